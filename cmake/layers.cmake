@@ -1,0 +1,48 @@
+# The functions that the house is put together with.
+
+# A layer: sources, the headers that the layers above may include, and the layers it uses. Its headers are reached
+# through a folder of links that holds nothing else; that is what keeps includes pointing down.
+function(qz_layer name)
+  cmake_parse_arguments(arg "" "ROOT" "HEADERS;SOURCES;USES" ${ARGN})
+  set(root ${PROJECT_SOURCE_DIR}/${arg_ROOT})
+  set(links ${PROJECT_BINARY_DIR}/layers/${name})
+  foreach(header IN LISTS arg_HEADERS)
+    cmake_path(GET header PARENT_PATH folder)
+    file(MAKE_DIRECTORY ${links}/${folder})
+    file(CREATE_LINK ${root}/${header} ${links}/${header} SYMBOLIC)
+  endforeach()
+  if(arg_SOURCES)
+    list(TRANSFORM arg_SOURCES PREPEND ${root}/)
+    add_library(${name} STATIC ${arg_SOURCES})
+    # The libraries must load where only libc is: nothing that the C++ runtime would have to supply.
+    target_compile_options(${name} PRIVATE -fno-exceptions -fno-rtti -fno-threadsafe-statics -fvisibility=hidden)
+    target_include_directories(${name} PUBLIC ${links})
+    target_link_libraries(${name} PUBLIC ${arg_USES})
+  else()
+    add_library(${name} INTERFACE)
+    target_include_directories(${name} INTERFACE ${links})
+    target_link_libraries(${name} INTERFACE ${arg_USES})
+  endif()
+endfunction()
+
+# A shared library made of whole layers. It is linked as C because it may need libc alone, and exports what its map
+# names and nothing else.
+function(qz_shared_library name)
+  cmake_parse_arguments(arg "" "MAP;HEADER" "LAYERS;USES" ${ARGN})
+  list(TRANSFORM arg_LAYERS REPLACE "(.+)" "$<TARGET_OBJECTS:\\1>" OUTPUT_VARIABLE objects)
+  add_library(${name} SHARED ${objects})
+  set_target_properties(${name} PROPERTIES
+    LINKER_LANGUAGE C
+    VERSION ${PROJECT_VERSION}
+    SOVERSION ${PROJECT_VERSION_MAJOR}
+    LINK_DEPENDS ${CMAKE_CURRENT_SOURCE_DIR}/${arg_MAP}
+    INSTALL_RPATH $ORIGIN)
+  target_link_options(${name} PRIVATE
+    -Wl,--version-script=${CMAKE_CURRENT_SOURCE_DIR}/${arg_MAP} -Wl,-z,relro,-z,now)
+  if(NOT QZ_SANITIZE)
+    target_link_options(${name} PRIVATE -Wl,-z,defs)
+  endif()
+  target_link_libraries(${name} PRIVATE ${arg_USES} INTERFACE layer_interface)
+  install(TARGETS ${name} LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
+  install(FILES ${PROJECT_SOURCE_DIR}/include/qz/${arg_HEADER} DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/qz)
+endfunction()

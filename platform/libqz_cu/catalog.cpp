@@ -1,0 +1,46 @@
+// The message catalogs of the process: opened at the first text fetched, and kept open because handed-out
+// texts lie in them.
+#include "libqz_cu/catalog.h"
+
+#include <cstddef>
+#include <cstring>
+#include <nl_types.h>
+#include <pthread.h>
+
+namespace qz::cu {
+namespace {
+
+struct opened_catalog {
+    char name[64];
+    nl_catd descriptor; // what catopen gave, a failure too, so that the files are not searched again
+};
+
+constinit opened_catalog catalogs[8] = {};
+constinit std::size_t catalog_count = 0;
+pthread_mutex_t catalogs_mutex = PTHREAD_MUTEX_INITIALIZER;
+
+const nl_catd no_catalog = reinterpret_cast<nl_catd>(-1);
+
+nl_catd find_or_open(const char *name) {
+    for (std::size_t i = 0; i < catalog_count; ++i)
+        if (std::strcmp(catalogs[i].name, name) == 0)
+            return catalogs[i].descriptor;
+    const std::size_t length = std::strlen(name);
+    if (catalog_count == sizeof catalogs / sizeof *catalogs || length >= sizeof catalogs->name)
+        return no_catalog;
+    opened_catalog &added = catalogs[catalog_count++];
+    std::memcpy(added.name, name, length + 1);
+    added.descriptor = catopen(name, NL_CAT_LOCALE);
+    return added.descriptor;
+}
+
+} // namespace
+
+const char *catalog_text(const char *catalog, int set, int message_id) {
+    pthread_mutex_lock(&catalogs_mutex);
+    const nl_catd descriptor = find_or_open(catalog);
+    pthread_mutex_unlock(&catalogs_mutex);
+    return descriptor == no_catalog ? nullptr : catgets(descriptor, set, message_id, nullptr);
+}
+
+} // namespace qz::cu

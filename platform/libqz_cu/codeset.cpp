@@ -1,0 +1,287 @@
+// Code-set conversion over the system's iconv. A handle is only ever read; what a conversion changes, the
+// system's converter with its shift state, each thread has of its own for each handle.
+#include "libqz_cu/kept_errno.h"
+#include "libqz_cu/posix_fold.h"
+#include "qz/cu.h"
+
+#include <algorithm>
+#include <cstdlib>
+#include <cstring>
+#include <iconv.h>
+#include <pthread.h>
+
+struct cu_iconv {
+    pthread_key_t converters; // of the threads; unused when both code sets are UTF-8
+    bool from_utf8;
+    bool utf8_alone; // both code sets are UTF-8, and the system's converter has nothing to do
+    bool unmodified; // then bytes pass as they are
+    bool bmp_only;
+    bool ascii_as_it_is; // strings of ASCII alone come out as they went in
+    char codeset[1];     // the name, in a block as long as it takes
+};
+
+namespace {
+
+using qz::cu::kept_errno;
+
+const iconv_t no_converter = reinterpret_cast<iconv_t>(-1);
+constexpr std::size_t failed = static_cast<std::size_t>(-1);
+
+// A block that is given back unless somebody takes it.
+class owned_block {
+public:
+    owned_block() = default;
+    ~owned_block() { std::free(bytes_); }
+    owned_block(const owned_block &) = delete;
+    owned_block &operator=(const owned_block &) = delete;
+
+    char *get() const { return static_cast<char *>(bytes_); }
+
+    // On failure the block stays as it was. No bytes are a block too, so that null always means failure.
+    bool resize(std::size_t size) {
+        void *moved = std::realloc(bytes_, size != 0 ? size : 1);
+        if (moved == nullptr)
+            return false;
+        bytes_ = moved;
+        return true;
+    }
+
+    char *take() {
+        char *taken = get();
+        bytes_ = nullptr;
+        return taken;
+    }
+
+private:
+    void *bytes_ = nullptr;
+};
+
+struct result {
+    owned_block block;
+    std::size_t length = 0;
+};
+
+bool is_ascii(const char *in, std::size_t length) {
+    std::uint64_t seen = 0;
+    for (; length >= 8; in += 8, length -= 8)
+        seen |= qz::load8(in);
+    for (; length != 0; ++in, --length)
+        seen |= static_cast<unsigned char>(*in);
+    return (seen & 0x8080808080808080) == 0;
+}
+
+// Characters above U+FFFF are the ones that begin with such a byte in UTF-8.
+bool leaves_bmp(unsigned char lead) {
+    return lead >= 0xf0;
+}
+
+// Whether bytes are UTF-8: no longer forms than needed, no surrogates, nothing above U+10FFFF. The system's
+// converters let the last pass.
+bool is_valid_utf8(const char *in, std::size_t left) {
+    while (left != 0) {
+        const auto lead = static_cast<unsigned char>(*in);
+        const std::size_t more = lead < 0x80 ? 0 : lead < 0xe0 ? 1 : lead < 0xf0 ? 2 : 3;
+        if ((lead >= 0x80 && lead < 0xc2) || lead > 0xf4 || more >= left)
+            return false;
+        for (std::size_t i = 1; i <= more; ++i) {
+            const auto byte = static_cast<unsigned char>(in[i]);
+            const bool second = i == 1;
+            const unsigned lowest = second && lead == 0xe0 ? 0xa0 : second && lead == 0xf0 ? 0x90 : 0x80;
+            const unsigned highest = second && lead == 0xed ? 0x9f : second && lead == 0xf4 ? 0x8f : 0xbf;
+            if (byte < lowest || byte > highest)
+                return false;
+        }
+        in += more + 1;
+        left -= more + 1;
+    }
+    return true;
+}
+
+int copy(const char *in, std::size_t length, result &out) {
+    if (!out.block.resize(length))
+        return CU_ICONV_NO_MEMORY;
+    std::memcpy(out.block.get(), in, length);
+    out.length = length;
+    return CU_OK;
+}
+
+int convert(iconv_t converter, const char *in, std::size_t in_left, result &out) {
+    // Most conversions keep the length or lose some; the others grow the block as they go.
+    std::size_t size = in_left + 16;
+    if (size < in_left || !out.block.resize(size))
+        return CU_ICONV_NO_MEMORY;
+    // An earlier conversion may have failed amid a shift.
+    iconv(converter, nullptr, nullptr, nullptr, nullptr);
+    char *from = const_cast<char *>(in);
+    for (bool ending = false;;) {
+        char *to = out.block.get() + out.length;
+        std::size_t to_left = size - out.length;
+        const std::size_t answer = ending ? iconv(converter, nullptr, nullptr, &to, &to_left)
+                                          : iconv(converter, &from, &in_left, &to, &to_left);
+        out.length = size - to_left;
+        if (answer == 0) {
+            if (ending)
+                break;
+            ending = true;
+        } else if (answer != failed || errno == EILSEQ || errno == EINVAL) {
+            // A positive answer counts characters that were replaced by others: they did not convert either.
+            return CU_ICONV_UNCONVERTIBLE;
+        } else if (errno != E2BIG) {
+            return CU_INTERNAL;
+        } else {
+            if (size > SIZE_MAX / 2 || !out.block.resize(size * 2))
+                return CU_ICONV_NO_MEMORY;
+            size *= 2;
+        }
+    }
+    // Should the smaller block be refused, the larger one serves.
+    if (out.length != size)
+        out.block.resize(out.length);
+    return CU_OK;
+}
+
+void close_converter(void *converter) {
+    iconv_close(converter);
+}
+
+// The calling thread's converter for the handle, opened at its first use.
+int converter_of(const cu_iconv &handle, iconv_t &converter) {
+    converter = pthread_getspecific(handle.converters);
+    if (converter != nullptr)
+        return CU_OK;
+    converter = handle.from_utf8 ? iconv_open(handle.codeset, "UTF-8") : iconv_open("UTF-8", handle.codeset);
+    if (converter == no_converter)
+        return errno == ENOMEM   ? CU_ICONV_NO_MEMORY
+               : errno == EINVAL ? CU_ICONV_UNKNOWN_CODESET
+                                 : CU_NO_RESOURCE;
+    if (pthread_setspecific(handle.converters, converter) != 0) {
+        iconv_close(converter);
+        return CU_ICONV_NO_MEMORY;
+    }
+    return CU_OK;
+}
+
+// All of ASCII, and behind it a taste of each way in which a code set can hide other characters in ASCII: by
+// escape sequences, by shifts, and by printable marks.
+struct ascii_probe {
+    static constexpr char tricks[] = "\x1b$BF|\x1b(B" // as ISO-2022-JP has it
+                                     "\x1b$)C\x0eF|\x0f"
+                                     "~{VP~}"
+                                     "+AOk-"
+                                     "&AOk-";
+    char bytes[128 + sizeof tricks];
+
+    constexpr ascii_probe() : bytes() {
+        for (unsigned i = 0; i < sizeof bytes; ++i)
+            bytes[i] = i < 128 ? static_cast<char>(i) : tricks[i - 128];
+    }
+};
+constexpr ascii_probe probe;
+
+// Finds out whether the code set can be opened at all, and whether ASCII is only itself in it.
+int examine(cu_iconv &handle) {
+    iconv_t converter;
+    if (const int code = converter_of(handle, converter); code != CU_OK)
+        return code;
+    result out;
+    const int code = convert(converter, probe.bytes, sizeof probe.bytes, out);
+    if (code == CU_ICONV_NO_MEMORY)
+        return code;
+    handle.ascii_as_it_is = code == CU_OK && out.length == sizeof probe.bytes &&
+                            std::memcmp(out.block.get(), probe.bytes, out.length) == 0;
+    return CU_OK;
+}
+
+bool is_utf8(const char *codeset) {
+    return qz::fold_compare(codeset, "utf-8") == 0 || qz::fold_compare(codeset, "utf8") == 0;
+}
+
+// Whether the handle lets the UTF-8 of a conversion, be it what goes in or what comes out, pass.
+bool allows(const cu_iconv &handle, const char *utf8, std::size_t length) {
+    return (handle.unmodified || is_valid_utf8(utf8, length)) &&
+           !(handle.bmp_only && std::any_of(utf8, utf8 + length, leaves_bmp));
+}
+
+int convert_for(const cu_iconv &handle, const char *in, std::size_t length, result &out) {
+    if (handle.ascii_as_it_is && is_ascii(in, length))
+        return copy(in, length, out);
+    if ((handle.from_utf8 || handle.utf8_alone) && !allows(handle, in, length))
+        return CU_ICONV_UNCONVERTIBLE;
+    if (handle.utf8_alone)
+        return copy(in, length, out);
+    iconv_t converter;
+    int code = converter_of(handle, converter);
+    if (code == CU_OK)
+        code = convert(converter, in, length, out);
+    if (code == CU_OK && !handle.from_utf8 && !allows(handle, out.block.get(), out.length))
+        return CU_ICONV_UNCONVERTIBLE;
+    // The code set was there when the handle was opened.
+    return code == CU_ICONV_UNKNOWN_CODESET ? CU_NO_RESOURCE : code;
+}
+
+} // namespace
+
+int cu_iconv_open_1(const char *codeset, uint32_t flags, cu_iconv_t *handle) {
+    if (handle == nullptr)
+        return CU_BAD_PARAMETER;
+    *handle = nullptr;
+    // The empty name, and what a name may have behind a slash, would mean more to the system than a code set.
+    if (codeset == nullptr || *codeset == 0 || std::strchr(codeset, '/') != nullptr ||
+        (flags & ~(CU_ICONV_FROM_UTF8 | CU_ICONV_UTF8_UNMODIFIED | CU_ICONV_BMP_ONLY)) != 0)
+        return CU_BAD_PARAMETER;
+    const kept_errno kept;
+    const std::size_t length = std::strlen(codeset);
+    owned_block block;
+    if (!block.resize(sizeof(cu_iconv) + length))
+        return CU_ICONV_NO_MEMORY;
+    const bool utf8_alone = is_utf8(codeset);
+    auto *made = reinterpret_cast<cu_iconv *>(block.get());
+    *made = {.converters = {},
+             .from_utf8 = (flags & CU_ICONV_FROM_UTF8) != 0,
+             .utf8_alone = utf8_alone,
+             .unmodified = utf8_alone && (flags & CU_ICONV_UTF8_UNMODIFIED) != 0,
+             .bmp_only = (flags & CU_ICONV_BMP_ONLY) != 0,
+             .ascii_as_it_is = utf8_alone,
+             .codeset = {}};
+    std::memcpy(made->codeset, codeset, length + 1);
+    if (!utf8_alone) {
+        if (pthread_key_create(&made->converters, close_converter) != 0)
+            return CU_NO_RESOURCE;
+        if (const int code = examine(*made); code != CU_OK) {
+            if (void *converter = pthread_getspecific(made->converters))
+                close_converter(converter);
+            pthread_key_delete(made->converters);
+            return code;
+        }
+    }
+    *handle = made;
+    block.take();
+    return CU_OK;
+}
+
+int cu_iconv_str_1(cu_iconv_t handle, uint32_t options, const char *in, const size_t *in_length, char **out,
+                   size_t *out_length) {
+    if (handle == nullptr || options != 0 || in == nullptr || in_length == nullptr || out == nullptr ||
+        out_length == nullptr)
+        return CU_BAD_PARAMETER;
+    const kept_errno kept;
+    result made;
+    const int code = convert_for(*handle, in, *in_length, made);
+    if (code == CU_OK) {
+        *out = made.block.take();
+        *out_length = made.length;
+    }
+    return code;
+}
+
+int cu_utf8_is_assumed_1(void) {
+    return 0;
+}
+
+int cu_utf8_is_not_modified_1(void) {
+    return 0;
+}
+
+int cu_utf8_is_limited_to_bmp_1(void) {
+    return 0;
+}

@@ -1,0 +1,203 @@
+// The error facility: each thread's current error, recorded as it comes and made into a text only when
+// fetched.
+#include "libqz_cu/catalog.h"
+#include "libqz_cu/kept_errno.h"
+#include "libqz_cu/message_text.h"
+#include "qz/cu.h"
+
+#include <cstdarg>
+#include <cstddef>
+#include <cstdlib>
+#include <cstring>
+#include <pthread.h>
+#include <type_traits>
+
+namespace qz::cu {
+namespace {
+
+struct recorded_error {
+    cu_error_t head; // first, because a handle points to it
+    bool present;    // false: the no-error state, whatever else stands here
+    int set;
+    const char *catalog;
+    const char *default_text;
+    arguments given;
+};
+static_assert(std::is_standard_layout_v<recorded_error>);
+
+struct thread_record {
+    recorded_error error;
+    char *spill; // the strings, when they do not fit into the room
+    char room[512];
+};
+
+// Initial-exec: reaching the record is one instruction, and the library needs nothing of the dynamic linker
+// for it. Such storage is scarce in libraries loaded late, hence the small room.
+constinit thread_local thread_record current [[gnu::tls_model("initial-exec")]] = {};
+
+pthread_once_t spill_once = PTHREAD_ONCE_INIT;
+constinit pthread_key_t spill_key = {};
+constinit bool has_spill_key = false;
+
+void drop_spill() {
+    std::free(current.spill);
+    current.spill = nullptr;
+}
+
+// Runs as the thread exits, perhaps before other cleanups that look at the current error.
+void end_of_thread(void *) {
+    current.error.present = false;
+    drop_spill();
+}
+
+void make_spill_key() {
+    has_spill_key = pthread_key_create(&spill_key, end_of_thread) == 0;
+}
+
+[[gnu::cold, gnu::noinline]] bool take_spill(std::size_t size) {
+    const kept_errno kept;
+    pthread_once(&spill_once, make_spill_key);
+    if (!has_spill_key || pthread_setspecific(spill_key, &current) != 0)
+        return false;
+    current.spill = static_cast<char *>(std::malloc(size));
+    return current.spill != nullptr;
+}
+
+struct string_sizes {
+    std::size_t each[max_arguments];
+    std::size_t total = 0;
+
+    // Each with its NUL; a number and a null string take nothing.
+    explicit string_sizes(const arguments &given) {
+        for (unsigned i = 0; i < given.count; ++i) {
+            const bool has_bytes = given.is_string(i) && given.values[i].text != nullptr;
+            each[i] = has_bytes ? std::strlen(given.values[i].text) + 1 : 0;
+            total += each[i];
+        }
+    }
+};
+
+// Moves the strings into the room, cutting what does not fit.
+void pack_strings(arguments &given, const string_sizes &sizes, char *room, std::size_t left) {
+    for (unsigned i = 0; i < given.count; ++i) {
+        if (sizes.each[i] == 0)
+            continue;
+        const std::size_t taken = sizes.each[i] < left ? sizes.each[i] : left;
+        if (taken == 0) {
+            given.values[i].text = "";
+            continue;
+        }
+        std::memcpy(room, given.values[i].text, taken - 1);
+        room[taken - 1] = 0;
+        given.values[i].text = room;
+        room += taken;
+        left -= taken;
+    }
+}
+
+// Completes a record whose strings still lie elsewhere.
+void keep_strings() {
+    if (current.spill != nullptr) [[unlikely]]
+        drop_spill();
+    const string_sizes sizes(current.error.given);
+    if (sizes.total > sizeof current.room && take_spill(sizes.total))
+        pack_strings(current.error.given, sizes, current.spill, sizes.total);
+    else
+        pack_strings(current.error.given, sizes, current.room, sizeof current.room);
+}
+
+const recorded_error &record_of(const cu_error_t *handle) {
+    return *reinterpret_cast<const recorded_error *>(handle);
+}
+
+// The text that a recorded error shows: the catalog's if it can be trusted to fit the arguments.
+const char *text_of(const recorded_error &error) {
+    const char *by_default = error.default_text != nullptr ? error.default_text : "";
+    if (error.catalog == nullptr)
+        return by_default;
+    const char *offered = catalog_text(error.catalog, error.set, error.head.message_id);
+    return offered != nullptr && has_conversions_of(offered, by_default) ? offered : by_default;
+}
+
+} // namespace
+} // namespace qz::cu
+
+using namespace qz::cu;
+
+int cu_set_error_1(int code, int, const char *catalog, int set, int message_id, const char *default_text,
+                   ...) {
+    recorded_error &error = current.error;
+    error.head = {code, message_id};
+    error.present = true;
+    error.set = set;
+    error.catalog = catalog;
+    error.default_text = default_text;
+    find_arguments(default_text != nullptr ? default_text : "", error.given);
+
+    va_list given;
+    va_start(given, default_text);
+    for (unsigned i = 0; i < error.given.count; ++i) {
+        if (error.given.is_string(i))
+            error.given.values[i].text = va_arg(given, const char *);
+        else
+            error.given.values[i].number = va_arg(given, int);
+    }
+    va_end(given);
+    keep_strings();
+    return CU_OK;
+}
+
+int cu_set_no_error_1(void) {
+    current.error.present = false;
+    return CU_OK;
+}
+
+int cu_get_error_1(cu_error_t **error) {
+    if (error == nullptr)
+        return CU_BAD_PARAMETER;
+    const kept_errno kept;
+    const recorded_error from = current.error.present ? current.error : recorded_error{};
+    const string_sizes sizes(from.given);
+    void *block = std::malloc(sizeof(recorded_error) + sizes.total);
+    if (block == nullptr) {
+        *error = nullptr;
+        return CU_NO_MEMORY;
+    }
+    auto *copy = static_cast<recorded_error *>(std::memcpy(block, &from, sizeof from));
+    pack_strings(copy->given, sizes, static_cast<char *>(block) + sizeof from, sizes.total);
+    *error = &copy->head;
+    return CU_OK;
+}
+
+int cu_get_errmsg_1(const cu_error_t *error, char **text) {
+    if (text == nullptr)
+        return CU_BAD_PARAMETER;
+    *text = nullptr;
+    if (error == nullptr)
+        return CU_BAD_PARAMETER;
+    const kept_errno kept;
+    const recorded_error &from = record_of(error);
+    const char *shown = from.present ? text_of(from) : "";
+    char *made = static_cast<char *>(std::malloc(format_text(shown, from.given, nullptr)));
+    if (made == nullptr)
+        return CU_NO_MEMORY;
+    format_text(shown, from.given, made);
+    *text = made;
+    return CU_OK;
+}
+
+int cu_pset_error_1(const cu_error_t *error) {
+    if (error == nullptr)
+        return CU_BAD_PARAMETER;
+    current.error = record_of(error);
+    keep_strings();
+    return CU_OK;
+}
+
+void cu_rel_error_1(cu_error_t *error) {
+    std::free(error);
+}
+
+void cu_rel_errmsg_1(char *text) {
+    std::free(text);
+}

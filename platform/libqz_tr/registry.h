@@ -1,0 +1,24 @@
+// The registered components and the level bytes that they test.
+#ifndef QZ_TR_REGISTRY_H
+#define QZ_TR_REGISTRY_H
+
+#include "qz/tr.h"
+
+#include <cstdint>
+#include <span>
+#include <string_view>
+
+namespace qz::tr::registry {
+
+// Registers a component, anew or again, and fills its levels, of which there are as many as categories:
+// TR_OK, TR_BAD_PARAMETER (the name cannot be one) or TR_NO_MEMORY (no place is left).
+int enter(std::string_view name, std::span<std::uint8_t> levels, std::span<const tr_category_t> categories);
+
+// Sets the component's levels to 0 and forgets them: TR_OK or TR_NOT_REGISTERED.
+int leave(std::string_view name);
+
+bool contains(std::string_view name);
+
+} // namespace qz::tr::registry
+
+#endif

@@ -1,0 +1,111 @@
+// Opens the trace file with care, because whoever can reach its folder may have prepared something in its
+// place, and writes to it such that nothing which befalls the file reaches the traced program.
+#include "libqz_tr/trace_file.h"
+
+#include "libqz_tr/environment.h"
+#include "qz/tr.h"
+
+#include <cerrno>
+#include <csignal>
+#include <fcntl.h>
+#include <pthread.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace qz::tr::trace_file {
+namespace {
+
+pthread_once_t once = PTHREAD_ONCE_INIT;
+int descriptor = -1;
+dev_t device;
+ino_t inode;
+
+void open_file() {
+    const char *file = environment().file;
+    if (file == nullptr)
+        return;
+    // O_NONBLOCK keeps a FIFO without a reader from stopping the program before it can be seen to be one.
+    int opened = open(file, O_WRONLY | O_APPEND | O_CREAT | O_NOFOLLOW | O_CLOEXEC | O_NOCTTY | O_NONBLOCK,
+                      S_IRUSR | S_IWUSR);
+    if (opened >= 0 && opened <= STDERR_FILENO) {
+        // A program that runs without a standard stream must not print into the trace file.
+        const int higher = fcntl(opened, F_DUPFD_CLOEXEC, STDERR_FILENO + 1);
+        close(opened);
+        opened = higher;
+    }
+    if (opened < 0)
+        return;
+    struct stat status;
+    if (fstat(opened, &status) != 0 || !S_ISREG(status.st_mode)) {
+        close(opened);
+        return;
+    }
+    device = status.st_dev;
+    inode = status.st_ino;
+    descriptor = opened;
+}
+
+// A daemon may close every descriptor it finds, and the number of ours then names some other file of the
+// program.
+bool is_ours(struct stat &status) {
+    pthread_once(&once, open_file);
+    return descriptor >= 0 && fstat(descriptor, &status) == 0 && status.st_dev == device &&
+           status.st_ino == inode;
+}
+
+ssize_t write_once(std::string_view line) {
+    ssize_t written = 0;
+    do {
+        written = write(descriptor, line.data(), line.size());
+    } while (written < 0 && errno == EINTR);
+    return written;
+}
+
+// Under a file size limit a write may raise SIGXFSZ, which ends a program that does not expect it. The signal
+// is held back during the write, and taken away if this write raised it.
+ssize_t write_under_limit(std::string_view line) {
+    sigset_t limit_signal;
+    sigset_t before;
+    sigset_t pending;
+    sigemptyset(&limit_signal);
+    sigaddset(&limit_signal, SIGXFSZ);
+    pthread_sigmask(SIG_BLOCK, &limit_signal, &before);
+    sigpending(&pending);
+    const ssize_t written = write_once(line);
+    if (written < 0 && errno == EFBIG && sigismember(&pending, SIGXFSZ) == 0) {
+        const timespec at_once{};
+        while (sigtimedwait(&limit_signal, nullptr, &at_once) < 0 && errno == EINTR) {
+        }
+    }
+    pthread_sigmask(SIG_SETMASK, &before, nullptr);
+    return written;
+}
+
+} // namespace
+
+off_t size() {
+    struct stat status;
+    return is_ours(status) ? status.st_size : -1;
+}
+
+const char *name() {
+    struct stat status;
+    return is_ours(status) ? environment().file : nullptr;
+}
+
+int append(std::string_view line) {
+    struct stat status;
+    if (!is_ours(status))
+        return TR_NO_FILE;
+    rlimit limit{};
+    ssize_t written = -1;
+    if (getrlimit(RLIMIT_FSIZE, &limit) != 0 || limit.rlim_cur == RLIM_INFINITY) {
+        written = write_once(line);
+    } else if (static_cast<rlim_t>(status.st_size) + line.size() <= limit.rlim_cur) {
+        written = write_under_limit(line);
+    }
+    return written >= 0 && static_cast<std::size_t>(written) == line.size() ? TR_OK : TR_FILE_ERROR;
+}
+
+} // namespace qz::tr::trace_file

@@ -1,0 +1,160 @@
+// The command qzaclfck: its options, and the decision between help, a usage error and a check.
+#include "bulk_aclfile.h"
+
+#include "report.h"
+
+#include <clocale>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <fcntl.h>
+#include <unistd.h>
+
+namespace {
+
+char *aclfname;
+char *username;
+char *ptplname;
+
+// What the options come to; each event overwrites the status, so the last one decides.
+struct option_state {
+    static constexpr int help_wanted = 1;
+
+    unsigned flags = 0;
+    int status = 0;
+    bool has_error = false;
+
+    void fail(int code) {
+        has_error = true;
+        status = code;
+    }
+};
+
+void set_flag(option_state &state, unsigned flag, const char *option) {
+    if ((state.flags & flag) != 0)
+        state.fail(qz::report(SEC_S_BAD_PARAMETER, qz::msg::option_repeated, option));
+    else
+        state.flags |= flag;
+}
+
+void set_name(option_state &state, char *&name, const char *option) {
+    if (name != nullptr) {
+        state.fail(qz::report(SEC_S_BAD_PARAMETER, qz::msg::option_repeated, option));
+        return;
+    }
+    name = strdup(optarg);
+    if (name == nullptr)
+        state.fail(qz::report_no_memory("main", std::strlen(optarg) + 1));
+}
+
+option_state read_options(int argc, char *argv[]) {
+    option_state state;
+    opterr = 1;
+    for (;;) {
+        switch (getopt(argc, argv, "cf:hsSt:u:v")) {
+        case -1:
+            return state;
+        case 'c':
+            set_flag(state, ACLFCK_OPT_CONTINUE, "-c");
+            break;
+        case 'f':
+            set_name(state, aclfname, "-f");
+            break;
+        case 'h':
+            if ((state.flags & ACLFCK_OPT_HELP) == 0)
+                state.status = option_state::help_wanted;
+            set_flag(state, ACLFCK_OPT_HELP, "-h");
+            break;
+        case 's':
+            set_flag(state, ACLFCK_OPT_COMPILE, "-s");
+            break;
+        case 'S':
+            set_flag(state, ACLFCK_OPT_STREAM, "-S");
+            break;
+        case 't':
+            set_name(state, ptplname, "-t");
+            break;
+        case 'u':
+            set_name(state, username, "-u");
+            break;
+        case 'v':
+            set_flag(state, ACLFCK_OPT_VERBOSE, "-v");
+            break;
+        default:
+            state.fail(qz::report(SEC_S_BAD_PARAMETER, qz::msg::option_incorrect));
+            break;
+        }
+    }
+}
+
+int print_usage() {
+    const int status = qz::report(SEC_S_BAD_PARAMETER, qz::msg::usage);
+    aclfck__print_error();
+    return status;
+}
+
+int finish_without_check(const option_state &state) {
+    if (!state.has_error) {
+        qz::report(SEC_S_BAD_PARAMETER, qz::msg::help);
+        aclfck__print_error();
+        return EXIT_SUCCESS;
+    }
+    aclfck__print_error();
+    if (state.status == SEC_S_BAD_PARAMETER)
+        return print_usage();
+    return state.status == option_state::help_wanted ? EXIT_SUCCESS : state.status;
+}
+
+void warn_not_implemented() {
+    qz::report(SEC_S_WARNING, qz::msg::stream_not_implemented);
+    aclfck__print_error();
+    cu_set_no_error_1();
+}
+
+int check(unsigned flags) {
+    if (aclfname == nullptr) {
+        qz::report(SEC_S_BAD_PARAMETER, qz::msg::file_option_missing);
+        aclfck__print_error();
+        return print_usage();
+    }
+    const bool is_verbose = (flags & ACLFCK_OPT_VERBOSE) != 0;
+    if (ptplname != nullptr && is_verbose)
+        warn_not_implemented();
+    if ((flags & ACLFCK_OPT_STREAM) != 0) {
+        if (is_verbose)
+            warn_not_implemented();
+        flags &= ~unsigned{ACLFCK_OPT_STREAM};
+    }
+    if (username != nullptr && (flags & ACLFCK_OPT_COMPILE) != 0) {
+        flags &= ~unsigned{ACLFCK_OPT_COMPILE};
+        qz::report(SEC_S_ADVISORY, qz::msg::compile_option_ignored);
+        aclfck__print_error();
+        cu_set_no_error_1();
+    }
+    return aclfck__bulk_aclfile(aclfname, username, flags);
+}
+
+// A file that is opened later must not become one of the standard streams, or a message would end up in it.
+void fill_standard_descriptors() {
+    int fd = 0;
+    do {
+        fd = open("/dev/null", O_RDWR);
+    } while (fd >= 0 && fd <= STDERR_FILENO);
+    if (fd > STDERR_FILENO)
+        close(fd);
+}
+
+} // namespace
+
+int main(int argc, char *argv[]) {
+    fill_standard_descriptors();
+    std::setlocale(LC_ALL, "");
+    // Entry lines are gathered; every failure is flushed when it is printed, and the rest at the end.
+    static char stream_buffer[1 << 16];
+    std::setvbuf(stderr, stream_buffer, _IOFBF, sizeof stream_buffer);
+
+    const option_state state = read_options(argc, argv);
+    const int status = state.status != 0 ? finish_without_check(state) : check(state.flags);
+    std::fflush(stderr);
+    return status;
+}

@@ -1,0 +1,75 @@
+// Owners of what must be given back: memory from malloc, and descriptors.
+#ifndef QZ_OWNED_H
+#define QZ_OWNED_H
+
+#include <cstddef>
+#include <cstdlib>
+#include <memory>
+#include <unistd.h>
+#include <utility>
+
+namespace qz {
+
+struct free_memory {
+    void operator()(void *memory) const { std::free(memory); }
+};
+
+// Memory from malloc; release() hands it to a caller who frees it with free.
+template <class T>
+using owned = std::unique_ptr<T, free_memory>;
+
+// Uninitialised memory for `count` objects of a trivial type, or null.
+template <class T>
+owned<T[]> allocate(std::size_t count) {
+    static_assert(std::is_trivial_v<T>);
+    if (count > SIZE_MAX / sizeof(T))
+        return nullptr;
+    return owned<T[]>(static_cast<T *>(std::malloc(count * sizeof(T))));
+}
+
+// Resizes an owned array; on failure the array is as it was and the result is false.
+template <class T>
+bool reallocate(owned<T[]> &array, std::size_t count) {
+    static_assert(std::is_trivial_v<T>);
+    if (count > SIZE_MAX / sizeof(T))
+        return false;
+    auto *grown = static_cast<T *>(std::realloc(static_cast<void *>(array.get()), count * sizeof(T)));
+    if (grown == nullptr)
+        return false;
+    static_cast<void>(array.release());
+    array.reset(grown);
+    return true;
+}
+
+// An open file descriptor, closed at the end of its scope.
+class descriptor {
+public:
+    descriptor() = default;
+    explicit descriptor(int fd) : fd_(fd) {}
+    descriptor(descriptor &&other) noexcept : fd_(std::exchange(other.fd_, -1)) {}
+    descriptor &operator=(descriptor &&other) noexcept {
+        if (this != &other) {
+            close();
+            fd_ = std::exchange(other.fd_, -1);
+        }
+        return *this;
+    }
+    descriptor(const descriptor &) = delete;
+    descriptor &operator=(const descriptor &) = delete;
+    ~descriptor() { close(); }
+
+    explicit operator bool() const { return fd_ >= 0; }
+    int get() const { return fd_; }
+
+    void close() {
+        if (fd_ >= 0)
+            ::close(std::exchange(fd_, -1));
+    }
+
+private:
+    int fd_ = -1;
+};
+
+} // namespace qz
+
+#endif

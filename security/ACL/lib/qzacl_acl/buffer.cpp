@@ -1,0 +1,90 @@
+// Whole compiled buffers: making, taking over, releasing, and finding one sub-ACL in them.
+#include "qzacl_acl/buffer.h"
+
+#include "owned.h"
+#include "qzacl_acl/buffer_format.h"
+#include "qzacl_acl/entry.h"
+#include "qzacl_trace.h"
+#include "report.h"
+
+namespace {
+
+int read_checked(int length, const void *data, sec_acl_buffer_t *acl) {
+    constexpr const char *function = "sec_read_acl_from_data";
+    if (length < 1)
+        return qz::report_bad_parameter(function, 1, length);
+    if (data == nullptr)
+        return qz::report_bad_parameter(function, 2, 0);
+    if (acl == nullptr)
+        return qz::report_bad_parameter(function, 3, 0);
+    const auto size = static_cast<std::size_t>(length);
+    auto copy = qz::allocate<unsigned char>(size);
+    if (copy == nullptr)
+        return qz::report_no_memory(function, size);
+    std::memcpy(copy.get(), data, size);
+    *acl = {length, copy.release()};
+    return SEC_S_OK;
+}
+
+int release_checked(sec_acl_buffer_t *acl) {
+    if (acl == nullptr || acl->data == nullptr)
+        return SEC_S_OK;
+    // A descriptor that claims no bytes has no first byte to look at.
+    const qz::byte_span bytes = qz::format::bytes_of(*acl);
+    if (bytes.empty() || bytes.front() != qz::format::buffer_type)
+        return qz::report(SEC_S_BAD_ACL, qz::msg::acl_corrupted);
+    std::free(acl->data);
+    *acl = {};
+    return SEC_S_OK;
+}
+
+} // namespace
+
+int sec_create_empty_acl(sec_acl_buffer_t *acl) {
+    constexpr const char *function = "sec_create_empty_acl";
+    if (acl == nullptr)
+        return qz::report_bad_parameter(function, 1, 0);
+    acl->data = std::malloc(sizeof qz::format::empty_acl);
+    if (acl->data == nullptr)
+        return qz::report_no_memory(function, sizeof qz::format::empty_acl);
+    std::memcpy(acl->data, qz::format::empty_acl, sizeof qz::format::empty_acl);
+    acl->length = sizeof qz::format::empty_acl;
+    return SEC_S_OK;
+}
+
+int sec_read_acl_from_data(int length, const void *data, sec_acl_buffer_t *acl) {
+    qz::trace_entry(15, [&] { qz::trace_data(17, qz::number(length), qz::number(data), qz::number(acl)); });
+    cu_set_no_error_1();
+    const int result = read_checked(length, data, acl);
+    qz::trace_exit(18, result);
+    return result;
+}
+
+int sec_release_acl(sec_acl_buffer_t *acl) {
+    qz::trace_entry(70, [&] {
+        const sec_acl_buffer_t shown = acl == nullptr ? sec_acl_buffer_t{} : *acl;
+        qz::trace_data(72, qz::number(acl), qz::number(shown.length), qz::number(shown.data));
+    });
+    cu_set_no_error_1();
+    const int result = release_checked(acl);
+    qz::trace_release_exit(73);
+    return result;
+}
+
+int sec__find_subacl(const sec_acl_buffer_t *acl, std::uint8_t type, const char *mechanism,
+                     const unsigned char **subacl) {
+    *subacl = nullptr;
+    qz::format::subacl_walk walk(qz::format::bytes_of(*acl));
+    while (walk.next() == qz::format::subacl_walk::step::found) {
+        if (walk.current().type != type)
+            continue;
+        if (qz::has_mechanism(type)) {
+            const char *held = qz::format::string_in(walk.current().mechanism);
+            if (held == nullptr || cu_strcasecmp_posix_1(held, mechanism) != 0)
+                continue;
+        }
+        *subacl = walk.start().position();
+        break;
+    }
+    return SEC_S_OK;
+}

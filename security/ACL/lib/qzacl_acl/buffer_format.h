@@ -1,0 +1,172 @@
+// The byte format of a compiled ACL, and the walk over its sub-ACLs and entries. No other file knows an offset.
+//
+//   Header             0  1  buffer type, 0x85
+//                      1  1  version, 1
+//                      2  1  byte order: 2 when the fields below are in host order, anything else when they are not
+//                      3  2  number of sub-ACLs
+//
+//   Sub-ACL            0  4  its length: this header, the mechanism and the entries
+//                      4  1  type of its entries: 1, 2, 4, 8 or 16
+//                      5  4  number of entries
+//                      9  1  bytes of the mechanism with its NUL; 0 for types 1, 2 and 16
+//                     10     mechanism, entries
+//
+//   Entry              0  1  version, 1
+//                      1  4  permission mask
+//                      5  2  bytes of the identity with its NUL; 0 for types 1 and 2
+//                      7     identity
+//
+// Records follow each other without padding. One user entry, mechanism abcd, identity xyz, mask 3, takes 31 bytes:
+//
+//   85 01 02 01 00 | 1a 00 00 00  04  01 00 00 00  05  61 62 63 64 00 | 01  03 00 00 00  04 00  78 79 7a 00
+#ifndef QZACL_BUFFER_FORMAT_H
+#define QZACL_BUFFER_FORMAT_H
+
+#include "bytes.h"
+#include "qz/acl.h"
+
+#include <cstddef>
+#include <cstdint>
+#include <cstring>
+#include <limits>
+
+namespace qz::format {
+
+inline constexpr std::uint8_t buffer_type = 0x85;
+inline constexpr std::uint8_t buffer_version = 1;
+inline constexpr std::uint8_t host_order = 2;
+inline constexpr std::uint8_t entry_version = 1;
+
+inline constexpr std::size_t header_size = 5;
+inline constexpr std::size_t order_offset = 2;
+inline constexpr std::size_t count_offset = 3;
+
+inline constexpr std::size_t subacl_header_size = 10;
+inline constexpr std::size_t subacl_type_offset = 4;
+inline constexpr std::size_t subacl_count_offset = 5;
+
+inline constexpr std::size_t entry_fixed_size = 7;
+inline constexpr std::size_t entry_mask_offset = 1;
+inline constexpr std::size_t entry_length_offset = 5;
+
+// Limits of the fields' widths.
+inline constexpr std::size_t identity_max = std::numeric_limits<std::uint16_t>::max() - 1;
+inline constexpr std::size_t subacls_max = std::numeric_limits<std::uint16_t>::max();
+inline constexpr std::size_t buffer_max = std::numeric_limits<std::int32_t>::max();
+
+inline constexpr unsigned char empty_acl[header_size] = {buffer_type, buffer_version, host_order, 0, 0};
+
+struct header {
+    std::uint8_t type = 0;
+    std::uint8_t version = 0;
+    std::uint8_t order = 0;
+    std::uint16_t subacl_count = 0;
+};
+
+struct subacl {
+    std::uint32_t length = 0;
+    std::uint8_t type = 0;
+    std::uint32_t entry_count = 0;
+    byte_span mechanism; // with its NUL
+};
+
+struct entry {
+    std::uint8_t version = 0;
+    std::uint32_t perm_mask = 0;
+    byte_span identity; // with its NUL
+};
+
+// The bytes of a descriptor; none where its length is not positive or it holds no buffer.
+inline byte_span bytes_of(const sec_acl_buffer_t &acl) {
+    if (acl.data == nullptr || acl.length <= 0)
+        return {};
+    return {static_cast<const unsigned char *>(acl.data), static_cast<std::size_t>(acl.length)};
+}
+
+inline bool read(byte_reader &reader, header &out) {
+    return reader.field(out.type) && reader.field(out.version) && reader.field(out.order) &&
+           reader.field(out.subacl_count);
+}
+
+// Reads a sub-ACL's header and mechanism; the reader then stands before its first entry.
+inline bool read(byte_reader &reader, subacl &out) {
+    std::uint8_t mechanism_length = 0;
+    return reader.field(out.length) && reader.field(out.type) && reader.field(out.entry_count) &&
+           reader.field(mechanism_length) && reader.bytes(mechanism_length, out.mechanism);
+}
+
+inline bool read(byte_reader &reader, entry &out) {
+    std::uint16_t identity_length = 0;
+    return reader.field(out.version) && reader.field(out.perm_mask) && reader.field(identity_length) &&
+           reader.bytes(identity_length, out.identity);
+}
+
+// A string field as a C string, or null when no NUL ends it inside the field.
+inline const char *string_in(byte_span field) {
+    if (field.empty() || std::memchr(field.data(), '\0', field.size()) == nullptr)
+        return nullptr;
+    return reinterpret_cast<const char *>(field.data());
+}
+
+// Steps through the sub-ACLs of a buffer in host order, from each to the next by its length field.
+class subacl_walk {
+public:
+    enum class step : std::uint8_t { found, end, corrupt };
+
+    explicit subacl_walk(byte_span buffer) : next_(buffer) {
+        header head;
+        if (read(next_, head))
+            left_ = head.subacl_count;
+    }
+
+    step next() {
+        if (left_ == 0)
+            return step::end;
+        // A length that does not cover the sub-ACL's own header would lead back into it.
+        if (is_started_ && (current_.length < subacl_header_size || !next_.skip(current_.length)))
+            return step::corrupt;
+        is_started_ = true;
+        --left_;
+        entries_ = next_;
+        return read(entries_, current_) ? step::found : step::corrupt;
+    }
+
+    const subacl &current() const { return current_; }
+    // Where the current sub-ACL starts, and the reader before its entries.
+    byte_reader start() const { return next_; }
+    byte_reader entries() const { return entries_; }
+
+private:
+    byte_reader next_;
+    byte_reader entries_;
+    subacl current_;
+    std::size_t left_ = 0;
+    bool is_started_ = false;
+};
+
+inline void write_header(byte_writer &writer, std::uint16_t subacl_count) {
+    writer.field(buffer_type);
+    writer.field(buffer_version);
+    writer.field(host_order);
+    writer.field(subacl_count);
+}
+
+inline void write_subacl_header(byte_writer &writer, const subacl &head) {
+    writer.field(head.length);
+    writer.field(head.type);
+    writer.field(head.entry_count);
+    writer.field(static_cast<std::uint8_t>(head.mechanism.size()));
+    writer.bytes(head.mechanism.data(), head.mechanism.size());
+}
+
+// Writes an entry; `identity_size` counts the NUL, and is 0 for an entry without identity.
+inline void write_entry(byte_writer &writer, std::uint32_t perm_mask, const char *identity, std::size_t identity_size) {
+    writer.field(entry_version);
+    writer.field(perm_mask);
+    writer.field(static_cast<std::uint16_t>(identity_size));
+    writer.bytes(identity, identity_size);
+}
+
+} // namespace qz::format
+
+#endif

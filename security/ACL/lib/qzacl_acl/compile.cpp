@@ -1,0 +1,194 @@
+// Compiling trees into the bytes of a buffer, and expanding those bytes back into trees and lists.
+#include "qzacl_acl/compile.h"
+
+#include "qzacl_acl/buffer_format.h"
+#include "report.h"
+
+namespace {
+
+namespace format = qz::format;
+
+// What a tree becomes: its header, measured before anything is allocated.
+struct measured_subacl {
+    format::subacl head;
+    std::span<sec_acle_t *const> nodes;
+};
+
+int measure(const sec_acltree_t &tree, measured_subacl &out) {
+    constexpr const char *function = "sec__acltree_to_subacl";
+    std::size_t refused = 0;
+    if (!tree.in_order(out.nodes, refused))
+        return qz::report_no_memory(function, refused);
+    if (qz::has_identity(tree.type()) && tree.longest_identity() > format::identity_max)
+        return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_lacks_key, tree.type());
+
+    out.head.type = tree.type();
+    out.head.entry_count = tree.held_count();
+    if (qz::has_mechanism(tree.type())) {
+        const char *mechanism = tree.first_held()->mechanism;
+        out.head.mechanism = {reinterpret_cast<const unsigned char *>(mechanism), std::strlen(mechanism) + 1};
+    }
+    const std::uint64_t length = format::subacl_header_size + out.head.mechanism.size() + tree.packed_size();
+    if (length > format::buffer_max)
+        return qz::report_no_memory("sec__add_acle_to_subacl", length);
+    out.head.length = static_cast<std::uint32_t>(length);
+    return SEC_S_OK;
+}
+
+void write(qz::byte_writer &writer, const measured_subacl &subacl) {
+    // The nodes lie in memory in the order of insertion; fetching ahead hides most of the jumps between them.
+    constexpr std::size_t ahead = 8;
+    format::write_subacl_header(writer, subacl.head);
+    const bool has_identity = qz::has_identity(subacl.head.type);
+    for (std::size_t index = 0; index < subacl.nodes.size(); ++index) {
+        if (index + ahead < subacl.nodes.size())
+            __builtin_prefetch(subacl.nodes[index + ahead]);
+        const sec_acle_t &acle = *subacl.nodes[index];
+        if (acle.type != 0)
+            format::write_entry(writer, acle.perm_mask, acle.identity, has_identity ? std::strlen(acle.identity) + 1 : 0);
+    }
+}
+
+bool has_entries(const sec_acltree_t *root) { return root != nullptr && root->held_count() != 0; }
+
+int corrupt(int line) { return qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupted, qz::acl_source, line); }
+
+// The parts of an expanded entry that all entries of a sub-ACL share.
+int common_part(const format::subacl &head, sec_acle_t &acle) {
+    acle = {};
+    acle.type = head.type;
+    if (!qz::is_acle_type(head.type))
+        return corrupt(__LINE__);
+    if (!qz::has_mechanism(head.type))
+        return SEC_S_OK;
+    const char *mechanism = format::string_in(head.mechanism);
+    const std::size_t length = mechanism == nullptr ? head.mechanism.size() : std::strlen(mechanism);
+    if (length > qz::mechanism_max)
+        return qz::report(SEC_S_BAD_ACL, qz::msg::bad_mechanism_length, qz::shown_size(head.mechanism.size()),
+                          qz::acl_source, __LINE__);
+    if (mechanism == nullptr)
+        return corrupt(__LINE__);
+    std::memcpy(acle.mechanism, mechanism, length);
+    return SEC_S_OK;
+}
+
+int expand(qz::byte_reader reader, const format::subacl &head, sec_acltree_t **root) {
+    sec_acle_t acle = {};
+    if (const int result = common_part(head, acle); result != SEC_S_OK)
+        return result;
+    for (std::uint32_t left = head.entry_count; left != 0; --left) {
+        format::entry entry;
+        if (!format::read(reader, entry))
+            return corrupt(__LINE__);
+        acle.perm_mask = entry.perm_mask;
+        if (qz::has_identity(head.type)) {
+            const char *identity = format::string_in(entry.identity);
+            if (identity == nullptr)
+                return corrupt(__LINE__);
+            // The tree copies the identity; nothing writes through this pointer.
+            acle.identity = const_cast<char *>(identity);
+        }
+        if (const int result = sec__add_acle_to_tree(0, &acle, root); result != SEC_S_OK)
+            return result;
+    }
+    return SEC_S_OK;
+}
+
+} // namespace
+
+int sec__acltree_to_subacl(const sec_acltree_t *root, qz::loose_subacl &out) {
+    out = {};
+    if (!has_entries(root))
+        return SEC_S_OK;
+    measured_subacl subacl;
+    if (const int result = measure(*root, subacl); result != SEC_S_OK)
+        return result;
+    auto memory = qz::allocate<unsigned char>(subacl.head.length);
+    if (memory == nullptr)
+        return qz::report_no_memory("sec__add_acle_to_subacl", subacl.head.length);
+    qz::byte_writer writer(memory.get(), subacl.head.length);
+    write(writer, subacl);
+    out = {std::move(memory), subacl.head.length};
+    return SEC_S_OK;
+}
+
+int sec__acltrees_to_acl(std::span<sec_acltree_t *const> trees, sec_acl_buffer_t *acl) {
+    constexpr const char *function = "sec__acltrees_to_acl";
+    *acl = {};
+    std::uint64_t size = format::header_size;
+    std::size_t count = 0;
+    for (std::size_t index = trees.size(); index > 0; --index) {
+        const sec_acltree_t *tree = trees[index - 1];
+        if (!has_entries(tree))
+            continue;
+        measured_subacl subacl;
+        if (const int result = measure(*tree, subacl); result != SEC_S_OK)
+            return result;
+        size += subacl.head.length;
+        if (++count > format::subacls_max || size > format::buffer_max)
+            return qz::report_no_memory(function, size);
+    }
+    auto memory = qz::allocate<unsigned char>(size);
+    if (memory == nullptr)
+        return qz::report_no_memory(function, size);
+    qz::byte_writer writer(memory.get(), size);
+    format::write_header(writer, static_cast<std::uint16_t>(count));
+    for (std::size_t index = trees.size(); index > 0; --index) {
+        const sec_acltree_t *tree = trees[index - 1];
+        if (!has_entries(tree))
+            continue;
+        measured_subacl subacl;
+        if (const int result = measure(*tree, subacl); result != SEC_S_OK)
+            return result;
+        write(writer, subacl);
+    }
+    *acl = {static_cast<std::int32_t>(size), memory.release()};
+    return SEC_S_OK;
+}
+
+int sec__subacl_to_acltree(qz::byte_span bytes, sec_acltree_t **root) {
+    *root = nullptr;
+    qz::byte_reader reader(bytes);
+    format::subacl head;
+    if (!format::read(reader, head))
+        return corrupt(__LINE__);
+    if (qz::is_single_type(head.type) && head.entry_count > 1)
+        return qz::report(SEC_S_BAD_ACL, qz::msg::single_acle_repeated);
+    const int result = expand(reader, head, root);
+    if (result != SEC_S_OK) {
+        sec__free_acltree(*root);
+        *root = nullptr;
+    }
+    return result;
+}
+
+int sec__acltree_to_aclelist(sec_acltree_t *root, sec_aclelist_t *list) {
+    constexpr const char *function = "sec__acltree_to_aclelist";
+    if (!has_entries(root))
+        return SEC_S_OK;
+    std::span<sec_acle_t *const> nodes;
+    std::size_t refused = 0;
+    if (!root->in_order(nodes, refused))
+        return qz::report_no_memory(function, refused);
+
+    const std::size_t count = static_cast<std::size_t>(list->count) + root->held_count();
+    const std::size_t size = count * sizeof(sec_acle_t *);
+    auto *acles = count > format::buffer_max
+                      ? nullptr
+                      : static_cast<sec_acle_t **>(std::realloc(static_cast<void *>(list->acles), size));
+    if (acles == nullptr)
+        return qz::report_no_memory(function, size);
+    list->acles = acles;
+    for (sec_acle_t *node : nodes) {
+        if (node->type == 0)
+            continue;
+        sec_acle_t *made = nullptr;
+        const int result =
+            sec__create_acle(node->type, node->perm_mask, node->mechanism, node->identity, 0, &made);
+        if (result != SEC_S_OK)
+            return result;
+        list->acles[list->count++] = made;
+        root->erase(*node);
+    }
+    return SEC_S_OK;
+}

@@ -1,0 +1,149 @@
+// Readable printing of entries, trees and buffers. Every line is a message of the catalog, recorded, printed and
+// cleared; nothing stays recorded behind it.
+#include "qzacl_acl/dump.h"
+
+#include "owned.h"
+#include "qzacl_acl/buffer_format.h"
+#include "qzacl_acl/compile.h"
+#include "qzacl_acl/entry.h"
+#include "qzacl_acl/permission.h"
+#include "qzacl_acl/tree.h"
+#include "report.h"
+
+#include <algorithm>
+
+namespace {
+
+namespace format = qz::format;
+
+constexpr char as_it_stands[] = "";
+constexpr char with_empty_line[] = "\n";
+
+void print_and_clear(std::FILE *stream, const char *ending) {
+    qz::print_recorded(stream, ending);
+    cu_set_no_error_1();
+}
+
+
+void dump_subacl(qz::byte_span bytes, const char *indentation) {
+    qz::byte_reader reader(bytes);
+    format::subacl head;
+    const char *mechanism = nullptr;
+    if (format::read(reader, head))
+        mechanism = qz::has_mechanism(head.type) ? format::string_in(head.mechanism) : "";
+    if (mechanism == nullptr) {
+        qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupted, qz::acl_source, __LINE__);
+        print_and_clear(stdout, as_it_stands);
+        return;
+    }
+    qz::report(SEC_S_ADVISORY, qz::msg::dump_subacl, indentation, indentation, qz::shown_size(head.length), head.type,
+               mechanism, qz::shown_size(head.entry_count));
+    print_and_clear(stderr, with_empty_line);
+
+    sec_acltree_t *tree = nullptr;
+    if (sec__subacl_to_acltree(bytes, &tree) != SEC_S_OK) {
+        print_and_clear(stdout, as_it_stands);
+        return;
+    }
+    char entry_indentation[8];
+    std::snprintf(entry_indentation, sizeof entry_indentation, "%.6s\t", indentation);
+    sec__dump_acltree(tree, entry_indentation);
+    sec__free_acltree(tree);
+}
+
+} // namespace
+
+namespace qz {
+
+void print_recorded(std::FILE *stream, const char *ending) {
+    cu_error_t *error = nullptr;
+    char *text = nullptr;
+    if (cu_get_error_1(&error) == SEC_S_OK && cu_get_errmsg_1(error, &text) == SEC_S_OK) {
+        std::fputs(text, stream);
+        std::fputs(ending, stream);
+    }
+    cu_rel_error_1(error);
+    cu_rel_errmsg_1(text);
+}
+
+} // namespace qz
+
+void sec__dump_acle(const sec_acle_t *acle, const sec_perm_set_t *set, const char *indentation) {
+    if (acle == nullptr)
+        return;
+    if (indentation == nullptr)
+        indentation = "";
+    char *mechanism = nullptr;
+    char *identity = nullptr;
+    char permissions[qz::permission_text_size];
+    int result = sec_display_acle_id(acle, &mechanism, &identity);
+    const qz::owned<char> mechanism_owner(mechanism);
+    const qz::owned<char> identity_owner(identity);
+    if (result == SEC_S_OK)
+        result = sec_translate_bitmask(acle->perm_mask, set, permissions);
+    if (result == SEC_S_OK) {
+        const int letter = qz::type_letter(acle->type);
+        if (qz::has_mechanism(acle->type))
+            qz::report(SEC_S_ADVISORY, qz::msg::dump_mechanism_acle, indentation, letter, mechanism, identity,
+                       permissions);
+        else if (acle->type == SEC_ACLE_GROUP)
+            qz::report(SEC_S_ADVISORY, qz::msg::dump_group_acle, indentation, letter, identity, permissions);
+        else
+            qz::report(SEC_S_ADVISORY, qz::msg::dump_single_acle, indentation, letter, permissions);
+    }
+    // Either the entry's line, or the message that says why there is none.
+    print_and_clear(stderr, as_it_stands);
+}
+
+void sec__dump_acltree(const sec_acltree_t *node, const char *indentation) {
+    if (node == nullptr)
+        return;
+    std::span<sec_acle_t *const> nodes;
+    std::size_t refused = 0;
+    if (!node->in_order(nodes, refused)) {
+        qz::report_no_memory("sec__dump_acltree", refused);
+        print_and_clear(stderr, as_it_stands);
+        return;
+    }
+    for (const sec_acle_t *acle : nodes) {
+        if (acle->type != 0)
+            sec__dump_acle(acle, nullptr, indentation);
+    }
+}
+
+void sec__dump_subacl(const void *subacl, const char *indentation) {
+    if (subacl == nullptr)
+        return;
+    // The caller vouches for the header; all else must lie within the length that stands in it.
+    const auto *start = static_cast<const unsigned char *>(subacl);
+    std::uint32_t length = 0;
+    qz::byte_reader(qz::byte_span(start, format::subacl_header_size)).field(length);
+    dump_subacl({start, std::max<std::size_t>(length, format::subacl_header_size)},
+                indentation == nullptr ? "" : indentation);
+}
+
+void sec__dump_acl(const sec_acl_buffer_t *acl) {
+    if (acl == nullptr || acl->length == 0 || acl->data == nullptr)
+        return;
+    const qz::byte_span bytes = format::bytes_of(*acl);
+    qz::byte_reader reader(bytes);
+    format::header head;
+    if (!format::read(reader, head) || head.type != format::buffer_type) {
+        qz::report(SEC_S_ADVISORY, qz::msg::dump_not_valid);
+        print_and_clear(stderr, with_empty_line);
+        return;
+    }
+    char length[16];
+    std::snprintf(length, sizeof length, "%d", acl->length);
+    qz::report(SEC_S_ADVISORY, qz::msg::dump_descriptor, length, head.version, head.order, head.subacl_count);
+    print_and_clear(stderr, as_it_stands);
+
+    format::subacl_walk walk(bytes);
+    auto step = walk.next();
+    for (; step == format::subacl_walk::step::found; step = walk.next())
+        dump_subacl({walk.start().position(), walk.start().left()}, "\t");
+    if (step == format::subacl_walk::step::corrupt) {
+        qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupted, qz::acl_source, __LINE__);
+        print_and_clear(stdout, as_it_stands);
+    }
+}

@@ -1,0 +1,225 @@
+// Creating, displaying and releasing entries and lists of entries.
+#include "qzacl_acl/entry.h"
+
+#include "owned.h"
+#include "qzacl_trace.h"
+#include "qzacl_utils.h"
+#include "report.h"
+
+#include <arpa/inet.h>
+#include <cstring>
+
+namespace {
+
+using text = qz::owned<char>;
+
+// The mechanisms whose identities end in a host, whose address is brought into one form.
+bool names_hosts(const char *mechanism) {
+    return std::strcmp(mechanism, "unix") == 0 || std::strcmp(mechanism, "hba2") == 0;
+}
+
+// One string with its NUL, converted by either direction's operation.
+template <class Conversion>
+int converted(Conversion conversion, const char *in, text &out) {
+    const std::size_t length = std::strlen(in) + 1;
+    char *made = nullptr;
+    std::size_t made_length = 0;
+    const int result = conversion(in, &length, &made, &made_length);
+    out.reset(made);
+    return result;
+}
+
+int set_mechanism(sec_acle_t &acle, const char *mechanism, bool convert) {
+    text utf8;
+    if (convert) {
+        if (const int result = converted(acl__convert_to_utf8, mechanism, utf8); result != SEC_S_OK)
+            return result;
+    }
+    const char *source = convert ? utf8.get() : mechanism;
+    const std::size_t length = std::strlen(source);
+    // A mnemonic that fitted before its conversion may have grown.
+    if (length > qz::mechanism_max)
+        return qz::report_bad_parameter("sec_create_acle", 3, qz::shown_pointer(mechanism));
+    std::memcpy(acle.mechanism, source, length + 1);
+    return SEC_S_OK;
+}
+
+int set_identity(sec_acle_t &acle, const char *identity, bool convert) {
+    text made;
+    if (convert) {
+        if (const int result = converted(acl__convert_to_utf8, identity, made); result != SEC_S_OK)
+            return result;
+    } else {
+        made.reset(strdup(identity));
+        if (made == nullptr)
+            return qz::report_no_memory("sec__create_acle", std::strlen(identity) + 1);
+    }
+    acle.identity = made.release();
+    return SEC_S_OK;
+}
+
+int bad_identity(const char *identity) {
+    return qz::report_bad_parameter("sec_create_acle", 4, qz::shown_pointer(identity));
+}
+
+// Creates an entry of a mechanism that names hosts: an IPv6 address behind the '@' is written in its one form, so
+// that different spellings of one address are one identity. Everything else stays as it is.
+int create_with_host(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
+                     sec_acle_t **acle) {
+    const char *at = std::strchr(identity, '@');
+    if (at == nullptr && type == SEC_ACLE_USER)
+        return bad_identity(identity);
+    const char *host = at == nullptr ? identity : at + 1;
+    if (*host == '\0')
+        return bad_identity(identity);
+
+    in6_addr address = {};
+    if (inet_pton(AF_INET6, host, &address) != 1)
+        return sec__create_acle(type, perm_mask, mechanism, identity, 1, acle);
+
+    char formatted[INET6_ADDRSTRLEN] = {};
+    static_cast<void>(cu_ipaddr_ntop_1(&address, formatted));
+    const auto prefix = static_cast<std::size_t>(host - identity);
+    const std::size_t size = prefix + std::strlen(formatted) + 1;
+    const qz::owned<char[]> normalised = qz::allocate<char>(size);
+    if (normalised == nullptr)
+        return qz::report_no_memory("sec_create_acle", size);
+    std::memcpy(normalised.get(), identity, prefix);
+    std::memcpy(normalised.get() + prefix, formatted, size - prefix);
+    return sec__create_acle(type, perm_mask, mechanism, normalised.get(), 1, acle);
+}
+
+int create_checked(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
+                   sec_acle_t **acle) {
+    if (acle != nullptr)
+        *acle = nullptr;
+    if (!qz::is_acle_type(type))
+        return qz::report_bad_parameter("sec_create_acle", 1, type);
+    if (qz::has_mechanism(type)) {
+        const std::size_t length = mechanism == nullptr ? 0 : strnlen(mechanism, qz::mechanism_max + 1);
+        if (length == 0 || length > qz::mechanism_max)
+            return qz::report_bad_parameter("sec_create_acle", 3, qz::shown_pointer(mechanism));
+    }
+    if (qz::has_identity(type) && (identity == nullptr || *identity == '\0'))
+        return bad_identity(identity);
+    if (acle == nullptr)
+        return qz::report_bad_parameter("sec_create_acle", 5, 0);
+    if (qz::has_mechanism(type) && names_hosts(mechanism))
+        return create_with_host(type, perm_mask, mechanism, identity, acle);
+    return sec__create_acle(type, perm_mask, mechanism, identity, 1, acle);
+}
+
+int display_checked(const sec_acle_t *acle, char **mechanism, char **identity) {
+    constexpr const char *function = "sec_display_acle_id";
+    if (mechanism != nullptr)
+        *mechanism = nullptr;
+    if (identity != nullptr)
+        *identity = nullptr;
+    if (acle == nullptr)
+        return qz::report_bad_parameter(function, 1, 0);
+    if (mechanism == nullptr)
+        return qz::report_bad_parameter(function, 2, 0);
+    if (identity == nullptr)
+        return qz::report_bad_parameter(function, 3, 0);
+
+    if (qz::is_single_type(acle->type))
+        return SEC_S_OK;
+    if (!qz::has_identity(acle->type))
+        return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_type_not_displayable, acle->type);
+    const bool has_name = acle->identity != nullptr && acle->identity[0] != '\0';
+    if (!has_name || (qz::has_mechanism(acle->type) && acle->mechanism[0] == '\0'))
+        return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_incomplete);
+
+    text shown_mechanism;
+    if (qz::has_mechanism(acle->type)) {
+        const int result = converted(acl__convert_from_utf8, acle->mechanism, shown_mechanism);
+        if (result != SEC_S_OK)
+            return result;
+    }
+    text shown_identity;
+    if (const int result = converted(acl__convert_from_utf8, acle->identity, shown_identity); result != SEC_S_OK)
+        return result;
+    *mechanism = shown_mechanism.release();
+    *identity = shown_identity.release();
+    return SEC_S_OK;
+}
+
+} // namespace
+
+int sec__create_acle(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
+                     int convert, sec_acle_t **acle) {
+    *acle = nullptr;
+    qz::owned_acle made(static_cast<sec_acle_t *>(std::calloc(1, sizeof(sec_acle_t))));
+    if (made == nullptr)
+        return qz::report_no_memory("sec__create_acle", sizeof(sec_acle_t));
+    made->perm_mask = perm_mask;
+    made->type = type;
+    if (qz::has_mechanism(type)) {
+        if (const int result = set_mechanism(*made, mechanism, convert != 0); result != SEC_S_OK)
+            return result;
+    }
+    if (qz::has_identity(type)) {
+        if (const int result = set_identity(*made, identity, convert != 0); result != SEC_S_OK)
+            return result;
+    }
+    *acle = made.release();
+    return SEC_S_OK;
+}
+
+int sec_create_acle(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
+                    sec_acle_t **acle) {
+    qz::trace_entry(40, [&] {
+        const std::uint32_t shown_type = type;
+        qz::trace_data(42, qz::number(shown_type), qz::number(perm_mask), qz::item(mechanism), qz::item(identity),
+                       qz::number(acle));
+    });
+    cu_set_no_error_1();
+    const int result = create_checked(type, perm_mask, mechanism, identity, acle);
+    qz::trace_exit(43, result);
+    return result;
+}
+
+int sec_display_acle_id(const sec_acle_t *acle, char **mechanism, char **identity) {
+    qz::trace_entry(49, [&] {
+        const std::uint32_t type = acle == nullptr ? 0 : acle->type;
+        const std::uint32_t mask = acle == nullptr ? 0 : acle->perm_mask;
+        qz::trace_data(51, qz::number(acle), qz::number(type), qz::number(mask),
+                       qz::item(acle == nullptr ? nullptr : acle->mechanism),
+                       qz::item(acle == nullptr ? nullptr : acle->identity), qz::number(mechanism),
+                       qz::number(identity));
+    });
+    cu_set_no_error_1();
+    const int result = display_checked(acle, mechanism, identity);
+    qz::trace_exit(52, result,
+                   [&] { qz::trace_data(54, qz::number(result), qz::item(*mechanism), qz::item(*identity)); });
+    return result;
+}
+
+void sec_release_acle(sec_acle_t *acle) {
+    qz::trace_entry(45, [&] {
+        const std::uint32_t type = acle == nullptr ? 0 : acle->type;
+        const std::uint32_t mask = acle == nullptr ? 0 : acle->perm_mask;
+        qz::trace_data(47, qz::number(acle), qz::number(type), qz::number(mask),
+                       qz::item(acle == nullptr ? nullptr : acle->mechanism),
+                       qz::item(acle == nullptr ? nullptr : acle->identity));
+    });
+    if (acle != nullptr) {
+        std::free(acle->identity);
+        std::free(acle);
+    }
+    qz::trace_release_exit(48);
+}
+
+void sec_release_aclelist(sec_aclelist_t *list) {
+    qz::trace_entry(36, [&] {
+        const std::int32_t count = list == nullptr ? 0 : list->count;
+        qz::trace_data(38, qz::number(list), qz::number(count));
+    });
+    if (list != nullptr && list->count != 0 && list->acles != nullptr) {
+        for (std::int32_t index = 0; index < list->count; ++index)
+            sec_release_acle(list->acles[index]);
+        std::free(list->acles);
+        *list = {};
+    }
+    qz::trace_release_exit(39);
+}

@@ -1,0 +1,28 @@
+// Where an ACL file is: the full path for a name, and the user whose home directory holds it.
+#ifndef QZACL_FILE_NAME_H
+#define QZACL_FILE_NAME_H
+
+#include <cstddef>
+#include <cstdint>
+
+namespace qz {
+
+// The longest path, without its NUL.
+inline constexpr std::size_t path_max = 4096;
+
+struct path_buffer {
+    char text[path_max + 1] = {};
+};
+
+} // namespace qz
+
+// Looks a user up. Returns SEC_S_OK with the id and the home directory, of which no more is copied than a path may
+// hold; or SEC_S_UNKNOWN_USER or SEC_S_NO_MEMORY.
+int sec__get_user_info(const char *username, std::uint32_t *uid, qz::path_buffer &home);
+
+// Makes the full path of an ACL file: in the user's home directory when `username` is given, which also sets `*uid`,
+// else an absolute name as it stands or one relative to the current directory. Returns SEC_S_OK,
+// SEC_S_BAD_PARAMETER, SEC_S_NO_MEMORY, SEC_S_UNKNOWN_USER or SEC_S_BAD_FILENAME.
+int sec__get_aclfname(const char *aclfname, const char *username, qz::path_buffer &path, std::uint32_t *uid);
+
+#endif

@@ -1,0 +1,53 @@
+// Recording an error: every failing operation records exactly one message and returns its code. Nothing is
+// formatted here; the text is made when somebody fetches it.
+#ifndef QZ_REPORT_H
+#define QZ_REPORT_H
+
+#include "msg/messages.h"
+#include "qz/acl.h"
+#include "qz/cu.h"
+
+#include <climits>
+#include <cstddef>
+#include <cstdint>
+#include <type_traits>
+
+namespace qz {
+
+// Where located messages say that they come from; the line beside it is that of the failing check.
+inline constexpr char acl_source[] = "security/ACL/lib/qzacl_acl";
+inline constexpr char utils_source[] = "security/ACL/lib/qzacl_utils";
+
+// Records a message and returns its code.
+template <int Id, class... Args>
+int report(int code, msg::message<Id, Args...>, std::type_identity_t<Args>... args) {
+    cu_set_error_1(code, 0, msg::catalog_name, msg::catalog_set, Id, cu_mesgtbl_qzseclib_msg[Id], args...);
+    return code;
+}
+
+// A size as a message shows it: the conversions take an int, and a size beyond it is shown as the largest.
+template <class Size>
+constexpr int shown_size(Size size) {
+    static_assert(std::is_integral_v<Size>);
+    if constexpr (sizeof(Size) > sizeof(int) || std::is_unsigned_v<Size>)
+        return size > static_cast<Size>(INT_MAX) ? INT_MAX : static_cast<int>(size);
+    else
+        return size;
+}
+
+inline int report_no_memory(const char *function, std::size_t bytes) {
+    return report(SEC_S_NO_MEMORY, msg::no_memory, function, shown_size(bytes));
+}
+
+inline int report_bad_parameter(const char *function, int position, int value) {
+    return report(SEC_S_BAD_PARAMETER, msg::incorrect_parameter, function, position, value);
+}
+
+// A pointer as the parameter message shows it, cut to the width of its conversion.
+inline int shown_pointer(const void *pointer) {
+    return static_cast<int>(static_cast<std::uint32_t>(reinterpret_cast<std::uintptr_t>(pointer)));
+}
+
+} // namespace qz
+
+#endif
