@@ -8,6 +8,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <fcntl.h>
+#include <filesystem>
 #include <fstream>
 #include <functional>
 #include <gtest/gtest.h>
@@ -47,7 +48,7 @@ protected:
         ASSERT_NE(mkdtemp(folder.data()), nullptr);
         file = folder + "/trace";
     }
-    void TearDown() override { EXPECT_EQ(std::system(("rm -r " + folder).c_str()), 0); }
+    void TearDown() override { std::filesystem::remove_all(folder); }
 
     // Runs the body in a child that has the environment; the body's failed expectations are the child's
     // status.
@@ -90,7 +91,7 @@ protected:
         return all;
     }
 
-    std::string folder = testing::TempDir() + "tr_test.XXXXXX";
+    std::string folder = testing::TempDir() + "tr_test." + std::string(6, 'X');
     std::string file;
     uint8_t levels[4] = {9, 9, 9, 9};
 };
@@ -173,7 +174,7 @@ TEST_F(Trace, TextOnlyForPrintableStrings) {
             ASSERT_NE(line, all.end());
             const size_t at = line->find(",\"text\":");
             EXPECT_EQ(at == line->npos ? "" : line->substr(at),
-                      c.text ? ",\"text\":\""s + item.c_str() + "\"}]}" : "")
+                      c.text ? ",\"text\":\"" + item.substr(0, item.size() - 1) + "\"}]}" : "")
                 << c.what << ": " << *line;
             ++line;
         }

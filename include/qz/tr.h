@@ -1,33 +1,36 @@
-/* Tracing: components register their trace categories, ask the level of each by reading one byte, and record
- * trace points with data into the trace file of the process. This header is the manual.
+/* Tracing: components register their trace categories, ask the level of each by reading one byte, and
+ * record trace points with data into the trace file of the process. This header is the manual.
  *
- * CONVENTIONS
+ * CODES. Every function returns TR_OK (0) or one of the codes below, and says which. A caller that traces
+ * may ignore them all: a record that cannot be made is dropped, and nothing else happens. errno is always
+ * left as it was, no signal is raised, and no function is a point where a thread can be cancelled.
  *
- * Codes. Every function returns TR_OK (0) or one of the codes below, and says which. A caller that traces may
- * ignore them all: a record that cannot be made is dropped, and nothing else happens. errno is always left as
- * it was, no signal is raised, and no function is a point where a thread can be cancelled.
+ * CONFIGURATION. Two environment variables are read once in the life of a process, by its first
+ * registration (or by a query before it). A privileged program (set-user-ID and the like) ignores them.
  *
- * Configuration. Two environment variables are read once in the life of a process, by its first registration
- * (or by a query before it); a privileged program (set-user-ID and the like) ignores them. QZ_TRACE_LEVELS
- * The level, 0 to 255, of each category: "COMPONENT:Category=8,Other=2;COMPONENT2:Category=1". Names are
- * compared byte by byte, blanks included. What is not named is 0; of two settings for the same category the
- * later holds; a part that cannot be read is skipped and the rest holds. QZ_TRACE_FILE    The file that
- * records are appended to. It is opened when it is first needed and stays open. It is created with mode 0600
- * when missing; a symbolic link, or anything but a regular file, is refused. Without a usable file every
- * level stays 0, so that a component that tests its levels never records.
+ * - QZ_TRACE_LEVELS: the level, 0 to 255, of each category: "COMP:Category=8,Other=2;COMP2:Category=1".
+ *   Names are compared byte by byte, blanks included. What is not named is 0; of two settings for the
+ *   same category the later holds; a part that cannot be read is skipped and the rest holds.
+ * - QZ_TRACE_FILE: the file that records are appended to. It is opened when it is first needed and stays
+ *   open. It is created with mode 0600 when missing; a symbolic link, or anything but a regular file, is
+ *   refused.
  *
- * Records. One record is one line of JSON, written by one write to a descriptor opened for appending; records
- * of several threads and processes do not mix. After a fork the child's records carry its own process id. The
- * time is UTC.
- *   {"time":"2026-11-24T19:05:00.123456789Z","pid":4711,"tid":4711,"component":"_SEL","id":11,
- *    "items":[{"len":11,"hex":"2f6574632f612e61636c00","text":"/etc/a.acl"}]}          (in one line)
+ * Without a usable file every level stays 0, so that a component that tests its levels never records.
+ *
+ * RECORDS. One record is one line of JSON, written by one write to a descriptor opened for appending;
+ * records of several threads and processes do not mix. After a fork the child's records carry its own
+ * process id. The time is UTC. In one line:
+ *
+ * - {"time":"2026-11-24T19:05:00.123456789Z","pid":4711,"tid":4711,"component":"_SEL","id":11,
+ * - "items":[{"len":11,"hex":"2f6574632f612e61636c00","text":"/etc/a.acl"}]}
+ *
  * An item has a text beside its bytes when these are one NUL-terminated string of printable UTF-8.
  *
- * Names. A component is named by a NUL-terminated string of 1 to 63 bytes of printable UTF-8. It is copied:
- * no function keeps a pointer to a name, category table or item of the caller.
+ * NAMES. A component is named by a NUL-terminated string of 1 to 63 bytes of printable UTF-8. It is
+ * copied: no function keeps a pointer to a name, category table or item of the caller.
  *
- * Threads. Every function may be called by any thread at any time, also in the child of a fork; none may be
- * called from a signal handler. Recording takes no lock. */
+ * THREADS. Every function may be called by any thread at any time, also in the child of a fork; none may
+ * be called from a signal handler. Recording takes no lock. */
 #ifndef QZ_TR_H
 #define QZ_TR_H
 
@@ -53,8 +56,8 @@ extern "C" {
 #define TR_FILE_ERROR 5     /* the trace file did not take the whole line */
 #define TR_TOO_LARGE 6      /* the line is longer than TR_LINE_LIMIT, or the file name does not fit */
 
-/* The longest line that is written, in bytes, with its line feed. */
-#define TR_LINE_LIMIT (64 * 1024 * 1024)
+/* The longest line that is written, in bytes with its line feed: 64 MiB. */
+#define TR_LINE_LIMIT 67108864
 
 /* The size in bytes of the buffer for tr_get_filename_1: a name of 256 bytes and its NUL. */
 #define TR_FILENAME_SIZE 257
@@ -71,78 +74,87 @@ typedef struct tr_category {
 
 /* Registers a component and writes the configured level of each of its categories.
  *
- *   component   the component's name; not null
- *   levels      array of count bytes, written in the order of the table, each by one atomic store; may be
- * null only when count is 0. It stays the caller's, is only read by the caller from now on, and must live
- * until the component is unregistered or registered with another array. categories  table of count
- * categories, read during the call only; may be null only when count is 0 count       number of categories, 0
- * or more
+ * - component: the component's name; not null.
+ * - levels: array of count bytes, written in the order of the table, each by one atomic store; may be
+ *   null only when count is 0. It stays the caller's, who from now on only reads it, and must live until
+ *   the component is unregistered or registered with another array.
+ * - categories: table of count categories, read during the call only; may be null only when count is 0.
+ * - count: the number of categories, 0 or more.
  *
  * Registering a registered component again fills the new array, which takes the place of the former; the
  * former is left as it is.
  *
- * TR_OK             registered; also when tracing is not configured or the trace file is not usable: the
- * levels are 0 TR_BAD_PARAMETER  component is null or not a name (see above), count is negative, or levels or
- * categories is null with a count above 0; nothing was written TR_NO_MEMORY      TR_COMPONENT_LIMIT other
- * names have been registered already; the levels are 0 */
+ * - TR_OK: registered; also when tracing is not configured or the trace file is not usable: the levels
+ *   are 0.
+ * - TR_BAD_PARAMETER: component is null or not a name, count is negative, or levels or categories is null
+ *   with a count above 0; nothing was written.
+ * - TR_NO_MEMORY: TR_COMPONENT_LIMIT other names have been registered already; the levels are 0. */
 QZ_TR_API int tr_register_component_1(const char *component, uint8_t *levels, const tr_category_t *categories,
                                       int count);
 
-/* Ends recording for a component: its levels are set to 0, and the facility forgets the level array. A record
- * that another thread is making at that moment may still be written.
+/* Ends recording for a component: its levels are set to 0, and the facility forgets the level array. A
+ * record that another thread is making at that moment may still be written.
  *
- *   component   the component's name; not null
+ * - component: the component's name; not null.
  *
- * TR_OK              unregistered
- * TR_BAD_PARAMETER   component is null
- * TR_NOT_REGISTERED  no such component is registered */
+ * - TR_OK: unregistered.
+ * - TR_BAD_PARAMETER: component is null.
+ * - TR_NOT_REGISTERED: no such component is registered. */
 QZ_TR_API int tr_unregister_component_1(const char *component);
 
 /* Records a bare trace point: a record without items. The levels are not looked at; testing them is the
  * caller's part.
  *
- *   component   the component's name; not null
- *   id          the trace point number, any value
+ * - component: the component's name; not null.
+ * - id: the trace point number, any value.
  *
- * Codes as for tr_record_data_1 without items. */
+ * - TR_OK: the line has been written.
+ * - TR_BAD_PARAMETER: component is null.
+ * - TR_NOT_REGISTERED, TR_NO_FILE, TR_FILE_ERROR: as for tr_record_data_1. */
 QZ_TR_API int tr_record_id_1(const char *component, int id);
 
 /* Records a trace point with data. The levels are not looked at; testing them is the caller's part.
  *
- *   component   the component's name; not null
- *   id          the trace point number, any value
- *   count       number of items, 0 or more
- *   ...         count pairs (const void *address, size_t length in bytes), of exactly these types. The bytes
- * must not change during the call. A null address is recorded as an item of no bytes, whatever its length.
+ * - component: the component's name; not null.
+ * - id: the trace point number, any value.
+ * - count: the number of items, 0 or more.
+ * - ...: count pairs (const void *address, size_t length in bytes), of exactly these types. The bytes
+ *   must not change during the call. A null address is recorded as an item of no bytes, whatever its
+ *   length.
  *
- * TR_OK              the line has been written
- * TR_BAD_PARAMETER   component is null or count is negative; or bytes changed during the call so that the
- * line outgrew its memory TR_NO_MEMORY       the line is larger than a few thousand bytes and there is no
- * memory for it TR_NOT_REGISTERED  no such component is registered TR_NO_FILE         the process has no
- * trace file, or its descriptor was closed by the program (its number, if used again for another file, is not
- * written to) TR_FILE_ERROR      the file did not take the line whole: no space, a file size limit, a failing
- * device TR_TOO_LARGE       the line would be longer than TR_LINE_LIMIT With every code but TR_OK the record
- * is lost; only TR_FILE_ERROR may leave the beginning of the line in the file. */
+ * - TR_OK: the line has been written.
+ * - TR_BAD_PARAMETER: component is null or count is negative; or bytes changed during the call, so that
+ *   the line outgrew its memory.
+ * - TR_NO_MEMORY: the line is longer than 4096 bytes and there is no memory for it.
+ * - TR_NOT_REGISTERED: no such component is registered.
+ * - TR_NO_FILE: the process has no trace file, or the program has closed its descriptor. The descriptor's
+ *   number is not written to when it has come to name another file.
+ * - TR_FILE_ERROR: the file did not take the whole line: no space, a file size limit, a failing device.
+ * - TR_TOO_LARGE: the line would be longer than TR_LINE_LIMIT.
+ *
+ * With every code but TR_OK the record is lost; only TR_FILE_ERROR may leave the beginning of a line
+ * behind. */
 QZ_TR_API int tr_record_data_1(const char *component, int id, int count, ...);
 
 /* Tells the present size of the trace file.
  *
- *   size   receives the size in bytes, 4294967295 when it is that or more, 0 when there is no file; not null
+ * - size: receives the size in bytes: 4294967295 when it is that or more, 0 when there is no file; not
+ *   null.
  *
- * TR_OK             told
- * TR_BAD_PARAMETER  size is null
- * TR_NO_FILE        the process has no trace file, or has closed the descriptor of it */
+ * - TR_OK: told.
+ * - TR_BAD_PARAMETER: size is null.
+ * - TR_NO_FILE: the process has no trace file, or the program has closed its descriptor. */
 QZ_TR_API int tr_get_size_1(uint32_t *size);
 
 /* Tells the name of the trace file, as QZ_TRACE_FILE gives it.
  *
- *   name   buffer of TR_FILENAME_SIZE bytes that receives the name with its NUL; not null; untouched on
- * failure
+ * - name: buffer of TR_FILENAME_SIZE bytes that receives the name with its NUL; not null; untouched on
+ *   failure.
  *
- * TR_OK             told
- * TR_BAD_PARAMETER  name is null
- * TR_NO_FILE        the process has no trace file, or has closed the descriptor of it
- * TR_TOO_LARGE      the name is longer than 256 bytes */
+ * - TR_OK: told.
+ * - TR_BAD_PARAMETER: name is null.
+ * - TR_NO_FILE: the process has no trace file, or the program has closed its descriptor.
+ * - TR_TOO_LARGE: the name is longer than 256 bytes. */
 QZ_TR_API int tr_get_filename_1(char *name);
 
 #ifdef __cplusplus

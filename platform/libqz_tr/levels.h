@@ -7,8 +7,8 @@
 
 namespace qz::tr {
 
-// The level that `text`, "COMPONENT:Category=8,Other=2;COMPONENT2:Category=1", gives one category of one
-// component.
+// The level that `text` gives a category of a component:
+// "COMPONENT:Category=8,Other=2;COMPONENT2:Category=1".
 std::uint8_t configured_level(std::string_view text, std::string_view component, std::string_view category);
 
 } // namespace qz::tr

@@ -28,8 +28,7 @@ void trace_line::put(std::string_view text) {
         std::copy(text.begin(), text.end(), to);
 }
 
-// Puts printable text between quotation marks; only the two characters that mean something to JSON need an
-// escape.
+// Puts printable text between quotation marks; only these and the backslash need an escape in JSON.
 void trace_line::put_escaped(std::string_view text) {
     put("\"");
     for (const char &character : text) {

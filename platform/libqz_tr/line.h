@@ -10,8 +10,8 @@
 
 namespace qz::tr {
 
-// Collects the line in `room`. What does not fit is counted all the same, so that one try tells the size for
-// the next.
+// Collects the line in `room`. What does not fit is counted all the same, so that a first try tells
+// the size that the next one needs.
 class trace_line {
 public:
     explicit trace_line(std::span<char> room) : room_(room) {}

@@ -1,6 +1,5 @@
 // A table of a fixed number of places. A place once named keeps its name for the life of the process, so that
-// a recording thread can look components up without a lock; everything that changes a place is done under the
-// mutex.
+// recording threads look components up without a lock; whatever changes a place is done under the mutex.
 #include "libqz_tr/registry.h"
 
 #include "libqz_tr/environment.h"
@@ -37,8 +36,7 @@ void unlock() {
 }
 
 // A child forked while another thread held the mutex would otherwise wait for ever for a thread that it does
-// not have. Done at load time: a second time, through a once-guard that a fork interrupted, would take the
-// mutex twice.
+// not have. Done at load time, because a once-guard that a fork interrupts would do it twice.
 [[gnu::constructor]] void keep_free_over_fork() {
     pthread_atfork(lock, unlock, unlock);
 }

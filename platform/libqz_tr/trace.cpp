@@ -1,5 +1,4 @@
-// The public operations: they check arguments, keep the caller's thread undisturbed, and put the parts
-// together.
+// The public operations: they check arguments and keep the caller's thread undisturbed.
 #include "qz/tr.h"
 
 #include "libqz_tr/line.h"
@@ -62,8 +61,7 @@ void form(trace_line &line, const record_head &head, int count, va_list items) {
     line.end();
 }
 
-// The common line is formed in small memory of the thread; only a larger one, then of known size, is
-// allocated.
+// Most lines fit on the stack; only a larger one, whose size is known by then, is allocated.
 int record(const record_head &head, int count, va_list items, va_list items_again) {
     std::array<char, 4096> small;
     trace_line line{small};

@@ -46,8 +46,7 @@ void open_file() {
     descriptor = opened;
 }
 
-// A daemon may close every descriptor it finds, and the number of ours then names some other file of the
-// program.
+// A daemon may close every descriptor it finds, and the number of ours may then name another file.
 bool is_ours(struct stat &status) {
     pthread_once(&once, open_file);
     return descriptor >= 0 && fstat(descriptor, &status) == 0 && status.st_dev == device &&

@@ -7,8 +7,8 @@
 
 namespace qz::tr::trace_file {
 
-// The file's size in bytes, or -1 when there is no usable file. Opens the file when it is first needed, as do
-// the others.
+// The file's size in bytes, or -1 when there is no usable file. Like the others, it opens the file when
+// that has not been tried yet.
 off_t size();
 
 // The file's name, or null when there is no usable file.

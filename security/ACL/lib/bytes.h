@@ -3,6 +3,7 @@
 #ifndef QZ_BYTES_H
 #define QZ_BYTES_H
 
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
@@ -51,10 +52,48 @@ private:
     const unsigned char *end_ = nullptr;
 };
 
+// Walks over bytes of the other byte order, turning each field it is asked for into host order in place.
+class byte_swapper {
+public:
+    explicit byte_swapper(std::span<unsigned char> bytes) : at_(bytes.data()), end_(bytes.data() + bytes.size()) {}
+
+    const unsigned char *position() const { return at_; }
+
+    bool skip(std::size_t count) {
+        if (count > static_cast<std::size_t>(end_ - at_))
+            return false;
+        at_ += count;
+        return true;
+    }
+
+    // A byte, which has no order.
+    bool byte(std::uint8_t &out) {
+        if (at_ == end_)
+            return false;
+        out = *at_++;
+        return true;
+    }
+
+    // Swaps a field and hands out its value in host order.
+    template <class Field>
+    bool swap(Field &out) {
+        if (sizeof(Field) > static_cast<std::size_t>(end_ - at_))
+            return false;
+        std::reverse(at_, at_ + sizeof(Field));
+        std::memcpy(&out, at_, sizeof(Field));
+        at_ += sizeof(Field);
+        return true;
+    }
+
+private:
+    unsigned char *at_;
+    unsigned char *end_;
+};
+
 // Fills memory that was measured beforehand; what would not fit is not written and makes the writer failed.
 class byte_writer {
 public:
-    byte_writer(unsigned char *memory, std::size_t size) : at_(memory), end_(memory + size) {}
+    explicit byte_writer(std::span<unsigned char> memory) : at_(memory.data()), end_(memory.data() + memory.size()) {}
 
     std::size_t left() const { return static_cast<std::size_t>(end_ - at_); }
     // True when exactly the measured size was written.

@@ -83,7 +83,7 @@ int sec__find_subacl(const sec_acl_buffer_t *acl, std::uint8_t type, const char 
             if (held == nullptr || cu_strcasecmp_posix_1(held, mechanism) != 0)
                 continue;
         }
-        *subacl = walk.start().position();
+        *subacl = walk.from_start().data();
         break;
     }
     return SEC_S_OK;

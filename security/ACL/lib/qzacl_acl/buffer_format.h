@@ -67,6 +67,7 @@ struct subacl {
     std::uint32_t length = 0;
     std::uint8_t type = 0;
     std::uint32_t entry_count = 0;
+    std::uint8_t mechanism_length = 0;
     byte_span mechanism; // with its NUL
 };
 
@@ -83,22 +84,37 @@ inline byte_span bytes_of(const sec_acl_buffer_t &acl) {
     return {static_cast<const unsigned char *>(acl.data), static_cast<std::size_t>(acl.length)};
 }
 
+// The bytes of a descriptor from a place inside them on.
+inline byte_span bytes_from(const sec_acl_buffer_t &acl, const unsigned char *place) {
+    const byte_span bytes = bytes_of(acl);
+    return bytes.subspan(static_cast<std::size_t>(place - bytes.data()));
+}
+
 inline bool read(byte_reader &reader, header &out) {
     return reader.field(out.type) && reader.field(out.version) && reader.field(out.order) &&
            reader.field(out.subacl_count);
 }
 
-// Reads a sub-ACL's header and mechanism; the reader then stands before its first entry.
-inline bool read(byte_reader &reader, subacl &out) {
-    std::uint8_t mechanism_length = 0;
+// Reads the fixed fields of a sub-ACL; the reader then stands before its mechanism.
+inline bool read_fixed_part(byte_reader &reader, subacl &out) {
     return reader.field(out.length) && reader.field(out.type) && reader.field(out.entry_count) &&
-           reader.field(mechanism_length) && reader.bytes(mechanism_length, out.mechanism);
+           reader.field(out.mechanism_length);
+}
+
+// Reads a sub-ACL's fixed fields and mechanism; the reader then stands before its first entry.
+inline bool read(byte_reader &reader, subacl &out) {
+    return read_fixed_part(reader, out) && reader.bytes(out.mechanism_length, out.mechanism);
 }
 
 inline bool read(byte_reader &reader, entry &out) {
     std::uint16_t identity_length = 0;
     return reader.field(out.version) && reader.field(out.perm_mask) && reader.field(identity_length) &&
            reader.bytes(identity_length, out.identity);
+}
+
+// True when a string ends exactly where its field does.
+inline bool holds_exact_string(byte_span field) {
+    return !field.empty() && std::memchr(field.data(), '\0', field.size()) == &field.back();
 }
 
 // A string field as a C string, or null when no NUL ends it inside the field.
@@ -132,8 +148,8 @@ public:
     }
 
     const subacl &current() const { return current_; }
-    // Where the current sub-ACL starts, and the reader before its entries.
-    byte_reader start() const { return next_; }
+    // The bytes from the current sub-ACL's start to the end of the buffer, and the reader before its entries.
+    byte_span from_start() const { return {next_.position(), next_.left()}; }
     byte_reader entries() const { return entries_; }
 
 private:

@@ -106,7 +106,7 @@ int sec__acltree_to_subacl(const sec_acltree_t *root, qz::loose_subacl &out) {
     auto memory = qz::allocate<unsigned char>(subacl.head.length);
     if (memory == nullptr)
         return qz::report_no_memory("sec__add_acle_to_subacl", subacl.head.length);
-    qz::byte_writer writer(memory.get(), subacl.head.length);
+    qz::byte_writer writer({memory.get(), subacl.head.length});
     write(writer, subacl);
     out = {std::move(memory), subacl.head.length};
     return SEC_S_OK;
@@ -131,7 +131,7 @@ int sec__acltrees_to_acl(std::span<sec_acltree_t *const> trees, sec_acl_buffer_t
     auto memory = qz::allocate<unsigned char>(size);
     if (memory == nullptr)
         return qz::report_no_memory(function, size);
-    qz::byte_writer writer(memory.get(), size);
+    qz::byte_writer writer({memory.get(), size});
     format::write_header(writer, static_cast<std::uint16_t>(count));
     for (std::size_t index = trees.size(); index > 0; --index) {
         const sec_acltree_t *tree = trees[index - 1];

@@ -52,39 +52,6 @@ std::size_t packed_size_of(std::uint8_t type, std::size_t identity_length) {
     return fixed_part + (qz::has_identity(type) ? identity_length + 1 : 0);
 }
 
-int report_duplicate(const sec_acle_t &acle) {
-    const int letter = qz::type_letter(acle.type);
-    if (qz::is_single_type(acle.type))
-        return qz::report(SEC_S_BAD_ACLE, qz::msg::duplicate_single_acle, letter);
-    if (acle.type == SEC_ACLE_GROUP)
-        return qz::report(SEC_S_BAD_ACLE, qz::msg::duplicate_group, letter, acle.identity);
-    return qz::report(SEC_S_BAD_ACLE, qz::msg::duplicate_acle, letter, acle.mechanism, acle.identity);
-}
-
-void trace_replacement(const sec_acle_t &acle) {
-    if (!qz::traces(qz::trace_category::info))
-        return;
-    const char *type = "group";
-    switch (acle.type) {
-    case SEC_ACLE_UNAUTHENTICATED:
-        type = "unauthenticated";
-        break;
-    case SEC_ACLE_ANYOTHER:
-        type = "anyother";
-        break;
-    case SEC_ACLE_USER:
-        type = "user";
-        break;
-    case SEC_ACLE_EXPANDED:
-        type = "user-expanded";
-        break;
-    default:
-        break;
-    }
-    qz::trace_data(113, qz::item(type), qz::item(qz::is_single_type(acle.type) ? "<none>" : acle.mechanism),
-                   qz::item(acle.type == SEC_ACLE_USER ? acle.identity : "<none>"));
-}
-
 } // namespace
 
 sec_acle_t *sec_acltree::copy_to_room(const sec_acle_t &acle, std::size_t identity_length, std::size_t &size) {
@@ -390,9 +357,9 @@ int sec__add_acle_to_tree(int report_duplicates, const sec_acle_t *acle, sec_acl
         return SEC_S_OK;
     case sec_acltree::outcome::duplicate:
         if (report_duplicates != 0)
-            return report_duplicate(*acle);
+            return sec__report_duplicate(acle);
         held->perm_mask = acle->perm_mask;
-        trace_replacement(*acle);
+        sec__trace_replacement(acle);
         return SEC_S_OK;
     case sec_acltree::outcome::no_memory:
         break;
@@ -403,6 +370,39 @@ int sec__add_acle_to_tree(int report_duplicates, const sec_acle_t *acle, sec_acl
         *slot = nullptr;
     }
     return qz::report_no_memory(function, refused);
+}
+
+int sec__report_duplicate(const sec_acle_t *acle) {
+    const int letter = qz::type_letter(acle->type);
+    if (qz::is_single_type(acle->type))
+        return qz::report(SEC_S_BAD_ACLE, qz::msg::duplicate_single_acle, letter);
+    if (acle->type == SEC_ACLE_GROUP)
+        return qz::report(SEC_S_BAD_ACLE, qz::msg::duplicate_group, letter, acle->identity);
+    return qz::report(SEC_S_BAD_ACLE, qz::msg::duplicate_acle, letter, acle->mechanism, acle->identity);
+}
+
+void sec__trace_replacement(const sec_acle_t *acle) {
+    if (!qz::traces(qz::trace_category::info))
+        return;
+    const char *type = "group";
+    switch (acle->type) {
+    case SEC_ACLE_UNAUTHENTICATED:
+        type = "unauthenticated";
+        break;
+    case SEC_ACLE_ANYOTHER:
+        type = "anyother";
+        break;
+    case SEC_ACLE_USER:
+        type = "user";
+        break;
+    case SEC_ACLE_EXPANDED:
+        type = "user-expanded";
+        break;
+    default:
+        break;
+    }
+    qz::trace_data(113, qz::item(type), qz::item(qz::is_single_type(acle->type) ? "<none>" : acle->mechanism),
+                   qz::item(acle->type == SEC_ACLE_USER ? acle->identity : "<none>"));
 }
 
 int sec__acle_not_found(int code, const sec_acle_t *acle) {

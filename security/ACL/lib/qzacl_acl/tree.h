@@ -165,7 +165,19 @@ int sec__del_acle_from_tree(const sec_acle_t *acle, sec_acltree_t *root);
 // Releases a tree; null is allowed.
 void sec__free_acltree(sec_acltree_t *root);
 
-// Records that no entry matches the given one and returns `code`.
+namespace qz {
+
+struct free_acltree {
+    void operator()(sec_acltree_t *root) const { sec__free_acltree(root); }
+};
+using owned_acltree = std::unique_ptr<sec_acltree_t, free_acltree>;
+
+} // namespace qz
+
+// What trees and packed sub-ACLs report alike: that no entry matches the given one, with the code to return; that it
+// duplicates one; that a duplicate replaced the mask of the entry that was there.
 int sec__acle_not_found(int code, const sec_acle_t *acle);
+int sec__report_duplicate(const sec_acle_t *acle);
+void sec__trace_replacement(const sec_acle_t *acle);
 
 #endif

@@ -1,0 +1,348 @@
+// Adding entries to a compiled buffer and deleting them from it. An edit touches the sub-ACL of the entry's key and
+// no other.
+//
+// The plain way expands that sub-ACL into a tree, changes the tree and compiles it again. Where the stored entries
+// already are what compiling such a tree gives, well-formed and in ascending order, the bytes of the one entry are
+// changed in place instead: the result is the same, without a second copy of the sub-ACL.
+#include "owned.h"
+#include "qzacl_acl/buffer.h"
+#include "qzacl_acl/buffer_format.h"
+#include "qzacl_acl/compile.h"
+#include "qzacl_acl/entry.h"
+#include "qzacl_acl/tree.h"
+#include "qzacl_trace.h"
+#include "report.h"
+
+namespace {
+
+namespace format = qz::format;
+
+constexpr char add_function[] = "sec_add_acle_to_acl";
+constexpr char delete_function[] = "sec_del_acle_from_acl";
+
+int corrupt(int line) { return qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupted, qz::acl_source, line); }
+
+int check_entry(const sec_acle_t &acle) {
+    if (!qz::is_acle_type(acle.type))
+        return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_type_unknown, acle.type);
+    const bool lacks_identity = qz::has_identity(acle.type) && acle.identity == nullptr;
+    const std::size_t mechanism_length = strnlen(acle.mechanism, sizeof acle.mechanism);
+    const bool lacks_mechanism =
+        qz::has_mechanism(acle.type) && (mechanism_length == 0 || mechanism_length > qz::mechanism_max);
+    if (lacks_identity || lacks_mechanism)
+        return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_lacks_key, acle.type);
+    return SEC_S_OK;
+}
+
+int check_header(const sec_acl_buffer_t &acl) {
+    // What of the header the length does not cover counts as wrong in no way of its own, but as bytes that are missing.
+    qz::byte_reader reader(format::bytes_of(acl));
+    std::uint8_t type = format::buffer_type;
+    std::uint8_t version = format::buffer_version;
+    std::uint8_t order = format::host_order;
+    std::uint16_t subacl_count = 0;
+    const bool is_whole =
+        reader.field(type) && reader.field(version) && reader.field(order) && reader.field(subacl_count);
+    if (type != format::buffer_type)
+        return qz::report(SEC_S_BAD_ACL, qz::msg::second_argument_not_acl);
+    if (version != format::buffer_version)
+        return qz::report(SEC_S_BAD_ACL, qz::msg::buffer_version_unsupported);
+    if (order != format::host_order)
+        return qz::report(SEC_S_BAD_ACL, qz::msg::wrong_byte_order);
+    return is_whole ? SEC_S_OK : corrupt(__LINE__);
+}
+
+std::span<unsigned char> writable(const sec_acl_buffer_t &acl) {
+    return {static_cast<unsigned char *>(acl.data), static_cast<std::size_t>(acl.length)};
+}
+
+std::uint16_t subacl_count(const sec_acl_buffer_t &acl) {
+    qz::byte_reader reader(format::bytes_of(acl));
+    format::header head;
+    format::read(reader, head);
+    return head.subacl_count;
+}
+
+void set_subacl_count(const sec_acl_buffer_t &acl, std::size_t count) {
+    qz::store_field(writable(acl), format::count_offset, static_cast<std::uint16_t>(count));
+}
+
+// Replaces `old_size` bytes at `offset` by a gap of `new_size` bytes, which the caller fills. On failure nothing has
+// changed when the buffer was to grow; when it was to shrink it did, and only the memory was not given back.
+int make_gap(sec_acl_buffer_t &acl, std::size_t offset, std::size_t old_size, std::size_t new_size,
+             const char *function) {
+    const auto length = static_cast<std::size_t>(acl.length);
+    const std::size_t new_length = length - old_size + new_size;
+    const std::size_t tail = length - offset - old_size;
+    if (new_length > length) {
+        void *grown = new_length > format::buffer_max ? nullptr : std::realloc(acl.data, new_length);
+        if (grown == nullptr)
+            return qz::report_no_memory(function, new_length);
+        acl.data = grown;
+    }
+    auto *bytes = static_cast<unsigned char *>(acl.data);
+    std::memmove(bytes + offset + new_size, bytes + offset + old_size, tail);
+    acl.length = static_cast<std::int32_t>(new_length);
+    if (new_length < length) {
+        void *shrunk = std::realloc(acl.data, new_length);
+        if (shrunk == nullptr)
+            return qz::report_no_memory(function, new_length);
+        acl.data = shrunk;
+    }
+    return SEC_S_OK;
+}
+
+// The sub-ACL that an edit is about, as it stands in the buffer.
+struct stored_subacl {
+    const unsigned char *start = nullptr; // null when the key has none
+    std::size_t offset = 0;
+    format::subacl head;
+};
+
+int find(const sec_acl_buffer_t &acl, const sec_acle_t &acle, stored_subacl &out) {
+    if (const int result = sec__find_subacl(&acl, acle.type, acle.mechanism, &out.start); result != SEC_S_OK)
+        return result;
+    if (out.start == nullptr)
+        return SEC_S_OK;
+    const qz::byte_span bytes = format::bytes_from(acl, out.start);
+    qz::byte_reader reader(bytes);
+    out.offset = static_cast<std::size_t>(acl.length) - bytes.size();
+    // The bytes that the edit replaces must all be there.
+    if (!format::read(reader, out.head) || out.head.length > bytes.size())
+        return corrupt(__LINE__);
+    return SEC_S_OK;
+}
+
+// Where an identity stands, or would stand, among packed entries.
+struct packed_place {
+    std::size_t offset = 0; // in the sub-ACL
+    std::size_t size = 0;   // of the entry found there, 0 when the identity is not among them
+};
+
+// Looks for an identity in a user or group sub-ACL. False unless the bytes are exactly what compiling a tree of these
+// entries gives: only then does changing one entry's bytes give what the plain way would.
+bool find_packed(qz::byte_span subacl, const format::subacl &head, const char *identity, packed_place &place) {
+    if ((head.type != SEC_ACLE_USER && head.type != SEC_ACLE_GROUP) || head.entry_count == 0)
+        return false;
+    if (head.type == SEC_ACLE_USER &&
+        (!format::holds_exact_string(head.mechanism) || head.mechanism.size() > qz::mechanism_max + 1))
+        return false;
+    if (head.type == SEC_ACLE_GROUP && head.mechanism_length != 0)
+        return false;
+
+    qz::byte_reader reader(subacl);
+    reader.skip(format::subacl_header_size + head.mechanism_length);
+    const char *previous = nullptr;
+    bool is_placed = false;
+    for (std::uint32_t left = head.entry_count; left != 0; --left) {
+        const std::size_t offset = subacl.size() - reader.left();
+        format::entry entry;
+        if (!format::read(reader, entry) || entry.version != format::entry_version ||
+            !format::holds_exact_string(entry.identity))
+            return false;
+        const char *held = format::string_in(entry.identity);
+        if (previous != nullptr && cu_strcasecmp_posix_1(previous, held) >= 0)
+            return false;
+        previous = held;
+        if (is_placed)
+            continue;
+        const int order = cu_strcasecmp_posix_1(identity, held);
+        if (order <= 0) {
+            is_placed = true;
+            place.offset = offset;
+            place.size = order == 0 ? format::entry_fixed_size + entry.identity.size() : 0;
+        }
+    }
+    if (!is_placed)
+        place = {subacl.size() - reader.left(), 0};
+    return reader.left() == 0;
+}
+
+void store_subacl_size(const sec_acl_buffer_t &acl, const stored_subacl &stored, std::size_t length, std::uint32_t count) {
+    qz::store_field(writable(acl), stored.offset, static_cast<std::uint32_t>(length));
+    qz::store_field(writable(acl), stored.offset + format::subacl_count_offset, count);
+}
+
+// Adds to packed entries. The identity is known to fit the format.
+int add_packed(const sec_acle_t &acle, int report_duplicates, const stored_subacl &stored, const packed_place &place,
+               sec_acl_buffer_t &acl) {
+    if (place.size != 0) {
+        if (report_duplicates != 0)
+            return sec__report_duplicate(&acle);
+        qz::store_field(writable(acl), stored.offset + place.offset + format::entry_mask_offset, acle.perm_mask);
+        sec__trace_replacement(&acle);
+        return SEC_S_OK;
+    }
+    const std::size_t identity_size = std::strlen(acle.identity) + 1;
+    const std::size_t size = format::entry_fixed_size + identity_size;
+    const std::size_t offset = stored.offset + place.offset;
+    if (const int result = make_gap(acl, offset, 0, size, add_function); result != SEC_S_OK)
+        return result;
+    qz::byte_writer writer(writable(acl).subspan(offset, size));
+    format::write_entry(writer, acle.perm_mask, acle.identity, identity_size);
+    store_subacl_size(acl, stored, stored.head.length + size, stored.head.entry_count + 1);
+    return SEC_S_OK;
+}
+
+// Puts what a changed tree compiled to in the place of the stored sub-ACL, or behind all others when there was none.
+int splice(const qz::loose_subacl &compiled, const stored_subacl &stored, const char *function, sec_acl_buffer_t &acl) {
+    const bool is_new = stored.start == nullptr;
+    const std::size_t count = subacl_count(acl);
+    const std::size_t offset = is_new ? static_cast<std::size_t>(acl.length) : stored.offset;
+    if (is_new && count == format::subacls_max)
+        return qz::report_no_memory(function, static_cast<std::size_t>(acl.length) + compiled.length);
+    const std::int32_t old_length = acl.length;
+    const int result = make_gap(acl, offset, is_new ? 0 : stored.head.length, compiled.length, function);
+    if (result != SEC_S_OK && acl.length == old_length)
+        return result;
+    qz::byte_writer writer(writable(acl).subspan(offset, compiled.length));
+    writer.bytes(compiled.data.get(), compiled.length);
+    if (is_new)
+        set_subacl_count(acl, count + 1);
+    else if (compiled.length == 0)
+        set_subacl_count(acl, count - 1);
+    return result;
+}
+
+int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_subacl &stored, sec_acl_buffer_t &acl) {
+    sec_acltree_t *root = nullptr;
+    if (stored.start != nullptr) {
+        const int result = sec__subacl_to_acltree(format::bytes_from(acl, stored.start), &root);
+        if (result != SEC_S_OK)
+            return result;
+    }
+    int result = sec__add_acle_to_tree(report_duplicates, &acle, &root);
+    const qz::owned_acltree tree(root);
+    qz::loose_subacl compiled;
+    if (result == SEC_S_OK)
+        result = sec__acltree_to_subacl(root, compiled);
+    if (result != SEC_S_OK)
+        return result;
+    if (compiled.length == 0)
+        return qz::report(SEC_S_INTERNAL, qz::msg::internal_failure, qz::acl_source, __LINE__, SEC_S_INTERNAL);
+    return splice(compiled, stored, add_function, acl);
+}
+
+int add_to_buffer(const sec_acle_t &acle, int report_duplicates, sec_acl_buffer_t &acl) {
+    stored_subacl stored;
+    if (const int result = find(acl, acle, stored); result != SEC_S_OK)
+        return result;
+    packed_place place;
+    if (stored.start != nullptr && qz::has_identity(acle.type) &&
+        std::strlen(acle.identity) <= format::identity_max &&
+        find_packed({stored.start, stored.head.length}, stored.head, acle.identity, place))
+        return add_packed(acle, report_duplicates, stored, place, acl);
+    return add_by_tree(acle, report_duplicates, stored, acl);
+}
+
+int add_checked(const sec_acle_t *acle, int report_duplicates, sec_acl_buffer_t *acl) {
+    if (acle == nullptr)
+        return qz::report_bad_parameter(add_function, 1, 0);
+    if (acl == nullptr)
+        return qz::report_bad_parameter(add_function, 2, 0);
+    if (const int result = check_entry(*acle); result != SEC_S_OK)
+        return result;
+    if (acl->data != nullptr) {
+        const int result = check_header(*acl);
+        return result == SEC_S_OK ? add_to_buffer(*acle, report_duplicates, *acl) : result;
+    }
+
+    auto memory = qz::allocate<unsigned char>(format::header_size);
+    if (memory == nullptr)
+        return qz::report_no_memory(add_function, format::header_size);
+    std::memcpy(memory.get(), format::empty_acl, format::header_size);
+    sec_acl_buffer_t made = {format::header_size, memory.release()};
+    const int result = add_to_buffer(*acle, report_duplicates, made);
+    if (result == SEC_S_OK)
+        *acl = made;
+    else
+        std::free(made.data);
+    if (result != SEC_S_OK)
+        *acl = {};
+    return result;
+}
+
+int delete_packed(const stored_subacl &stored, const packed_place &place, sec_acl_buffer_t &acl) {
+    const bool is_last = stored.head.entry_count == 1;
+    const std::size_t offset = is_last ? stored.offset : stored.offset + place.offset;
+    const std::size_t size = is_last ? stored.head.length : place.size;
+    const std::size_t count = subacl_count(acl);
+    const int result = make_gap(acl, offset, size, 0, delete_function);
+    if (is_last)
+        set_subacl_count(acl, count - 1);
+    else
+        store_subacl_size(acl, stored, stored.head.length - size, stored.head.entry_count - 1);
+    return result;
+}
+
+int delete_by_tree(const sec_acle_t &acle, const stored_subacl &stored, sec_acl_buffer_t &acl) {
+    sec_acltree_t *root = nullptr;
+    int result = sec__subacl_to_acltree(format::bytes_from(acl, stored.start), &root);
+    if (result != SEC_S_OK)
+        return result;
+    const qz::owned_acltree tree(root);
+    if (root == nullptr)
+        return sec__acle_not_found(SEC_S_BAD_ACLE, &acle);
+    result = sec__del_acle_from_tree(&acle, root);
+    qz::loose_subacl compiled;
+    if (result == SEC_S_OK)
+        result = sec__acltree_to_subacl(root, compiled);
+    return result == SEC_S_OK ? splice(compiled, stored, delete_function, acl) : result;
+}
+
+int delete_checked(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
+    if (acle == nullptr)
+        return qz::report_bad_parameter(delete_function, 1, 0);
+    if (acl == nullptr)
+        return qz::report_bad_parameter(delete_function, 2, 0);
+    if (const int result = check_entry(*acle); result != SEC_S_OK)
+        return result;
+    if (acl->length == 0 || acl->data == nullptr)
+        return qz::report(SEC_S_BAD_ACL, qz::msg::acl_corrupted);
+    if (const int result = check_header(*acl); result != SEC_S_OK)
+        return result;
+
+    stored_subacl stored;
+    if (const int result = find(*acl, *acle, stored); result != SEC_S_OK)
+        return result;
+    if (stored.start == nullptr)
+        return sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, acle);
+    packed_place place;
+    if (qz::has_identity(acle->type) &&
+        find_packed({stored.start, stored.head.length}, stored.head, acle->identity, place))
+        return place.size == 0 ? sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, acle) : delete_packed(stored, place, *acl);
+    return delete_by_tree(*acle, stored, *acl);
+}
+
+// The entry and the descriptor, as the entry records of all edits show them.
+void trace_arguments(int id, const sec_acle_t *acle, const sec_acl_buffer_t *acl) {
+    const std::uint32_t type = acle == nullptr ? 0 : acle->type;
+    const std::uint32_t mask = acle == nullptr ? 0 : acle->perm_mask;
+    const sec_acl_buffer_t shown = acl == nullptr ? sec_acl_buffer_t{} : *acl;
+    qz::trace_data(id, qz::number(acle), qz::number(type), qz::number(mask),
+                   qz::item(acle == nullptr ? nullptr : acle->mechanism),
+                   qz::item(acle == nullptr ? nullptr : acle->identity), qz::number(acl), qz::number(shown.length),
+                   qz::number(shown.data));
+}
+
+int sec__add_acle_to_acl(int report_duplicates, const sec_acle_t *acle, sec_acl_buffer_t *acl) {
+    qz::trace_entry(60, [&] { trace_arguments(62, acle, acl); });
+    cu_set_no_error_1();
+    const int result = add_checked(acle, report_duplicates, acl);
+    qz::trace_exit(63, result);
+    return result;
+}
+
+} // namespace
+
+int sec_add_acle_to_acl(const sec_acle_t *acle, sec_acl_buffer_t *acl) { return sec__add_acle_to_acl(0, acle, acl); }
+
+int sec_add_acle_to_acl2(const sec_acle_t *acle, sec_acl_buffer_t *acl) { return sec__add_acle_to_acl(1, acle, acl); }
+
+int sec_del_acle_from_acl(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
+    qz::trace_entry(65, [&] { trace_arguments(67, acle, acl); });
+    cu_set_no_error_1();
+    const int result = delete_checked(acle, acl);
+    qz::trace_exit(68, result);
+    return result;
+}

@@ -1,0 +1,348 @@
+// Access decisions: which permissions a compiled ACL grants one party, or the groups of one. The buffer is read in
+// place, nothing is allocated, and the one lock is held only while a handler is looked up.
+#include "libqz_cu/posix_fold.h"
+#include "qzacl_acl/buffer.h"
+#include "qzacl_acl/buffer_format.h"
+#include "qzacl_acl/entry.h"
+#include "qzacl_acl/id_handlers.h"
+#include "qzacl_init.h"
+#include "qzacl_trace.h"
+#include "report.h"
+
+#include <algorithm>
+#include <array>
+#include <bit>
+
+namespace {
+
+namespace format = qz::format;
+
+constexpr unsigned type_bits = 0x1f;
+
+int corrupt(int line) { return qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupted, qz::acl_source, line); }
+
+int check_buffer(const sec_acl_buffer_t &acl) {
+    const qz::byte_span bytes = format::bytes_of(acl);
+    if (bytes.size() < format::order_offset || bytes[0] != format::buffer_type || bytes[1] != format::buffer_version)
+        return qz::report(SEC_S_BAD_ACL, qz::msg::not_an_acl_buffer);
+    if (bytes.size() < format::header_size)
+        return corrupt(__LINE__);
+    if (bytes[format::order_offset] != format::host_order)
+        return qz::report(SEC_S_BAD_ACL, qz::msg::wrong_byte_order);
+    return SEC_S_OK;
+}
+
+// An identity that is looked for, ready to be compared with one stored entry after the other.
+class wanted_identity {
+public:
+    // No order: the stored field holds no whole string.
+    static constexpr int unordered = 2;
+
+    explicit wanted_identity(const char *text) : text_(text) {
+        // The first word is padded with NULs; the bytes behind the wanted NUL do not take part in a comparison.
+        const std::size_t size = strnlen(text, word_size);
+        std::uint64_t word = 0;
+        std::memcpy(&word, text, size);
+        first_word_ = qz::fold8(word);
+        first_size_ = std::min(size + 1, word_size);
+    }
+
+    // Negative, zero or positive as the wanted identity sorts before, with or behind a stored one, of which `left`
+    // bytes from its start to the end of the buffer may be looked at.
+    int compare(qz::byte_span stored, std::size_t left) const {
+        if constexpr (std::endian::native == std::endian::little) {
+            if (left >= word_size) {
+                std::uint64_t word = 0;
+                std::memcpy(&word, stored.data(), word_size);
+                const std::uint64_t difference = qz::fold8(word) ^ first_word_;
+                const std::size_t same = static_cast<std::size_t>(std::countr_zero(difference)) / 8;
+                if (same < first_size_ && same < stored.size())
+                    return byte_at(first_word_, same) < byte_at(qz::fold8(word), same) ? -1 : 1;
+                if (same >= first_size_ && first_size_ <= stored.size() && first_size_ < word_size)
+                    return 0;
+            }
+        }
+        return compare_bytes(stored);
+    }
+
+private:
+    static constexpr std::size_t word_size = sizeof(std::uint64_t);
+
+    static unsigned byte_at(std::uint64_t word, std::size_t index) { return (word >> (index * 8)) & 0xff; }
+
+    int compare_bytes(qz::byte_span stored) const {
+        for (std::size_t index = 0; index < stored.size(); ++index) {
+            const unsigned wanted = qz::fold(static_cast<unsigned char>(text_[index]));
+            const unsigned held = qz::fold(stored[index]);
+            if (wanted != held)
+                return wanted < held ? -1 : 1;
+            if (wanted == 0)
+                return 0;
+        }
+        return unordered;
+    }
+
+    const char *text_;
+    std::uint64_t first_word_ = 0;
+    std::size_t first_size_ = 0; // the bytes of the first word that count, the NUL included
+};
+
+// Looks up the sub-ACL and reads its header.
+bool find(const sec_acl_buffer_t &acl, std::uint8_t type, const char *mechanism, format::subacl &head,
+          qz::byte_reader &entries) {
+    const unsigned char *start = nullptr;
+    sec__find_subacl(&acl, type, mechanism, &start);
+    if (start == nullptr)
+        return false;
+    entries = qz::byte_reader(format::bytes_from(acl, start));
+    return format::read(entries, head);
+}
+
+struct single_request {
+    std::uint8_t type_argument;
+    const char *mechanism;
+    const char *identity;
+    std::int32_t walked = -1; // entries of the user sub-ACL that was walked
+
+    std::uint8_t type() const { return type_argument & type_bits; }
+    bool uses_handler() const { return (type_argument & SEC_ACLE_USE_ID_HANDLER) != 0; }
+};
+
+int no_match(const single_request &request, const char *identity) {
+    return qz::report(SEC_S_BAD_ACLE, qz::msg::no_matching_acle, request.type_argument,
+                      request.mechanism == nullptr ? "" : request.mechanism, identity);
+}
+
+int evaluate_single_entry(const single_request &request, const format::subacl &head, qz::byte_reader entries,
+                          std::uint32_t &mask) {
+    if (head.entry_count > 1)
+        return qz::report(SEC_S_BAD_ACL, qz::msg::more_than_one_acle, qz::acl_source, __LINE__);
+    if (head.entry_count == 0)
+        return no_match(request, "");
+    format::entry entry;
+    if (!format::read(entries, entry))
+        return corrupt(__LINE__);
+    mask = entry.perm_mask;
+    return SEC_S_OK;
+}
+
+// Asks a handler about each entry in turn. Whatever the handler recorded about an entry that does not match is its own
+// affair and is cleared.
+int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler, bool is_sorted,
+                        const format::subacl &head, qz::byte_reader entries, std::uint32_t &mask) {
+    for (std::uint32_t left = head.entry_count; left != 0; --left) {
+        format::entry entry;
+        if (!format::read(entries, entry))
+            return corrupt(__LINE__);
+        const char *identity = format::string_in(entry.identity);
+        if (identity == nullptr)
+            return corrupt(__LINE__);
+        const int order = handler(request.identity, identity);
+        if (order == 0) {
+            mask = entry.perm_mask;
+            return SEC_S_OK;
+        }
+        cu_set_no_error_1();
+        if (is_sorted && order < 0)
+            break;
+    }
+    return no_match(request, request.identity);
+}
+
+int evaluate_user(const single_request &request, const format::subacl &head, qz::byte_reader entries,
+                  std::uint32_t &mask) {
+    const wanted_identity wanted(request.identity);
+    for (std::uint32_t left = head.entry_count; left != 0; --left) {
+        format::entry entry;
+        std::uint16_t identity_length = 0;
+        if (!entries.field(entry.version) || !entries.field(entry.perm_mask) || !entries.field(identity_length))
+            return corrupt(__LINE__);
+        const std::size_t bytes_left = entries.left();
+        if (!entries.bytes(identity_length, entry.identity))
+            return corrupt(__LINE__);
+        const int order = wanted.compare(entry.identity, bytes_left);
+        if (order == 1)
+            continue;
+        if (order == 0) {
+            mask = entry.perm_mask;
+            return SEC_S_OK;
+        }
+        if (order == wanted_identity::unordered)
+            return corrupt(__LINE__);
+        break;
+    }
+    return no_match(request, request.identity);
+}
+
+int evaluate_single(const sec_acl_buffer_t *acl, single_request &request, const char *subacl_mechanism,
+                    std::uint32_t *mask) {
+    constexpr const char *function = "sec__single_acle_perm";
+    if (acl == nullptr)
+        return qz::report_bad_parameter(function, 1, 0);
+    if (mask == nullptr)
+        return qz::report_bad_parameter(function, 5, 0);
+    if (const int result = check_buffer(*acl); result != SEC_S_OK)
+        return result;
+    const std::uint8_t type = request.type();
+    if (!qz::is_single_type(type) && !qz::has_mechanism(type))
+        return qz::report(SEC_S_BAD_PARAMETER, qz::msg::type_not_evaluated, request.type_argument);
+    if (qz::has_mechanism(type)) {
+        if (request.mechanism == nullptr || *request.mechanism == '\0')
+            return qz::report(SEC_S_BAD_PARAMETER, qz::msg::mechanism_required);
+        if (request.identity == nullptr || *request.identity == '\0')
+            return qz::report(SEC_S_BAD_PARAMETER, qz::msg::identity_required);
+    }
+    *mask = 0;
+
+    format::subacl head;
+    qz::byte_reader entries;
+    if (!find(*acl, type, subacl_mechanism == nullptr ? request.mechanism : subacl_mechanism, head, entries))
+        return no_match(request, "");
+    if (qz::is_single_type(type))
+        return evaluate_single_entry(request, head, entries, *mask);
+
+    sec_id_compare_fn handler = nullptr;
+    if (type == SEC_ACLE_EXPANDED) {
+        static_cast<void>(sec__get_id_handler(SEC_ID_HANDLER_EXPANDED, request.mechanism, &handler));
+        if (handler == nullptr)
+            return no_match(request, request.identity);
+        return evaluate_by_handler(request, handler, false, head, entries, *mask);
+    }
+    request.walked = static_cast<std::int32_t>(head.entry_count);
+    if (request.uses_handler())
+        static_cast<void>(sec__get_id_handler(SEC_ID_HANDLER_USER, request.mechanism, &handler));
+    return handler == nullptr ? evaluate_user(request, head, entries, *mask)
+                              : evaluate_by_handler(request, handler, true, head, entries, *mask);
+}
+
+// Evaluates some of the requester's groups with one pass over the entries.
+//
+// A group's walk goes up to the first entry that does not sort before it, and that entry decides. So the groups are
+// taken in ascending order: while one waits, every entry that passed sorts before it and thus before all behind it.
+class group_batch {
+public:
+    static constexpr std::size_t capacity = 64;
+
+    void add(const char *name) { names_[count_++] = name; }
+    bool is_full() const { return count_ == capacity; }
+
+    int evaluate(const format::subacl &head, qz::byte_reader entries, std::uint32_t &mask, bool &is_found) {
+        std::sort(names_.begin(), names_.begin() + count_,
+                  [](const char *a, const char *b) { return cu_strcasecmp_posix_1(a, b) < 0; });
+        std::size_t waiting = 0;
+        wanted_identity wanted(count_ == 0 ? "" : names_[0]);
+        for (std::uint32_t left = head.entry_count; left != 0 && waiting != count_; --left) {
+            format::entry entry;
+            std::uint16_t identity_length = 0;
+            if (!entries.field(entry.version) || !entries.field(entry.perm_mask) || !entries.field(identity_length))
+                return corrupt(__LINE__);
+            const std::size_t bytes_left = entries.left();
+            if (!entries.bytes(identity_length, entry.identity))
+                return corrupt(__LINE__);
+            while (waiting != count_) {
+                const int order = wanted.compare(entry.identity, bytes_left);
+                if (order == wanted_identity::unordered)
+                    return corrupt(__LINE__);
+                if (order > 0)
+                    break;
+                if (order == 0) {
+                    mask |= entry.perm_mask;
+                    is_found = true;
+                }
+                if (++waiting != count_)
+                    wanted = wanted_identity(names_[waiting]);
+            }
+        }
+        count_ = 0;
+        return SEC_S_OK;
+    }
+
+private:
+    std::array<const char *, capacity> names_;
+    std::size_t count_ = 0;
+};
+
+int no_group() { return qz::report(SEC_S_BAD_ACLE, qz::msg::no_matching_acle, SEC_ACLE_GROUP, "", ""); }
+
+int evaluate_groups(const sec_acl_buffer_t *acl, std::int32_t count, const sec_group_ref_t *groups,
+                    std::uint32_t *mask) {
+    constexpr const char *function = "sec__group_acles_perm";
+    if (acl == nullptr)
+        return qz::report_bad_parameter(function, 1, 0);
+    if (count != 0 && groups == nullptr)
+        return qz::report_bad_parameter(function, 3, 0);
+    if (mask == nullptr)
+        return qz::report_bad_parameter(function, 4, 0);
+    if (const int result = check_buffer(*acl); result != SEC_S_OK)
+        return result;
+    *mask = 0;
+    if (count == 0)
+        return SEC_S_OK;
+    format::subacl head;
+    qz::byte_reader entries;
+    if (!find(*acl, SEC_ACLE_GROUP, nullptr, head, entries) || count < 0)
+        return no_group();
+
+    std::uint32_t granted = 0;
+    bool is_found = false;
+    group_batch batch;
+    for (std::int32_t index = 0; index < count; ++index) {
+        if (groups[index].name != nullptr)
+            batch.add(groups[index].name);
+        if (batch.is_full() || index == count - 1) {
+            if (const int result = batch.evaluate(head, entries, granted, is_found); result != SEC_S_OK)
+                return result;
+        }
+    }
+    if (!is_found)
+        return no_group();
+    *mask = granted;
+    return SEC_S_OK;
+}
+
+} // namespace
+
+int sec__single_acle_perm(const sec_acl_buffer_t *acl, std::uint8_t type, const char *mechanism,
+                          const char *subacl_mechanism, const char *identity, std::uint32_t *mask) {
+    qz::trace_entry(79, [&] {
+        const sec_acl_buffer_t shown = acl == nullptr ? sec_acl_buffer_t{} : *acl;
+        const std::uint32_t shown_type = type;
+        qz::trace_data(81, qz::number(acl), qz::number(shown.length), qz::number(shown.data), qz::number(shown_type),
+                       qz::item(mechanism), qz::item(identity), qz::number(mask));
+    });
+    cu_set_no_error_1();
+    pthread_once(&acl__init_once_block, acl__state_init);
+    const bool is_timed = qz::trace_level(qz::trace_category::perf) == 2;
+    const std::uint64_t start = is_timed ? qz::read_counter() : 0;
+
+    single_request request{type, mechanism, identity};
+    const int result = evaluate_single(acl, request, subacl_mechanism, mask);
+
+    if (is_timed) {
+        const std::uint32_t shown_type = type;
+        qz::trace_elapsed(7, start, qz::number(request.walked), qz::number(shown_type), qz::item(mechanism),
+                          qz::item(identity));
+    }
+    qz::trace_exit(82, result, [&] { qz::trace_data(84, qz::number(result), qz::number(*mask)); });
+    return result;
+}
+
+int sec__group_acles_perm(const sec_acl_buffer_t *acl, std::int32_t count, const sec_group_ref_t *groups,
+                          std::uint32_t *mask) {
+    qz::trace_entry(85, [&] {
+        const sec_acl_buffer_t shown = acl == nullptr ? sec_acl_buffer_t{} : *acl;
+        qz::trace_data(87, qz::number(acl), qz::number(shown.length), qz::number(shown.data), qz::number(count),
+                       qz::number(groups), qz::number(mask));
+    });
+    cu_set_no_error_1();
+    pthread_once(&acl__init_once_block, acl__state_init);
+    const bool is_timed = qz::trace_level(qz::trace_category::perf) == 2;
+    const std::uint64_t start = is_timed ? qz::read_counter() : 0;
+
+    const int result = evaluate_groups(acl, count, groups, mask);
+
+    if (is_timed)
+        qz::trace_elapsed(8, start);
+    qz::trace_exit(88, result, [&] { qz::trace_data(90, qz::number(result), qz::number(*mask)); });
+    return result;
+}

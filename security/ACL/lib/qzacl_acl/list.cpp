@@ -1,0 +1,149 @@
+// Listing the entries of a compiled buffer.
+#include "qzacl_acl/buffer.h"
+#include "qzacl_acl/buffer_format.h"
+#include "qzacl_acl/compile.h"
+#include "qzacl_acl/entry.h"
+#include "qzacl_acl/tree.h"
+#include "qzacl_trace.h"
+#include "report.h"
+
+namespace {
+
+namespace format = qz::format;
+
+// Owns what was listed until all of it is.
+class pending_list {
+public:
+    pending_list() = default;
+    pending_list(const pending_list &) = delete;
+    pending_list &operator=(const pending_list &) = delete;
+    ~pending_list() { sec_release_aclelist(&list_); }
+
+    // Appends the entries of the sub-ACL at the start of the bytes.
+    int append(qz::byte_span bytes) {
+        sec_acltree_t *tree = nullptr;
+        int result = sec__subacl_to_acltree(bytes, &tree);
+        if (result == SEC_S_OK)
+            result = sec__acltree_to_aclelist(tree, &list_);
+        sec__free_acltree(tree);
+        return result;
+    }
+
+    sec_aclelist_t release() { return std::exchange(list_, {}); }
+
+private:
+    sec_aclelist_t list_ = {};
+};
+
+// The empty ACL and every buffer whose first two bytes are right.
+bool is_acl(const sec_acl_buffer_t &acl) {
+    if (acl.length == 0)
+        return acl.data == nullptr;
+    const qz::byte_span bytes = format::bytes_of(acl);
+    return bytes.size() > 1 && bytes[0] == format::buffer_type && bytes[1] == format::buffer_version;
+}
+
+int corrupt(int line) { return qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupted, qz::acl_source, line); }
+
+// Lists the sub-ACLs that are wanted, in the order in which they stand.
+template <class Wanted>
+int append_all(const sec_acl_buffer_t &acl, pending_list &list, const Wanted &is_wanted) {
+    const qz::byte_span bytes = format::bytes_of(acl);
+    if (bytes.size() < format::header_size)
+        return bytes.empty() ? SEC_S_OK : corrupt(__LINE__);
+    format::subacl_walk walk(bytes);
+    for (;;) {
+        switch (walk.next()) {
+        case format::subacl_walk::step::end:
+            return SEC_S_OK;
+        case format::subacl_walk::step::corrupt:
+            return corrupt(__LINE__);
+        case format::subacl_walk::step::found:
+            break;
+        }
+        if (!is_wanted(walk.current()))
+            continue;
+        if (const int result = list.append(walk.from_start()); result != SEC_S_OK)
+            return result;
+    }
+}
+
+int append_one(const sec_acl_buffer_t &acl, std::uint8_t type, const char *mechanism, pending_list &list) {
+    const unsigned char *subacl = nullptr;
+    if (const int result = sec__find_subacl(&acl, type, mechanism, &subacl); result != SEC_S_OK)
+        return result;
+    return subacl == nullptr ? SEC_S_OK : list.append(format::bytes_from(acl, subacl));
+}
+
+int list_checked(const sec_acl_buffer_t *acl, sec_aclelist_t *list) {
+    if (acl == nullptr)
+        return qz::report_bad_parameter("sec_list_acl", 1, 0);
+    if (list == nullptr)
+        return qz::report_bad_parameter("sec_list_acl", 2, 0);
+    if (!is_acl(*acl))
+        return qz::report(SEC_S_BAD_ACL, qz::msg::not_an_acl_buffer);
+    *list = {};
+    pending_list pending;
+    const int result = append_all(*acl, pending, [](const format::subacl &) { return true; });
+    if (result == SEC_S_OK)
+        *list = pending.release();
+    return result;
+}
+
+int list_by_type_checked(const sec_acl_buffer_t *acl, std::uint8_t type, const char *mechanism,
+                         sec_aclelist_t *list) {
+    constexpr const char *function = "sec_list_acl_by_type";
+    if (acl == nullptr)
+        return qz::report_bad_parameter(function, 1, 0);
+    if (!qz::is_acle_type(type))
+        return qz::report_bad_parameter(function, 2, type);
+    if (qz::has_mechanism(type) && mechanism != nullptr) {
+        const std::size_t length = strnlen(mechanism, qz::mechanism_max + 1);
+        if (length == 0 || length > qz::mechanism_max)
+            return qz::report_bad_parameter(function, 3, qz::shown_pointer(mechanism));
+    }
+    if (list == nullptr)
+        return qz::report_bad_parameter(function, 4, 0);
+    if (!is_acl(*acl))
+        return qz::report(SEC_S_BAD_ACL, qz::msg::not_an_acl_buffer);
+    *list = {};
+    pending_list pending;
+    const int result =
+        qz::has_mechanism(type) && mechanism == nullptr
+            ? append_all(*acl, pending, [type](const format::subacl &head) { return head.type == type; })
+            : append_one(*acl, type, mechanism, pending);
+    if (result == SEC_S_OK)
+        *list = pending.release();
+    return result;
+}
+
+} // namespace
+
+int sec_list_acl(const sec_acl_buffer_t *acl, sec_aclelist_t *list) {
+    qz::trace_entry(20, [&] {
+        if (acl == nullptr)
+            qz::trace_data(22, qz::number(acl), qz::number(list));
+        else
+            qz::trace_data(24, qz::number(acl->length), qz::number(acl->data), qz::number(list));
+    });
+    cu_set_no_error_1();
+    const int result = list_checked(acl, list);
+    qz::trace_exit(25, result, [&] { qz::trace_data(27, qz::number(result), qz::number(list->count)); });
+    return result;
+}
+
+int sec_list_acl_by_type(const sec_acl_buffer_t *acl, std::uint8_t type, const char *mechanism,
+                         sec_aclelist_t *list) {
+    qz::trace_entry(28, [&] {
+        const std::uint32_t shown_type = type;
+        if (acl == nullptr)
+            qz::trace_data(30, qz::number(acl), qz::number(shown_type), qz::item(mechanism), qz::number(list));
+        else
+            qz::trace_data(32, qz::number(acl->length), qz::number(acl->data), qz::number(shown_type),
+                           qz::item(mechanism), qz::number(list));
+    });
+    cu_set_no_error_1();
+    const int result = list_by_type_checked(acl, type, mechanism, list);
+    qz::trace_exit(33, result, [&] { qz::trace_data(35, qz::number(result), qz::number(list->count)); });
+    return result;
+}

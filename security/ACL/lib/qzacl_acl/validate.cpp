@@ -1,0 +1,184 @@
+// Checking the structure of a compiled buffer, and bringing one into host byte order.
+#include "qzacl_acl/validate.h"
+
+#include "qzacl_acl/buffer_format.h"
+#include "qzacl_acl/entry.h"
+#include "qzacl_trace.h"
+#include "report.h"
+
+namespace {
+
+namespace format = qz::format;
+
+// Corrupt in a way that has no message of its own: something does not end where it should, or the bytes end early.
+int corrupt(int line) { return qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupted, qz::acl_source, line); }
+
+int report_shorter_than_header(std::int32_t length, int line) {
+    return qz::report(SEC_S_BAD_ACL, qz::msg::shorter_than_header, length, qz::acl_source, line);
+}
+
+// A mechanism that does not end with its field, shown up to the first NUL that follows or what is left of the bytes.
+int report_bad_mechanism(qz::byte_reader at_mechanism, int line) {
+    char shown[256] = {};
+    qz::byte_span bytes;
+    at_mechanism.bytes(std::min(at_mechanism.left(), sizeof shown - 1), bytes);
+    std::memcpy(shown, bytes.data(), bytes.size());
+    return qz::report(SEC_S_BAD_ACL, qz::msg::bad_mechanism, shown, qz::acl_source, line);
+}
+
+int check_mechanism(qz::byte_reader &reader, format::subacl &head) {
+    if (!qz::is_acle_type(head.type))
+        return qz::report(SEC_S_BAD_ACL, qz::msg::subacl_type_unknown, head.type, qz::acl_source, __LINE__);
+    if (!qz::has_mechanism(head.type)) {
+        if (head.mechanism_length != 0)
+            return qz::report(SEC_S_BAD_ACL, qz::msg::subacl_takes_no_mechanism, head.type, qz::acl_source, __LINE__);
+        if (qz::is_single_type(head.type) && head.entry_count > 1)
+            return qz::report(SEC_S_BAD_ACL, qz::msg::more_than_one_acle, qz::acl_source, __LINE__);
+        return SEC_S_OK;
+    }
+    if (head.mechanism_length < 2)
+        return qz::report(SEC_S_BAD_ACL, qz::msg::bad_mechanism_length, head.mechanism_length, qz::acl_source, __LINE__);
+    const qz::byte_reader at_mechanism = reader;
+    if (!reader.bytes(head.mechanism_length, head.mechanism))
+        return corrupt(__LINE__);
+    if (!format::holds_exact_string(head.mechanism))
+        return report_bad_mechanism(at_mechanism, __LINE__);
+    return SEC_S_OK;
+}
+
+int check_entry(const format::entry &entry, std::uint8_t type) {
+    if (entry.version != format::entry_version)
+        return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_version_unsupported, entry.version, qz::acl_source, __LINE__);
+    if (qz::is_single_type(type)) {
+        if (!entry.identity.empty())
+            return qz::report(SEC_S_BAD_ACLE, qz::msg::unexpected_identity, qz::acl_source, __LINE__);
+    } else if (!format::holds_exact_string(entry.identity)) {
+        return qz::report(SEC_S_BAD_ACLE, qz::msg::bad_identity_length, qz::acl_source, __LINE__);
+    }
+    return SEC_S_OK;
+}
+
+// Checks the entries of one sub-ACL. A faulty one ends its walk, with the reader standing before it.
+int check_entries(qz::byte_reader &reader, const format::subacl &head) {
+    for (std::uint32_t left = head.entry_count; left != 0; --left) {
+        qz::byte_reader next = reader;
+        format::entry entry;
+        if (!format::read(next, entry))
+            return corrupt(__LINE__);
+        if (const int result = check_entry(entry, head.type); result != SEC_S_OK)
+            return result;
+        reader = next;
+    }
+    return SEC_S_OK;
+}
+
+// Where a sub-ACL's length says that it ends, against where the walk arrived.
+class expected_end {
+public:
+    void set(const unsigned char *start, std::uint32_t length) {
+        start_ = start;
+        length_ = length;
+    }
+    bool is_at(const unsigned char *position) const {
+        return start_ == nullptr || static_cast<std::size_t>(position - start_) == length_;
+    }
+
+private:
+    const unsigned char *start_ = nullptr;
+    std::uint32_t length_ = 0;
+};
+
+int convert(std::span<unsigned char> bytes) {
+    qz::byte_swapper swapper(bytes);
+    std::uint16_t subacl_count = 0;
+    if (!swapper.skip(format::count_offset) || !swapper.swap(subacl_count))
+        return corrupt(__LINE__);
+    expected_end end;
+    for (; subacl_count != 0; --subacl_count) {
+        if (!end.is_at(swapper.position()))
+            return corrupt(__LINE__);
+        const unsigned char *start = swapper.position();
+        format::subacl head;
+        if (!swapper.swap(head.length) || !swapper.byte(head.type) || !swapper.swap(head.entry_count) ||
+            !swapper.byte(head.mechanism_length) || !swapper.skip(head.mechanism_length))
+            return corrupt(__LINE__);
+        end.set(start, head.length);
+        for (std::uint32_t left = head.entry_count; left != 0; --left) {
+            format::entry entry;
+            std::uint16_t identity_length = 0;
+            if (!swapper.byte(entry.version) || !swapper.swap(entry.perm_mask) || !swapper.swap(identity_length) ||
+                !swapper.skip(identity_length))
+                return corrupt(__LINE__);
+        }
+    }
+    qz::store_field(bytes, format::order_offset, format::host_order);
+    return SEC_S_OK;
+}
+
+int convert_checked(int check, sec_acl_buffer_t *acl) {
+    if (acl == nullptr)
+        return qz::report_bad_parameter("sec_convert_acl_to_host", 2, 0);
+    // Bytes that the length does not cover are not looked at; what of the header it covers must be right.
+    const qz::byte_span bytes = format::bytes_of(*acl);
+    qz::byte_reader reader(bytes);
+    std::uint8_t type = format::buffer_type;
+    std::uint8_t version = format::buffer_version;
+    std::uint8_t order = 0;
+    reader.field(type);
+    reader.field(version);
+    if (acl->length == 0 || acl->data == nullptr || type != format::buffer_type || version != format::buffer_version)
+        return qz::report(SEC_S_BAD_ACL, qz::msg::not_an_acl_buffer);
+    if (!reader.field(order))
+        return report_shorter_than_header(acl->length, __LINE__);
+
+    if (order == format::host_order) {
+        if (qz::traces(qz::trace_category::info))
+            qz::trace_id(104);
+        return check != 0 ? sec__check_acl_buffer(acl) : SEC_S_OK;
+    }
+    if (qz::traces(qz::trace_category::info))
+        qz::trace_id(106);
+    return convert({static_cast<unsigned char *>(acl->data), bytes.size()});
+}
+
+} // namespace
+
+int sec__check_acl_buffer(const sec_acl_buffer_t *acl) {
+    if (acl->length < static_cast<std::int32_t>(format::header_size))
+        return report_shorter_than_header(acl->length, __LINE__);
+    qz::byte_reader reader(format::bytes_of(*acl));
+    format::header header;
+    if (!format::read(reader, header))
+        return report_shorter_than_header(acl->length, __LINE__);
+
+    int result = SEC_S_OK;
+    expected_end end;
+    for (unsigned left = header.subacl_count; left != 0; --left) {
+        if (!end.is_at(reader.position()))
+            return corrupt(__LINE__);
+        const unsigned char *start = reader.position();
+        format::subacl head;
+        if (!format::read_fixed_part(reader, head))
+            return corrupt(__LINE__);
+        end.set(start, head.length);
+        if (const int fault = check_mechanism(reader, head); fault != SEC_S_OK)
+            return fault;
+        const int fault = check_entries(reader, head);
+        if (fault == SEC_S_BAD_ACL)
+            return fault;
+        if (fault != SEC_S_OK)
+            result = fault;
+    }
+    return result;
+}
+
+int sec_convert_acl_to_host(int check, sec_acl_buffer_t *acl) {
+    qz::trace_entry(55, [&] {
+        const sec_acl_buffer_t shown = acl == nullptr ? sec_acl_buffer_t{} : *acl;
+        qz::trace_data(57, qz::number(check), qz::number(acl), qz::number(shown.length), qz::number(shown.data));
+    });
+    cu_set_no_error_1();
+    const int result = convert_checked(check, acl);
+    qz::trace_exit(58, result);
+    return result;
+}
