@@ -1,5 +1,4 @@
-// The clock: a counter of nanoseconds that the kernel keeps readable without a system call, and its
-// conversion.
+// The clock: a counter of nanoseconds, which the kernel lets us read without a system call, as a time.
 #include "qz/cu.h"
 
 #include <cstdint>

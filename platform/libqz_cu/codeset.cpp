@@ -71,9 +71,7 @@ bool is_ascii(const char *in, std::size_t length) {
 }
 
 // Characters above U+FFFF are the ones that begin with such a byte in UTF-8.
-bool leaves_bmp(unsigned char lead) {
-    return lead >= 0xf0;
-}
+bool leaves_bmp(unsigned char lead) { return lead >= 0xf0; }
 
 // Whether bytes are UTF-8: no longer forms than needed, no surrogates, nothing above U+10FFFF. The system's
 // converters let the last pass.
@@ -140,9 +138,7 @@ int convert(iconv_t converter, const char *in, std::size_t in_left, result &out)
     return CU_OK;
 }
 
-void close_converter(void *converter) {
-    iconv_close(converter);
-}
+void close_converter(void *converter) { iconv_close(converter); }
 
 // The calling thread's converter for the handle, opened at its first use.
 int converter_of(const cu_iconv &handle, iconv_t &converter) {
@@ -274,14 +270,8 @@ int cu_iconv_str_1(cu_iconv_t handle, uint32_t options, const char *in, const si
     return code;
 }
 
-int cu_utf8_is_assumed_1(void) {
-    return 0;
-}
+int cu_utf8_is_assumed_1(void) { return 0; }
 
-int cu_utf8_is_not_modified_1(void) {
-    return 0;
-}
+int cu_utf8_is_not_modified_1(void) { return 0; }
 
-int cu_utf8_is_limited_to_bmp_1(void) {
-    return 0;
-}
+int cu_utf8_is_limited_to_bmp_1(void) { return 0; }

@@ -1,10 +1,11 @@
-// The error facility: each thread's current error, recorded as it comes and made into a text only when
-// fetched.
+// The error facility: each thread's current error, recorded as it comes and made into a text when fetched.
 #include "libqz_cu/catalog.h"
 #include "libqz_cu/kept_errno.h"
 #include "libqz_cu/message_text.h"
 #include "qz/cu.h"
 
+#include <algorithm>
+#include <bit>
 #include <cstdarg>
 #include <cstddef>
 #include <cstdlib>
@@ -50,9 +51,7 @@ void end_of_thread(void *) {
     drop_spill();
 }
 
-void make_spill_key() {
-    has_spill_key = pthread_key_create(&spill_key, end_of_thread) == 0;
-}
+void make_spill_key() { has_spill_key = pthread_key_create(&spill_key, end_of_thread) == 0; }
 
 [[gnu::cold, gnu::noinline]] bool take_spill(std::size_t size) {
     const kept_errno kept;
@@ -63,26 +62,15 @@ void make_spill_key() {
     return current.spill != nullptr;
 }
 
-struct string_sizes {
-    std::size_t each[max_arguments];
-    std::size_t total = 0;
+// Bytes that a string takes with its NUL. A null string takes none.
+std::size_t bytes_of(const char *text) { return text != nullptr ? std::strlen(text) + 1 : 0; }
 
-    // Each with its NUL; a number and a null string take nothing.
-    explicit string_sizes(const arguments &given) {
-        for (unsigned i = 0; i < given.count; ++i) {
-            const bool has_bytes = given.is_string(i) && given.values[i].text != nullptr;
-            each[i] = has_bytes ? std::strlen(given.values[i].text) + 1 : 0;
-            total += each[i];
-        }
-    }
-};
-
-// Moves the strings into the room, cutting what does not fit.
-void pack_strings(arguments &given, const string_sizes &sizes, char *room, std::size_t left) {
-    for (unsigned i = 0; i < given.count; ++i) {
-        if (sizes.each[i] == 0)
+// Moves strings into the room, those of the positions from `first` on, cutting what does not fit.
+void pack_strings(arguments &given, unsigned first, char *room, std::size_t left) {
+    for (unsigned i = first; i < given.count; ++i) {
+        if (!given.is_string(i) || given.values[i].text == nullptr)
             continue;
-        const std::size_t taken = sizes.each[i] < left ? sizes.each[i] : left;
+        const std::size_t taken = std::min(bytes_of(given.values[i].text), left);
         if (taken == 0) {
             given.values[i].text = "";
             continue;
@@ -95,15 +83,43 @@ void pack_strings(arguments &given, const string_sizes &sizes, char *room, std::
     }
 }
 
+std::size_t string_bytes(const arguments &given, unsigned first) {
+    std::size_t total = 0;
+    for (unsigned i = first; i < given.count; ++i)
+        if (given.is_string(i))
+            total += bytes_of(given.values[i].text);
+    return total;
+}
+
+// The strings from `first` on, for which the rest of the room does not suffice.
+[[gnu::cold, gnu::noinline]] void keep_long_strings(unsigned first, char *room, std::size_t left) {
+    const std::size_t total = string_bytes(current.error.given, first);
+    if (take_spill(total))
+        pack_strings(current.error.given, first, current.spill, total);
+    else
+        pack_strings(current.error.given, first, room, left);
+}
+
 // Completes a record whose strings still lie elsewhere.
 void keep_strings() {
     if (current.spill != nullptr) [[unlikely]]
         drop_spill();
-    const string_sizes sizes(current.error.given);
-    if (sizes.total > sizeof current.room && take_spill(sizes.total))
-        pack_strings(current.error.given, sizes, current.spill, sizes.total);
-    else
-        pack_strings(current.error.given, sizes, current.room, sizeof current.room);
+    arguments &given = current.error.given;
+    char *room = current.room;
+    std::size_t left = sizeof current.room;
+    for (unsigned strings = given.strings; strings != 0; strings &= strings - 1) {
+        const auto i = static_cast<unsigned>(std::countr_zero(strings));
+        const std::size_t taken = bytes_of(given.values[i].text);
+        if (taken > left) [[unlikely]] {
+            keep_long_strings(i, room, left);
+            return;
+        }
+        if (taken != 0) {
+            given.values[i].text = static_cast<char *>(std::memcpy(room, given.values[i].text, taken));
+            room += taken;
+            left -= taken;
+        }
+    }
 }
 
 const recorded_error &record_of(const cu_error_t *handle) {
@@ -157,14 +173,14 @@ int cu_get_error_1(cu_error_t **error) {
         return CU_BAD_PARAMETER;
     const kept_errno kept;
     const recorded_error from = current.error.present ? current.error : recorded_error{};
-    const string_sizes sizes(from.given);
-    void *block = std::malloc(sizeof(recorded_error) + sizes.total);
+    const std::size_t bytes = string_bytes(from.given, 0);
+    void *block = std::malloc(sizeof from + bytes);
     if (block == nullptr) {
         *error = nullptr;
         return CU_NO_MEMORY;
     }
     auto *copy = static_cast<recorded_error *>(std::memcpy(block, &from, sizeof from));
-    pack_strings(copy->given, sizes, static_cast<char *>(block) + sizeof from, sizes.total);
+    pack_strings(copy->given, 0, static_cast<char *>(block) + sizeof from, bytes);
     *error = &copy->head;
     return CU_OK;
 }
@@ -194,10 +210,6 @@ int cu_pset_error_1(const cu_error_t *error) {
     return CU_OK;
 }
 
-void cu_rel_error_1(cu_error_t *error) {
-    std::free(error);
-}
+void cu_rel_error_1(cu_error_t *error) { std::free(error); }
 
-void cu_rel_errmsg_1(char *text) {
-    std::free(text);
-}
+void cu_rel_errmsg_1(char *text) { std::free(text); }

@@ -19,9 +19,7 @@ struct conversion {
     bool operator==(const conversion &) const = default;
 };
 
-bool is_digit(char c) {
-    return c >= '0' && c <= '9';
-}
+bool is_digit(char c) { return c >= '0' && c <= '9'; }
 
 // Reads the conversion that a percent sign begins; false when it begins none.
 bool read_conversion(const char *percent, conversion &found) {

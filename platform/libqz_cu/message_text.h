@@ -1,6 +1,5 @@
 // Message texts and their positional conversions: which arguments a text takes, whether two texts take the
-// same, and the text with the arguments put in. No text, wherever it is from, ever becomes the format of a
-// printf.
+// same, and the text with the arguments put in. No text, wherever it is from, becomes the format of a printf.
 #ifndef QZ_CU_MESSAGE_TEXT_H
 #define QZ_CU_MESSAGE_TEXT_H
 

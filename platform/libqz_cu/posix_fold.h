@@ -1,5 +1,4 @@
-// Letter case by the rules of the POSIX locale, inline: for loops over many strings that cannot afford a call
-// for each.
+// Letter case by the rules of the POSIX locale, inline: for loops over many strings that cannot afford calls.
 #ifndef QZ_CU_POSIX_FOLD_H
 #define QZ_CU_POSIX_FOLD_H
 
@@ -34,8 +33,7 @@ inline std::uint64_t load8(const char *at) {
     return word;
 }
 
-// Orders two runs of n bytes without regard to case, NUL bytes being bytes like any other: below, equal to or
-// above 0.
+// Orders two runs of n bytes without regard to case, NUL being a byte like any other: below 0, 0 or above 0.
 inline int fold_compare(const char *a, const char *b, std::size_t n) {
     for (; n >= 8; a += 8, b += 8, n -= 8) {
         const std::uint64_t left = fold8(load8(a));

@@ -2,9 +2,7 @@
 #include "libqz_cu/posix_fold.h"
 #include "qz/cu.h"
 
-int cu_strcasecmp_posix_1(const char *a, const char *b) {
-    return qz::fold_compare(a, b);
-}
+int cu_strcasecmp_posix_1(const char *a, const char *b) { return qz::fold_compare(a, b); }
 
 int cu_strncasecmp_posix_1(const char *a, const char *b, size_t n) {
     for (; n != 0; ++a, ++b, --n) {
@@ -18,6 +16,4 @@ int cu_strncasecmp_posix_1(const char *a, const char *b, size_t n) {
     return 0;
 }
 
-int cu_tolower_posix_1(int c) {
-    return c >= 'A' && c <= 'Z' ? c + ('a' - 'A') : c;
-}
+int cu_tolower_posix_1(int c) { return c >= 'A' && c <= 'Z' ? c + ('a' - 'A') : c; }

@@ -1,5 +1,5 @@
-// The messages of the library and the command, each declared once with the types of its arguments. Recording a
-// message with other arguments does not compile, nor does a declaration that its text contradicts.
+// The messages of the library and the command, each declared once with the types of its arguments. Recording
+// a message with other arguments does not compile, nor does a declaration that its text contradicts.
 #ifndef QZ_MESSAGES_H
 #define QZ_MESSAGES_H
 
@@ -9,7 +9,8 @@
 
 namespace qz::msg {
 
-// The conversion letter of a position such as "%2$d" or "0x%1$08x": 0 when the text does not mention the position,
+// The conversion letter of a position such as "%2$d" or "0x%1$08x": 0 when the text does not mention the
+// position,
 // '!' when it mentions it with different letters.
 constexpr char conversion_of(std::string_view text, std::size_t position) {
     char found = 0;
@@ -92,7 +93,8 @@ inline constexpr message<144, int, const char *, const char *> duplicate_acle;
 inline constexpr message<160, int> duplicate_single_acle;
 inline constexpr message<161, int, const char *> duplicate_group;
 
-// Compiled buffers. The last two arguments of a located message are the source path and the line of the check.
+// Compiled buffers. The last two arguments of a located message are the source path and the line of the
+// check.
 inline constexpr message<93> acl_corrupted;
 inline constexpr message<96> not_an_acl_buffer;
 inline constexpr message<97, const char *, int> buffer_corrupted;

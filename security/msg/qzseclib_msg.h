@@ -1,6 +1,6 @@
-// The default texts of message set 1 of the catalog qzseclib.cat: one list in the order of the message ids, one
-// source line for each line of text, so that a line feed is never lost unseen. The table, the catalog source for
-// translators and the checks of every message's arguments are all made from this list.
+// The default texts of message set 1 of the catalog qzseclib.cat: one list in the order of the message ids,
+// one source line for each line of text, so that a line feed is never lost unseen. The table, the catalog
+// source for translators and the checks of every message's arguments are all made from this list.
 #ifndef QZSECLIB_MSG_H
 #define QZSECLIB_MSG_H
 

@@ -31,7 +31,8 @@ void write_quoted(std::string_view text) {
 } // namespace
 
 int main() {
-    std::printf("$ Messages of the ACL library and its checker. The conversions (%%1$s and the like) of a text must stay;\n"
+    std::printf("$ Messages of the ACL library and its checker. The conversions (%%1$s and the like) of a "
+                "text must stay;\n"
                 "$ their order may change. A text whose conversions differ is not used.\n"
                 "$set %d\n$quote \"\n",
                 qz::msg::catalog_set);

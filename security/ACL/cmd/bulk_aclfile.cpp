@@ -1,5 +1,5 @@
-// The check of one ACL file: vet it, read it whole, parse every line, collect the entries, and cache what they compile
-// to.
+// The check of one ACL file: vet it, read it whole, parse every line, collect the entries, and cache what
+// they compile to.
 #include "bulk_aclfile.h"
 
 #include "owned.h"
@@ -72,8 +72,8 @@ void warn_of_skipped_cache(unsigned flags) {
     aclfck__print_error();
 }
 
-// Collects the entries of every line. Returns the failure that ends the check; failures that are passed over clear
-// `is_clean` instead.
+// Collects the entries of every line. Returns the failure that ends the check; failures that are passed over
+// clear `is_clean` instead.
 int read_entries(file_contents &contents, unsigned flags, sec_acltree_array &trees, bool &is_clean) {
     constexpr int line_consumed = 1;
     const bool goes_on = (flags & ACLFCK_OPT_CONTINUE) != 0;

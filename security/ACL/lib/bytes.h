@@ -1,5 +1,5 @@
-// The one reader of bytes that somebody else made and the one writer of ours. Every step of the reader is checked
-// as "wanted is at most what is left"; nothing adds two lengths and hopes.
+// The one reader of bytes that somebody else made and the one writer of ours. Every step of the reader is
+// checked as "wanted is at most what is left"; nothing adds two lengths and hopes.
 #ifndef QZ_BYTES_H
 #define QZ_BYTES_H
 
@@ -55,7 +55,8 @@ private:
 // Walks over bytes of the other byte order, turning each field it is asked for into host order in place.
 class byte_swapper {
 public:
-    explicit byte_swapper(std::span<unsigned char> bytes) : at_(bytes.data()), end_(bytes.data() + bytes.size()) {}
+    explicit byte_swapper(std::span<unsigned char> bytes)
+        : at_(bytes.data()), end_(bytes.data() + bytes.size()) {}
 
     const unsigned char *position() const { return at_; }
 
@@ -93,7 +94,8 @@ private:
 // Fills memory that was measured beforehand; what would not fit is not written and makes the writer failed.
 class byte_writer {
 public:
-    explicit byte_writer(std::span<unsigned char> memory) : at_(memory.data()), end_(memory.data() + memory.size()) {}
+    explicit byte_writer(std::span<unsigned char> memory)
+        : at_(memory.data()), end_(memory.data() + memory.size()) {}
 
     std::size_t left() const { return static_cast<std::size_t>(end_ - at_); }
     // True when exactly the measured size was written.
@@ -119,8 +121,8 @@ private:
     bool failed_ = false;
 };
 
-// A field in host byte order at an offset that was found by a reader or fixed by the format, over bytes that are
-// held writable.
+// A field in host byte order at an offset that was found by a reader or fixed by the format, over bytes that
+// are held writable.
 template <class Field>
 void store_field(std::span<unsigned char> bytes, std::size_t offset, Field value) {
     if (offset <= bytes.size() && sizeof(Field) <= bytes.size() - offset)

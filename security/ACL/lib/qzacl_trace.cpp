@@ -12,9 +12,7 @@ constexpr tr_category_t acl__trace_categories[qz::trace_category_count] = {
 };
 
 // The levels of the Perf category at which registration leaves a record of it.
-bool perf_level_is_recorded(unsigned level) {
-    return (level >= 1 && level <= 4) || level == 7 || level == 8;
-}
+bool perf_level_is_recorded(unsigned level) { return (level >= 1 && level <= 4) || level == 7 || level == 8; }
 
 } // namespace
 
@@ -22,17 +20,16 @@ int acl__trace_register_component() {
     // Whoever reached the first trace point must find its recorded error as it left it.
     cu_error_t *error = nullptr;
     const int saved = cu_get_error_1(&error);
-    const int result = tr_register_component_1(qz::trace_component, acl__trace_detail_levels, acl__trace_categories,
-                                               qz::trace_category_count);
+    const int result = tr_register_component_1(qz::trace_component, acl__trace_detail_levels,
+                                               acl__trace_categories, qz::trace_category_count);
     if (saved == 0) {
         static_cast<void>(cu_pset_error_1(error));
         cu_rel_error_1(error);
     }
     static_cast<void>(cu_get_procspeed_1(&timeinfo));
 
-    const std::uint32_t level =
-        __atomic_load_n(&acl__trace_detail_levels[static_cast<std::size_t>(qz::trace_category::perf)],
-                        __ATOMIC_RELAXED);
+    const std::uint32_t level = __atomic_load_n(
+        &acl__trace_detail_levels[static_cast<std::size_t>(qz::trace_category::perf)], __ATOMIC_RELAXED);
     if (perf_level_is_recorded(level))
         qz::trace_data(0, qz::number(level));
     return result;

@@ -1,5 +1,5 @@
-// Trace points of the library: registration, the level tests, and the records of operations and timings. A point
-// that is switched off costs a once-guard and a comparison of one byte; nothing is measured for it.
+// Trace points of the library: registration, the level tests, and the records of operations and timings. A
+// point that is switched off costs a once-guard and a comparison of one byte; nothing is measured for it.
 #ifndef QZACL_TRACE_H
 #define QZACL_TRACE_H
 
@@ -64,7 +64,8 @@ template <class... Items>
 void trace_data(int id, const Items &...items) {
     std::apply(
         [id](auto... pairs) {
-            static_cast<void>(tr_record_data_1(trace_component, id, static_cast<int>(sizeof...(Items)), pairs...));
+            static_cast<void>(
+                tr_record_data_1(trace_component, id, static_cast<int>(sizeof...(Items)), pairs...));
         },
         std::tuple_cat(std::make_tuple(items.address, items.length)...));
 }
@@ -79,7 +80,8 @@ void trace_entry(int entry, const Record &record) {
         record();
 }
 
-// The exit point of an operation whose success has a data record of its own, numbered two above the exit point.
+// The exit point of an operation whose success has a data record of its own, numbered two above the exit
+// point.
 template <class Record>
 void trace_exit(int exit, int result, const Record &success) {
     const unsigned level = trace_level(trace_category::api);

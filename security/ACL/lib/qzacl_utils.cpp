@@ -79,7 +79,8 @@ int read_file(const char *file_name, int fd, file_text &file) {
         const int error = errno;
         if (qz::traces(qz::trace_category::info))
             qz::trace_data(127, qz::item(file_name), qz::number(size), qz::number(count));
-        return qz::report(SEC_S_FILE_ERROR, qz::msg::short_read, qz::shown_size(count), qz::shown_size(size), error);
+        return qz::report(SEC_S_FILE_ERROR, qz::msg::short_read, qz::shown_size(count), qz::shown_size(size),
+                          error);
     }
     file.text[size] = '\0';
     file.length = size;
@@ -110,7 +111,8 @@ int acl__convert_to_utf8(const char *in, const std::size_t *in_length, char **ou
     return convert("acl__convert_to_utf8", acl__to_utf8_hdl, in, in_length, out, out_length);
 }
 
-int acl__convert_from_utf8(const char *in, const std::size_t *in_length, char **out, std::size_t *out_length) {
+int acl__convert_from_utf8(const char *in, const std::size_t *in_length, char **out,
+                           std::size_t *out_length) {
     pthread_once(&acl__init_from_utf8_once_block, acl__init_from_utf8_handle);
     return convert("acl__convert_from_utf8", acl__from_utf8_hdl, in, in_length, out, out_length);
 }

@@ -9,25 +9,27 @@
 
 namespace qz {
 
-// Opens a file that was vetted by its name, so that whoever exchanges it in between gains nothing: the descriptor
-// must show the same regular file. Returns an empty descriptor with errno set, to ESTALE for another file. A file
-// that turned into a FIFO or a terminal neither blocks nor becomes the controlling one.
+// Opens a file that was vetted by its name, so that whoever exchanges it in between gains nothing: the
+// descriptor must show the same regular file. Returns an empty descriptor with errno set, to ESTALE for
+// another file. A file that turned into a FIFO or a terminal neither blocks nor becomes the controlling one.
 descriptor open_vetted(const char *path, int access, const struct stat &vetted);
 
 } // namespace qz
 
-// Convert the `*in_length` bytes at `in`, the terminating NUL included, into a new string that the caller frees.
-// Both return SEC_S_OK, or record an error and return SEC_S_CODESET, SEC_S_NO_MEMORY or SEC_S_INTERNAL, leaving
+// Convert the `*in_length` bytes at `in`, the terminating NUL included, into a new string that the caller
+// frees. Both return SEC_S_OK, or record an error and return SEC_S_CODESET, SEC_S_NO_MEMORY or
+// SEC_S_INTERNAL, leaving
 // `*out` alone. Safe from several threads.
 int acl__convert_to_utf8(const char *in, const std::size_t *in_length, char **out, std::size_t *out_length);
 int acl__convert_from_utf8(const char *in, const std::size_t *in_length, char **out, std::size_t *out_length);
 
-// The lock hook of every file that is read (mode 1) or about to be replaced (mode 2). No lock is taken; any result
-// but 0 would make the caller close the file and return that result.
+// The lock hook of every file that is read (mode 1) or about to be replaced (mode 2). No lock is taken; any
+// result but 0 would make the caller close the file and return that result.
 int acl__lock_acl_file(const char *file_name, int fd, int mode);
 
-// Reads the whole file into a new block of its size and a NUL, with one read. An empty file gives a null block and
-// length 0. On failure records an error, returns SEC_S_FILE_ERROR or SEC_S_NO_MEMORY, and hands out nothing.
+// Reads the whole file into a new block of its size and a NUL, with one read. An empty file gives a null
+// block and length 0. On failure records an error, returns SEC_S_FILE_ERROR or SEC_S_NO_MEMORY, and hands out
+// nothing.
 int acl__read_acl_file(const char *file_name, int fd, char **text, std::size_t *length);
 
 #endif

@@ -1,8 +1,9 @@
-// The byte format of a compiled ACL, and the walk over its sub-ACLs and entries. No other file knows an offset.
+// The byte format of a compiled ACL, and the walk over its sub-ACLs and entries: the one file that knows an
+// offset.
 //
 //   Header             0  1  buffer type, 0x85
 //                      1  1  version, 1
-//                      2  1  byte order: 2 when the fields below are in host order, anything else when they are not
+//                      2  1  byte order: 2 when all fields are in host order, anything else when not
 //                      3  2  number of sub-ACLs
 //
 //   Sub-ACL            0  4  its length: this header, the mechanism and the entries
@@ -16,7 +17,8 @@
 //                      5  2  bytes of the identity with its NUL; 0 for types 1 and 2
 //                      7     identity
 //
-// Records follow each other without padding. One user entry, mechanism abcd, identity xyz, mask 3, takes 31 bytes:
+// Records follow each other without padding. One user entry, mechanism abcd, identity xyz, mask 3, takes
+// 31 bytes:
 //
 //   85 01 02 01 00 | 1a 00 00 00  04  01 00 00 00  05  61 62 63 64 00 | 01  03 00 00 00  04 00  78 79 7a 00
 #ifndef QZACL_BUFFER_FORMAT_H
@@ -176,7 +178,8 @@ inline void write_subacl_header(byte_writer &writer, const subacl &head) {
 }
 
 // Writes an entry; `identity_size` counts the NUL, and is 0 for an entry without identity.
-inline void write_entry(byte_writer &writer, std::uint32_t perm_mask, const char *identity, std::size_t identity_size) {
+inline void write_entry(byte_writer &writer, std::uint32_t perm_mask, const char *identity,
+                        std::size_t identity_size) {
     writer.field(entry_version);
     writer.field(perm_mask);
     writer.field(static_cast<std::uint16_t>(identity_size));

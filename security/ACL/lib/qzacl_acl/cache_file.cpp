@@ -17,8 +17,8 @@ namespace {
 
 constexpr mode_t permission_bits = 07777;
 
-// A file under a name that this call made. It is removed at the end of the scope unless it was kept, and only while
-// the name still leads to the file that is held open.
+// A file under a name that this call made. It is removed at the end of the scope unless it was kept, and only
+// while the name still leads to the file that is held open.
 class made_file {
 public:
     made_file(const char *name, qz::descriptor file) : name_(name), file_(std::move(file)) {}
@@ -57,8 +57,9 @@ int check_existing(const char *aclfname, const char *cache_name, const struct st
                    const struct stat &cache_status) {
     if (cache_status.st_uid != acl_status.st_uid || cache_status.st_gid != acl_status.st_gid) {
         if (qz::traces(qz::trace_category::errors))
-            qz::trace_data(111, qz::item(cache_name), qz::number(cache_status.st_uid), qz::number(cache_status.st_gid),
-                           qz::number(acl_status.st_uid), qz::number(acl_status.st_gid));
+            qz::trace_data(111, qz::item(cache_name), qz::number(cache_status.st_uid),
+                           qz::number(cache_status.st_gid), qz::number(acl_status.st_uid),
+                           qz::number(acl_status.st_gid));
         return qz::report(SEC_S_FILE_ERROR, qz::msg::cache_owner_differs, aclfname);
     }
     if (cache_status.st_mode != acl_status.st_mode) {
@@ -71,8 +72,8 @@ int check_existing(const char *aclfname, const char *cache_name, const struct st
     return SEC_S_OK;
 }
 
-// Creates the temporary file under the ACL file's name, a '.', and groups of four digits, one more for each name that
-// is taken. On failure `name` is the one that could not be had.
+// Creates the temporary file under the ACL file's name, a '.', and groups of four digits, one more for each
+// name that is taken. On failure `name` is the one that could not be had.
 qz::descriptor create_temporary(const char *aclfname, qz::path_buffer &name) {
     constexpr std::size_t digits = 4;
     std::size_t length = std::strlen(aclfname);
@@ -90,7 +91,8 @@ qz::descriptor create_temporary(const char *aclfname, qz::path_buffer &name) {
             continue;
         if (errno != ENOENT)
             return {};
-        qz::descriptor file(open(name.text, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC | O_NOCTTY, 0));
+        qz::descriptor file(
+            open(name.text, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC | O_NOCTTY, 0));
         // Somebody may have taken the name since, or a link that leads nowhere stands under it.
         if (file || errno != EEXIST)
             return file;
@@ -98,7 +100,8 @@ qz::descriptor create_temporary(const char *aclfname, qz::path_buffer &name) {
     return {};
 }
 
-// Writes the buffer and gives the file its time, so that both are on disk before the file gets its final name.
+// Writes the buffer and gives the file its time, so that both are on disk before the file gets its final
+// name.
 int write_buffer(int fd, const sec_acl_buffer_t &acl, const timespec &text_time) {
     const timespec times[2] = {text_time, text_time};
     errno = 0;
@@ -138,7 +141,8 @@ timespec file_clock() {
 
 } // namespace qz
 
-int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, int force, const timespec &text_time) {
+int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, int force,
+                         const timespec &text_time) {
     constexpr int lock_for_replacing = 2;
     if (acl->length == 0) {
         if (qz::trace_level(qz::trace_category::info) == 1)
@@ -181,7 +185,8 @@ int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, int 
         return cannot_open(cache_name.text);
     if (!is_new)
         placeholder.keep();
-    if (const int result = acl__lock_acl_file(cache_name.text, placeholder.fd(), lock_for_replacing); result != 0)
+    if (const int result = acl__lock_acl_file(cache_name.text, placeholder.fd(), lock_for_replacing);
+        result != 0)
         return result;
 
     qz::path_buffer temporary_name;

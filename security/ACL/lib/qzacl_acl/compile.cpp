@@ -45,7 +45,8 @@ void write(qz::byte_writer &writer, const measured_subacl &subacl) {
             __builtin_prefetch(subacl.nodes[index + ahead]);
         const sec_acle_t &acle = *subacl.nodes[index];
         if (acle.type != 0)
-            format::write_entry(writer, acle.perm_mask, acle.identity, has_identity ? std::strlen(acle.identity) + 1 : 0);
+            format::write_entry(writer, acle.perm_mask, acle.identity,
+                                has_identity ? std::strlen(acle.identity) + 1 : 0);
     }
 }
 

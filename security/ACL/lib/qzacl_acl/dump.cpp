@@ -1,5 +1,5 @@
-// Readable printing of entries, trees and buffers. Every line is a message of the catalog, recorded, printed and
-// cleared; nothing stays recorded behind it.
+// Readable printing of entries, trees and buffers. Every line is a message of the catalog, recorded, printed
+// and cleared; nothing stays recorded behind it.
 #include "qzacl_acl/dump.h"
 
 #include "owned.h"
@@ -24,7 +24,6 @@ void print_and_clear(std::FILE *stream, const char *ending) {
     cu_set_no_error_1();
 }
 
-
 void dump_subacl(qz::byte_span bytes, const char *indentation) {
     qz::byte_reader reader(bytes);
     format::subacl head;
@@ -36,8 +35,8 @@ void dump_subacl(qz::byte_span bytes, const char *indentation) {
         print_and_clear(stdout, as_it_stands);
         return;
     }
-    qz::report(SEC_S_ADVISORY, qz::msg::dump_subacl, indentation, indentation, qz::shown_size(head.length), head.type,
-               mechanism, qz::shown_size(head.entry_count));
+    qz::report(SEC_S_ADVISORY, qz::msg::dump_subacl, indentation, indentation, qz::shown_size(head.length),
+               head.type, mechanism, qz::shown_size(head.entry_count));
     print_and_clear(stderr, with_empty_line);
 
     sec_acltree_t *tree = nullptr;

@@ -1,9 +1,9 @@
-// Adding entries to a compiled buffer and deleting them from it. An edit touches the sub-ACL of the entry's key and
-// no other.
+// Adding entries to a compiled buffer and deleting them from it. An edit touches the sub-ACL of the entry's
+// key and no other.
 //
-// The plain way expands that sub-ACL into a tree, changes the tree and compiles it again. Where the stored entries
-// already are what compiling such a tree gives, well-formed and in ascending order, the bytes of the one entry are
-// changed in place instead: the result is the same, without a second copy of the sub-ACL.
+// The plain way expands that sub-ACL into a tree, changes the tree and compiles it again. Where the stored
+// entries already are what compiling such a tree gives, well-formed and in ascending order, the bytes of the
+// one entry are changed in place instead: the result is the same, without a second copy of the sub-ACL.
 #include "owned.h"
 #include "qzacl_acl/buffer.h"
 #include "qzacl_acl/buffer_format.h"
@@ -35,7 +35,8 @@ int check_entry(const sec_acle_t &acle) {
 }
 
 int check_header(const sec_acl_buffer_t &acl) {
-    // What of the header the length does not cover counts as wrong in no way of its own, but as bytes that are missing.
+    // What of the header the length does not cover counts as wrong in no way of its own, but as bytes that
+    // are missing.
     qz::byte_reader reader(format::bytes_of(acl));
     std::uint8_t type = format::buffer_type;
     std::uint8_t version = format::buffer_version;
@@ -67,8 +68,9 @@ void set_subacl_count(const sec_acl_buffer_t &acl, std::size_t count) {
     qz::store_field(writable(acl), format::count_offset, static_cast<std::uint16_t>(count));
 }
 
-// Replaces `old_size` bytes at `offset` by a gap of `new_size` bytes, which the caller fills. On failure nothing has
-// changed when the buffer was to grow; when it was to shrink it did, and only the memory was not given back.
+// Replaces `old_size` bytes at `offset` by a gap of `new_size` bytes, which the caller fills. On failure
+// nothing has changed when the buffer was to grow; when it was to shrink it did, and only the memory was not
+// given back.
 int make_gap(sec_acl_buffer_t &acl, std::size_t offset, std::size_t old_size, std::size_t new_size,
              const char *function) {
     const auto length = static_cast<std::size_t>(acl.length);
@@ -119,9 +121,10 @@ struct packed_place {
     std::size_t size = 0;   // of the entry found there, 0 when the identity is not among them
 };
 
-// Looks for an identity in a user or group sub-ACL. False unless the bytes are exactly what compiling a tree of these
-// entries gives: only then does changing one entry's bytes give what the plain way would.
-bool find_packed(qz::byte_span subacl, const format::subacl &head, const char *identity, packed_place &place) {
+// Looks for an identity in a user or group sub-ACL. False unless the bytes are exactly what compiling a tree
+// of these entries gives: only then does changing one entry's bytes give what the plain way would.
+bool find_packed(qz::byte_span subacl, const format::subacl &head, const char *identity,
+                 packed_place &place) {
     if ((head.type != SEC_ACLE_USER && head.type != SEC_ACLE_GROUP) || head.entry_count == 0)
         return false;
     if (head.type == SEC_ACLE_USER &&
@@ -158,18 +161,20 @@ bool find_packed(qz::byte_span subacl, const format::subacl &head, const char *i
     return reader.left() == 0;
 }
 
-void store_subacl_size(const sec_acl_buffer_t &acl, const stored_subacl &stored, std::size_t length, std::uint32_t count) {
+void store_subacl_size(const sec_acl_buffer_t &acl, const stored_subacl &stored, std::size_t length,
+                       std::uint32_t count) {
     qz::store_field(writable(acl), stored.offset, static_cast<std::uint32_t>(length));
     qz::store_field(writable(acl), stored.offset + format::subacl_count_offset, count);
 }
 
 // Adds to packed entries. The identity is known to fit the format.
-int add_packed(const sec_acle_t &acle, int report_duplicates, const stored_subacl &stored, const packed_place &place,
-               sec_acl_buffer_t &acl) {
+int add_packed(const sec_acle_t &acle, int report_duplicates, const stored_subacl &stored,
+               const packed_place &place, sec_acl_buffer_t &acl) {
     if (place.size != 0) {
         if (report_duplicates != 0)
             return sec__report_duplicate(&acle);
-        qz::store_field(writable(acl), stored.offset + place.offset + format::entry_mask_offset, acle.perm_mask);
+        qz::store_field(writable(acl), stored.offset + place.offset + format::entry_mask_offset,
+                        acle.perm_mask);
         sec__trace_replacement(&acle);
         return SEC_S_OK;
     }
@@ -184,8 +189,10 @@ int add_packed(const sec_acle_t &acle, int report_duplicates, const stored_subac
     return SEC_S_OK;
 }
 
-// Puts what a changed tree compiled to in the place of the stored sub-ACL, or behind all others when there was none.
-int splice(const qz::loose_subacl &compiled, const stored_subacl &stored, const char *function, sec_acl_buffer_t &acl) {
+// Puts what a changed tree compiled to in the place of the stored sub-ACL, or behind all others when there
+// was none.
+int splice(const qz::loose_subacl &compiled, const stored_subacl &stored, const char *function,
+           sec_acl_buffer_t &acl) {
     const bool is_new = stored.start == nullptr;
     const std::size_t count = subacl_count(acl);
     const std::size_t offset = is_new ? static_cast<std::size_t>(acl.length) : stored.offset;
@@ -204,7 +211,8 @@ int splice(const qz::loose_subacl &compiled, const stored_subacl &stored, const 
     return result;
 }
 
-int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_subacl &stored, sec_acl_buffer_t &acl) {
+int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_subacl &stored,
+                sec_acl_buffer_t &acl) {
     sec_acltree_t *root = nullptr;
     if (stored.start != nullptr) {
         const int result = sec__subacl_to_acltree(format::bytes_from(acl, stored.start), &root);
@@ -219,7 +227,8 @@ int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_suba
     if (result != SEC_S_OK)
         return result;
     if (compiled.length == 0)
-        return qz::report(SEC_S_INTERNAL, qz::msg::internal_failure, qz::acl_source, __LINE__, SEC_S_INTERNAL);
+        return qz::report(SEC_S_INTERNAL, qz::msg::internal_failure, qz::acl_source, __LINE__,
+                          SEC_S_INTERNAL);
     return splice(compiled, stored, add_function, acl);
 }
 
@@ -310,7 +319,8 @@ int delete_checked(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
     packed_place place;
     if (qz::has_identity(acle->type) &&
         find_packed({stored.start, stored.head.length}, stored.head, acle->identity, place))
-        return place.size == 0 ? sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, acle) : delete_packed(stored, place, *acl);
+        return place.size == 0 ? sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, acle)
+                               : delete_packed(stored, place, *acl);
     return delete_by_tree(*acle, stored, *acl);
 }
 
@@ -321,8 +331,8 @@ void trace_arguments(int id, const sec_acle_t *acle, const sec_acl_buffer_t *acl
     const sec_acl_buffer_t shown = acl == nullptr ? sec_acl_buffer_t{} : *acl;
     qz::trace_data(id, qz::number(acle), qz::number(type), qz::number(mask),
                    qz::item(acle == nullptr ? nullptr : acle->mechanism),
-                   qz::item(acle == nullptr ? nullptr : acle->identity), qz::number(acl), qz::number(shown.length),
-                   qz::number(shown.data));
+                   qz::item(acle == nullptr ? nullptr : acle->identity), qz::number(acl),
+                   qz::number(shown.length), qz::number(shown.data));
 }
 
 int sec__add_acle_to_acl(int report_duplicates, const sec_acle_t *acle, sec_acl_buffer_t *acl) {
@@ -335,9 +345,13 @@ int sec__add_acle_to_acl(int report_duplicates, const sec_acle_t *acle, sec_acl_
 
 } // namespace
 
-int sec_add_acle_to_acl(const sec_acle_t *acle, sec_acl_buffer_t *acl) { return sec__add_acle_to_acl(0, acle, acl); }
+int sec_add_acle_to_acl(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
+    return sec__add_acle_to_acl(0, acle, acl);
+}
 
-int sec_add_acle_to_acl2(const sec_acle_t *acle, sec_acl_buffer_t *acl) { return sec__add_acle_to_acl(1, acle, acl); }
+int sec_add_acle_to_acl2(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
+    return sec__add_acle_to_acl(1, acle, acl);
+}
 
 int sec_del_acle_from_acl(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
     qz::trace_entry(65, [&] { trace_arguments(67, acle, acl); });

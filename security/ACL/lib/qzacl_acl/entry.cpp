@@ -62,8 +62,8 @@ int bad_identity(const char *identity) {
     return qz::report_bad_parameter("sec_create_acle", 4, qz::shown_pointer(identity));
 }
 
-// Creates an entry of a mechanism that names hosts: an IPv6 address behind the '@' is written in its one form, so
-// that different spellings of one address are one identity. Everything else stays as it is.
+// Creates an entry of a mechanism that names hosts: an IPv6 address behind the '@' is written in its one
+// form, so that different spellings of one address are one identity. Everything else stays as it is.
 int create_with_host(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
                      sec_acle_t **acle) {
     const char *at = std::strchr(identity, '@');
@@ -137,7 +137,8 @@ int display_checked(const sec_acle_t *acle, char **mechanism, char **identity) {
             return result;
     }
     text shown_identity;
-    if (const int result = converted(acl__convert_from_utf8, acle->identity, shown_identity); result != SEC_S_OK)
+    if (const int result = converted(acl__convert_from_utf8, acle->identity, shown_identity);
+        result != SEC_S_OK)
         return result;
     *mechanism = shown_mechanism.release();
     *identity = shown_identity.release();
@@ -170,8 +171,8 @@ int sec_create_acle(std::uint8_t type, std::uint32_t perm_mask, const char *mech
                     sec_acle_t **acle) {
     qz::trace_entry(40, [&] {
         const std::uint32_t shown_type = type;
-        qz::trace_data(42, qz::number(shown_type), qz::number(perm_mask), qz::item(mechanism), qz::item(identity),
-                       qz::number(acle));
+        qz::trace_data(42, qz::number(shown_type), qz::number(perm_mask), qz::item(mechanism),
+                       qz::item(identity), qz::number(acle));
     });
     cu_set_no_error_1();
     const int result = create_checked(type, perm_mask, mechanism, identity, acle);
@@ -190,8 +191,9 @@ int sec_display_acle_id(const sec_acle_t *acle, char **mechanism, char **identit
     });
     cu_set_no_error_1();
     const int result = display_checked(acle, mechanism, identity);
-    qz::trace_exit(52, result,
-                   [&] { qz::trace_data(54, qz::number(result), qz::item(*mechanism), qz::item(*identity)); });
+    qz::trace_exit(52, result, [&] {
+        qz::trace_data(54, qz::number(result), qz::item(*mechanism), qz::item(*identity));
+    });
     return result;
 }
 

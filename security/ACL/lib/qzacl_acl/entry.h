@@ -29,7 +29,7 @@ constexpr bool has_mechanism(unsigned type) { return type == SEC_ACLE_USER || ty
 constexpr bool has_identity(unsigned type) { return has_mechanism(type) || type == SEC_ACLE_GROUP; }
 
 // The letter of a type in an ACL file, always in lower case; '?' for a value that is no type.
-constexpr char type_letter(unsigned type) {
+constexpr int type_letter(unsigned type) {
     switch (type) {
     case SEC_ACLE_UNAUTHENTICATED:
         return 'n';
@@ -53,9 +53,9 @@ using owned_acle = std::unique_ptr<sec_acle_t, release_acle>;
 
 } // namespace qz
 
-// Makes an entry whose arguments were checked by the caller: a mechanism of at most 16 bytes for types 4 and 8, an
-// identity for types 4, 8 and 16. With `convert` non-zero both are converted to UTF-8. Returns SEC_S_OK with a new
-// entry in `*acle`, or the code of the failed allocation or conversion with null there.
+// Makes an entry whose arguments were checked by the caller: a mechanism of at most 16 bytes for types 4 and
+// 8, an identity for types 4, 8 and 16. With `convert` non-zero both are converted to UTF-8. Returns SEC_S_OK
+// with a new entry in `*acle`, or the code of the failed allocation or conversion with null there.
 int sec__create_acle(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
                      int convert, sec_acle_t **acle);
 

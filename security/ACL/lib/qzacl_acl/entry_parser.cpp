@@ -21,8 +21,8 @@ namespace {
 constexpr bool is_line_end(char c) { return c == '\n' || c == '\f' || c == '\r'; }
 constexpr bool is_blank(char c) { return c == ' ' || c == '\t' || c == '\v'; }
 
-// White space by the locale of the process. The class table is fetched once for a line, because one call for each
-// byte would cost more than all the rest of the parse.
+// White space by the locale of the process. The class table is fetched once for a line, because one call for
+// each byte would cost more than all the rest of the parse.
 class space_class {
 public:
 #ifdef __GLIBC__
@@ -35,8 +35,8 @@ private:
 #endif
 };
 
-// True when one of the eight bytes is a NUL or a line end. A byte of the difference is zero where it matches; the
-// borrow test may report a byte above a match, never miss one.
+// True when one of the eight bytes is a NUL or a line end. A byte of the difference is zero where it matches;
+// the borrow test may report a byte above a match, never miss one.
 bool may_end_line(std::uint64_t word) {
     constexpr std::uint64_t ones = 0x0101010101010101;
     constexpr std::uint64_t highs = 0x8080808080808080;
@@ -145,7 +145,8 @@ int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, sec_acle
     token permissions;
     if (!tokens.next(permissions))
         return SEC_S_OK;
-    if (const int result = sec__translate_perms(permissions.text, &set, &entry.perm_mask); result != SEC_S_OK) {
+    if (const int result = sec__translate_perms(permissions.text, &set, &entry.perm_mask);
+        result != SEC_S_OK) {
         // The message about the letter gives way to the one that names the line.
         cu_set_no_error_1();
         qz::report(result, qz::msg::bad_permission_token, line, permissions.text);
@@ -159,8 +160,8 @@ int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, sec_acle
 
 } // namespace
 
-int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size_t *remaining, std::uint32_t *line,
-                             sec_acle_t *entry) {
+int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size_t *remaining,
+                             std::uint32_t *line, sec_acle_t *entry) {
     constexpr int line_consumed = 1;
     *entry = {};
     char *begin = *cursor;
@@ -178,7 +179,8 @@ int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size
             qz::trace_data(115, qz::number(*line), qz::number(length));
         result = qz::report(SEC_S_FILE_ERROR, qz::msg::line_too_long, shown_line);
     } else {
-        result = parse_line(line_tokens(begin, end), set == nullptr ? acl__default_perm_set : *set, shown_line, *entry);
+        result = parse_line(line_tokens(begin, end), set == nullptr ? acl__default_perm_set : *set,
+                            shown_line, *entry);
         // A NUL that is not the text's own end hides whatever follows it.
         if (result == SEC_S_OK && ends_at_nul && *remaining != length) {
             *cursor = nullptr;

@@ -1,5 +1,5 @@
-// Access decisions: which permissions a compiled ACL grants one party, or the groups of one. The buffer is read in
-// place, nothing is allocated, and the one lock is held only while a handler is looked up.
+// Access decisions: which permissions a compiled ACL grants one party, or the groups of one. The buffer is
+// read in place, nothing is allocated, and the one lock is held only while a handler is looked up.
 #include "libqz_cu/posix_fold.h"
 #include "qzacl_acl/buffer.h"
 #include "qzacl_acl/buffer_format.h"
@@ -23,7 +23,8 @@ int corrupt(int line) { return qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupt
 
 int check_buffer(const sec_acl_buffer_t &acl) {
     const qz::byte_span bytes = format::bytes_of(acl);
-    if (bytes.size() < format::order_offset || bytes[0] != format::buffer_type || bytes[1] != format::buffer_version)
+    if (bytes.size() < format::order_offset || bytes[0] != format::buffer_type ||
+        bytes[1] != format::buffer_version)
         return qz::report(SEC_S_BAD_ACL, qz::msg::not_an_acl_buffer);
     if (bytes.size() < format::header_size)
         return corrupt(__LINE__);
@@ -39,7 +40,8 @@ public:
     static constexpr int unordered = 2;
 
     explicit wanted_identity(const char *text) : text_(text) {
-        // The first word is padded with NULs; the bytes behind the wanted NUL do not take part in a comparison.
+        // The first word is padded with NULs; the bytes behind the wanted NUL do not take part in a
+        // comparison.
         const std::size_t size = strnlen(text, word_size);
         std::uint64_t word = 0;
         std::memcpy(&word, text, size);
@@ -47,8 +49,8 @@ public:
         first_size_ = std::min(size + 1, word_size);
     }
 
-    // Negative, zero or positive as the wanted identity sorts before, with or behind a stored one, of which `left`
-    // bytes from its start to the end of the buffer may be looked at.
+    // Negative, zero or positive as the wanted identity sorts before, with or behind a stored one, of which
+    // `left` bytes from its start to the end of the buffer may be looked at.
     int compare(qz::byte_span stored, std::size_t left) const {
         if constexpr (std::endian::native == std::endian::little) {
             if (left >= word_size) {
@@ -126,8 +128,8 @@ int evaluate_single_entry(const single_request &request, const format::subacl &h
     return SEC_S_OK;
 }
 
-// Asks a handler about each entry in turn. Whatever the handler recorded about an entry that does not match is its own
-// affair and is cleared.
+// Asks a handler about each entry in turn. Whatever the handler recorded about an entry that does not match
+// is its own affair and is cleared.
 int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler, bool is_sorted,
                         const format::subacl &head, qz::byte_reader entries, std::uint32_t &mask) {
     for (std::uint32_t left = head.entry_count; left != 0; --left) {
@@ -155,7 +157,8 @@ int evaluate_user(const single_request &request, const format::subacl &head, qz:
     for (std::uint32_t left = head.entry_count; left != 0; --left) {
         format::entry entry;
         std::uint16_t identity_length = 0;
-        if (!entries.field(entry.version) || !entries.field(entry.perm_mask) || !entries.field(identity_length))
+        if (!entries.field(entry.version) || !entries.field(entry.perm_mask) ||
+            !entries.field(identity_length))
             return corrupt(__LINE__);
         const std::size_t bytes_left = entries.left();
         if (!entries.bytes(identity_length, entry.identity))
@@ -217,8 +220,9 @@ int evaluate_single(const sec_acl_buffer_t *acl, single_request &request, const 
 
 // Evaluates some of the requester's groups with one pass over the entries.
 //
-// A group's walk goes up to the first entry that does not sort before it, and that entry decides. So the groups are
-// taken in ascending order: while one waits, every entry that passed sorts before it and thus before all behind it.
+// A group's walk goes up to the first entry that does not sort before it, and that entry decides. So the
+// groups are taken in ascending order: while one waits, every entry that passed sorts before it and thus
+// before all behind it.
 class group_batch {
 public:
     static constexpr std::size_t capacity = 64;
@@ -234,7 +238,8 @@ public:
         for (std::uint32_t left = head.entry_count; left != 0 && waiting != count_; --left) {
             format::entry entry;
             std::uint16_t identity_length = 0;
-            if (!entries.field(entry.version) || !entries.field(entry.perm_mask) || !entries.field(identity_length))
+            if (!entries.field(entry.version) || !entries.field(entry.perm_mask) ||
+                !entries.field(identity_length))
                 return corrupt(__LINE__);
             const std::size_t bytes_left = entries.left();
             if (!entries.bytes(identity_length, entry.identity))
@@ -307,8 +312,8 @@ int sec__single_acle_perm(const sec_acl_buffer_t *acl, std::uint8_t type, const 
     qz::trace_entry(79, [&] {
         const sec_acl_buffer_t shown = acl == nullptr ? sec_acl_buffer_t{} : *acl;
         const std::uint32_t shown_type = type;
-        qz::trace_data(81, qz::number(acl), qz::number(shown.length), qz::number(shown.data), qz::number(shown_type),
-                       qz::item(mechanism), qz::item(identity), qz::number(mask));
+        qz::trace_data(81, qz::number(acl), qz::number(shown.length), qz::number(shown.data),
+                       qz::number(shown_type), qz::item(mechanism), qz::item(identity), qz::number(mask));
     });
     cu_set_no_error_1();
     pthread_once(&acl__init_once_block, acl__state_init);
@@ -331,8 +336,8 @@ int sec__group_acles_perm(const sec_acl_buffer_t *acl, std::int32_t count, const
                           std::uint32_t *mask) {
     qz::trace_entry(85, [&] {
         const sec_acl_buffer_t shown = acl == nullptr ? sec_acl_buffer_t{} : *acl;
-        qz::trace_data(87, qz::number(acl), qz::number(shown.length), qz::number(shown.data), qz::number(count),
-                       qz::number(groups), qz::number(mask));
+        qz::trace_data(87, qz::number(acl), qz::number(shown.length), qz::number(shown.data),
+                       qz::number(count), qz::number(groups), qz::number(mask));
     });
     cu_set_no_error_1();
     pthread_once(&acl__init_once_block, acl__state_init);

@@ -11,7 +11,8 @@
 
 namespace {
 
-// True when a directory, a separator and a name fit into a path; the separator counts even where none is needed.
+// True when a directory, a separator and a name fit into a path; the separator counts even where none is
+// needed.
 bool fits(std::size_t directory_length, std::size_t name_length) {
     return directory_length + 1 <= qz::path_max && name_length <= qz::path_max - (directory_length + 1);
 }

@@ -16,12 +16,12 @@ struct path_buffer {
 
 } // namespace qz
 
-// Looks a user up. Returns SEC_S_OK with the id and the home directory, of which no more is copied than a path may
-// hold; or SEC_S_UNKNOWN_USER or SEC_S_NO_MEMORY.
+// Looks a user up. Returns SEC_S_OK with the id and the home directory, of which no more is copied than a
+// path may hold; or SEC_S_UNKNOWN_USER or SEC_S_NO_MEMORY.
 int sec__get_user_info(const char *username, std::uint32_t *uid, qz::path_buffer &home);
 
-// Makes the full path of an ACL file: in the user's home directory when `username` is given, which also sets `*uid`,
-// else an absolute name as it stands or one relative to the current directory. Returns SEC_S_OK,
+// Makes the full path of an ACL file: in the user's home directory when `username` is given, which also sets
+// `*uid`, else an absolute name as it stands or one relative to the current directory. Returns SEC_S_OK,
 // SEC_S_BAD_PARAMETER, SEC_S_NO_MEMORY, SEC_S_UNKNOWN_USER or SEC_S_BAD_FILENAME.
 int sec__get_aclfname(const char *aclfname, const char *username, qz::path_buffer &path, std::uint32_t *uid);
 

@@ -56,7 +56,8 @@ int register_checked(std::uint32_t kind, const char *mechanism, sec_id_compare_f
 } // namespace
 
 int sec__register_id_handler(std::uint32_t kind, const char *mechanism, sec_id_compare_fn handler) {
-    qz::trace_entry(74, [&] { qz::trace_data(76, qz::number(kind), qz::item(mechanism), qz::number(handler)); });
+    qz::trace_entry(74,
+                    [&] { qz::trace_data(76, qz::number(kind), qz::item(mechanism), qz::number(handler)); });
     cu_set_no_error_1();
     pthread_once(&acl__init_once_block, acl__state_init);
     const int result = register_checked(kind, mechanism, handler);

@@ -36,8 +36,8 @@ std::size_t common_prefix(std::span<sec_acle_t *const> acles) {
     for (const sec_acle_t *acle : acles) {
         std::size_t same = 0;
         while (same < prefix) {
-            const std::uint64_t difference =
-                in_byte_order(folded_word(first, same / word_size) ^ folded_word(acle->identity, same / word_size));
+            const std::uint64_t difference = in_byte_order(folded_word(first, same / word_size) ^
+                                                           folded_word(acle->identity, same / word_size));
             if (difference != 0) {
                 same += static_cast<std::size_t>(std::countl_zero(difference)) / 8;
                 break;
@@ -72,8 +72,8 @@ bool sorts_before(const keyed_acle &a, const keyed_acle &b) {
 // Below this many elements comparing costs less than counting digits.
 constexpr std::size_t comparison_sort_max = 48;
 
-// Distributes by one byte of the key after the other, the highest first, between the two arrays; the recursion is
-// as deep as a key has bytes. The result always ends in `elements`.
+// Distributes by one byte of the key after the other, the highest first, between the two arrays; the
+// recursion is as deep as a key has bytes. The result always ends in `elements`.
 void sort_keyed(std::span<keyed_acle> elements, std::span<keyed_acle> scratch, unsigned shift) {
     if (elements.size() <= comparison_sort_max || shift >= 64) {
         std::sort(elements.begin(), elements.end(), sorts_before);
@@ -97,7 +97,8 @@ void sort_keyed(std::span<keyed_acle> elements, std::span<keyed_acle> scratch, u
     for (std::size_t value = 0; value < ends.size(); ++value) {
         const std::size_t size = ends[value] - starts[value];
         if (size > 1)
-            sort_keyed(elements.subspan(starts[value], size), scratch.subspan(starts[value], size), shift + 8);
+            sort_keyed(elements.subspan(starts[value], size), scratch.subspan(starts[value], size),
+                       shift + 8);
     }
 }
 

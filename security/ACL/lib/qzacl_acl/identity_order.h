@@ -1,7 +1,7 @@
 // Identities laid out for quick comparison, and sorting them. Case folds as in the POSIX locale everywhere.
 //
-// An identity held by a tree starts at a multiple of eight bytes and is padded with NULs to the next, so that it can
-// be folded, hashed and compared eight bytes at a time without looking outside its own memory.
+// An identity held by a tree starts at a multiple of eight bytes and is padded with NULs to the next, so that
+// it can be folded, hashed and compared eight bytes at a time without looking outside its own memory.
 #ifndef QZACL_IDENTITY_ORDER_H
 #define QZACL_IDENTITY_ORDER_H
 
@@ -52,9 +52,9 @@ struct keyed_acle {
     sec_acle_t *acle;
 };
 
-// Sorts entries, whose identities are padded and no two equal, in ascending order of identity. Both scratch arrays
-// hold as many elements as there are entries. Takes O(n log n) comparisons whatever the order of input, and a
-// bounded depth of stack.
+// Sorts entries, whose identities are padded and no two equal, in ascending order of identity. Both scratch
+// arrays hold as many elements as there are entries. Takes O(n log n) comparisons whatever the order of
+// input, and a bounded depth of stack.
 void sort_by_identity(std::span<sec_acle_t *> acles, keyed_acle *scratch, keyed_acle *more_scratch);
 
 } // namespace qz

@@ -137,7 +137,8 @@ int sec_list_acl_by_type(const sec_acl_buffer_t *acl, std::uint8_t type, const c
     qz::trace_entry(28, [&] {
         const std::uint32_t shown_type = type;
         if (acl == nullptr)
-            qz::trace_data(30, qz::number(acl), qz::number(shown_type), qz::item(mechanism), qz::number(list));
+            qz::trace_data(30, qz::number(acl), qz::number(shown_type), qz::item(mechanism),
+                           qz::number(list));
         else
             qz::trace_data(32, qz::number(acl->length), qz::number(acl->data), qz::number(shown_type),
                            qz::item(mechanism), qz::number(list));

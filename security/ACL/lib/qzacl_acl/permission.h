@@ -19,12 +19,12 @@ inline std::span<const sec_perm_template_t> templates_of(const sec_perm_set_t &s
 
 } // namespace qz
 
-// ORs the bit of each character of `text` into `*mask`. Returns SEC_S_OK, or SEC_S_BAD_PERMISSION for the first
-// character without a template, the bits before it having been added.
+// ORs the bit of each character of `text` into `*mask`. Returns SEC_S_OK, or SEC_S_BAD_PERMISSION for the
+// first character without a template, the bits before it having been added.
 int sec__translate_perms(const char *text, const sec_perm_set_t *set, std::uint32_t *mask);
 
-// Writes the letters of the mask's bits in ascending order, and a NUL, into the 33 bytes at `out`. Returns SEC_S_OK,
-// or SEC_S_BAD_PERMISSION for the first bit without a template, after the letters below it.
+// Writes the letters of the mask's bits in ascending order, and a NUL, into the 33 bytes at `out`. Returns
+// SEC_S_OK, or SEC_S_BAD_PERMISSION for the first bit without a template, after the letters below it.
 int sec__translate_bitmask(std::uint32_t mask, const sec_perm_set_t *set, char *out);
 
 #endif

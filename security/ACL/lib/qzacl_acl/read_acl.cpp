@@ -33,7 +33,8 @@ struct file_bytes {
 class acl_file_reader {
 public:
     acl_file_reader(const char *username, const sec_perm_set_t *set, std::uint32_t flags)
-        : username_(username), set_(set), flags_(flags), perf_level_(qz::trace_level(qz::trace_category::perf)),
+        : username_(username), set_(set), flags_(flags),
+          perf_level_(qz::trace_level(qz::trace_category::perf)),
           start_(perf_level_ == 1 ? qz::read_counter() : 0) {}
 
     int read(const char *aclfname, sec_acl_buffer_t &out);
@@ -45,7 +46,7 @@ private:
     int vet(const char *aclfname);
     bool cache_is_current();
     bool read_cache(sec_acl_buffer_t &out);
-    int open_and_read(const vetted_file &file, file_bytes &bytes);
+    int open_and_read(const vetted_file &file, file_bytes &bytes) const;
     int read_text(sec_acl_buffer_t &out);
     int parse(file_bytes &text, sec_acl_buffer_t &out);
     int parse_lines(file_bytes &text, sec_acltree_array &trees);
@@ -97,15 +98,16 @@ bool acl_file_reader::cache_is_current() {
     if (cache_.status.st_uid != acl_.status.st_uid || cache_.status.st_gid != acl_.status.st_gid ||
         (cache_.status.st_mode & permission_bits) != (acl_.status.st_mode & permission_bits)) {
         if (is_traced)
-            qz::trace_data(120, qz::item(acl_.path.text), qz::number(acl_.status.st_uid), qz::number(acl_.status.st_gid),
-                           qz::number(cache_.status.st_uid), qz::number(cache_.status.st_gid),
-                           qz::number(acl_.status.st_mode), qz::number(cache_.status.st_mode));
+            qz::trace_data(120, qz::item(acl_.path.text), qz::number(acl_.status.st_uid),
+                           qz::number(acl_.status.st_gid), qz::number(cache_.status.st_uid),
+                           qz::number(cache_.status.st_gid), qz::number(acl_.status.st_mode),
+                           qz::number(cache_.status.st_mode));
         return false;
     }
     return true;
 }
 
-int acl_file_reader::open_and_read(const vetted_file &file, file_bytes &bytes) {
+int acl_file_reader::open_and_read(const vetted_file &file, file_bytes &bytes) const {
     constexpr int lock_for_reading = 1;
     const char *path = file.path.text;
     if (qz::traces(qz::trace_category::info))
@@ -163,8 +165,8 @@ int acl_file_reader::parse_lines(file_bytes &text, sec_acltree_array &trees) {
             return result;
         if (traces_lines) {
             const std::uint32_t type = entry.type;
-            qz::trace_data(114, qz::number(line_), qz::number(type), qz::item(entry.mechanism), qz::item(entry.identity),
-                           qz::number(entry.perm_mask));
+            qz::trace_data(114, qz::number(line_), qz::number(type), qz::item(entry.mechanism),
+                           qz::item(entry.identity), qz::number(entry.perm_mask));
         }
         if (entry.type == 0)
             continue;
@@ -193,7 +195,8 @@ int acl_file_reader::read_text(sec_acl_buffer_t &out) {
         return result;
     if (const int result = parse(text, out); result != SEC_S_OK)
         return result;
-    if ((flags_ & SEC_READ_ACL_CACHE) != 0 && sec__cache_aclbuffer(acl_.path.text, &out, 0, text_time) != SEC_S_OK) {
+    if ((flags_ & SEC_READ_ACL_CACHE) != 0 &&
+        sec__cache_aclbuffer(acl_.path.text, &out, 0, text_time) != SEC_S_OK) {
         // A cache that cannot be written is no failure of the read.
         cu_set_no_error_1();
         flags_ &= ~std::uint32_t{SEC_READ_ACL_CACHE};
@@ -225,11 +228,12 @@ int acl_file_reader::read(const char *aclfname, sec_acl_buffer_t &out) {
 
 } // namespace
 
-int sec_read_acl_file(const char *aclfname, const char *username, const sec_perm_set_t *set, std::uint32_t flags,
-                      sec_acl_buffer_t *acl, std::uint32_t *out_flags) {
+int sec_read_acl_file(const char *aclfname, const char *username, const sec_perm_set_t *set,
+                      std::uint32_t flags, sec_acl_buffer_t *acl, std::uint32_t *out_flags) {
     constexpr const char *function = "sec_read_acl_file";
     qz::trace_entry(9, [&] {
-        qz::trace_data(11, qz::item(aclfname), qz::item(username), qz::number(set), qz::number(flags), qz::number(acl));
+        qz::trace_data(11, qz::item(aclfname), qz::item(username), qz::number(set), qz::number(flags),
+                       qz::number(acl));
     });
     cu_set_no_error_1();
     if (acl != nullptr)

@@ -54,7 +54,8 @@ std::size_t packed_size_of(std::uint8_t type, std::size_t identity_length) {
 
 } // namespace
 
-sec_acle_t *sec_acltree::copy_to_room(const sec_acle_t &acle, std::size_t identity_length, std::size_t &size) {
+sec_acle_t *sec_acltree::copy_to_room(const sec_acle_t &acle, std::size_t identity_length,
+                                      std::size_t &size) {
     size = node_size(identity_length);
     unsigned char *memory = arena_.room(size);
     if (memory == nullptr) {
@@ -111,7 +112,8 @@ bool sec_acltree::prepare_slots() {
     return true;
 }
 
-sec_acle_t *sec_acltree::find_equal(const sec_acle_t &acle, std::size_t identity_length, std::uint32_t hash) const {
+sec_acle_t *sec_acltree::find_equal(const sec_acle_t &acle, std::size_t identity_length,
+                                    std::uint32_t hash) const {
     const std::size_t mask = (std::size_t{1} << slot_bits_) - 1;
     for (std::size_t at = hash >> (32 - slot_bits_); slots_[at].number != 0; at = (at + 1) & mask) {
         if (slots_[at].hash != hash)
@@ -186,9 +188,10 @@ sec_acle_t *sec_acltree::find(const char *identity) const {
         return acle->type != 0 && cu_strcasecmp_posix_1(identity, acle->identity) == 0;
     };
     if (is_ascending_) {
-        const auto at = std::lower_bound(
-            entries.begin(), entries.end(), identity,
-            [](const sec_acle_t *acle, const char *wanted) { return cu_strcasecmp_posix_1(acle->identity, wanted) < 0; });
+        const auto at = std::lower_bound(entries.begin(), entries.end(), identity,
+                                         [](const sec_acle_t *acle, const char *wanted) {
+                                             return cu_strcasecmp_posix_1(acle->identity, wanted) < 0;
+                                         });
         return at != entries.end() && is_match(*at) ? *at : nullptr;
     }
     const auto at = std::find_if(entries.begin(), entries.end(), is_match);
@@ -229,8 +232,8 @@ const sec_acle_t *sec_acltree::first_held() const {
         return entries_[0];
     if (!is_sorted_by_identity()) // a chain to the right
         return *std::find_if(entries_, entries_ + count_, is_held);
-    // Below the root hang the nodes that sort before it, then those behind it, each side headed by the one that was
-    // inserted first; and so on below every node without an entry.
+    // Below the root hang the nodes that sort before it, then those behind it, each side headed by the one
+    // that was inserted first; and so on below every node without an entry.
     const auto precedes = [](const sec_acle_t *a, const sec_acle_t *b) {
         return qz::compare_identities(a->identity, b->identity) < 0;
     };
@@ -257,7 +260,8 @@ namespace {
 
 bool is_of_key(const sec_acltree_t *tree, const sec_acle_t &acle) {
     return tree != nullptr && tree->type() == acle.type &&
-           (!qz::has_mechanism(acle.type) || cu_strcasecmp_posix_1(tree->root().mechanism, acle.mechanism) == 0);
+           (!qz::has_mechanism(acle.type) ||
+            cu_strcasecmp_posix_1(tree->root().mechanism, acle.mechanism) == 0);
 }
 
 std::uint32_t hash_of_key(const sec_acle_t &acle, const qz::identity_hash_key &key) {
@@ -302,7 +306,8 @@ bool sec_acltree_array::index_last() {
     };
     if ((indexed_ + 1) * 2 > index_size_) {
         const std::uint32_t size = index_size_ == 0 ? first_size : index_size_ * 2;
-        qz::owned<std::uint32_t[]> grown(static_cast<std::uint32_t *>(std::calloc(size, sizeof(std::uint32_t))));
+        qz::owned<std::uint32_t[]> grown(
+            static_cast<std::uint32_t *>(std::calloc(size, sizeof(std::uint32_t))));
         if (grown == nullptr)
             return false;
         if (index_ == nullptr)
@@ -406,7 +411,8 @@ void sec__trace_replacement(const sec_acle_t *acle) {
 }
 
 int sec__acle_not_found(int code, const sec_acle_t *acle) {
-    return qz::report(code, qz::msg::acle_not_found, acle->type, qz::has_mechanism(acle->type) ? acle->mechanism : "",
+    return qz::report(code, qz::msg::acle_not_found, acle->type,
+                      qz::has_mechanism(acle->type) ? acle->mechanism : "",
                       qz::has_identity(acle->type) ? acle->identity : "");
 }
 

@@ -1,12 +1,13 @@
-// Trees: the entries of one key, collected in the order in which they are compiled. A key is the type alone for
-// unauthenticated, any-other and group entries, and the type with the mechanism for user and expanded ones.
+// Trees: the entries of one key, collected in the order in which they are compiled. A key is the type alone
+// for unauthenticated, any-other and group entries, and the type with the mechanism for user and expanded
+// ones.
 //
-// A tree of user or group entries is the binary search tree that plain insertion makes, a tree of expanded entries
-// the chain of its insertions. Both shapes follow wholly from two sequences, the entries in order of insertion and
-// the entries in order of identity: a node heads its subtree because it was inserted first among the identities
-// that the subtree spans. So the two sequences are what is kept, and the links are not. Finding a duplicate takes
-// one look-up by hash whatever the order of the input; the sorted sequence is made when it is first asked for, and
-// nothing here recurses on the size of a tree.
+// A tree of user or group entries is the binary search tree that plain insertion makes, a tree of expanded
+// entries the chain of its insertions. Both shapes follow wholly from two sequences, the entries in order of
+// insertion and the entries in order of identity: a node heads its subtree because it was inserted first
+// among the identities that the subtree spans. So the two sequences are what is kept, and the links are not.
+// Finding a duplicate takes one look-up by hash whatever the order of the input; the sorted sequence is made
+// when it is first asked for, and nothing here recurses on the size of a tree.
 #ifndef QZACL_TREE_H
 #define QZACL_TREE_H
 
@@ -65,8 +66,8 @@ public:
     std::uint8_t type() const { return type_; }
     // The entry inserted first, which names the tree's mechanism.
     const sec_acle_t &root() const { return *entries_[0]; }
-    // The entry that compiling meets first: the root, or where it was deleted the nearest node below that holds one.
-    // Null when no node does. Asked after in_order() succeeded.
+    // The entry that compiling meets first: the root, or where it was deleted the nearest node below that
+    // holds one. Null when no node does. Asked after in_order() succeeded.
     const sec_acle_t *first_held() const;
 
     // Inserts a copy. For a duplicate nothing changes and `held` is the entry that is there.
@@ -76,8 +77,8 @@ public:
     // Takes the entry out; its node stays, so that the order of the others does not change.
     void erase(sec_acle_t &acle);
 
-    // All nodes in the order of the tree; those without an entry have the type 0. Returns false, the bytes asked for
-    // in `refused`, when memory for sorting is lacking.
+    // All nodes in the order of the tree; those without an entry have the type 0. Returns false, the bytes
+    // asked for in `refused`, when memory for sorting is lacking.
     bool in_order(std::span<sec_acle_t *const> &nodes, std::size_t &refused) const;
 
     std::uint32_t held_count() const { return held_count_; }
@@ -104,8 +105,8 @@ private:
     static constexpr std::uint32_t own_capacity = 2;
 
     std::uint8_t type_;
-    // While every entry sorted behind the one before it, the entries are their own sorted sequence and no entry has
-    // a slot.
+    // While every entry sorted behind the one before it, the entries are their own sorted sequence and no
+    // entry has a slot.
     bool is_ascending_ = true;
     std::uint32_t count_ = 0;
     std::uint32_t capacity_ = own_capacity;
@@ -125,7 +126,8 @@ private:
     qz::acle_arena arena_;
 };
 
-// The trees of one ACL in the order in which their keys first appeared. A slot whose first insertion failed is null.
+// The trees of one ACL in the order in which their keys first appeared. A slot whose first insertion failed
+// is null.
 class sec_acltree_array {
 public:
     sec_acltree_array() = default;
@@ -144,22 +146,25 @@ private:
     qz::owned<sec_acltree_t *[]> trees_;
     std::int32_t count_ = 0;
     std::int32_t last_found_ = 0;
-    // The numbers of the slots plus one, by the hash of their keys: there may be as many mechanisms as entries.
+    // The numbers of the slots plus one, by the hash of their keys: there may be as many mechanisms as
+    // entries.
     qz::owned<std::uint32_t[]> index_;
     std::uint32_t index_size_ = 0;
     std::uint32_t indexed_ = 0;
     qz::identity_hash_key hash_key_;
 };
 
-// Inserts a copy of the entry into the tree of its key, which is appended when there is none. Returns SEC_S_OK,
-// SEC_S_BAD_ACLE for a duplicate or SEC_S_NO_MEMORY.
+// Inserts a copy of the entry into the tree of its key, which is appended when there is none. Returns
+// SEC_S_OK, SEC_S_BAD_ACLE for a duplicate or SEC_S_NO_MEMORY.
 int sec__add_acle_to_trees(const sec_acle_t *acle, sec_acltree_array &array);
 
-// Inserts a copy of the entry into the tree in `*slot`, made when that is null. An entry with the same identity is
-// reported when `report_duplicates` is not 0, else it takes the new permission mask. Results as above.
+// Inserts a copy of the entry into the tree in `*slot`, made when that is null. An entry with the same
+// identity is reported when `report_duplicates` is not 0, else it takes the new permission mask. Results as
+// above.
 int sec__add_acle_to_tree(int report_duplicates, const sec_acle_t *acle, sec_acltree_t **slot);
 
-// Deletes the entry with the same identity from a tree of the same key. Returns SEC_S_OK or SEC_S_ACLE_NOT_FOUND.
+// Deletes the entry with the same identity from a tree of the same key. Returns SEC_S_OK or
+// SEC_S_ACLE_NOT_FOUND.
 int sec__del_acle_from_tree(const sec_acle_t *acle, sec_acltree_t *root);
 
 // Releases a tree; null is allowed.
@@ -174,8 +179,8 @@ using owned_acltree = std::unique_ptr<sec_acltree_t, free_acltree>;
 
 } // namespace qz
 
-// What trees and packed sub-ACLs report alike: that no entry matches the given one, with the code to return; that it
-// duplicates one; that a duplicate replaced the mask of the entry that was there.
+// What trees and packed sub-ACLs report alike: that no entry matches the given one, with the code to return;
+// that it duplicates one; that a duplicate replaced the mask of the entry that was there.
 int sec__acle_not_found(int code, const sec_acle_t *acle);
 int sec__report_duplicate(const sec_acle_t *acle);
 void sec__trace_replacement(const sec_acle_t *acle);

@@ -10,14 +10,16 @@ namespace {
 
 namespace format = qz::format;
 
-// Corrupt in a way that has no message of its own: something does not end where it should, or the bytes end early.
+// Corrupt in a way that has no message of its own: something does not end where it should, or the bytes end
+// early.
 int corrupt(int line) { return qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupted, qz::acl_source, line); }
 
 int report_shorter_than_header(std::int32_t length, int line) {
     return qz::report(SEC_S_BAD_ACL, qz::msg::shorter_than_header, length, qz::acl_source, line);
 }
 
-// A mechanism that does not end with its field, shown up to the first NUL that follows or what is left of the bytes.
+// A mechanism that does not end with its field, shown up to the first NUL that follows or what is left of the
+// bytes.
 int report_bad_mechanism(qz::byte_reader at_mechanism, int line) {
     char shown[256] = {};
     qz::byte_span bytes;
@@ -31,13 +33,15 @@ int check_mechanism(qz::byte_reader &reader, format::subacl &head) {
         return qz::report(SEC_S_BAD_ACL, qz::msg::subacl_type_unknown, head.type, qz::acl_source, __LINE__);
     if (!qz::has_mechanism(head.type)) {
         if (head.mechanism_length != 0)
-            return qz::report(SEC_S_BAD_ACL, qz::msg::subacl_takes_no_mechanism, head.type, qz::acl_source, __LINE__);
+            return qz::report(SEC_S_BAD_ACL, qz::msg::subacl_takes_no_mechanism, head.type, qz::acl_source,
+                              __LINE__);
         if (qz::is_single_type(head.type) && head.entry_count > 1)
             return qz::report(SEC_S_BAD_ACL, qz::msg::more_than_one_acle, qz::acl_source, __LINE__);
         return SEC_S_OK;
     }
     if (head.mechanism_length < 2)
-        return qz::report(SEC_S_BAD_ACL, qz::msg::bad_mechanism_length, head.mechanism_length, qz::acl_source, __LINE__);
+        return qz::report(SEC_S_BAD_ACL, qz::msg::bad_mechanism_length, head.mechanism_length, qz::acl_source,
+                          __LINE__);
     const qz::byte_reader at_mechanism = reader;
     if (!reader.bytes(head.mechanism_length, head.mechanism))
         return corrupt(__LINE__);
@@ -48,7 +52,8 @@ int check_mechanism(qz::byte_reader &reader, format::subacl &head) {
 
 int check_entry(const format::entry &entry, std::uint8_t type) {
     if (entry.version != format::entry_version)
-        return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_version_unsupported, entry.version, qz::acl_source, __LINE__);
+        return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_version_unsupported, entry.version, qz::acl_source,
+                          __LINE__);
     if (qz::is_single_type(type)) {
         if (!entry.identity.empty())
             return qz::report(SEC_S_BAD_ACLE, qz::msg::unexpected_identity, qz::acl_source, __LINE__);
@@ -106,8 +111,8 @@ int convert(std::span<unsigned char> bytes) {
         for (std::uint32_t left = head.entry_count; left != 0; --left) {
             format::entry entry;
             std::uint16_t identity_length = 0;
-            if (!swapper.byte(entry.version) || !swapper.swap(entry.perm_mask) || !swapper.swap(identity_length) ||
-                !swapper.skip(identity_length))
+            if (!swapper.byte(entry.version) || !swapper.swap(entry.perm_mask) ||
+                !swapper.swap(identity_length) || !swapper.skip(identity_length))
                 return corrupt(__LINE__);
         }
     }
@@ -126,7 +131,8 @@ int convert_checked(int check, sec_acl_buffer_t *acl) {
     std::uint8_t order = 0;
     reader.field(type);
     reader.field(version);
-    if (acl->length == 0 || acl->data == nullptr || type != format::buffer_type || version != format::buffer_version)
+    if (acl->length == 0 || acl->data == nullptr || type != format::buffer_type ||
+        version != format::buffer_version)
         return qz::report(SEC_S_BAD_ACL, qz::msg::not_an_acl_buffer);
     if (!reader.field(order))
         return report_shorter_than_header(acl->length, __LINE__);
@@ -175,7 +181,8 @@ int sec__check_acl_buffer(const sec_acl_buffer_t *acl) {
 int sec_convert_acl_to_host(int check, sec_acl_buffer_t *acl) {
     qz::trace_entry(55, [&] {
         const sec_acl_buffer_t shown = acl == nullptr ? sec_acl_buffer_t{} : *acl;
-        qz::trace_data(57, qz::number(check), qz::number(acl), qz::number(shown.length), qz::number(shown.data));
+        qz::trace_data(57, qz::number(check), qz::number(acl), qz::number(shown.length),
+                       qz::number(shown.data));
     });
     cu_set_no_error_1();
     const int result = convert_checked(check, acl);

@@ -1,0 +1,190 @@
+// What the tests of the ACL library share: the recorded error as a value, bytes that end at an inaccessible page,
+// captured output, and folders that vanish.
+#ifndef QZ_TESTS_SUPPORT_H
+#define QZ_TESTS_SUPPORT_H
+
+#include "msg/qzseclib_msg.h"
+#include "qz/acl.h"
+#include "qz/cu.h"
+
+#include <gtest/gtest.h>
+
+#include <cstdio>
+#include <cstring>
+#include <filesystem>
+#include <ostream>
+#include <string>
+#include <string_view>
+#include <sys/mman.h>
+#include <unistd.h>
+#include <vector>
+
+namespace support {
+
+using namespace std::literals;
+using arguments = std::vector<std::string>;
+
+struct failure {
+    int code = 0;
+    int id = 0;
+    std::string text;
+    bool operator==(const failure &) const = default;
+};
+
+inline std::ostream &operator<<(std::ostream &out, const failure &error) {
+    return out << "code " << error.code << ", message " << error.id << ": " << error.text;
+}
+
+// The error of this thread, which is cleared.
+inline failure recorded_error() {
+    cu_error_t *error = nullptr;
+    char *text = nullptr;
+    EXPECT_EQ(cu_get_error_1(&error), CU_OK);
+    EXPECT_EQ(cu_get_errmsg_1(error, &text), CU_OK);
+    failure found{error->code, error->message_id, text};
+    cu_rel_errmsg_1(text);
+    cu_rel_error_1(error);
+    cu_set_no_error_1();
+    return found;
+}
+
+// The error that a message with these arguments, each as it is shown, would be recorded as.
+inline failure error_of(int code, int id, const arguments &args = {}) {
+    const std::string_view text = qz::msg::default_text(id);
+    failure made{code, id, {}};
+    for (std::size_t at = 0; at < text.size(); ++at) {
+        if (text[at] != '%' || text.substr(at + 2, 1) != "$") {
+            made.text += text[at];
+            continue;
+        }
+        made.text += args.at(static_cast<std::size_t>(text[at + 1] - '1'));
+        at = text.find_first_of("sdxc", at);
+    }
+    return made;
+}
+
+inline std::string hex(unsigned long value) {
+    char text[20];
+    std::snprintf(text, sizeof text, "%lx", value);
+    return text;
+}
+
+// A pointer as the parameter message shows it.
+inline std::string shown(const void *pointer) { return hex(reinterpret_cast<std::uintptr_t>(pointer) & 0xffffffff); }
+
+// A copy of bytes whose last one lies right before a page that nothing may touch.
+class guarded {
+public:
+    explicit guarded(std::string_view bytes) : size_(bytes.size()) {
+        const auto page = static_cast<std::size_t>(sysconf(_SC_PAGESIZE));
+        const std::size_t used = (size_ / page + 1) * page;
+        mapped_ = used + page;
+        memory_ = static_cast<char *>(
+            mmap(nullptr, mapped_, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0));
+        mprotect(memory_ + used, page, PROT_NONE);
+        data_ = memory_ + used - size_;
+        std::memcpy(data_, bytes.data(), size_);
+    }
+    guarded(const guarded &) = delete;
+    guarded &operator=(const guarded &) = delete;
+    ~guarded() { munmap(memory_, mapped_); }
+
+    char *data() const { return data_; }
+    std::size_t size() const { return size_; }
+
+private:
+    std::size_t size_;
+    std::size_t mapped_;
+    char *memory_;
+    char *data_;
+};
+
+struct output {
+    std::string out;
+    std::string err;
+    bool operator==(const output &) const = default;
+};
+
+inline std::ostream &operator<<(std::ostream &stream, const output &shown) {
+    return stream << "out <<" << shown.out << ">> err <<" << shown.err << ">>";
+}
+
+// What a call writes to the two standard streams.
+template <class Call>
+output output_of(const Call &call) {
+    output written;
+    FILE *const streams[] = {stdout, stderr};
+    std::string *const texts[] = {&written.out, &written.err};
+    int kept[2];
+    int files[2];
+    for (int index : {0, 1}) {
+        std::fflush(streams[index]);
+        kept[index] = dup(index + 1);
+        files[index] = memfd_create("output", 0);
+        dup2(files[index], index + 1);
+    }
+    call();
+    for (int index : {0, 1}) {
+        std::fflush(streams[index]);
+        dup2(kept[index], index + 1);
+        close(kept[index]);
+        texts[index]->resize(static_cast<std::size_t>(lseek(files[index], 0, SEEK_END)));
+        EXPECT_EQ(pread(files[index], texts[index]->data(), texts[index]->size(), 0),
+                  static_cast<ssize_t>(texts[index]->size()));
+        close(files[index]);
+    }
+    return written;
+}
+
+class temporary_folder {
+public:
+    temporary_folder() {
+        std::string name = std::filesystem::temp_directory_path() / "qzacl-XXXXXX";
+        path_ = mkdtemp(name.data());
+    }
+    temporary_folder(const temporary_folder &) = delete;
+    temporary_folder &operator=(const temporary_folder &) = delete;
+    ~temporary_folder() { std::filesystem::remove_all(path_); }
+
+    std::string operator/(std::string_view name) const { return path_ + "/" + std::string(name); }
+    const std::string &path() const { return path_; }
+
+private:
+    std::string path_;
+};
+
+// An entry that borrows its texts.
+inline sec_acle_t entry(int type, std::string_view mechanism, const char *identity, std::uint32_t mask) {
+    sec_acle_t made = {};
+    made.type = static_cast<std::uint8_t>(type);
+    made.perm_mask = mask;
+    mechanism.copy(made.mechanism, sizeof made.mechanism - 1);
+    made.identity = const_cast<char *>(identity);
+    return made;
+}
+
+// Fields of a compiled buffer, low byte first.
+inline std::string number(std::uint64_t value, std::size_t width) {
+    std::string bytes;
+    for (; width != 0; --width, value >>= 8)
+        bytes += static_cast<char>(value & 0xff);
+    return bytes;
+}
+
+inline std::string packed_entry(std::uint32_t mask, std::string_view identity_field) {
+    return "\1"s + number(mask, 4) + number(identity_field.size(), 2) + std::string(identity_field);
+}
+
+inline std::string packed_subacl(int type, std::string_view mechanism_field, std::uint64_t count,
+                                 const std::string &entries) {
+    return number(10 + mechanism_field.size() + entries.size(), 4) + static_cast<char>(type) + number(count, 4) +
+           static_cast<char>(mechanism_field.size()) + std::string(mechanism_field) + entries;
+}
+
+inline std::string packed_acl(std::uint64_t count, const std::string &subacls) {
+    return "\x85\1\2"s + number(count, 2) + subacls;
+}
+
+} // namespace support
+
+#endif
