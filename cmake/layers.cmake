@@ -37,8 +37,9 @@ function(qz_shared_library name)
     SOVERSION ${PROJECT_VERSION_MAJOR}
     LINK_DEPENDS ${CMAKE_CURRENT_SOURCE_DIR}/${arg_MAP}
     INSTALL_RPATH $ORIGIN)
+  # Never unloaded: threads that live on release what these libraries recorded for them when they end.
   target_link_options(${name} PRIVATE
-    -Wl,--version-script=${CMAKE_CURRENT_SOURCE_DIR}/${arg_MAP} -Wl,-z,relro,-z,now)
+    -Wl,--version-script=${CMAKE_CURRENT_SOURCE_DIR}/${arg_MAP} -Wl,-z,relro,-z,now,-z,nodelete)
   if(NOT QZ_SANITIZE)
     target_link_options(${name} PRIVATE -Wl,-z,defs)
   endif()
