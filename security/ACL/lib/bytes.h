@@ -52,6 +52,15 @@ private:
     const unsigned char *end_ = nullptr;
 };
 
+// A field in host byte order at an offset that the format fixes, inside bytes that were read as one piece.
+template <class Field>
+Field load_field(byte_span bytes, std::size_t offset) {
+    Field value = 0;
+    if (offset <= bytes.size() && sizeof(Field) <= bytes.size() - offset)
+        std::memcpy(&value, bytes.data() + offset, sizeof value);
+    return value;
+}
+
 // Walks over bytes of the other byte order, turning each field it is asked for into host order in place.
 class byte_swapper {
 public:

@@ -109,9 +109,12 @@ inline bool read(byte_reader &reader, subacl &out) {
 }
 
 inline bool read(byte_reader &reader, entry &out) {
-    std::uint16_t identity_length = 0;
-    return reader.field(out.version) && reader.field(out.perm_mask) && reader.field(identity_length) &&
-           reader.bytes(identity_length, out.identity);
+    byte_span fixed;
+    if (!reader.bytes(entry_fixed_size, fixed))
+        return false;
+    out.version = fixed[0];
+    out.perm_mask = load_field<std::uint32_t>(fixed, entry_mask_offset);
+    return reader.bytes(load_field<std::uint16_t>(fixed, entry_length_offset), out.identity);
 }
 
 // True when a string ends exactly where its field does.

@@ -1,17 +1,16 @@
 // Access decisions: which permissions a compiled ACL grants one party, or the groups of one. The buffer is
 // read in place, nothing is allocated, and the one lock is held only while a handler is looked up.
-#include "libqz_cu/posix_fold.h"
 #include "qzacl_acl/buffer.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/id_handlers.h"
+#include "qzacl_acl/wanted_identity.h"
 #include "qzacl_init.h"
 #include "qzacl_trace.h"
 #include "report.h"
 
 #include <algorithm>
 #include <array>
-#include <bit>
 
 namespace {
 
@@ -32,62 +31,6 @@ int check_buffer(const sec_acl_buffer_t &acl) {
         return qz::report(SEC_S_BAD_ACL, qz::msg::wrong_byte_order);
     return SEC_S_OK;
 }
-
-// An identity that is looked for, ready to be compared with one stored entry after the other.
-class wanted_identity {
-public:
-    // No order: the stored field holds no whole string.
-    static constexpr int unordered = 2;
-
-    explicit wanted_identity(const char *text) : text_(text) {
-        // The first word is padded with NULs; the bytes behind the wanted NUL do not take part in a
-        // comparison.
-        const std::size_t size = strnlen(text, word_size);
-        std::uint64_t word = 0;
-        std::memcpy(&word, text, size);
-        first_word_ = qz::fold8(word);
-        first_size_ = std::min(size + 1, word_size);
-    }
-
-    // Negative, zero or positive as the wanted identity sorts before, with or behind a stored one, of which
-    // `left` bytes from its start to the end of the buffer may be looked at.
-    int compare(qz::byte_span stored, std::size_t left) const {
-        if constexpr (std::endian::native == std::endian::little) {
-            if (left >= word_size) {
-                std::uint64_t word = 0;
-                std::memcpy(&word, stored.data(), word_size);
-                const std::uint64_t difference = qz::fold8(word) ^ first_word_;
-                const std::size_t same = static_cast<std::size_t>(std::countr_zero(difference)) / 8;
-                if (same < first_size_ && same < stored.size())
-                    return byte_at(first_word_, same) < byte_at(qz::fold8(word), same) ? -1 : 1;
-                if (same >= first_size_ && first_size_ <= stored.size() && first_size_ < word_size)
-                    return 0;
-            }
-        }
-        return compare_bytes(stored);
-    }
-
-private:
-    static constexpr std::size_t word_size = sizeof(std::uint64_t);
-
-    static unsigned byte_at(std::uint64_t word, std::size_t index) { return (word >> (index * 8)) & 0xff; }
-
-    int compare_bytes(qz::byte_span stored) const {
-        for (std::size_t index = 0; index < stored.size(); ++index) {
-            const unsigned wanted = qz::fold(static_cast<unsigned char>(text_[index]));
-            const unsigned held = qz::fold(stored[index]);
-            if (wanted != held)
-                return wanted < held ? -1 : 1;
-            if (wanted == 0)
-                return 0;
-        }
-        return unordered;
-    }
-
-    const char *text_;
-    std::uint64_t first_word_ = 0;
-    std::size_t first_size_ = 0; // the bytes of the first word that count, the NUL included
-};
 
 // Looks up the sub-ACL and reads its header.
 bool find(const sec_acl_buffer_t &acl, std::uint8_t type, const char *mechanism, format::subacl &head,
@@ -151,30 +94,55 @@ int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler
     return no_match(request, request.identity);
 }
 
+// The entries of a user or group sub-ACL that are still to be looked at.
+struct entry_walk {
+    qz::byte_reader entries;
+    std::uint32_t left;
+};
+
+// Passes by the entries that sort before the wanted identity, all but those whose order is not clear at first
+// sight. Nothing else is in this loop, because it is what a decision costs.
+[[gnu::noinline]] void pass_by(const qz::wanted_identity &wanted, entry_walk &walk) {
+    entry_walk at = walk;
+    format::entry entry;
+    for (qz::byte_reader next = at.entries;
+         at.left != 0 && format::read(next, entry) &&
+         wanted.is_clearly_behind(entry.identity, entry.identity.size() + next.left());
+         at.entries = next)
+        --at.left;
+    walk = at;
+}
+
+// Compares the wanted identity with the entries from the next one on, up to the one that decides about it,
+// before which the walk then stands. When none is left the wanted identity sorts behind all.
+qz::identity_order compare_next(const qz::wanted_identity &wanted, entry_walk &walk, format::entry &entry) {
+    for (;;) {
+        pass_by(wanted, walk);
+        if (walk.left == 0)
+            return qz::identity_order::behind;
+        qz::byte_reader next = walk.entries;
+        if (!format::read(next, entry))
+            return qz::identity_order::unknown;
+        const qz::identity_order order = wanted.compare(entry.identity);
+        if (order != qz::identity_order::behind)
+            return order;
+        walk = {next, walk.left - 1};
+    }
+}
+
 int evaluate_user(const single_request &request, const format::subacl &head, qz::byte_reader entries,
                   std::uint32_t &mask) {
-    const wanted_identity wanted(request.identity);
-    for (std::uint32_t left = head.entry_count; left != 0; --left) {
-        format::entry entry;
-        std::uint16_t identity_length = 0;
-        if (!entries.field(entry.version) || !entries.field(entry.perm_mask) ||
-            !entries.field(identity_length))
-            return corrupt(__LINE__);
-        const std::size_t bytes_left = entries.left();
-        if (!entries.bytes(identity_length, entry.identity))
-            return corrupt(__LINE__);
-        const int order = wanted.compare(entry.identity, bytes_left);
-        if (order == 1)
-            continue;
-        if (order == 0) {
-            mask = entry.perm_mask;
-            return SEC_S_OK;
-        }
-        if (order == wanted_identity::unordered)
-            return corrupt(__LINE__);
-        break;
+    entry_walk walk{entries, head.entry_count};
+    format::entry entry;
+    switch (compare_next(qz::wanted_identity(request.identity), walk, entry)) {
+    case qz::identity_order::same:
+        mask = entry.perm_mask;
+        return SEC_S_OK;
+    case qz::identity_order::unknown:
+        return corrupt(__LINE__);
+    default:
+        return no_match(request, request.identity);
     }
-    return no_match(request, request.identity);
 }
 
 int evaluate_single(const sec_acl_buffer_t *acl, single_request &request, const char *subacl_mechanism,
@@ -233,29 +201,15 @@ public:
     int evaluate(const format::subacl &head, qz::byte_reader entries, std::uint32_t &mask, bool &is_found) {
         std::sort(names_.begin(), names_.begin() + count_,
                   [](const char *a, const char *b) { return cu_strcasecmp_posix_1(a, b) < 0; });
-        std::size_t waiting = 0;
-        wanted_identity wanted(count_ == 0 ? "" : names_[0]);
-        for (std::uint32_t left = head.entry_count; left != 0 && waiting != count_; --left) {
+        entry_walk walk{entries, head.entry_count};
+        for (std::size_t index = 0; index < count_ && walk.left != 0; ++index) {
             format::entry entry;
-            std::uint16_t identity_length = 0;
-            if (!entries.field(entry.version) || !entries.field(entry.perm_mask) ||
-                !entries.field(identity_length))
+            const auto order = compare_next(qz::wanted_identity(names_[index]), walk, entry);
+            if (order == qz::identity_order::unknown)
                 return corrupt(__LINE__);
-            const std::size_t bytes_left = entries.left();
-            if (!entries.bytes(identity_length, entry.identity))
-                return corrupt(__LINE__);
-            while (waiting != count_) {
-                const int order = wanted.compare(entry.identity, bytes_left);
-                if (order == wanted_identity::unordered)
-                    return corrupt(__LINE__);
-                if (order > 0)
-                    break;
-                if (order == 0) {
-                    mask |= entry.perm_mask;
-                    is_found = true;
-                }
-                if (++waiting != count_)
-                    wanted = wanted_identity(names_[waiting]);
+            if (order == qz::identity_order::same) {
+                mask |= entry.perm_mask;
+                is_found = true;
             }
         }
         count_ = 0;
