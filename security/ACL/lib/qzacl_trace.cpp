@@ -3,6 +3,7 @@
 
 std::uint8_t acl__trace_detail_levels[qz::trace_category_count] = {};
 pthread_once_t acl__trace_register_once = PTHREAD_ONCE_INIT;
+bool acl__trace_is_registered = false;
 cu_timeinfo_t timeinfo = {};
 
 namespace {
@@ -32,6 +33,7 @@ int acl__trace_register_component() {
         &acl__trace_detail_levels[static_cast<std::size_t>(qz::trace_category::perf)], __ATOMIC_RELAXED);
     if (perf_level_is_recorded(level))
         qz::trace_data(0, qz::number(level));
+    __atomic_store_n(&acl__trace_is_registered, true, __ATOMIC_RELEASE);
     return result;
 }
 

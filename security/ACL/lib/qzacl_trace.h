@@ -23,6 +23,8 @@ inline constexpr char trace_component[] = "_SEL";
 
 extern std::uint8_t acl__trace_detail_levels[qz::trace_category_count];
 extern pthread_once_t acl__trace_register_once;
+// Set when registration is complete, so that later trace points need not call into the once-guard.
+extern bool acl__trace_is_registered;
 extern cu_timeinfo_t timeinfo;
 
 int acl__trace_register_component();
@@ -32,7 +34,8 @@ namespace qz {
 
 // The category's detail level; registers the component when this is the first trace point of the process.
 inline unsigned trace_level(trace_category category) {
-    pthread_once(&acl__trace_register_once, [] { static_cast<void>(acl__trace_register_component()); });
+    if (!__atomic_load_n(&acl__trace_is_registered, __ATOMIC_ACQUIRE)) [[unlikely]]
+        pthread_once(&acl__trace_register_once, [] { static_cast<void>(acl__trace_register_component()); });
     return __atomic_load_n(&acl__trace_detail_levels[static_cast<std::size_t>(category)], __ATOMIC_RELAXED);
 }
 
