@@ -9,6 +9,7 @@
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/entry.h"
+#include "qzacl_acl/packed_identity.h"
 #include "qzacl_acl/tree.h"
 #include "qzacl_trace.h"
 #include "report.h"
@@ -121,39 +122,71 @@ struct packed_place {
     std::size_t size = 0;   // of the entry found there, 0 when the identity is not among them
 };
 
+// A packed identity beside its first bytes.
+struct packed_identity {
+    qz::byte_span field;
+    qz::identity_block block;
+
+    bool is_exact_string() const {
+        if (block.nul_at() < qz::identity_block::size)
+            return block.nul_at() + 1 == field.size();
+        return format::holds_exact_string(field);
+    }
+
+    bool sorts_before(const packed_identity &other) const {
+        // Only bytes up to the NUL count; behind it stand other fields.
+        const std::size_t place = block.lower_at(other.block);
+        if (place < qz::identity_block::size && place < field.size())
+            return true;
+        return cu_strcasecmp_posix_1(format::string_in(field), format::string_in(other.field)) < 0;
+    }
+};
+
+// The block of a field close to the end of the buffer, with what follows it taken as NULs.
+qz::identity_block block_of(qz::byte_span field, std::size_t left_behind) {
+    if (field.size() + left_behind >= qz::identity_block::size)
+        return qz::identity_block(field.data());
+    unsigned char padded[qz::identity_block::size] = {};
+    std::memcpy(padded, field.data(), field.size());
+    return qz::identity_block(padded);
+}
+
+bool has_sorted_form(const format::subacl &head) {
+    if (head.entry_count == 0)
+        return false;
+    if (head.type == SEC_ACLE_USER)
+        return format::holds_exact_string(head.mechanism) && head.mechanism.size() <= qz::mechanism_max + 1;
+    return head.type == SEC_ACLE_GROUP && head.mechanism_length == 0;
+}
+
 // Looks for an identity in a user or group sub-ACL. False unless the bytes are exactly what compiling a tree
 // of these entries gives: only then does changing one entry's bytes give what the plain way would.
 bool find_packed(qz::byte_span subacl, const format::subacl &head, const char *identity,
                  packed_place &place) {
-    if ((head.type != SEC_ACLE_USER && head.type != SEC_ACLE_GROUP) || head.entry_count == 0)
+    if (!has_sorted_form(head))
         return false;
-    if (head.type == SEC_ACLE_USER &&
-        (!format::holds_exact_string(head.mechanism) || head.mechanism.size() > qz::mechanism_max + 1))
-        return false;
-    if (head.type == SEC_ACLE_GROUP && head.mechanism_length != 0)
-        return false;
-
+    const qz::wanted_identity wanted(identity);
     qz::byte_reader reader(subacl);
     reader.skip(format::subacl_header_size + head.mechanism_length);
-    const char *previous = nullptr;
+    packed_identity previous = {{}, block_of({}, 0)};
     bool is_placed = false;
     for (std::uint32_t left = head.entry_count; left != 0; --left) {
         const std::size_t offset = subacl.size() - reader.left();
         format::entry entry;
-        if (!format::read(reader, entry) || entry.version != format::entry_version ||
-            !format::holds_exact_string(entry.identity))
+        if (!format::read(reader, entry) || entry.version != format::entry_version || entry.identity.empty())
             return false;
-        const char *held = format::string_in(entry.identity);
-        if (previous != nullptr && cu_strcasecmp_posix_1(previous, held) >= 0)
+        const packed_identity held = {entry.identity, block_of(entry.identity, reader.left())};
+        if (!held.is_exact_string() || (!previous.field.empty() && !previous.sorts_before(held)))
             return false;
         previous = held;
-        if (is_placed)
+        if (is_placed || wanted.is_clearly_behind(held.block))
             continue;
-        const int order = cu_strcasecmp_posix_1(identity, held);
-        if (order <= 0) {
+        const qz::identity_order order = wanted.compare(entry.identity);
+        if (order != qz::identity_order::behind) {
             is_placed = true;
             place.offset = offset;
-            place.size = order == 0 ? format::entry_fixed_size + entry.identity.size() : 0;
+            place.size =
+                order == qz::identity_order::same ? format::entry_fixed_size + entry.identity.size() : 0;
         }
     }
     if (!is_placed)

@@ -4,7 +4,7 @@
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/id_handlers.h"
-#include "qzacl_acl/wanted_identity.h"
+#include "qzacl_acl/packed_identity.h"
 #include "qzacl_init.h"
 #include "qzacl_trace.h"
 #include "report.h"
@@ -104,12 +104,15 @@ struct entry_walk {
 // sight. Nothing else is in this loop, because it is what a decision costs.
 [[gnu::noinline]] void pass_by(const qz::wanted_identity &wanted, entry_walk &walk) {
     entry_walk at = walk;
-    format::entry entry;
-    for (qz::byte_reader next = at.entries;
-         at.left != 0 && format::read(next, entry) &&
-         wanted.is_clearly_behind(entry.identity, entry.identity.size() + next.left());
-         at.entries = next)
-        --at.left;
+    while (at.left != 0) {
+        qz::byte_reader next = at.entries;
+        format::entry entry;
+        if (!format::read(next, entry) || entry.identity.size() + next.left() < qz::identity_block::size ||
+            entry.identity.empty() || entry.identity.back() != '\0' ||
+            !wanted.is_clearly_behind(qz::identity_block(entry.identity.data())))
+            break;
+        at = {next, at.left - 1};
+    }
     walk = at;
 }
 
