@@ -35,13 +35,12 @@ function(qz_shared_library name)
     LINKER_LANGUAGE C
     VERSION ${PROJECT_VERSION}
     SOVERSION ${PROJECT_VERSION_MAJOR}
-    LINK_DEPENDS ${CMAKE_CURRENT_SOURCE_DIR}/${arg_MAP}
-    INSTALL_RPATH $ORIGIN)
+    LINK_DEPENDS ${CMAKE_CURRENT_SOURCE_DIR}/${arg_MAP})
   # Never unloaded: threads that live on release what these libraries recorded for them when they end.
   target_link_options(${name} PRIVATE
     -Wl,--version-script=${CMAKE_CURRENT_SOURCE_DIR}/${arg_MAP} -Wl,-z,relro,-z,now,-z,nodelete)
   if(NOT QZ_SANITIZE)
-    target_link_options(${name} PRIVATE -Wl,-z,defs)
+    target_link_options(${name} PRIVATE -Wl,-z,defs -Wl,--as-needed)
   endif()
   target_link_libraries(${name} PRIVATE ${arg_USES} INTERFACE layer_interface)
   install(TARGETS ${name} LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})

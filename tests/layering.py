@@ -20,7 +20,7 @@ LAYERS = [
     [LIB + name for name in ("report", "owned", "bytes")],
     [LIB + name for name in ("qzacl_trace", "qzacl_utils", "qzacl_init")],
     [ACL + name for name in ("permission", "entry")],
-    [ACL + name for name in ("entry_parser", "identity_order", "tree", "buffer_format", "buffer", "wanted_identity")],
+    [ACL + name for name in ("entry_parser", "identity_order", "tree", "buffer_format", "buffer", "packed_identity")],
     [ACL + name for name in ("compile", "validate")],
     [ACL + name for name in ("file_name", "cache_file")],
     [ACL + name for name in ("read_acl", "list", "edit", "id_handlers", "evaluate", "dump")],

@@ -1,5 +1,5 @@
-// What the tests of the ACL library share: the recorded error as a value, bytes that end at an inaccessible page,
-// captured output, and folders that vanish.
+// What the tests of the ACL library share: the recorded error as a value, compiled bytes written by hand,
+// bytes that end at an inaccessible page, captured output, and folders that vanish.
 #ifndef QZ_TESTS_SUPPORT_H
 #define QZ_TESTS_SUPPORT_H
 
@@ -16,6 +16,7 @@
 #include <string>
 #include <string_view>
 #include <sys/mman.h>
+#include <tuple>
 #include <unistd.h>
 #include <vector>
 
@@ -27,7 +28,7 @@ using arguments = std::vector<std::string>;
 struct failure {
     int code = 0;
     int id = 0;
-    std::string text;
+    std::string text = {};
     bool operator==(const failure &) const = default;
 };
 
@@ -51,7 +52,7 @@ inline failure recorded_error() {
 // The error that a message with these arguments, each as it is shown, would be recorded as.
 inline failure error_of(int code, int id, const arguments &args = {}) {
     const std::string_view text = qz::msg::default_text(id);
-    failure made{code, id, {}};
+    failure made{code, id};
     for (std::size_t at = 0; at < text.size(); ++at) {
         if (text[at] != '%' || text.substr(at + 2, 1) != "$") {
             made.text += text[at];
@@ -63,85 +64,65 @@ inline failure error_of(int code, int id, const arguments &args = {}) {
     return made;
 }
 
-inline std::string hex(unsigned long value) {
-    char text[20];
-    std::snprintf(text, sizeof text, "%lx", value);
+// A pointer as the parameter message shows it.
+inline std::string shown(const void *pointer) {
+    char text[9];
+    std::snprintf(text, sizeof text, "%x",
+                  static_cast<std::uint32_t>(reinterpret_cast<std::uintptr_t>(pointer)));
     return text;
 }
-
-// A pointer as the parameter message shows it.
-inline std::string shown(const void *pointer) { return hex(reinterpret_cast<std::uintptr_t>(pointer) & 0xffffffff); }
 
 // A copy of bytes whose last one lies right before a page that nothing may touch.
 class guarded {
 public:
-    explicit guarded(std::string_view bytes) : size_(bytes.size()) {
-        const auto page = static_cast<std::size_t>(sysconf(_SC_PAGESIZE));
-        const std::size_t used = (size_ / page + 1) * page;
-        mapped_ = used + page;
-        memory_ = static_cast<char *>(
-            mmap(nullptr, mapped_, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0));
-        mprotect(memory_ + used, page, PROT_NONE);
-        data_ = memory_ + used - size_;
-        std::memcpy(data_, bytes.data(), size_);
+    explicit guarded(std::string_view bytes) : size_(bytes.size()), page_((size_ | 4095) + 1) {
+        const int access = PROT_READ | PROT_WRITE;
+        memory_ =
+            static_cast<char *>(mmap(nullptr, page_ + 4096, access, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0));
+        mprotect(memory_ + page_, 4096, PROT_NONE);
+        bytes.copy(data(), size_);
     }
     guarded(const guarded &) = delete;
     guarded &operator=(const guarded &) = delete;
-    ~guarded() { munmap(memory_, mapped_); }
+    ~guarded() { munmap(memory_, page_ + 4096); }
 
-    char *data() const { return data_; }
+    char *data() const { return memory_ + page_ - size_; }
     std::size_t size() const { return size_; }
 
 private:
     std::size_t size_;
-    std::size_t mapped_;
+    std::size_t page_; // where the page is
     char *memory_;
-    char *data_;
 };
 
-struct output {
-    std::string out;
-    std::string err;
-    bool operator==(const output &) const = default;
-};
+// What a call writes to standard output and to standard error.
+using output = std::pair<std::string, std::string>;
 
-inline std::ostream &operator<<(std::ostream &stream, const output &shown) {
-    return stream << "out <<" << shown.out << ">> err <<" << shown.err << ">>";
-}
-
-// What a call writes to the two standard streams.
 template <class Call>
 output output_of(const Call &call) {
     output written;
-    FILE *const streams[] = {stdout, stderr};
-    std::string *const texts[] = {&written.out, &written.err};
-    int kept[2];
-    int files[2];
-    for (int index : {0, 1}) {
-        std::fflush(streams[index]);
-        kept[index] = dup(index + 1);
-        files[index] = memfd_create("output", 0);
-        dup2(files[index], index + 1);
+    const std::tuple<FILE *, int, int, std::string *> streams[] = {
+        {stdout, dup(1), memfd_create("out", 0), &written.first},
+        {stderr, dup(2), memfd_create("err", 0), &written.second}};
+    for (const auto &[stream, kept, file, text] : streams) {
+        std::fflush(stream);
+        dup2(file, fileno(stream));
     }
     call();
-    for (int index : {0, 1}) {
-        std::fflush(streams[index]);
-        dup2(kept[index], index + 1);
-        close(kept[index]);
-        texts[index]->resize(static_cast<std::size_t>(lseek(files[index], 0, SEEK_END)));
-        EXPECT_EQ(pread(files[index], texts[index]->data(), texts[index]->size(), 0),
-                  static_cast<ssize_t>(texts[index]->size()));
-        close(files[index]);
+    for (const auto &[stream, kept, file, text] : streams) {
+        std::fflush(stream);
+        dup2(kept, fileno(stream));
+        text->resize(static_cast<std::size_t>(lseek(file, 0, SEEK_END)));
+        EXPECT_EQ(pread(file, text->data(), text->size(), 0), static_cast<ssize_t>(text->size()));
+        close(kept);
+        close(file);
     }
     return written;
 }
 
 class temporary_folder {
 public:
-    temporary_folder() {
-        std::string name = std::filesystem::temp_directory_path() / "qzacl-XXXXXX";
-        path_ = mkdtemp(name.data());
-    }
+    temporary_folder() { mkdtemp(path_.data()); }
     temporary_folder(const temporary_folder &) = delete;
     temporary_folder &operator=(const temporary_folder &) = delete;
     ~temporary_folder() { std::filesystem::remove_all(path_); }
@@ -150,7 +131,7 @@ public:
     const std::string &path() const { return path_; }
 
 private:
-    std::string path_;
+    std::string path_ = std::filesystem::temp_directory_path() / ("qzacl-test-" + std::string(6, 'X'));
 };
 
 // An entry that borrows its texts.
@@ -163,7 +144,7 @@ inline sec_acle_t entry(int type, std::string_view mechanism, const char *identi
     return made;
 }
 
-// Fields of a compiled buffer, low byte first.
+// Parts of a compiled buffer. Numbers stand low byte first; strings are given with their NUL.
 inline std::string number(std::uint64_t value, std::size_t width) {
     std::string bytes;
     for (; width != 0; --width, value >>= 8)
@@ -171,14 +152,14 @@ inline std::string number(std::uint64_t value, std::size_t width) {
     return bytes;
 }
 
-inline std::string packed_entry(std::uint32_t mask, std::string_view identity_field) {
-    return "\1"s + number(mask, 4) + number(identity_field.size(), 2) + std::string(identity_field);
+inline std::string packed_entry(std::uint32_t mask, std::string_view identity) {
+    return "\1"s + number(mask, 4) + number(identity.size(), 2) + std::string(identity);
 }
 
-inline std::string packed_subacl(int type, std::string_view mechanism_field, std::uint64_t count,
+inline std::string packed_subacl(int type, std::string_view mechanism, std::uint64_t count,
                                  const std::string &entries) {
-    return number(10 + mechanism_field.size() + entries.size(), 4) + static_cast<char>(type) + number(count, 4) +
-           static_cast<char>(mechanism_field.size()) + std::string(mechanism_field) + entries;
+    return number(10 + mechanism.size() + entries.size(), 4) + static_cast<char>(type) + number(count, 4) +
+           static_cast<char>(mechanism.size()) + std::string(mechanism) + entries;
 }
 
 inline std::string packed_acl(std::uint64_t count, const std::string &subacls) {

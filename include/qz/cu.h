@@ -79,12 +79,15 @@ typedef struct cu_error {
  *   code          the return code that goes with the error
  *   reserved      0; not looked at
  *   catalog       name of the message catalog, as catopen takes it; null: no catalog. Must stay valid and
- * unchanged as long as the process runs (a literal), because only the pointer is kept. set           number
- * of the message set in the catalog message_id    number of the message in the set default_text  the text for
- * when no catalog supplies one; null: empty. Must stay valid like the catalog's name.
+ *                 unchanged as long as the process runs (a literal), because only the pointer is kept.
+ *   set           number of the message set in the catalog
+ *   message_id    number of the message in the set
+ *   default_text  the text for when no catalog supplies one; null: empty. Must stay valid like the catalog's
+ *                 name.
  *   ...           one argument per position of the default text, in order of the positions up to the highest
- * one used: const char * for s, int for the others. A position below the highest that the text does not use
- * must be passed as an int. Strings are copied here; the caller's may go afterwards.
+ *                 one used: const char * for s, int for the others. A position below the highest that the
+ *                 text does not use must be passed as an int. Strings are copied here; the caller's may go
+ *                 afterwards.
  *
  * Strings of any length are kept. Only when they do not fit the storage of the thread and an allocation fails
  * too are they cut at the end.
@@ -182,8 +185,8 @@ QZ_CU_API int cu_iconv_open_1(const char *codeset, uint32_t flags, cu_iconv_t *h
  *   in          the bytes to convert. Null: CU_BAD_PARAMETER.
  *   in_length   their number. Null: CU_BAD_PARAMETER.
  *   out         out: a buffer of the caller's own that holds the converted bytes, released with free(); never
- * null after success, even for no bytes. Null: CU_BAD_PARAMETER. out_length  out: the number of converted
- * bytes. Null: CU_BAD_PARAMETER.
+ *               null after success, even for no bytes. Null: CU_BAD_PARAMETER.
+ *   out_length  out: the number of converted bytes. Null: CU_BAD_PARAMETER.
  *
  * Returns CU_OK; CU_BAD_PARAMETER; CU_ICONV_UNCONVERTIBLE when the bytes are not valid or end within a
  * character, when the other code set lacks a character, or when a flag of the handle forbids one;

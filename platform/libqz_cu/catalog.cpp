@@ -19,6 +19,13 @@ constinit opened_catalog catalogs[8] = {};
 constinit std::size_t catalog_count = 0;
 pthread_mutex_t catalogs_mutex = PTHREAD_MUTEX_INITIALIZER;
 
+void lock() { pthread_mutex_lock(&catalogs_mutex); }
+void unlock() { pthread_mutex_unlock(&catalogs_mutex); }
+
+// A child forked while another thread opens a catalog would otherwise wait for ever for a thread that it does not
+// have.
+[[gnu::constructor]] void keep_free_over_fork() { pthread_atfork(lock, unlock, unlock); }
+
 const nl_catd no_catalog = reinterpret_cast<nl_catd>(-1);
 
 nl_catd find_or_open(const char *name) {
@@ -37,9 +44,9 @@ nl_catd find_or_open(const char *name) {
 } // namespace
 
 const char *catalog_text(const char *catalog, int set, int message_id) {
-    pthread_mutex_lock(&catalogs_mutex);
+    lock();
     const nl_catd descriptor = find_or_open(catalog);
-    pthread_mutex_unlock(&catalogs_mutex);
+    unlock();
     return descriptor == no_catalog ? nullptr : catgets(descriptor, set, message_id, nullptr);
 }
 

@@ -6,7 +6,6 @@
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
-#include <string_view>
 
 namespace qz {
 
@@ -53,19 +52,6 @@ inline int fold_compare(const char *a, const char *b, std::size_t n) {
             return left - right;
     }
     return 0;
-}
-
-// Orders two strings of known lengths without regard to case. For strings without NUL bytes the order is that
-// of cu_strcasecmp_posix_1.
-inline int fold_compare(std::string_view a, std::string_view b) {
-    const int order = fold_compare(a.data(), b.data(), a.size() < b.size() ? a.size() : b.size());
-    if (order != 0 || a.size() == b.size())
-        return order;
-    return a.size() < b.size() ? -1 : 1;
-}
-
-inline bool fold_equal(std::string_view a, std::string_view b) {
-    return a.size() == b.size() && fold_compare(a.data(), b.data(), a.size()) == 0;
 }
 
 // Orders two NUL-terminated strings without regard to case. It goes byte by byte, since a word might reach

@@ -119,8 +119,6 @@ void trace_line::item(const void *address, std::size_t length) {
     put("}");
 }
 
-void trace_line::end() {
-    put("]}\n");
-}
+void trace_line::end() { put("]}\n"); }
 
 } // namespace qz::tr

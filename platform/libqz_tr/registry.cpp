@@ -28,18 +28,12 @@ constinit std::array<component_place, TR_COMPONENT_LIMIT> places{};
 constinit std::atomic<std::size_t> named{0};
 pthread_mutex_t mutex = PTHREAD_MUTEX_INITIALIZER;
 
-void lock() {
-    pthread_mutex_lock(&mutex);
-}
-void unlock() {
-    pthread_mutex_unlock(&mutex);
-}
+void lock() { pthread_mutex_lock(&mutex); }
+void unlock() { pthread_mutex_unlock(&mutex); }
 
 // A child forked while another thread held the mutex would otherwise wait for ever for a thread that it does
 // not have. Done at load time, because a once-guard that a fork interrupts would do it twice.
-[[gnu::constructor]] void keep_free_over_fork() {
-    pthread_atfork(lock, unlock, unlock);
-}
+[[gnu::constructor]] void keep_free_over_fork() { pthread_atfork(lock, unlock, unlock); }
 
 class table_lock {
 public:

@@ -15,8 +15,8 @@ bool is_printable(std::string_view bytes) {
         std::uint32_t least = 0x20;
         if (lead >= 0xF0) {
             followers = 3;
-            point = lead &
-                    0x0FU; // a lead byte above 0xF7 leaves a bit too many and ends beyond the last code point
+            // A lead byte above 0xF7 leaves a bit too many and ends beyond the last code point.
+            point = lead & 0x0FU;
             least = 0x10000;
         } else if (lead >= 0xE0) {
             followers = 2;

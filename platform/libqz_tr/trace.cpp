@@ -96,9 +96,7 @@ int tr_unregister_component_1(const char *component) {
     return registry::leave(component);
 }
 
-int tr_record_id_1(const char *component, int id) {
-    return tr_record_data_1(component, id, 0);
-}
+int tr_record_id_1(const char *component, int id) { return tr_record_data_1(component, id, 0); }
 
 int tr_record_data_1(const char *component, int id, int count, ...) {
     if (component == nullptr || count < 0)

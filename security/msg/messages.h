@@ -10,8 +10,7 @@
 namespace qz::msg {
 
 // The conversion letter of a position such as "%2$d" or "0x%1$08x": 0 when the text does not mention the
-// position,
-// '!' when it mentions it with different letters.
+// position, '!' when it mentions it with different letters.
 constexpr char conversion_of(std::string_view text, std::size_t position) {
     char found = 0;
     for (std::size_t at = 0; at + 3 < text.size(); ++at) {

@@ -18,6 +18,9 @@
 
 namespace {
 
+// Given back when there is none left to say so.
+qz::owned<void> spare_memory;
+
 // The file that was found and vetted; whatever is opened later must still be this one.
 struct acl_file {
     qz::path_buffer path;
@@ -27,7 +30,6 @@ struct acl_file {
 struct file_contents {
     qz::owned<char> text;
     std::size_t length = 0;
-    timespec read_time = {};
 };
 
 int aclfck__get_aclfile(const char *aclfname, const char *username, acl_file &file) {
@@ -46,7 +48,6 @@ int aclfck__get_aclfile(const char *aclfname, const char *username, acl_file &fi
 
 int read_contents(const acl_file &file, file_contents &contents) {
     constexpr int lock_for_reading = 1;
-    contents.read_time = qz::file_clock();
     const qz::descriptor opened = qz::open_vetted(file.path.text, O_RDONLY, file.status);
     if (!opened)
         return qz::report(SEC_S_FILE_ERROR, qz::msg::cannot_open_acl_file, file.path.text, errno);
@@ -103,13 +104,13 @@ int read_entries(file_contents &contents, unsigned flags, sec_acltree_array &tre
     }
 }
 
-int compile_and_cache(const acl_file &file, const sec_acltree_array &trees, const timespec &read_time) {
+int compile_and_cache(const acl_file &file, const sec_acltree_array &trees, const qz::text_origin &origin) {
     constexpr int even_when_current = 1;
     sec_acl_buffer_t buffer = {};
     if (const int result = sec__acltrees_to_acl(trees.trees(), &buffer); result != SEC_S_OK)
         return result;
     const qz::owned<void> buffer_owner(buffer.data);
-    return sec__cache_aclbuffer(file.path.text, &buffer, even_when_current, read_time);
+    return sec__cache_aclbuffer(file.path.text, &buffer, even_when_current, origin);
 }
 
 } // namespace
@@ -118,6 +119,7 @@ int aclfck__bulk_aclfile(const char *aclfname, const char *username, unsigned fl
     acl_file file;
     if (const int result = aclfck__get_aclfile(aclfname, username, file); result != SEC_S_OK)
         return printed(result);
+    const qz::text_origin origin(file.status);
     file_contents contents;
     if (const int result = read_contents(file, contents); result != SEC_S_OK)
         return printed(result);
@@ -138,13 +140,21 @@ int aclfck__bulk_aclfile(const char *aclfname, const char *username, unsigned fl
     if (!is_clean)
         warn_of_skipped_cache(flags);
     else if ((flags & ACLFCK_OPT_COMPILE) != 0)
-        return printed(compile_and_cache(file, trees, contents.read_time));
+        return printed(compile_and_cache(file, trees, origin));
     return SEC_S_OK;
 }
 
 int aclfck__stream_aclfile(const char * /*aclfname*/, const char * /*username*/) { return SEC_S_OK; }
 
+void aclfck__keep_spare_memory() {
+    constexpr std::size_t enough_for_a_message = 16384;
+    spare_memory.reset(std::malloc(enough_for_a_message));
+}
+
 void aclfck__print_error() {
-    qz::print_recorded(stderr, "\n");
+    if (!qz::print_recorded(stderr, "\n")) {
+        spare_memory.reset();
+        static_cast<void>(qz::print_recorded(stderr, "\n"));
+    }
     std::fflush(stderr);
 }

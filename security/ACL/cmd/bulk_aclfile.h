@@ -17,6 +17,9 @@ int aclfck__bulk_aclfile(const char *aclfname, const char *username, unsigned fl
 // Stands for a check that does not hold the whole file in memory; it does nothing and returns 0.
 int aclfck__stream_aclfile(const char *aclfname, const char *username);
 
+// Sets memory aside for printing an error when there is no other left; called once, at the start.
+void aclfck__keep_spare_memory();
+
 // Prints the current error and an empty line, at once.
 void aclfck__print_error();
 

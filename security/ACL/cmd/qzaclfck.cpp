@@ -148,6 +148,7 @@ void fill_standard_descriptors() {
 
 int main(int argc, char *argv[]) {
     fill_standard_descriptors();
+    aclfck__keep_spare_memory();
     std::setlocale(LC_ALL, "");
     // Entry lines are gathered; every failure is flushed when it is printed, and the rest at the end.
     static char stream_buffer[1 << 16];

@@ -115,7 +115,8 @@ public:
             failed_ = true;
             return;
         }
-        std::memcpy(at_, source, count);
+        if (count != 0) // what is absent has no address
+            std::memcpy(at_, source, count);
         at_ += count;
     }
 

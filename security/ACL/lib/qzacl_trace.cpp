@@ -31,6 +31,7 @@ int acl__trace_register_component() {
 
     const std::uint32_t level = __atomic_load_n(
         &acl__trace_detail_levels[static_cast<std::size_t>(qz::trace_category::perf)], __ATOMIC_RELAXED);
+    // The record carries the level alone; the trace file's own name and size are no news to whoever reads it.
     if (perf_level_is_recorded(level))
         qz::trace_data(0, qz::number(level));
     __atomic_store_n(&acl__trace_is_registered, true, __ATOMIC_RELEASE);

@@ -56,14 +56,20 @@ struct file_text {
     std::size_t length = 0;
 };
 
+int not_found(const char *file_name, int error) {
+    if (qz::traces(qz::trace_category::info))
+        qz::trace_data(123, qz::item(file_name), qz::number(error));
+    return qz::report(SEC_S_FILE_ERROR, qz::msg::bad_file_name, file_name, error);
+}
+
 int read_file(const char *file_name, int fd, file_text &file) {
     struct stat status = {};
-    if (stat(file_name, &status) != 0) {
-        const int error = errno;
-        if (qz::traces(qz::trace_category::info))
-            qz::trace_data(123, qz::item(file_name), qz::number(error));
-        return qz::report(SEC_S_FILE_ERROR, qz::msg::bad_file_name, file_name, error);
-    }
+    if (stat(file_name, &status) != 0)
+        return not_found(file_name, errno);
+    // The size of one file must not cut the text of another that was exchanged for it after the open.
+    struct stat opened = {};
+    if (fstat(fd, &opened) != 0 || opened.st_dev != status.st_dev || opened.st_ino != status.st_ino)
+        return not_found(file_name, ESTALE);
     const auto size = static_cast<std::size_t>(status.st_size);
     if (size == 0)
         return SEC_S_OK;
@@ -126,7 +132,7 @@ int acl__read_acl_file(const char *file_name, int fd, char **text, std::size_t *
     const int result = read_file(file_name, fd, file);
     *length = result == SEC_S_OK ? file.length : 0;
     *text = result == SEC_S_OK ? file.text.release() : nullptr;
-    if (qz::trace_level(qz::trace_category::perf) == 2)
+    if (is_timed)
         qz::trace_elapsed(6, start);
     return result;
 }

@@ -29,9 +29,8 @@ int read_checked(int length, const void *data, sec_acl_buffer_t *acl) {
 int release_checked(sec_acl_buffer_t *acl) {
     if (acl == nullptr || acl->data == nullptr)
         return SEC_S_OK;
-    // A descriptor that claims no bytes has no first byte to look at.
-    const qz::byte_span bytes = qz::format::bytes_of(*acl);
-    if (bytes.empty() || bytes.front() != qz::format::buffer_type)
+    // Memory that is held has a first byte, whatever the length says.
+    if (*static_cast<const unsigned char *>(acl->data) != qz::format::buffer_type)
         return qz::report(SEC_S_BAD_ACL, qz::msg::acl_corrupted);
     std::free(acl->data);
     *acl = {};

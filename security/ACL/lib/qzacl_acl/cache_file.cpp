@@ -7,10 +7,12 @@
 #include "report.h"
 
 #include <cerrno>
+#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <fcntl.h>
+#include <pthread.h>
 #include <sys/stat.h>
 
 namespace {
@@ -100,12 +102,33 @@ qz::descriptor create_temporary(const char *aclfname, qz::path_buffer &name) {
     return {};
 }
 
-// Writes the buffer and gives the file its time, so that both are on disk before the file gets its final
-// name.
-int write_buffer(int fd, const sec_acl_buffer_t &acl, const timespec &text_time) {
-    const timespec times[2] = {text_time, text_time};
+// One write. Past a file size limit it fails like on a full disk: the signal that would end the process, and leave half
+// a cache behind, is held back and taken away again.
+ssize_t write_once(int fd, const sec_acl_buffer_t &acl) {
+    sigset_t limit_signal;
+    sigset_t before;
+    sigset_t pending;
+    sigemptyset(&limit_signal);
+    sigaddset(&limit_signal, SIGXFSZ);
+    pthread_sigmask(SIG_BLOCK, &limit_signal, &before);
+    sigpending(&pending);
     errno = 0;
     const ssize_t count = write(fd, acl.data, static_cast<std::size_t>(acl.length));
+    const int error = errno;
+    if (error == EFBIG && sigismember(&pending, SIGXFSZ) == 0) {
+        const timespec at_once = {};
+        while (sigtimedwait(&limit_signal, nullptr, &at_once) < 0 && errno == EINTR) {
+        }
+    }
+    pthread_sigmask(SIG_SETMASK, &before, nullptr);
+    errno = error;
+    return count;
+}
+
+// Writes the buffer, stamps the file, and has its bytes on disk before the file gets its final name.
+int write_buffer(int fd, const sec_acl_buffer_t &acl, const timespec &text_time) {
+    const timespec times[2] = {text_time, text_time};
+    const ssize_t count = write_once(fd, acl);
     if (count == acl.length && futimens(fd, times) == 0 && fdatasync(fd) == 0)
         return SEC_S_OK;
     return qz::report(SEC_S_FILE_ERROR, qz::msg::short_write, static_cast<int>(count), acl.length, errno);
@@ -133,35 +156,44 @@ int fill_and_rename(int fd, const char *temporary_name, const char *cache_name, 
 
 namespace qz {
 
-timespec file_clock() {
-    timespec now = {};
-    clock_gettime(CLOCK_REALTIME_COARSE, &now);
-    return now;
+text_origin::text_origin(const struct stat &vetted) : device(vetted.st_dev), inode(vetted.st_ino), time() {
+    // The coarse clock is the one that the kernel stamps files from.
+    clock_gettime(CLOCK_REALTIME_COARSE, &time);
+}
+
+bool make_cache_name(const char *aclfname, path_buffer &name) {
+    const std::size_t length = strnlen(aclfname, uncached_path_length);
+    if (length >= uncached_path_length)
+        return false;
+    std::memcpy(name.text, aclfname, length);
+    std::memcpy(name.text + length, cache_extension, sizeof cache_extension);
+    return true;
 }
 
 } // namespace qz
 
 int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, int force,
-                         const timespec &text_time) {
+                         const qz::text_origin &origin) {
     constexpr int lock_for_replacing = 2;
     if (acl->length == 0) {
         if (qz::trace_level(qz::trace_category::info) == 1)
             qz::trace_data(107, qz::item(aclfname));
         return SEC_S_ADVISORY;
     }
-    const std::size_t name_length = std::strlen(aclfname);
-    if (name_length >= qz::uncached_path_length) {
-        const int shown_length = qz::shown_size(name_length);
+    qz::path_buffer cache_name;
+    if (!qz::make_cache_name(aclfname, cache_name)) {
+        const int shown_length = qz::shown_size(std::strlen(aclfname));
         if (qz::traces(qz::trace_category::errors))
             qz::trace_data(108, qz::item(aclfname), qz::number(shown_length));
         return qz::report(SEC_S_FILE_ERROR, qz::msg::name_too_long_for_cache, aclfname);
     }
-    qz::path_buffer cache_name;
-    std::snprintf(cache_name.text, sizeof cache_name.text, "%s%s", aclfname, qz::cache_extension);
 
     struct stat acl_status = {};
     if (stat(aclfname, &acl_status) != 0)
         return query_failed(aclfname, aclfname, errno);
+    if (acl_status.st_dev != origin.device || acl_status.st_ino != origin.inode ||
+        !S_ISREG(acl_status.st_mode))
+        return query_failed(aclfname, aclfname, ESTALE);
     struct stat cache_status = {};
     const bool is_new = stat(cache_name.text, &cache_status) != 0;
     if (is_new) {
@@ -194,7 +226,7 @@ int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, int 
     if (!temporary)
         return cannot_open(temporary_name.text);
     const int result =
-        fill_and_rename(temporary.fd(), temporary_name.text, cache_name.text, *acl, acl_status, text_time);
+        fill_and_rename(temporary.fd(), temporary_name.text, cache_name.text, *acl, acl_status, origin.time);
     if (result == SEC_S_OK) {
         temporary.keep();
         placeholder.keep();

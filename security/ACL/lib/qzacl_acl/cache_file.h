@@ -7,26 +7,35 @@
 
 #include <cstddef>
 #include <ctime>
+#include <sys/stat.h>
 
 namespace qz {
 
 inline constexpr char cache_extension[] = ".cacl";
-// An ACL file's path that is as long as this has no cache.
+// An ACL file's path that is as long as this, or longer, has no cache.
 inline constexpr std::size_t uncached_path_length = path_max - sizeof cache_extension;
 
-// The time of files as the kernel takes it when it stamps them now. Taken before the text of an ACL file is
-// read, it is what the cache made from that text is stamped with: an edit that comes later is never older
-// than the cache.
-timespec file_clock();
+// Where the text of a cache comes from: the file that is read, and the time, as the kernel stamps files now, before
+// any of it is read. The cache is stamped with that time, so that an edit that comes later is never older than it;
+// and no other file that was exchanged for the one read lends its owner and mode to the cache.
+struct text_origin {
+    explicit text_origin(const struct stat &vetted);
+
+    dev_t device;
+    ino_t inode;
+    timespec time;
+};
+
+// Forms the name of a file's cache; false when the path is too long to have one.
+bool make_cache_name(const char *aclfname, path_buffer &name);
 
 } // namespace qz
 
-// Writes the buffer to the ACL file's cache, stamped with `text_time` (see file_clock), through a temporary
-// file that takes the cache's place whole. Without `force` a cache that is later than the ACL file is left
-// alone. Returns SEC_S_OK when a new cache is in place; SEC_S_ADVISORY, without a message, when the buffer is
-// empty or the cache current; else SEC_S_FILE_ERROR, leaving a cache that was there as it was and nothing
-// else behind.
+// Writes the buffer to the ACL file's cache, through a temporary file that takes the cache's place whole. Without
+// `force` a cache that is later than the ACL file is left alone. Returns SEC_S_OK when a new cache is in place;
+// SEC_S_ADVISORY, without a message, when the buffer is empty or the cache current; else SEC_S_FILE_ERROR, leaving a
+// cache that was there as it was and nothing else behind.
 int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, int force,
-                         const timespec &text_time);
+                         const qz::text_origin &origin);
 
 #endif

@@ -2,6 +2,7 @@
 #include "qzacl_acl/compile.h"
 
 #include "qzacl_acl/buffer_format.h"
+#include "qzacl_trace.h"
 #include "report.h"
 
 namespace {
@@ -74,6 +75,7 @@ int common_part(const format::subacl &head, sec_acle_t &acle) {
 }
 
 int expand(qz::byte_reader reader, const format::subacl &head, sec_acltree_t **root) {
+    const bool is_traced = qz::traces(qz::trace_category::api);
     sec_acle_t acle = {};
     if (const int result = common_part(head, acle); result != SEC_S_OK)
         return result;
@@ -91,6 +93,8 @@ int expand(qz::byte_reader reader, const format::subacl &head, sec_acltree_t **r
         }
         if (const int result = sec__add_acle_to_tree(0, &acle, root); result != SEC_S_OK)
             return result;
+        if (is_traced)
+            sec__trace_release(&acle);
     }
     return SEC_S_OK;
 }
@@ -109,6 +113,8 @@ int sec__acltree_to_subacl(const sec_acltree_t *root, qz::loose_subacl &out) {
         return qz::report_no_memory("sec__add_acle_to_subacl", subacl.head.length);
     qz::byte_writer writer({memory.get(), subacl.head.length});
     write(writer, subacl);
+    if (!writer.is_full())
+        return corrupt(__LINE__);
     out = {std::move(memory), subacl.head.length};
     return SEC_S_OK;
 }
@@ -143,6 +149,8 @@ int sec__acltrees_to_acl(std::span<sec_acltree_t *const> trees, sec_acl_buffer_t
             return result;
         write(writer, subacl);
     }
+    if (!writer.is_full())
+        return corrupt(__LINE__);
     *acl = {static_cast<std::int32_t>(size), memory.release()};
     return SEC_S_OK;
 }
@@ -186,8 +194,12 @@ int sec__acltree_to_aclelist(sec_acltree_t *root, sec_aclelist_t *list) {
         sec_acle_t *made = nullptr;
         const int result =
             sec__create_acle(node->type, node->perm_mask, node->mechanism, node->identity, 0, &made);
-        if (result != SEC_S_OK)
+        if (result != SEC_S_OK) {
+            // A list without entries owns no array.
+            if (list->count == 0)
+                std::free(std::exchange(list->acles, nullptr));
             return result;
+        }
         list->acles[list->count++] = made;
         root->erase(*node);
     }

@@ -20,7 +20,7 @@ constexpr char as_it_stands[] = "";
 constexpr char with_empty_line[] = "\n";
 
 void print_and_clear(std::FILE *stream, const char *ending) {
-    qz::print_recorded(stream, ending);
+    static_cast<void>(qz::print_recorded(stream, ending));
     cu_set_no_error_1();
 }
 
@@ -54,15 +54,17 @@ void dump_subacl(qz::byte_span bytes, const char *indentation) {
 
 namespace qz {
 
-void print_recorded(std::FILE *stream, const char *ending) {
+bool print_recorded(std::FILE *stream, const char *ending) {
     cu_error_t *error = nullptr;
     char *text = nullptr;
-    if (cu_get_error_1(&error) == SEC_S_OK && cu_get_errmsg_1(error, &text) == SEC_S_OK) {
+    const bool has_text = cu_get_error_1(&error) == SEC_S_OK && cu_get_errmsg_1(error, &text) == SEC_S_OK;
+    if (has_text) {
         std::fputs(text, stream);
         std::fputs(ending, stream);
     }
     cu_rel_error_1(error);
     cu_rel_errmsg_1(text);
+    return has_text;
 }
 
 } // namespace qz

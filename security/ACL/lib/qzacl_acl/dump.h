@@ -6,8 +6,9 @@
 
 namespace qz {
 
-// Writes the text of the thread's current error and then `ending`; the error stays current.
-void print_recorded(std::FILE *stream, const char *ending);
+// Writes the text of the thread's current error and then `ending`; the error stays current. False when there is no
+// memory for the text, and nothing was written.
+bool print_recorded(std::FILE *stream, const char *ending);
 
 } // namespace qz
 

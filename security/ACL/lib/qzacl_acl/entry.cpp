@@ -197,7 +197,7 @@ int sec_display_acle_id(const sec_acle_t *acle, char **mechanism, char **identit
     return result;
 }
 
-void sec_release_acle(sec_acle_t *acle) {
+void sec__trace_release(const sec_acle_t *acle) {
     qz::trace_entry(45, [&] {
         const std::uint32_t type = acle == nullptr ? 0 : acle->type;
         const std::uint32_t mask = acle == nullptr ? 0 : acle->perm_mask;
@@ -205,11 +205,15 @@ void sec_release_acle(sec_acle_t *acle) {
                        qz::item(acle == nullptr ? nullptr : acle->mechanism),
                        qz::item(acle == nullptr ? nullptr : acle->identity));
     });
+    qz::trace_release_exit(48);
+}
+
+void sec_release_acle(sec_acle_t *acle) {
+    sec__trace_release(acle);
     if (acle != nullptr) {
         std::free(acle->identity);
         std::free(acle);
     }
-    qz::trace_release_exit(48);
 }
 
 void sec_release_aclelist(sec_aclelist_t *list) {

@@ -77,6 +77,9 @@ int sec_translate_perms(const char *text, const sec_perm_set_t *set, std::uint32
 }
 
 int sec_translate_bitmask(std::uint32_t mask, const sec_perm_set_t *set, char *out) {
+    // Before the entry point, whose record shows the output.
+    if (out != nullptr)
+        out[0] = '\0';
     qz::trace_entry(97, [&] {
         qz::trace_data(99, qz::number(mask), qz::number(set), qz::item(out == nullptr ? "<nil>" : out));
     });
@@ -84,10 +87,8 @@ int sec_translate_bitmask(std::uint32_t mask, const sec_perm_set_t *set, char *o
     if (out == nullptr) {
         // The name in this message differs from the operation's; callers match on it as it stands.
         result = qz::report_bad_parameter("sec_translate_mask", 3, 0);
-    } else {
-        out[0] = '\0';
-        if (mask != 0)
-            result = sec__translate_bitmask(mask, set == nullptr ? &acl__default_perm_set : set, out);
+    } else if (mask != 0) {
+        result = sec__translate_bitmask(mask, set == nullptr ? &acl__default_perm_set : set, out);
     }
     qz::trace_exit(100, result, [&] { qz::trace_data(102, qz::number(result), qz::item(out)); });
     return result;

@@ -10,8 +10,6 @@
 #include "report.h"
 
 #include <cerrno>
-#include <cstdio>
-#include <cstring>
 #include <fcntl.h>
 #include <sys/stat.h>
 
@@ -79,9 +77,8 @@ int acl_file_reader::vet(const char *aclfname) {
 // True when the cache may be read instead of the text: there, later than the text, owned and protected alike.
 bool acl_file_reader::cache_is_current() {
     const bool is_traced = qz::traces(qz::trace_category::info);
-    if (std::strlen(acl_.path.text) >= qz::uncached_path_length)
+    if (!qz::make_cache_name(acl_.path.text, cache_.path))
         return false;
-    std::snprintf(cache_.path.text, sizeof cache_.path.text, "%s%s", acl_.path.text, qz::cache_extension);
     if (is_traced)
         qz::trace_data(117, qz::item(cache_.path.text));
     if (stat(cache_.path.text, &cache_.status) != 0) {
@@ -188,15 +185,14 @@ int acl_file_reader::parse(file_bytes &text, sec_acl_buffer_t &out) {
 }
 
 int acl_file_reader::read_text(sec_acl_buffer_t &out) {
-    // Whatever changes in the file from here on is no older than the cache that is made of it.
-    const timespec text_time = qz::file_clock();
+    const qz::text_origin origin(acl_.status);
     file_bytes text;
     if (const int result = open_and_read(acl_, text); result != SEC_S_OK)
         return result;
     if (const int result = parse(text, out); result != SEC_S_OK)
         return result;
     if ((flags_ & SEC_READ_ACL_CACHE) != 0 &&
-        sec__cache_aclbuffer(acl_.path.text, &out, 0, text_time) != SEC_S_OK) {
+        sec__cache_aclbuffer(acl_.path.text, &out, 0, origin) != SEC_S_OK) {
         // A cache that cannot be written is no failure of the read.
         cu_set_no_error_1();
         flags_ &= ~std::uint32_t{SEC_READ_ACL_CACHE};
@@ -210,6 +206,7 @@ int acl_file_reader::read(const char *aclfname, sec_acl_buffer_t &out) {
     if (acl_.status.st_size == 0) {
         if (qz::traces(qz::trace_category::info))
             qz::trace_data(116, qz::item(acl_.path.text));
+        flags_ &= ~std::uint32_t{SEC_READ_ACL_CACHE};
         return SEC_S_OK;
     }
     if (!reads_text() && !cache_is_current())

@@ -194,6 +194,7 @@ sec_acle_t *sec_acltree::find(const char *identity) const {
                                          });
         return at != entries.end() && is_match(*at) ? *at : nullptr;
     }
+    // Deleting is one step of an edit that has read all entries before; it must not need memory to hash a name.
     const auto at = std::find_if(entries.begin(), entries.end(), is_match);
     return at == entries.end() ? nullptr : *at;
 }
@@ -202,6 +203,11 @@ void sec_acltree::erase(sec_acle_t &acle) {
     packed_size_ -= packed_size_of(type_, std::strlen(acle.identity));
     --held_count_;
     acle.type = 0;
+}
+
+void sec_acltree::trace_release() const {
+    for (const sec_acle_t *acle : std::span(entries_, count_))
+        sec__trace_release(acle->type == 0 ? nullptr : acle);
 }
 
 bool sec_acltree::in_order(std::span<sec_acle_t *const> &nodes, std::size_t &refused) const {
@@ -296,7 +302,7 @@ sec_acltree_t **sec_acltree_array::find(const sec_acle_t &acle) {
 }
 
 // Enters the last slot into the index; half of it stays free.
-bool sec_acltree_array::index_last() {
+bool sec_acltree_array::index_last(std::size_t &refused) {
     constexpr std::uint32_t first_size = 16;
     const auto enter = [this](std::uint32_t *index, std::uint32_t size, std::uint32_t number) {
         std::uint32_t at = hash_of_key(trees_[number]->root(), hash_key_);
@@ -308,8 +314,10 @@ bool sec_acltree_array::index_last() {
         const std::uint32_t size = index_size_ == 0 ? first_size : index_size_ * 2;
         qz::owned<std::uint32_t[]> grown(
             static_cast<std::uint32_t *>(std::calloc(size, sizeof(std::uint32_t))));
-        if (grown == nullptr)
+        if (grown == nullptr) {
+            refused = size * sizeof(std::uint32_t);
             return false;
+        }
         if (index_ == nullptr)
             hash_key_ = qz::make_identity_hash_key();
         for (std::uint32_t at = 0; at < index_size_; ++at) {
@@ -338,11 +346,11 @@ int sec__add_acle_to_trees(const sec_acle_t *acle, sec_acltree_array &array) {
     ++array.count_;
     if (const int result = sec__add_acle_to_tree(1, acle, slot); result != SEC_S_OK)
         return result;
-    if (!array.index_last()) {
+    if (std::size_t refused = 0; !array.index_last(refused)) {
         // A tree that could not be found again would let a duplicate pass.
         sec__free_acltree(*slot);
         *slot = nullptr;
-        return qz::report_no_memory(function, count * sizeof(sec_acltree_t *));
+        return qz::report_no_memory(function, refused);
     }
     return SEC_S_OK;
 }
@@ -428,6 +436,7 @@ int sec__del_acle_from_tree(const sec_acle_t *acle, sec_acltree_t *root) {
     }
     if (held == nullptr)
         return sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, acle);
+    sec__trace_release(held);
     root->erase(*held);
     return SEC_S_OK;
 }
@@ -435,6 +444,8 @@ int sec__del_acle_from_tree(const sec_acle_t *acle, sec_acltree_t *root) {
 void sec__free_acltree(sec_acltree_t *root) {
     if (root == nullptr)
         return;
+    if (qz::traces(qz::trace_category::api))
+        root->trace_release();
     root->~sec_acltree();
     std::free(root);
 }

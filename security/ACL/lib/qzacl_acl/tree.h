@@ -81,6 +81,9 @@ public:
     // asked for in `refused`, when memory for sorting is lacking.
     bool in_order(std::span<sec_acle_t *const> &nodes, std::size_t &refused) const;
 
+    // Records the trace points of releasing every node's entry.
+    void trace_release() const;
+
     std::uint32_t held_count() const { return held_count_; }
     // The bytes that the entries take in a sub-ACL.
     std::uint64_t packed_size() const { return packed_size_; }
@@ -141,7 +144,7 @@ private:
     friend int sec__add_acle_to_trees(const sec_acle_t *acle, sec_acltree_array &array);
 
     sec_acltree_t **find(const sec_acle_t &acle);
-    bool index_last();
+    bool index_last(std::size_t &refused);
 
     qz::owned<sec_acltree_t *[]> trees_;
     std::int32_t count_ = 0;

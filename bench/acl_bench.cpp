@@ -1,0 +1,109 @@
+// Measures what no service can reach on its own: a trace point that is switched off, and the phases that the
+// check of a file goes through.
+//
+// usage: acl_bench FOLDER [--benchmark_...]
+//
+// The folder holds files of generate.py; a size without its file is not measured.
+#include "qzacl_acl/compile.h"
+#include "qzacl_acl/entry_parser.h"
+#include "qzacl_acl/tree.h"
+#include "qzacl_trace.h"
+
+#include <benchmark/benchmark.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <ctime>
+#include <fstream>
+#include <iterator>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace {
+
+void bench_trace_point(benchmark::State &state) {
+    int item = 0;
+    for (auto _ : state)
+        qz::trace_entry(79, [&] { qz::trace_data(81, qz::number(item)); });
+}
+
+class stopwatch {
+public:
+    // The nanoseconds of this thread since the last call.
+    double lap() {
+        timespec now = {};
+        clock_gettime(CLOCK_THREAD_CPUTIME_ID, &now);
+        const double time = static_cast<double>(now.tv_sec) * 1e9 + static_cast<double>(now.tv_nsec);
+        const double passed = time - last_;
+        last_ = time;
+        return passed;
+    }
+
+private:
+    double last_ = 0;
+};
+
+// The phases one after the other for the whole file, where the check goes from line to line; all in
+// nanoseconds a line.
+void bench_phases(benchmark::State &state, const std::string &text) {
+    double parsing = 0;
+    double inserting = 0;
+    double compiling = 0;
+    double releasing = 0;
+    std::size_t lines = 0;
+    for (auto _ : state) {
+        std::string consumed = text;
+        std::vector<sec_acle_t> entries;
+        entries.reserve(text.size() / 8);
+        char *cursor = consumed.data();
+        std::size_t remaining = consumed.size() + 1;
+        std::uint32_t line = 1;
+        stopwatch watch;
+        watch.lap();
+        for (sec_acle_t entry; sec__read_acle_from_text(nullptr, &cursor, &remaining, &line, &entry) == 1;)
+            entries.push_back(entry);
+        parsing += watch.lap();
+
+        std::optional<sec_acltree_array> trees(std::in_place);
+        int result = SEC_S_OK;
+        for (const sec_acle_t &entry : entries)
+            result |= sec__add_acle_to_trees(&entry, *trees);
+        inserting += watch.lap();
+
+        sec_acl_buffer_t acl = {};
+        result |= sec__acltrees_to_acl(trees->trees(), &acl);
+        compiling += watch.lap();
+
+        trees.reset();
+        sec_release_acl(&acl);
+        releasing += watch.lap();
+        lines += entries.size();
+        if (result != SEC_S_OK)
+            state.SkipWithError("an entry was refused");
+    }
+    const auto count = static_cast<double>(lines);
+    state.counters["parsing"] = parsing / count;
+    state.counters["inserting"] = inserting / count;
+    state.counters["compiling"] = compiling / count;
+    state.counters["releasing"] = releasing / count;
+}
+
+} // namespace
+
+int main(int argc, char *argv[]) {
+    benchmark::Initialize(&argc, argv);
+    if (argc != 2) {
+        std::fprintf(stderr, "usage: acl_bench FOLDER [--benchmark_...]\n");
+        return EXIT_FAILURE;
+    }
+    benchmark::RegisterBenchmark("trace_point", bench_trace_point);
+    for (const char *size : {"1000", "100000", "1000000"}) {
+        std::ifstream file(std::string(argv[1]) + "/rand-random-u-" + size + ".acl");
+        const std::string text{std::istreambuf_iterator<char>(file), {}};
+        if (!text.empty())
+            benchmark::RegisterBenchmark((std::string("phases/") + size).c_str(), bench_phases, text);
+    }
+    benchmark::RunSpecifiedBenchmarks();
+    benchmark::Shutdown();
+}

@@ -1,0 +1,387 @@
+// Measures what a service asks of the shared library: decisions, edits and reads, each beside the plainest
+// code that could do the same.
+//
+// usage: service_bench FOLDER [--benchmark_...]
+//
+// The folder holds files of generate.py; a size or family without its file is not measured.
+#include "qz/acl.h"
+#include "qzacl_acl/buffer_format.h"
+
+#include <benchmark/benchmark.h>
+
+#include <algorithm>
+#include <array>
+#include <cctype>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <ctime>
+#include <fcntl.h>
+#include <memory>
+#include <string>
+#include <strings.h>
+#include <sys/stat.h>
+#include <unistd.h>
+#include <vector>
+
+#ifdef QZ_BENCH_LIBACL
+#include <acl/libacl.h>
+#include <sys/acl.h>
+#endif
+
+namespace {
+
+namespace format = qz::format;
+
+constexpr char mechanism[] = "unix";
+
+[[noreturn]] void give_up(const std::string &what) {
+    std::fprintf(stderr, "service_bench: %s\n", what.c_str());
+    std::exit(EXIT_FAILURE);
+}
+
+void require(bool holds, const std::string &what) {
+    if (!holds)
+        give_up(what);
+}
+
+// ---- Buffers, and the plainest ways through them ----
+
+template <class Number>
+Number load(const unsigned char *at) {
+    Number value;
+    std::memcpy(&value, at, sizeof value);
+    return value;
+}
+
+const unsigned char *behind(const unsigned char *entry) {
+    return entry + format::entry_fixed_size + load<std::uint16_t>(entry + format::entry_length_offset);
+}
+
+const char *identity_of(const unsigned char *entry) {
+    return reinterpret_cast<const char *>(entry + format::entry_fixed_size);
+}
+
+// The compiled form of a file whose entries all have one key.
+class compiled {
+public:
+    explicit compiled(const std::string &path) {
+        require(sec_read_acl_file(path.c_str(), nullptr, nullptr, SEC_READ_ACL_TEXT, &acl, nullptr) ==
+                    SEC_S_OK,
+                "cannot read " + path);
+        qz::byte_reader reader(format::bytes_of(acl));
+        format::header header;
+        format::subacl head;
+        require(format::read(reader, header) && format::read(reader, head), path + " is empty");
+        first = reader.position();
+        count = head.entry_count;
+    }
+    compiled(const compiled &) = delete;
+    compiled &operator=(const compiled &) = delete;
+    ~compiled() { sec_release_acl(&acl); }
+
+    const unsigned char *entry(std::uint32_t number) const {
+        const unsigned char *at = first;
+        for (; number != 0; --number)
+            at = behind(at);
+        return at;
+    }
+
+    sec_acl_buffer_t acl = {};
+    const unsigned char *first = nullptr;
+    std::uint32_t count = 0;
+};
+
+// An identity as a requester may spell it: the same in the other letter case.
+std::string respelled(const unsigned char *entry) {
+    std::string text = identity_of(entry);
+    std::transform(text.begin(), text.end(), text.begin(), [](unsigned char c) {
+        return static_cast<char>(std::islower(c) != 0 ? std::toupper(c) : std::tolower(c));
+    });
+    return text;
+}
+
+constexpr std::array<unsigned char, 256> fold_table = [] {
+    std::array<unsigned char, 256> table{};
+    for (unsigned byte = 0; byte < table.size(); ++byte)
+        table[byte] = static_cast<unsigned char>(byte >= 'A' && byte <= 'Z' ? byte + ('a' - 'A') : byte);
+    return table;
+}();
+
+int compare_by_table(const char *a, const char *b) {
+    for (;; ++a, ++b) {
+        const int left = fold_table[static_cast<unsigned char>(*a)];
+        const int right = fold_table[static_cast<unsigned char>(*b)];
+        if (left != right || left == 0)
+            return left - right;
+    }
+}
+
+// The permissions of the identity, found by comparing with entry after entry; no bound is checked.
+template <class Compare>
+std::uint32_t scan(const unsigned char *entry, std::uint32_t count, const char *wanted, Compare compare) {
+    for (; count != 0; --count, entry = behind(entry)) {
+        const int order = compare(wanted, identity_of(entry));
+        if (order == 0)
+            return load<std::uint32_t>(entry + format::entry_mask_offset);
+        if (order < 0)
+            break;
+    }
+    return 0;
+}
+
+// ---- Decisions ----
+
+using buffer = std::shared_ptr<compiled>;
+
+void bench_decision(benchmark::State &state, const buffer &held, const std::string &identity, int expected) {
+    std::uint32_t mask = 0;
+    for (auto _ : state) {
+        const int result =
+            sec__single_acle_perm(&held->acl, SEC_ACLE_USER, mechanism, nullptr, identity.c_str(), &mask);
+        benchmark::DoNotOptimize(result);
+        benchmark::DoNotOptimize(mask);
+        if (result != expected) {
+            state.SkipWithError("unexpected result");
+            break;
+        }
+    }
+}
+
+void bench_walk(benchmark::State &state, const buffer &held, std::uint32_t steps) {
+    for (auto _ : state) {
+        const unsigned char *at = held->first;
+        benchmark::DoNotOptimize(at);
+        for (std::uint32_t left = steps; left != 0; --left)
+            at = behind(at);
+        benchmark::DoNotOptimize(at);
+    }
+}
+
+template <class Compare>
+void bench_scan(benchmark::State &state, const buffer &held, const std::string &identity, Compare compare) {
+    for (auto _ : state) {
+        const char *wanted = identity.c_str();
+        benchmark::DoNotOptimize(wanted);
+        benchmark::DoNotOptimize(scan(held->first, held->count, wanted, compare));
+    }
+}
+
+void add_decisions(const std::string &family, std::uint32_t count, const std::string &path) {
+    const auto held = std::make_shared<compiled>(path);
+    const std::uint32_t middle = count / 2;
+    const std::string identity = respelled(held->entry(middle));
+    const auto add = [&](const std::string &what, auto function, auto... arguments) {
+        const std::string name = what + "/" + family + "/" + std::to_string(count);
+        benchmark::RegisterBenchmark(name.c_str(), function, held, arguments...);
+    };
+    add("decision", bench_decision, identity, SEC_S_OK);
+    add("walk", bench_walk, middle);
+    add("table_scan", bench_scan<decltype(&compare_by_table)>, identity, &compare_by_table);
+    add("strcasecmp_scan", bench_scan<decltype(&strcasecmp)>, identity, &strcasecmp);
+    // Behind everything, and where the decision ends but just not there.
+    add("denial_at_end", bench_decision, std::string(10, '~'), SEC_S_BAD_ACLE);
+    std::string almost = identity;
+    almost.pop_back();
+    add("denial_in_middle", bench_decision, almost, SEC_S_BAD_ACLE);
+    add("decision_at_end", bench_decision, respelled(held->entry(count - 1)), SEC_S_OK);
+}
+
+// 32 groups in no order, of which every other one has an entry.
+void bench_groups(benchmark::State &state, const buffer &held) {
+    constexpr std::uint32_t group_count = 32;
+    std::vector<std::string> names;
+    names.reserve(group_count);
+    for (std::uint32_t index = 0; index < group_count; ++index) {
+        const std::uint32_t scattered = index * 7 % group_count;
+        names.push_back(respelled(held->entry(held->count / group_count * scattered)) +
+                        (index % 2 == 0 ? "" : "x"));
+    }
+    std::vector<sec_group_ref_t> groups;
+    groups.reserve(group_count);
+    for (const std::string &name : names)
+        groups.push_back({0, name.c_str()});
+    std::uint32_t mask = 0;
+    for (auto _ : state) {
+        if (sec__group_acles_perm(&held->acl, static_cast<std::int32_t>(groups.size()), groups.data(),
+                                  &mask) != SEC_S_OK)
+            state.SkipWithError("no group found");
+        benchmark::DoNotOptimize(mask);
+    }
+}
+
+// ---- Edits ----
+
+double thread_seconds() {
+    timespec now = {};
+    clock_gettime(CLOCK_THREAD_CPUTIME_ID, &now);
+    return static_cast<double>(now.tv_sec) + static_cast<double>(now.tv_nsec) / 1e9;
+}
+
+// Adds an entry in the middle and deletes it again; one of the two is timed.
+void bench_edit(benchmark::State &state, const buffer &held, bool times_adding) {
+    std::string identity = identity_of(held->entry(held->count / 2));
+    identity += "x";
+    sec_acle_t acle = {};
+    acle.type = SEC_ACLE_USER;
+    acle.perm_mask = 1;
+    std::memcpy(acle.mechanism, mechanism, sizeof mechanism);
+    acle.identity = identity.data();
+    for (auto _ : state) {
+        const double start = thread_seconds();
+        const int added = sec_add_acle_to_acl2(&acle, &held->acl);
+        const double between = thread_seconds();
+        const int deleted = sec_del_acle_from_acl(&acle, &held->acl);
+        const double end = thread_seconds();
+        if (added != SEC_S_OK || deleted != SEC_S_OK) {
+            state.SkipWithError("an edit failed");
+            break;
+        }
+        state.SetIterationTime(times_adding ? between - start : end - between);
+    }
+}
+
+// ---- Reads ----
+
+void bench_read(benchmark::State &state, const std::string &path, std::uint32_t flags) {
+    for (auto _ : state) {
+        sec_acl_buffer_t acl = {};
+        std::uint32_t out_flags = 0;
+        const int result = sec_read_acl_file(path.c_str(), nullptr, nullptr, flags, &acl, &out_flags);
+        if (result != SEC_S_OK || out_flags != flags) {
+            state.SkipWithError("read in another way than wanted");
+            break;
+        }
+        sec_release_acl(&acl);
+    }
+}
+
+// Opens a file and reads all of it into memory of its size.
+void bench_plain_read(benchmark::State &state, const std::string &path) {
+    for (auto _ : state) {
+        const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC);
+        struct stat status = {};
+        if (fstat(fd, &status) != 0) {
+            state.SkipWithError("no such file");
+            break;
+        }
+        const auto size = static_cast<std::size_t>(status.st_size);
+        void *memory = std::malloc(size);
+        if (read(fd, memory, size) != status.st_size)
+            state.SkipWithError("a short read");
+        benchmark::DoNotOptimize(memory);
+        std::free(memory);
+        close(fd);
+    }
+}
+
+void add_reads(std::uint32_t count, const std::string &path) {
+    // The cache is used only when it is later in whole seconds.
+    const timespec long_ago[2] = {{1, 0}, {1, 0}};
+    require(utimensat(AT_FDCWD, path.c_str(), long_ago, 0) == 0, "cannot set the time of " + path);
+    sec_acl_buffer_t acl = {};
+    sec_read_acl_file(path.c_str(), nullptr, nullptr, SEC_READ_ACL_CACHE, &acl, nullptr);
+    sec_release_acl(&acl);
+
+    const auto add = [&](const std::string &what, auto function, const std::string &file, auto... arguments) {
+        const std::string name = what + "/" + std::to_string(count);
+        benchmark::RegisterBenchmark(name.c_str(), function, file, arguments...);
+    };
+    add("cached_read", bench_read, path, std::uint32_t{SEC_READ_ACL_CONVERT});
+    add("text_read", bench_read, path, std::uint32_t{SEC_READ_ACL_TEXT});
+    add("plain_read", bench_plain_read, path + ".cacl");
+}
+
+// ---- POSIX ACLs: the parse of a text and the look-up of a user by number ----
+
+#ifdef QZ_BENCH_LIBACL
+
+std::string posix_acl_text(std::uint32_t count) {
+    std::string text = "user::rwx\ngroup::r-x\nother::---\nmask::rwx\n";
+    for (std::uint32_t number = 0; number < count; ++number)
+        text += "user:" + std::to_string(100000 + number) + ":r-x\n";
+    return text;
+}
+
+void bench_posix_parse(benchmark::State &state, std::uint32_t count) {
+    const std::string text = posix_acl_text(count);
+    for (auto _ : state) {
+        acl_t acl = acl_from_text(text.c_str());
+        if (acl == nullptr) {
+            state.SkipWithError("refused");
+            break;
+        }
+        acl_free(acl);
+    }
+}
+
+bool grants(acl_t acl, uid_t user) {
+    acl_entry_t entry = nullptr;
+    for (int id = ACL_FIRST_ENTRY; acl_get_entry(acl, id, &entry) == 1; id = ACL_NEXT_ENTRY) {
+        acl_tag_t tag = 0;
+        if (acl_get_tag_type(entry, &tag) != 0 || tag != ACL_USER)
+            continue;
+        void *held = acl_get_qualifier(entry);
+        const bool is_match = held != nullptr && *static_cast<uid_t *>(held) == user;
+        acl_free(held);
+        if (is_match) {
+            acl_permset_t permissions = nullptr;
+            return acl_get_permset(entry, &permissions) == 0 && acl_get_perm(permissions, ACL_READ) == 1;
+        }
+    }
+    return false;
+}
+
+void bench_posix_look_up(benchmark::State &state, std::uint32_t count) {
+    acl_t acl = acl_from_text(posix_acl_text(count).c_str());
+    for (auto _ : state) {
+        if (!grants(acl, 100000 + count / 2))
+            state.SkipWithError("not granted");
+    }
+    acl_free(acl);
+}
+
+#endif
+
+// ---- What is there to be measured ----
+
+void add_all(const std::string &folder) {
+    const auto file = [&](const std::string &family, const char *type, std::uint32_t count) {
+        return folder + "/" + family + "-random-" + type + "-" + std::to_string(count) + ".acl";
+    };
+    const auto is_there = [](const std::string &path) { return access(path.c_str(), R_OK) == 0; };
+    for (const char *family : {"rand", "prefixed"}) {
+        for (const std::uint32_t count : {10u, 100u, 1000u, 100000u}) {
+            const std::string path = file(family, "u", count);
+            if (is_there(path))
+                add_decisions(family, count, path);
+        }
+    }
+    if (const std::string path = file("rand", "g", 1000); is_there(path))
+        benchmark::RegisterBenchmark("groups/1000", bench_groups, std::make_shared<compiled>(path));
+    if (const std::string path = file("rand", "u", 100000); is_there(path)) {
+        const auto held = std::make_shared<compiled>(path);
+        benchmark::RegisterBenchmark("adding/100000", bench_edit, held, true)->UseManualTime();
+        benchmark::RegisterBenchmark("deleting/100000", bench_edit, held, false)->UseManualTime();
+    }
+    for (const std::uint32_t count : {1000u, 100000u, 1000000u}) {
+        const std::string path = file("rand", "u", count);
+        if (is_there(path))
+            add_reads(count, path);
+    }
+#ifdef QZ_BENCH_LIBACL
+    benchmark::RegisterBenchmark("posix_parse/1000", bench_posix_parse, 1000);
+    benchmark::RegisterBenchmark("posix_look_up/1000", bench_posix_look_up, 1000);
+#endif
+}
+
+} // namespace
+
+int main(int argc, char *argv[]) {
+    benchmark::Initialize(&argc, argv);
+    if (argc != 2)
+        give_up("usage: service_bench FOLDER [--benchmark_...]");
+    add_all(argv[1]);
+    benchmark::RunSpecifiedBenchmarks();
+    benchmark::Shutdown();
+}
