@@ -20,7 +20,7 @@ int measure(const sec_acltree_t &tree, measured_subacl &out) {
     std::size_t refused = 0;
     if (!tree.in_order(out.nodes, refused))
         return qz::report_no_memory(function, refused);
-    if (qz::has_identity(tree.type()) && tree.longest_identity() > format::identity_max)
+    if (qz::has_identity(tree.type()) && tree.has_overlong_identity())
         return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_lacks_key, tree.type());
 
     out.head.type = tree.type();

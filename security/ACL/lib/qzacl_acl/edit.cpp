@@ -147,7 +147,8 @@ qz::identity_block block_of(qz::byte_span field, std::size_t left_behind) {
     if (field.size() + left_behind >= qz::identity_block::size)
         return qz::identity_block(field.data());
     unsigned char padded[qz::identity_block::size] = {};
-    std::memcpy(padded, field.data(), field.size());
+    if (!field.empty())
+        std::memcpy(padded, field.data(), field.size());
     return qz::identity_block(padded);
 }
 

@@ -63,11 +63,13 @@ std::uint64_t key_behind(const char *identity, std::size_t prefix) {
     return key;
 }
 
-bool sorts_before(const keyed_acle &a, const keyed_acle &b) {
-    if (a.key != b.key)
-        return a.key < b.key;
-    return compare_identities(a.acle->identity, b.acle->identity) < 0;
-}
+struct sorts_before {
+    bool operator()(const keyed_acle &a, const keyed_acle &b) const {
+        if (a.key != b.key)
+            return a.key < b.key;
+        return compare_identities(a.acle->identity, b.acle->identity) < 0;
+    }
+};
 
 // Below this many elements comparing costs less than counting digits.
 constexpr std::size_t comparison_sort_max = 48;
@@ -76,7 +78,7 @@ constexpr std::size_t comparison_sort_max = 48;
 // recursion is as deep as a key has bytes. The result always ends in `elements`.
 void sort_keyed(std::span<keyed_acle> elements, std::span<keyed_acle> scratch, unsigned shift) {
     if (elements.size() <= comparison_sort_max || shift >= 64) {
-        std::sort(elements.begin(), elements.end(), sorts_before);
+        std::sort(elements.begin(), elements.end(), sorts_before{});
         return;
     }
     const auto digit = [shift](const keyed_acle &element) { return (element.key >> (56 - shift)) & 0xff; };

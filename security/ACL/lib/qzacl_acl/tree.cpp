@@ -1,6 +1,7 @@
 // Trees: the entries of one key, collected in the order in which they are compiled.
 #include "qzacl_acl/tree.h"
 
+#include "qzacl_acl/buffer_format.h"
 #include "qzacl_trace.h"
 #include "report.h"
 
@@ -47,9 +48,12 @@ std::size_t node_size(std::size_t identity_length) {
 // Single entries have no identity of their own; an empty one keeps their handling alike.
 const char *identity_of(const sec_acle_t &acle) { return acle.identity == nullptr ? "" : acle.identity; }
 
+std::uint32_t is_overlong(std::size_t identity_length) {
+    return identity_length > qz::format::identity_max ? 1 : 0;
+}
+
 std::size_t packed_size_of(std::uint8_t type, std::size_t identity_length) {
-    constexpr std::size_t fixed_part = 7;
-    return fixed_part + (qz::has_identity(type) ? identity_length + 1 : 0);
+    return qz::format::entry_fixed_size + (qz::has_identity(type) ? identity_length + 1 : 0);
 }
 
 } // namespace
@@ -177,7 +181,7 @@ sec_acltree::outcome sec_acltree::insert(const sec_acle_t &acle, sec_acle_t *&he
     order_.reset();
     ++held_count_;
     packed_size_ += packed_size_of(type_, length);
-    longest_identity_ = std::max(longest_identity_, length);
+    overlong_count_ += is_overlong(length);
     held = copy;
     return outcome::inserted;
 }
@@ -200,7 +204,9 @@ sec_acle_t *sec_acltree::find(const char *identity) const {
 }
 
 void sec_acltree::erase(sec_acle_t &acle) {
-    packed_size_ -= packed_size_of(type_, std::strlen(acle.identity));
+    const std::size_t length = std::strlen(acle.identity);
+    packed_size_ -= packed_size_of(type_, length);
+    overlong_count_ -= is_overlong(length);
     --held_count_;
     acle.type = 0;
 }

@@ -87,8 +87,8 @@ public:
     std::uint32_t held_count() const { return held_count_; }
     // The bytes that the entries take in a sub-ACL.
     std::uint64_t packed_size() const { return packed_size_; }
-    // The length of the longest identity that was ever inserted, without its NUL.
-    std::size_t longest_identity() const { return longest_identity_; }
+    // True when an entry's identity is longer than a length field can say.
+    bool has_overlong_identity() const { return overlong_count_ != 0; }
     // The bytes that the last failed insertion asked for.
     std::size_t refused() const { return refused_; }
 
@@ -115,7 +115,7 @@ private:
     std::uint32_t capacity_ = own_capacity;
     std::uint32_t held_count_ = 0;
     std::uint64_t packed_size_ = 0;
-    std::size_t longest_identity_ = 0;
+    std::uint32_t overlong_count_ = 0;
     std::size_t refused_ = 0;
 
     sec_acle_t *own_entries_[own_capacity] = {};
