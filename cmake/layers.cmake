@@ -26,9 +26,9 @@ function(qz_layer name)
 endfunction()
 
 # A shared library made of whole layers. It is linked as C because it may need libc alone, and exports what its map
-# names and nothing else.
+# names and nothing else. REQUIRES names the project's libraries whose headers and symbols its users need, too.
 function(qz_shared_library name)
-  cmake_parse_arguments(arg "" "MAP;HEADER" "LAYERS;USES" ${ARGN})
+  cmake_parse_arguments(arg "" "MAP;HEADER;DESCRIPTION" "LAYERS;REQUIRES" ${ARGN})
   list(TRANSFORM arg_LAYERS REPLACE "(.+)" "$<TARGET_OBJECTS:\\1>" OUTPUT_VARIABLE objects)
   add_library(${name} SHARED ${objects})
   set_target_properties(${name} PROPERTIES
@@ -36,13 +36,43 @@ function(qz_shared_library name)
     VERSION ${PROJECT_VERSION}
     SOVERSION ${PROJECT_VERSION_MAJOR}
     LINK_DEPENDS ${CMAKE_CURRENT_SOURCE_DIR}/${arg_MAP})
+  if(arg_REQUIRES)
+    set_target_properties(${name} PROPERTIES INSTALL_RPATH $ORIGIN)
+  endif()
   # Never unloaded: threads that live on release what these libraries recorded for them when they end.
   target_link_options(${name} PRIVATE
     -Wl,--version-script=${CMAKE_CURRENT_SOURCE_DIR}/${arg_MAP} -Wl,-z,relro,-z,now,-z,nodelete)
   if(NOT QZ_SANITIZE)
     target_link_options(${name} PRIVATE -Wl,-z,defs -Wl,--as-needed)
   endif()
-  target_link_libraries(${name} PRIVATE ${arg_USES} INTERFACE layer_interface)
-  install(TARGETS ${name} LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
-  install(FILES ${PROJECT_SOURCE_DIR}/include/qz/${arg_HEADER} DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/qz)
+  target_link_libraries(${name} PRIVATE Threads::Threads PUBLIC ${arg_REQUIRES})
+  target_include_directories(${name} INTERFACE
+    $<BUILD_INTERFACE:${PROJECT_BINARY_DIR}/layers/layer_interface>
+    $<INSTALL_INTERFACE:${CMAKE_INSTALL_INCLUDEDIR}>)
+  qz_install_library(${name} "${arg_HEADER}" "${arg_REQUIRES}" "${arg_DESCRIPTION}")
+endfunction()
+
+# Installs a library for those who run with it and for those who build against it, by pkg-config or by CMake.
+function(qz_install_library name header requires_list arg_DESCRIPTION)
+  set(package_dir ${CMAKE_INSTALL_LIBDIR}/cmake/${name})
+  list(JOIN requires_list " " requires)
+  # Relative, so that an installed tree may be moved.
+  file(RELATIVE_PATH prefix_from_pc /${CMAKE_INSTALL_LIBDIR}/pkgconfig /)
+  string(REGEX REPLACE "/$" "" prefix_from_pc "${prefix_from_pc}")
+  install(TARGETS ${name} EXPORT ${name}-targets
+    LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR} NAMELINK_COMPONENT development)
+  install(FILES ${PROJECT_SOURCE_DIR}/include/qz/${header} DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/qz
+    COMPONENT development)
+  install(EXPORT ${name}-targets NAMESPACE ${name}:: DESTINATION ${package_dir} COMPONENT development)
+
+  include(CMakePackageConfigHelpers)
+  set(made ${PROJECT_BINARY_DIR}/packages)
+  configure_file(${PROJECT_SOURCE_DIR}/cmake/library.pc.in ${made}/${name}.pc @ONLY)
+  string(REPLACE ";" " " requires_list "${requires_list}")
+  configure_package_config_file(${PROJECT_SOURCE_DIR}/cmake/library-config.cmake.in ${made}/${name}-config.cmake
+    INSTALL_DESTINATION ${package_dir})
+  write_basic_package_version_file(${made}/${name}-config-version.cmake COMPATIBILITY SameMajorVersion)
+  install(FILES ${made}/${name}.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig COMPONENT development)
+  install(FILES ${made}/${name}-config.cmake ${made}/${name}-config-version.cmake DESTINATION ${package_dir}
+    COMPONENT development)
 endfunction()
