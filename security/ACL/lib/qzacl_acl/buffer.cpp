@@ -1,6 +1,7 @@
 // Whole compiled buffers: making, taking over, releasing, and finding one sub-ACL in them.
 #include "qzacl_acl/buffer.h"
 
+#include "libqz_cu/posix_fold.h"
 #include "owned.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/entry.h"
@@ -79,7 +80,7 @@ int sec__find_subacl(const sec_acl_buffer_t *acl, std::uint8_t type, const char 
             continue;
         if (qz::has_mechanism(type)) {
             const char *held = qz::format::string_in(walk.current().mechanism);
-            if (held == nullptr || cu_strcasecmp_posix_1(held, mechanism) != 0)
+            if (held == nullptr || qz::fold_compare(held, mechanism) != 0)
                 continue;
         }
         *subacl = walk.from_start().data();

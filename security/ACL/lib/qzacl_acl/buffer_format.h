@@ -108,13 +108,20 @@ inline bool read(byte_reader &reader, subacl &out) {
     return read_fixed_part(reader, out) && reader.bytes(out.mechanism_length, out.mechanism);
 }
 
-inline bool read(byte_reader &reader, entry &out) {
+// Reads the fixed fields of an entry; the reader then stands before its identity.
+inline bool read_fixed_part(byte_reader &reader, entry &out, std::uint16_t &identity_length) {
     byte_span fixed;
     if (!reader.bytes(entry_fixed_size, fixed))
         return false;
     out.version = fixed[0];
     out.perm_mask = load_field<std::uint32_t>(fixed, entry_mask_offset);
-    return reader.bytes(load_field<std::uint16_t>(fixed, entry_length_offset), out.identity);
+    identity_length = load_field<std::uint16_t>(fixed, entry_length_offset);
+    return true;
+}
+
+inline bool read(byte_reader &reader, entry &out) {
+    std::uint16_t identity_length = 0;
+    return read_fixed_part(reader, out, identity_length) && reader.bytes(identity_length, out.identity);
 }
 
 // True when a string ends exactly where its field does.
@@ -127,6 +134,40 @@ inline const char *string_in(byte_span field) {
     if (field.empty() || std::memchr(field.data(), '\0', field.size()) == nullptr)
         return nullptr;
     return reinterpret_cast<const char *>(field.data());
+}
+
+// The entries of a sub-ACL that are still to be looked at.
+struct entry_walk {
+    byte_reader entries;
+    std::uint32_t left = 0;
+};
+
+// Steps over entries while `passes` says so of the first `readable` bytes of their identities. Stops as well before an
+// entry that ends the buffer too early, whose field does not end in NUL, or that has fewer bytes behind it than are
+// asked for: those are left to the checked reader. This is the loop that a decision spends its time in, so each step
+// makes do with one test for where the bytes end and one for the field.
+template <class Passes>
+void pass_entries(entry_walk &walk, std::size_t readable, const Passes &passes) {
+    const unsigned char *const start = walk.entries.position();
+    const std::size_t size = walk.entries.left();
+    if (size < entry_fixed_size + readable)
+        return;
+    const unsigned char *const end = start + size;
+    const unsigned char *const last = end - (entry_fixed_size + readable);
+    const unsigned char *at = start;
+    std::uint32_t left = walk.left;
+    for (; left != 0 && at <= last; --left) {
+        std::uint16_t length = 0;
+        std::memcpy(&length, at + entry_length_offset, sizeof length);
+        const unsigned char *identity = at + entry_fixed_size;
+        // A length of 0 wraps around and is beyond any end.
+        const std::size_t nul = std::size_t{length} - 1;
+        if (nul >= static_cast<std::size_t>(end - identity) || identity[nul] != '\0' || !passes(identity))
+            break;
+        at = identity + length;
+    }
+    walk.entries.skip(static_cast<std::size_t>(at - start));
+    walk.left = left;
 }
 
 // Steps through the sub-ACLs of a buffer in host order, from each to the next by its length field.

@@ -157,7 +157,7 @@ int fill_and_rename(int fd, const char *temporary_name, const char *cache_name, 
 namespace qz {
 
 text_origin::text_origin(const struct stat &vetted) : device(vetted.st_dev), inode(vetted.st_ino), time() {
-    // The coarse clock is the one that the kernel stamps files from.
+    // The coarse clock: the kernel stamps files from it or from a finer one, never earlier than it.
     clock_gettime(CLOCK_REALTIME_COARSE, &time);
 }
 

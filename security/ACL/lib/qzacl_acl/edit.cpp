@@ -168,7 +168,8 @@ bool find_packed(qz::byte_span subacl, const format::subacl &head, const char *i
         return false;
     const qz::wanted_identity wanted(identity);
     qz::byte_reader reader(subacl);
-    reader.skip(format::subacl_header_size + head.mechanism_length);
+    if (!reader.skip(format::subacl_header_size + head.mechanism_length))
+        return false;
     packed_identity previous = {{}, block_of({}, 0)};
     bool is_placed = false;
     for (std::uint32_t left = head.entry_count; left != 0; --left) {

@@ -94,31 +94,18 @@ int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler
     return no_match(request, request.identity);
 }
 
-// The entries of a user or group sub-ACL that are still to be looked at.
-struct entry_walk {
-    qz::byte_reader entries;
-    std::uint32_t left;
-};
-
-// Passes by the entries that sort before the wanted identity, all but those whose order is not clear at first
-// sight. Nothing else is in this loop, because it is what a decision costs.
-[[gnu::noinline]] void pass_by(const qz::wanted_identity &wanted, entry_walk &walk) {
-    entry_walk at = walk;
-    while (at.left != 0) {
-        qz::byte_reader next = at.entries;
-        format::entry entry;
-        if (!format::read(next, entry) || entry.identity.size() + next.left() < qz::identity_block::size ||
-            entry.identity.empty() || entry.identity.back() != '\0' ||
-            !wanted.is_clearly_behind(qz::identity_block(entry.identity.data())))
-            break;
-        at = {next, at.left - 1};
-    }
-    walk = at;
+// Passes by the entries that sort before the wanted identity, all but those whose order is not clear at first sight.
+[[gnu::noinline]] void pass_by(const qz::wanted_identity &wanted, format::entry_walk &walk) {
+    const qz::wanted_identity held_in_registers = wanted;
+    format::pass_entries(walk, qz::identity_block::size, [&](const unsigned char *identity) {
+        return held_in_registers.is_clearly_behind(qz::identity_block(identity));
+    });
 }
 
 // Compares the wanted identity with the entries from the next one on, up to the one that decides about it,
 // before which the walk then stands. When none is left the wanted identity sorts behind all.
-qz::identity_order compare_next(const qz::wanted_identity &wanted, entry_walk &walk, format::entry &entry) {
+qz::identity_order compare_next(const qz::wanted_identity &wanted, format::entry_walk &walk,
+                                format::entry &entry) {
     for (;;) {
         pass_by(wanted, walk);
         if (walk.left == 0)
@@ -135,7 +122,7 @@ qz::identity_order compare_next(const qz::wanted_identity &wanted, entry_walk &w
 
 int evaluate_user(const single_request &request, const format::subacl &head, qz::byte_reader entries,
                   std::uint32_t &mask) {
-    entry_walk walk{entries, head.entry_count};
+    format::entry_walk walk{entries, head.entry_count};
     format::entry entry;
     switch (compare_next(qz::wanted_identity(request.identity), walk, entry)) {
     case qz::identity_order::same:
@@ -204,7 +191,7 @@ public:
     int evaluate(const format::subacl &head, qz::byte_reader entries, std::uint32_t &mask, bool &is_found) {
         std::sort(names_.begin(), names_.begin() + count_,
                   [](const char *a, const char *b) { return cu_strcasecmp_posix_1(a, b) < 0; });
-        entry_walk walk{entries, head.entry_count};
+        format::entry_walk walk{entries, head.entry_count};
         for (std::size_t index = 0; index < count_ && walk.left != 0; ++index) {
             format::entry entry;
             const auto order = compare_next(qz::wanted_identity(names_[index]), walk, entry);

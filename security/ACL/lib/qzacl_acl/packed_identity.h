@@ -24,11 +24,26 @@ public:
     static constexpr std::size_t size = 16;
 
 #ifdef __SSE2__
-    explicit identity_block(const unsigned char *bytes) {
-        const __m128i raw = _mm_loadu_si128(reinterpret_cast<const __m128i *>(bytes));
-        const __m128i is_upper = _mm_and_si128(_mm_cmpgt_epi8(raw, _mm_set1_epi8('A' - 1)),
-                                               _mm_cmplt_epi8(raw, _mm_set1_epi8('Z' + 1)));
-        bytes_ = _mm_or_si128(raw, _mm_and_si128(is_upper, _mm_set1_epi8('a' - 'A')));
+    explicit identity_block(const unsigned char *bytes)
+        : identity_block(_mm_loadu_si128(reinterpret_cast<const __m128i *>(bytes))) {}
+
+    // The block of a string, padded with NULs. It is put together in registers: to read sixteen bytes right after
+    // fewer were stored would stall a decision for as long as comparing some entries takes.
+    static identity_block of_string(const char *text) {
+        const std::size_t length = strnlen(text, size);
+        std::uint64_t low = 0;
+        std::uint64_t high = 0;
+        if (length >= 8) {
+            low = load8(text);
+            if (length > 8)
+                high = load8(text + length - 8) >> (8 * (size - length));
+        } else if (length >= 4) {
+            low = load4(text) | load4(text + length - 4) << (8 * (length - 4));
+        } else {
+            for (std::size_t index = 0; index < length; ++index)
+                low |= std::uint64_t{static_cast<unsigned char>(text[index])} << (8 * index);
+        }
+        return identity_block(_mm_set_epi64x(static_cast<long long>(high), static_cast<long long>(low)));
     }
 
     // The place of the first byte that differs, where that byte sorts before the other's; else at least
@@ -46,6 +61,18 @@ public:
     }
 
 private:
+    explicit identity_block(__m128i raw) {
+        const __m128i is_upper = _mm_and_si128(_mm_cmpgt_epi8(raw, _mm_set1_epi8('A' - 1)),
+                                               _mm_cmplt_epi8(raw, _mm_set1_epi8('Z' + 1)));
+        bytes_ = _mm_or_si128(raw, _mm_and_si128(is_upper, _mm_set1_epi8('a' - 'A')));
+    }
+
+    static std::uint64_t load4(const char *at) {
+        std::uint32_t word = 0;
+        std::memcpy(&word, at, sizeof word);
+        return word;
+    }
+
     static unsigned mask_of(__m128i bytes) { return static_cast<unsigned>(_mm_movemask_epi8(bytes)); }
 
     __m128i bytes_;
@@ -53,6 +80,12 @@ private:
     explicit identity_block(const unsigned char *bytes) {
         for (std::size_t index = 0; index < size; ++index)
             bytes_[index] = fold(bytes[index]);
+    }
+
+    static identity_block of_string(const char *text) {
+        unsigned char padded[size] = {};
+        std::memcpy(padded, text, strnlen(text, size));
+        return identity_block(padded);
     }
 
     unsigned lower_at(const identity_block &other) const {
@@ -84,7 +117,7 @@ enum class identity_order : std::uint8_t {
 // An identity that is looked for among many.
 class wanted_identity {
 public:
-    explicit wanted_identity(const char *text) : text_(text), block_(padded_block(text)) {}
+    explicit wanted_identity(const char *text) : text_(text), block_(identity_block::of_string(text)) {}
 
     // True for most entries that the wanted identity sorts behind, and for no others. `stored` is the entry's
     // field, of which the last byte is NUL, and `block` its start: what stands behind that NUL takes no part,
@@ -107,12 +140,6 @@ public:
     }
 
 private:
-    static identity_block padded_block(const char *text) {
-        unsigned char padded[identity_block::size] = {};
-        std::memcpy(padded, text, strnlen(text, sizeof padded));
-        return identity_block(padded);
-    }
-
     const char *text_;
     identity_block block_;
 };

@@ -18,6 +18,14 @@ int report_shorter_than_header(std::int32_t length, int line) {
     return qz::report(SEC_S_BAD_ACL, qz::msg::shorter_than_header, length, qz::acl_source, line);
 }
 
+// The bytes of the string that starts here, its NUL included; 0 when the bytes end before it does.
+std::size_t string_size(const qz::byte_reader &reader) {
+    const void *nul = reader.left() == 0 ? nullptr : std::memchr(reader.position(), '\0', reader.left());
+    return nul == nullptr
+               ? 0
+               : static_cast<std::size_t>(static_cast<const unsigned char *>(nul) - reader.position()) + 1;
+}
+
 // A mechanism that does not end with its field, shown up to the first NUL that follows or what is left of the
 // bytes.
 int report_bad_mechanism(qz::byte_reader at_mechanism, int line) {
@@ -42,24 +50,34 @@ int check_mechanism(qz::byte_reader &reader, format::subacl &head) {
     if (head.mechanism_length < 2)
         return qz::report(SEC_S_BAD_ACL, qz::msg::bad_mechanism_length, head.mechanism_length, qz::acl_source,
                           __LINE__);
-    const qz::byte_reader at_mechanism = reader;
-    if (!reader.bytes(head.mechanism_length, head.mechanism))
+    const std::size_t size = string_size(reader);
+    if (size == 0)
         return corrupt(__LINE__);
-    if (!format::holds_exact_string(head.mechanism))
-        return report_bad_mechanism(at_mechanism, __LINE__);
+    if (size != head.mechanism_length)
+        return report_bad_mechanism(reader, __LINE__);
+    reader.skip(size);
     return SEC_S_OK;
 }
 
-int check_entry(const format::entry &entry, std::uint8_t type) {
+// Checks one entry and steps behind it.
+int check_entry(qz::byte_reader &reader, std::uint8_t type) {
+    format::entry entry;
+    std::uint16_t identity_length = 0;
+    if (!format::read_fixed_part(reader, entry, identity_length))
+        return corrupt(__LINE__);
     if (entry.version != format::entry_version)
         return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_version_unsupported, entry.version, qz::acl_source,
                           __LINE__);
-    if (qz::is_single_type(type)) {
-        if (!entry.identity.empty())
-            return qz::report(SEC_S_BAD_ACLE, qz::msg::unexpected_identity, qz::acl_source, __LINE__);
-    } else if (!format::holds_exact_string(entry.identity)) {
+    if (qz::is_single_type(type))
+        return identity_length == 0
+                   ? SEC_S_OK
+                   : qz::report(SEC_S_BAD_ACLE, qz::msg::unexpected_identity, qz::acl_source, __LINE__);
+    const std::size_t size = string_size(reader);
+    if (size == 0)
+        return corrupt(__LINE__);
+    if (size != identity_length)
         return qz::report(SEC_S_BAD_ACLE, qz::msg::bad_identity_length, qz::acl_source, __LINE__);
-    }
+    reader.skip(size);
     return SEC_S_OK;
 }
 
@@ -67,10 +85,7 @@ int check_entry(const format::entry &entry, std::uint8_t type) {
 int check_entries(qz::byte_reader &reader, const format::subacl &head) {
     for (std::uint32_t left = head.entry_count; left != 0; --left) {
         qz::byte_reader next = reader;
-        format::entry entry;
-        if (!format::read(next, entry))
-            return corrupt(__LINE__);
-        if (const int result = check_entry(entry, head.type); result != SEC_S_OK)
+        if (const int result = check_entry(next, head.type); result != SEC_S_OK)
             return result;
         reader = next;
     }
