@@ -18,12 +18,20 @@ int report_shorter_than_header(std::int32_t length, int line) {
     return qz::report(SEC_S_BAD_ACL, qz::msg::shorter_than_header, length, qz::acl_source, line);
 }
 
-// The bytes of the string that starts here, its NUL included; 0 when the bytes end before it does.
-std::size_t string_size(const qz::byte_reader &reader) {
+enum class field_fault : std::uint8_t { none, inexact, cut_short };
+
+// Checks that the string which starts here ends exactly with its field, and steps behind it. Bytes that are too few are
+// a fault of their own only where the string does not end before them either.
+field_fault skip_exact_string(qz::byte_reader &reader, std::size_t length) {
     const void *nul = reader.left() == 0 ? nullptr : std::memchr(reader.position(), '\0', reader.left());
-    return nul == nullptr
-               ? 0
-               : static_cast<std::size_t>(static_cast<const unsigned char *>(nul) - reader.position()) + 1;
+    if (nul == nullptr)
+        return length > reader.left() ? field_fault::cut_short : field_fault::inexact;
+    const auto size =
+        static_cast<std::size_t>(static_cast<const unsigned char *>(nul) - reader.position()) + 1;
+    if (size != length)
+        return field_fault::inexact;
+    reader.skip(size);
+    return field_fault::none;
 }
 
 // A mechanism that does not end with its field, shown up to the first NUL that follows or what is left of the
@@ -50,12 +58,14 @@ int check_mechanism(qz::byte_reader &reader, format::subacl &head) {
     if (head.mechanism_length < 2)
         return qz::report(SEC_S_BAD_ACL, qz::msg::bad_mechanism_length, head.mechanism_length, qz::acl_source,
                           __LINE__);
-    const std::size_t size = string_size(reader);
-    if (size == 0)
+    switch (skip_exact_string(reader, head.mechanism_length)) {
+    case field_fault::cut_short:
         return corrupt(__LINE__);
-    if (size != head.mechanism_length)
+    case field_fault::inexact:
         return report_bad_mechanism(reader, __LINE__);
-    reader.skip(size);
+    case field_fault::none:
+        break;
+    }
     return SEC_S_OK;
 }
 
@@ -72,12 +82,14 @@ int check_entry(qz::byte_reader &reader, std::uint8_t type) {
         return identity_length == 0
                    ? SEC_S_OK
                    : qz::report(SEC_S_BAD_ACLE, qz::msg::unexpected_identity, qz::acl_source, __LINE__);
-    const std::size_t size = string_size(reader);
-    if (size == 0)
+    switch (skip_exact_string(reader, identity_length)) {
+    case field_fault::cut_short:
         return corrupt(__LINE__);
-    if (size != identity_length)
+    case field_fault::inexact:
         return qz::report(SEC_S_BAD_ACLE, qz::msg::bad_identity_length, qz::acl_source, __LINE__);
-    reader.skip(size);
+    case field_fault::none:
+        break;
+    }
     return SEC_S_OK;
 }
 
