@@ -41,7 +41,7 @@ function(qz_shared_library name)
   endif()
   # Never unloaded: threads that live on release what these libraries recorded for them when they end.
   target_link_options(${name} PRIVATE
-    -Wl,--version-script=${CMAKE_CURRENT_SOURCE_DIR}/${arg_MAP} -Wl,-z,relro,-z,now,-z,nodelete)
+    -Wl,--version-script=${CMAKE_CURRENT_SOURCE_DIR}/${arg_MAP} -Wl,-z,nodelete)
   if(NOT QZ_SANITIZE)
     target_link_options(${name} PRIVATE -Wl,-z,defs -Wl,--as-needed)
   endif()

@@ -265,10 +265,28 @@ TEST(edit, reports_what_it_refuses_and_leaves_the_buffer_alone) {
     // A buffer that the call itself made goes with its failure.
     const std::string too_long(65535, 'i');
     const sec_acle_t refused = entry(4, "unix", too_long.c_str(), 1);
-    sec_acl_buffer_t acl = {};
+    sec_acl_buffer_t acl = {7, nullptr};
     EXPECT_EQ(after(sec_add_acle_to_acl(&refused, &acl)), error_of(43, 104, {"4"}));
     EXPECT_EQ(acl.data, nullptr);
     EXPECT_EQ(acl.length, 0);
+}
+
+// What compiling would never write is not changed in place: the whole sub-ACL is put right.
+TEST(edit, tidies_what_it_rebuilds) {
+    const std::string a = named(1, "a"), c = named(9, "c-and-more-bytes");
+    for (const std::string &stored : {
+             of_mechanism(4, "unix", 2, with(a, 0, 7) + c),                 // a version nobody looks at
+             of_mechanism(4, "unix", 2, packed_entry(1, "a\0junk\0"s) + c), // bytes behind the string
+             of_mechanism(4, "unix", 3, named(8, "a") + named(1, "A") + c), // equal in sorted order
+             of_mechanism(4, "unix", 2, c + a),                             // out of order
+             packed_subacl(4, "unix\0\0\0"s, 2, a + c),                     // bytes behind the mechanism
+         }) {
+        buffer held(packed_acl(2, stored + packed_subacl(1, "", 0, "")));
+        const sec_acle_t b = entry(4, "unix", "b", 5);
+        EXPECT_EQ(after(sec_add_acle_to_acl2(&b, &held.acl)), no_error);
+        EXPECT_EQ(held.bytes(), packed_acl(2, of_mechanism(4, "unix", 3, a + named(5, "b") + c) +
+                                                  packed_subacl(1, "", 0, "")));
+    }
 }
 
 TEST(edit, holds_identities_of_at_most_65534_bytes) {

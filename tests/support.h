@@ -122,7 +122,7 @@ output output_of(const Call &call) {
 
 class temporary_folder {
 public:
-    temporary_folder() { mkdtemp(path_.data()); }
+    temporary_folder() { EXPECT_NE(mkdtemp(path_.data()), nullptr); }
     temporary_folder(const temporary_folder &) = delete;
     temporary_folder &operator=(const temporary_folder &) = delete;
     ~temporary_folder() { std::filesystem::remove_all(path_); }
