@@ -83,7 +83,7 @@ int sec__find_subacl(const sec_acl_buffer_t *acl, std::uint8_t type, const char 
             if (held == nullptr || qz::fold_compare(held, mechanism) != 0)
                 continue;
         }
-        *subacl = walk.from_start().data();
+        *subacl = walk.bytes().data();
         break;
     }
     return SEC_S_OK;

@@ -27,6 +27,7 @@
 #include "bytes.h"
 #include "qz/acl.h"
 
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
@@ -189,18 +190,21 @@ public:
             return step::corrupt;
         is_started_ = true;
         --left_;
-        entries_ = next_;
-        return read(entries_, current_) ? step::found : step::corrupt;
+        byte_reader head = next_;
+        return read(head, current_) ? step::found : step::corrupt;
     }
 
     const subacl &current() const { return current_; }
-    // The bytes from the current sub-ACL's start to the end of the buffer, and the reader before its entries.
-    byte_span from_start() const { return {next_.position(), next_.left()}; }
-    byte_reader entries() const { return entries_; }
+    // The bytes that the current sub-ACL may take: up to where the next one starts, and for the last up to the end of
+    // the buffer. So however sub-ACLs are made to overlap, walking over all their entries takes no more than the bytes
+    // can hold.
+    byte_span bytes() const {
+        return {next_.position(),
+                left_ == 0 ? next_.left() : std::min<std::size_t>(current_.length, next_.left())};
+    }
 
 private:
     byte_reader next_;
-    byte_reader entries_;
     subacl current_;
     std::size_t left_ = 0;
     bool is_started_ = false;

@@ -142,7 +142,7 @@ void sec__dump_acl(const sec_acl_buffer_t *acl) {
     format::subacl_walk walk(bytes);
     auto step = walk.next();
     for (; step == format::subacl_walk::step::found; step = walk.next())
-        dump_subacl(walk.from_start(), "\t");
+        dump_subacl(walk.bytes(), "\t");
     if (step == format::subacl_walk::step::corrupt) {
         qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupted, qz::acl_source, __LINE__);
         print_and_clear(stdout, as_it_stands);

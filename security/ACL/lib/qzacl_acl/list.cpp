@@ -63,7 +63,7 @@ int append_all(const sec_acl_buffer_t &acl, pending_list &list, const Wanted &is
         }
         if (!is_wanted(walk.current()))
             continue;
-        if (const int result = list.append(walk.from_start()); result != SEC_S_OK)
+        if (const int result = list.append(walk.bytes()); result != SEC_S_OK)
             return result;
     }
 }
