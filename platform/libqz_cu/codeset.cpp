@@ -165,9 +165,9 @@ struct ascii_probe {
                                      "~{VP~}"
                                      "+AOk-"
                                      "&AOk-";
-    char bytes[128 + sizeof tricks];
+    char bytes[128 + sizeof tricks] = {};
 
-    constexpr ascii_probe() : bytes() {
+    constexpr ascii_probe() {
         for (unsigned i = 0; i < sizeof bytes; ++i)
             bytes[i] = i < 128 ? static_cast<char>(i) : tricks[i - 128];
     }

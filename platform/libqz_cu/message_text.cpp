@@ -95,7 +95,7 @@ void put_value(sink &to, const conversion &how, const arguments::value &value) {
         what.count = room[0] != 0 ? 1 : 0;
     } else {
         const bool negative = how.kind == 'd' && value.number < 0;
-        const unsigned bits = static_cast<unsigned>(value.number);
+        const auto bits = static_cast<unsigned>(value.number);
         what = show_digits(negative ? 0u - bits : bits, how.kind == 'x' ? 16 : 10, room + sizeof room);
         what.sign = negative ? "-" : "";
     }
