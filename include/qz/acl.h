@@ -483,8 +483,8 @@ QZ_ACL_API int sec__register_id_handler(uint32_t kind, const char *mechanism, se
  *                      messages, may be null.
  *   subacl_mechanism   types 4 and 8: the mechanism whose entries are searched; null: as mechanism
  *   identity           types 4 and 8: the requester's, UTF-8. Others: ignored, may be null.
- *   mask               out: the permissions. Untouched by 4 and by 42 (3417-109, 3417-115), 0 after every
- *                      other failure.
+ *   mask               out: the permissions. Untouched by 4, by 42 (3417-109, 3417-115), and by 42
+ *                      (3417-110) when the header itself is cut short; 0 after every other failure.
  *
  * Codes: 0
  *   4 (3417-101)    null acl (position 1) or mask (shown as 5)
@@ -492,7 +492,7 @@ QZ_ACL_API int sec__register_id_handler(uint32_t kind, const char *mechanism, se
  *   4 (3417-129)    types 4 and 8: mechanism null or empty
  *   4 (3417-130)    types 4 and 8: identity null or empty
  *   42 (3417-109)   no bytes, or not an ACL of version 1
- *   42 (3417-110)   an entry extends past the end
+ *   42 (3417-110)   the header is cut short, or an entry extends past the end
  *   42 (3417-115)   not in host byte order
  *   42 (3417-122)   more than one entry of type 1 or 2
  *   43 (3417-147)   nothing is granted: no entry matches. The everyday denial, and as cheap as a grant.

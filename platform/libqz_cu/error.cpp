@@ -147,8 +147,12 @@ int cu_set_error_1(int code, int, const char *catalog, int set, int message_id, 
     error.present = true;
     error.set = set;
     error.catalog = catalog;
-    error.default_text = default_text;
-    find_arguments(default_text != nullptr ? default_text : "", error.given);
+    // A text stays as it is for the life of the process. What the last one took is still known when it comes again, as
+    // the text of denials does.
+    if (default_text == nullptr || default_text != error.default_text) {
+        error.default_text = default_text;
+        find_arguments(default_text != nullptr ? default_text : "", error.given);
+    }
 
     va_list given;
     va_start(given, default_text);

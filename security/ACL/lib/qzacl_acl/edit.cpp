@@ -69,9 +69,8 @@ void set_subacl_count(const sec_acl_buffer_t &acl, std::size_t count) {
     qz::store_field(writable(acl), format::count_offset, static_cast<std::uint16_t>(count));
 }
 
-// Replaces `old_size` bytes at `offset` by a gap of `new_size` bytes, which the caller fills. On failure
-// nothing has changed when the buffer was to grow; when it was to shrink it did, and only the memory was not
-// given back.
+// Replaces `old_size` bytes at `offset` by a gap of `new_size` bytes, which the caller fills. Only growing can fail,
+// and then nothing has changed; what shrank keeps its memory until it is given back.
 int make_gap(sec_acl_buffer_t &acl, std::size_t offset, std::size_t old_size, std::size_t new_size,
              const char *function) {
     const auto length = static_cast<std::size_t>(acl.length);
@@ -86,13 +85,22 @@ int make_gap(sec_acl_buffer_t &acl, std::size_t offset, std::size_t old_size, st
     auto *bytes = static_cast<unsigned char *>(acl.data);
     std::memmove(bytes + offset + new_size, bytes + offset + old_size, tail);
     acl.length = static_cast<std::int32_t>(new_length);
-    if (new_length < length) {
-        void *shrunk = std::realloc(acl.data, new_length);
-        if (shrunk == nullptr)
-            return qz::report_no_memory(function, new_length);
-        acl.data = shrunk;
-    }
     return SEC_S_OK;
+}
+
+// Gives back the memory that a buffer shrank by. False leaves the buffer sound, with more memory than it needs.
+bool give_back(sec_acl_buffer_t &acl) {
+    void *shrunk = std::realloc(acl.data, static_cast<std::size_t>(acl.length));
+    if (shrunk == nullptr)
+        return false;
+    acl.data = shrunk;
+    return true;
+}
+
+// The end of every deletion: the entry is gone, and a failure tells no more than that the memory was kept.
+int finish_deletion(sec_acl_buffer_t &acl) {
+    return give_back(acl) ? SEC_S_OK
+                          : qz::report_no_memory(delete_function, static_cast<std::size_t>(acl.length));
 }
 
 // The sub-ACL that an edit is about, as it stands in the buffer.
@@ -196,6 +204,11 @@ bool find_packed(qz::byte_span subacl, const format::subacl &head, const char *i
     return reader.left() == 0;
 }
 
+// Traces show each entry of the tree that the plain way makes.
+bool may_edit_packed(const sec_acle_t &acle) {
+    return qz::has_identity(acle.type) && !qz::traces(qz::trace_category::api);
+}
+
 void store_subacl_size(const sec_acl_buffer_t &acl, const stored_subacl &stored, std::size_t length,
                        std::uint32_t count) {
     qz::store_field(writable(acl), stored.offset, static_cast<std::uint32_t>(length));
@@ -233,9 +246,8 @@ int splice(const qz::loose_subacl &compiled, const stored_subacl &stored, const 
     const std::size_t offset = is_new ? static_cast<std::size_t>(acl.length) : stored.offset;
     if (is_new && count == format::subacls_max)
         return qz::report_no_memory(function, static_cast<std::size_t>(acl.length) + compiled.length);
-    const std::int32_t old_length = acl.length;
     const int result = make_gap(acl, offset, is_new ? 0 : stored.head.length, compiled.length, function);
-    if (result != SEC_S_OK && acl.length == old_length)
+    if (result != SEC_S_OK)
         return result;
     qz::byte_writer writer(writable(acl).subspan(offset, compiled.length));
     writer.bytes(compiled.data.get(), compiled.length);
@@ -243,7 +255,7 @@ int splice(const qz::loose_subacl &compiled, const stored_subacl &stored, const 
         set_subacl_count(acl, count + 1);
     else if (compiled.length == 0)
         set_subacl_count(acl, count - 1);
-    return result;
+    return SEC_S_OK;
 }
 
 int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_subacl &stored,
@@ -264,7 +276,12 @@ int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_suba
     if (compiled.length == 0)
         return qz::report(SEC_S_INTERNAL, qz::msg::internal_failure, qz::acl_source, __LINE__,
                           SEC_S_INTERNAL);
-    return splice(compiled, stored, add_function, acl);
+    // Entries with equal identities may have become one; an entry that was added is no failure for want of less memory.
+    const std::int32_t old_length = acl.length;
+    const int spliced = splice(compiled, stored, add_function, acl);
+    if (spliced == SEC_S_OK && acl.length < old_length)
+        static_cast<void>(give_back(acl));
+    return spliced;
 }
 
 int add_to_buffer(const sec_acle_t &acle, int report_duplicates, sec_acl_buffer_t &acl) {
@@ -272,7 +289,7 @@ int add_to_buffer(const sec_acle_t &acle, int report_duplicates, sec_acl_buffer_
     if (const int result = find(acl, acle, stored); result != SEC_S_OK)
         return result;
     packed_place place;
-    if (stored.start != nullptr && qz::has_identity(acle.type) &&
+    if (stored.start != nullptr && may_edit_packed(acle) &&
         std::strlen(acle.identity) <= format::identity_max &&
         find_packed({stored.start, stored.head.length}, stored.head, acle.identity, place))
         return add_packed(acle, report_duplicates, stored, place, acl);
@@ -311,12 +328,12 @@ int delete_packed(const stored_subacl &stored, const packed_place &place, sec_ac
     const std::size_t offset = is_last ? stored.offset : stored.offset + place.offset;
     const std::size_t size = is_last ? stored.head.length : place.size;
     const std::size_t count = subacl_count(acl);
-    const int result = make_gap(acl, offset, size, 0, delete_function);
+    static_cast<void>(make_gap(acl, offset, size, 0, delete_function)); // it does not grow
     if (is_last)
         set_subacl_count(acl, count - 1);
     else
         store_subacl_size(acl, stored, stored.head.length - size, stored.head.entry_count - 1);
-    return result;
+    return finish_deletion(acl);
 }
 
 int delete_by_tree(const sec_acle_t &acle, const stored_subacl &stored, sec_acl_buffer_t &acl) {
@@ -331,7 +348,9 @@ int delete_by_tree(const sec_acle_t &acle, const stored_subacl &stored, sec_acl_
     qz::loose_subacl compiled;
     if (result == SEC_S_OK)
         result = sec__acltree_to_subacl(root, compiled);
-    return result == SEC_S_OK ? splice(compiled, stored, delete_function, acl) : result;
+    if (result == SEC_S_OK)
+        result = splice(compiled, stored, delete_function, acl);
+    return result == SEC_S_OK ? finish_deletion(acl) : result;
 }
 
 int delete_checked(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
@@ -352,7 +371,7 @@ int delete_checked(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
     if (stored.start == nullptr)
         return sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, acle);
     packed_place place;
-    if (qz::has_identity(acle->type) &&
+    if (may_edit_packed(*acle) &&
         find_packed({stored.start, stored.head.length}, stored.head, acle->identity, place))
         return place.size == 0 ? sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, acle)
                                : delete_packed(stored, place, *acl);

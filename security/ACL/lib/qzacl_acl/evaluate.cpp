@@ -25,16 +25,14 @@ int check_buffer(const sec_acl_buffer_t &acl) {
     if (bytes.size() < format::order_offset || bytes[0] != format::buffer_type ||
         bytes[1] != format::buffer_version)
         return qz::report(SEC_S_BAD_ACL, qz::msg::not_an_acl_buffer);
-    if (bytes.size() < format::header_size)
-        return corrupt(__LINE__);
-    if (bytes[format::order_offset] != format::host_order)
+    if (bytes.size() > format::order_offset && bytes[format::order_offset] != format::host_order)
         return qz::report(SEC_S_BAD_ACL, qz::msg::wrong_byte_order);
-    return SEC_S_OK;
+    return bytes.size() < format::header_size ? corrupt(__LINE__) : SEC_S_OK;
 }
 
-// Looks up the sub-ACL and reads its header.
-bool find(const sec_acl_buffer_t &acl, std::uint8_t type, const char *mechanism, format::subacl &head,
-          qz::byte_reader &entries) {
+// Looks up the sub-ACL and reads its header. Inline, so that the reader stays in registers.
+[[gnu::always_inline]] inline bool find(const sec_acl_buffer_t &acl, std::uint8_t type, const char *mechanism,
+                                        format::subacl &head, qz::byte_reader &entries) {
     const unsigned char *start = nullptr;
     sec__find_subacl(&acl, type, mechanism, &start);
     if (start == nullptr)

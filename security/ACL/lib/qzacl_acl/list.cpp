@@ -17,7 +17,10 @@ public:
     pending_list() = default;
     pending_list(const pending_list &) = delete;
     pending_list &operator=(const pending_list &) = delete;
-    ~pending_list() { sec_release_aclelist(&list_); }
+    ~pending_list() {
+        if (list_.count != 0) // nothing is released where nothing was listed, nor recorded as released
+            sec_release_aclelist(&list_);
+    }
 
     // Appends the entries of the sub-ACL at the start of the bytes.
     int append(qz::byte_span bytes) {

@@ -106,6 +106,17 @@ private:
 #endif
 };
 
+// The place of the first NUL among the sixteen bytes of a block; at least sixteen where there is none.
+inline unsigned nul_in_block(const unsigned char *bytes) {
+#ifdef __SSE2__
+    const __m128i raw = _mm_loadu_si128(reinterpret_cast<const __m128i *>(bytes));
+    const int nuls = _mm_movemask_epi8(_mm_cmpeq_epi8(raw, _mm_setzero_si128()));
+    return static_cast<unsigned>(std::countr_zero(static_cast<unsigned>(nuls)));
+#else
+    return identity_block(bytes).nul_at();
+#endif
+}
+
 // How one identity stands to another, without regard to letter case.
 enum class identity_order : std::uint8_t {
     before,

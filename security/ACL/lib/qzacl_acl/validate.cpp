@@ -3,6 +3,7 @@
 
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/entry.h"
+#include "qzacl_acl/packed_identity.h"
 #include "qzacl_trace.h"
 #include "report.h"
 
@@ -23,6 +24,16 @@ enum class field_fault : std::uint8_t { none, inexact, cut_short };
 // Checks that the string which starts here ends exactly with its field, and steps behind it. Bytes that are too few are
 // a fault of their own only where the string does not end before them either.
 field_fault skip_exact_string(qz::byte_reader &reader, std::size_t length) {
+    // Most strings end within the first block, and a call for each would cost more than all the rest of the walk.
+    if (reader.left() >= qz::identity_block::size) {
+        const std::size_t size = std::size_t{qz::nul_in_block(reader.position())} + 1;
+        if (size <= qz::identity_block::size) {
+            if (size != length)
+                return field_fault::inexact;
+            reader.skip(size);
+            return field_fault::none;
+        }
+    }
     const void *nul = reader.left() == 0 ? nullptr : std::memchr(reader.position(), '\0', reader.left());
     if (nul == nullptr)
         return length > reader.left() ? field_fault::cut_short : field_fault::inexact;
@@ -34,13 +45,17 @@ field_fault skip_exact_string(qz::byte_reader &reader, std::size_t length) {
     return field_fault::none;
 }
 
-// A mechanism that does not end with its field, shown up to the first NUL that follows or what is left of the
-// bytes.
+// A mechanism that does not end with its field, shown up to the first NUL that follows; where none does, as much of what
+// is left as a mechanism's field can hold.
 int report_bad_mechanism(qz::byte_reader at_mechanism, int line) {
-    char shown[256] = {};
-    qz::byte_span bytes;
-    at_mechanism.bytes(std::min(at_mechanism.left(), sizeof shown - 1), bytes);
-    std::memcpy(shown, bytes.data(), bytes.size());
+    const qz::byte_span left(at_mechanism.position(), at_mechanism.left());
+    char cut[256] = {};
+    const char *shown = format::string_in(left);
+    if (shown == nullptr) {
+        if (!left.empty())
+            std::memcpy(cut, left.data(), std::min(left.size(), sizeof cut - 1));
+        shown = cut;
+    }
     return qz::report(SEC_S_BAD_ACL, qz::msg::bad_mechanism, shown, qz::acl_source, line);
 }
 
@@ -162,7 +177,7 @@ int convert_checked(int check, sec_acl_buffer_t *acl) {
         version != format::buffer_version)
         return qz::report(SEC_S_BAD_ACL, qz::msg::not_an_acl_buffer);
     if (!reader.field(order))
-        return report_shorter_than_header(acl->length, __LINE__);
+        return check != 0 ? report_shorter_than_header(acl->length, __LINE__) : corrupt(__LINE__);
 
     if (order == format::host_order) {
         if (qz::traces(qz::trace_category::info))
