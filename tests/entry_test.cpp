@@ -1,15 +1,16 @@
-// Permissions in both directions, and entries: making, displaying and releasing them, also in other code
-// sets.
+// Permissions in both directions, and entries: making, displaying and releasing them, also in other code sets.
 #include "owned.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/permission.h"
-#include "support.h"
+#include "service_support.h"
 
 #include <clocale>
 #include <dlfcn.h>
+#include <gmock/gmock.h>
 #include <langinfo.h>
 
 using namespace support;
+using testing::PrintToString;
 
 // The code set that the process claims to use; null: that of its locale.
 static const char *claimed_code_set = nullptr;
@@ -21,153 +22,108 @@ extern "C" char *nl_langinfo(nl_item item) noexcept {
 
 namespace {
 
-failure missing(const char *function, const char *position) {
-    return error_of(4, 88, {function, position, "0"});
-}
-
 TEST(permissions, turn_letters_into_bits_and_back) {
-    const sec_perm_template_t templates[] = {
-        {0x80000000, 'r', "", ""}, {1, '\xe9', "", ""}, {1, 'x', "", ""}};
-    const sec_perm_set_t own = {3, templates}, none = {0, nullptr};
-    const struct {
-        const char *text;
-        const sec_perm_set_t *set;
-        std::uint32_t mask; // after a failure, what was found before it
-        const char *refused = nullptr;
-    } letters[] = {{nullptr, nullptr, 0},
-                   {"", &none, 0},
-                   {"oasvdelqCxcwr", nullptr, 0x1fff},
-                   {"cC", nullptr, 0x14},
-                   {"xr\xe9r", &own, 0x80000001},
-                   {"rR", nullptr, 1, "R"},
-                   {"xw", &own, 1, "w"},
-                   {"r", &none, 0, "r"}};
-    for (const auto &row : letters) {
+    const sec_perm_template_t list[] = {{0x80000000, 'r', "", ""}, {1, '\xe9', "", ""}, {1, 'x', "", ""}};
+    const sec_perm_set_t own = {3, list}, none = {0, nullptr};
+    // After an error the result is what was found before it.
+    const auto bits = [](const char *text, const sec_perm_set_t *set, unsigned wanted, const char *bad) {
         std::uint32_t mask = 0xffffffff;
-        EXPECT_EQ(sec_translate_perms(row.text, row.set, &mask), row.refused == nullptr ? 0 : 36);
-        EXPECT_EQ(recorded_error(), row.refused == nullptr ? failure{} : error_of(36, 133, {row.refused}));
-        EXPECT_EQ(mask, row.mask) << row.text;
-    }
-    const struct {
-        std::uint32_t mask;
-        const sec_perm_set_t *set;
-        std::string_view text;
-        const char *refused = nullptr;
-    } bits[] = {{0, &none, ""},
-                {0x1fff, nullptr, "rwcxCqledvsao"},
-                {0x80000001, &own, "\xe9r"},
-                {0x80000000, nullptr, "", "80000000"},
-                {0xffffffff, nullptr, "rwcxCqledvsao", "00002000"},
-                {3, &own, "\xe9", "00000002"}};
-    for (const auto &row : bits) {
+        EXPECT_EQ(after(sec_translate_perms(text, set, &mask)),
+                  *bad == 0 ? no_error : error_of(36, 133, {bad}));
+        EXPECT_EQ(mask, wanted) << text;
+    };
+    bits(nullptr, nullptr, 0, "");
+    bits("", &none, 0, "");
+    bits("oasvdelqCxcwr", nullptr, 0x1fff, "");
+    bits("cC", nullptr, 0x14, "");
+    bits("xr\xe9r", &own, 0x80000001, "");
+    bits("rR", nullptr, 1, "R");
+    bits("xw", &own, 1, "w");
+    const auto letters = [](unsigned mask, const sec_perm_set_t *set, const char *wanted, const char *bad) {
         char text[qz::permission_text_size + 1] = {};
-        EXPECT_EQ(sec_translate_bitmask(row.mask, row.set, text), row.refused == nullptr ? 0 : 36);
-        EXPECT_EQ(recorded_error(), row.refused == nullptr ? failure{} : error_of(36, 164, {row.refused}));
-        EXPECT_EQ(text, row.text);
-    }
+        EXPECT_EQ(after(sec_translate_bitmask(mask, set, text)),
+                  *bad == 0 ? no_error : error_of(36, 164, {bad}));
+        EXPECT_STREQ(text, wanted);
+    };
+    letters(0, &none, "", "");
+    letters(0x1fff, nullptr, "rwcxCqledvsao", "");
+    letters(0x80000001, &own, "\xe9r", "");
+    letters(0x80000000, nullptr, "", "80000000");
+    letters(0xffffffff, nullptr, "rwcxCqledvsao", "00002000");
+    letters(3, &own, "\xe9", "00000002");
     std::uint32_t mask = 1; // the inner operation adds to what is there
     EXPECT_EQ(sec__translate_perms("w", &acl__default_perm_set, &mask), 0);
     EXPECT_EQ(mask, 3u);
-    EXPECT_EQ(sec_translate_perms("r", nullptr, nullptr), 4);
-    EXPECT_EQ(recorded_error(), missing("sec_translate_perms", "3"));
-    EXPECT_EQ(sec_translate_bitmask(1, nullptr, nullptr), 4);
-    EXPECT_EQ(recorded_error(), missing("sec_translate_mask", "3"));
+    EXPECT_EQ(after(sec_translate_perms("", nullptr, nullptr)), bad_parameter("sec_translate_perms", 3, "0"));
+    EXPECT_EQ(after(sec_translate_bitmask(1, nullptr, nullptr)), bad_parameter("sec_translate_mask", 3, "0"));
 }
 
 // What an entry made of these parameters holds, or the error.
-std::string made_of(int type, const char *mechanism, const char *identity) {
+std::string made_of(std::uint8_t type, const char *mechanism, const char *identity) {
     auto *made = reinterpret_cast<sec_acle_t *>(0x10);
-    const int result =
-        sec_create_acle(static_cast<std::uint8_t>(type), 0x80000001, mechanism, identity, &made);
+    const failure error = after(sec_create_acle(type, 1u << 31, mechanism, identity, &made));
     const qz::owned_acle owner(made);
-    const failure error = recorded_error();
-    EXPECT_EQ(result, error.code);
-    EXPECT_EQ(made == nullptr, result != 0);
     if (made == nullptr)
-        return testing::PrintToString(error);
-    EXPECT_EQ(std::tuple(int{made->type}, made->perm_mask), std::tuple(type, 0x80000001));
+        return PrintToString(error);
+    EXPECT_EQ(std::tuple(error, made->type, made->perm_mask), std::tuple(no_error, type, 1u << 31));
     return made->mechanism + "/"s + (made->identity == nullptr ? "none" : made->identity);
 }
 
-std::string refused(const char *position, const std::string &value) {
-    return testing::PrintToString(error_of(4, 88, {"sec_create_acle", position, value}));
+std::string refused(int position, const std::string &value) {
+    return PrintToString(bad_parameter("sec_create_acle", position, value));
 }
 
 TEST(entries, are_made_from_sound_parameters) {
     const char mechanism17[] = "12345678901234567", empty[] = "", bare[] = "alice", no_host[] = "alice@";
-    const char *const mechanism16 = mechanism17 + 1;
-    const std::tuple<int, const char *, const char *, std::string> rows[] = {
-        {1, nullptr, nullptr, "/none"},
-        {2, mechanism17, "ignored", "/none"},
-        {16, mechanism17, "a@::0", "/a@::0"},
-        {4, mechanism16, "x", mechanism16 + "/x"s},
-        {8, "UNIX", "a@::0", "UNIX/a@::0"},
-        {4, "unixx", no_host, "unixx/alice@"},
-        {4, "unix", "alice@0:0:0:0:0:FFFF:a00:1", "unix/alice@::ffff:10.0.0.1"},
-        {4, "hba2", "@FE80:0::1", "hba2/@fe80::1"},
-        {8, "hba2", "1111:2222:3333:4444:5555:6666:7777:08888",
-         "hba2/1111:2222:3333:4444:5555:6666:7777:08888"},
-        {8, "hba2", "1111:2222:3333:4444:5555:6666:7777:888F",
-         "hba2/1111:2222:3333:4444:5555:6666:7777:888f"},
-        {4, "unix", "a@b@::01", "unix/a@b@::01"},
-        {4, "unix", "alice@10.0.0.1", "unix/alice@10.0.0.1"},
-        {4, "unix", "alice@::01%eth0", "unix/alice@::01%eth0"},
-        {8, "hba2", bare, "hba2/alice"},
-        {8, "unix", "@0::0", "unix/@::"},
-        {0, "unix", bare, refused("1", "0")},
-        {3, mechanism17, nullptr, refused("1", "3")},
-        {32, nullptr, nullptr, refused("1", "20")},
-        {255, nullptr, nullptr, refused("1", "ff")},
-        {4, nullptr, nullptr, refused("3", "0")},
-        {8, empty, bare, refused("3", shown(empty))},
-        {4, mechanism17, bare, refused("3", shown(mechanism17))},
-        {4, "kdz", nullptr, refused("4", "0")},
-        {16, nullptr, empty, refused("4", shown(empty))},
-        {4, "unix", bare, refused("4", shown(bare))},
-        {4, "hba2", no_host, refused("4", shown(no_host))},
-        {8, "unix", no_host, refused("4", shown(no_host))},
-    };
-    for (const auto &[type, mechanism, identity, made] : rows)
-        EXPECT_EQ(made_of(type, mechanism, identity), made);
-    EXPECT_EQ(sec_create_acle(1, 0, nullptr, nullptr, nullptr), 4);
-    EXPECT_EQ(recorded_error(), missing("sec_create_acle", "5"));
+    EXPECT_EQ(made_of(1, nullptr, nullptr), "/none");
+    EXPECT_EQ(made_of(2, mechanism17, "ignored"), "/none");
+    EXPECT_EQ(made_of(16, mechanism17, "a@::0"), "/a@::0");
+    EXPECT_EQ(made_of(4, mechanism17 + 1, "x"), "2345678901234567/x");
+    EXPECT_EQ(made_of(8, "UNIX", "a@::0"), "UNIX/a@::0");
+    EXPECT_EQ(made_of(4, "unixx", no_host), "unixx/alice@");
+    EXPECT_EQ(made_of(4, "unix", "alice@0:0:0:0:0:FFFF:a00:1"), "unix/alice@::ffff:10.0.0.1");
+    EXPECT_EQ(made_of(4, "hba2", "@FE80:0::1"), "hba2/@fe80::1");
+    EXPECT_EQ(made_of(8, "hba2", "1111:2222:3333:4444:5555:6666:7777:888F"),
+              "hba2/1111:2222:3333:4444:5555:6666:7777:888f");
+    EXPECT_EQ(made_of(4, "unix", "a@b@::01"), "unix/a@b@::01");
+    EXPECT_EQ(made_of(8, "hba2", bare), "hba2/alice");
+    EXPECT_EQ(made_of(0, "unix", bare), refused(1, "0"));
+    EXPECT_EQ(made_of(3, mechanism17, nullptr), refused(1, "3"));
+    EXPECT_EQ(made_of(4, nullptr, nullptr), refused(3, "0"));
+    EXPECT_EQ(made_of(8, empty, bare), refused(3, shown(empty)));
+    EXPECT_EQ(made_of(4, mechanism17, bare), refused(3, shown(mechanism17)));
+    EXPECT_EQ(made_of(4, "kdz", nullptr), refused(4, "0"));
+    EXPECT_EQ(made_of(16, nullptr, empty), refused(4, shown(empty)));
+    EXPECT_EQ(made_of(4, "unix", bare), refused(4, shown(bare)));
+    EXPECT_EQ(made_of(4, "hba2", no_host), refused(4, shown(no_host)));
+    EXPECT_EQ(after(sec_create_acle(1, 0, "", "", nullptr)), bad_parameter("sec_create_acle", 5, "0"));
 }
 
-// The two texts of an entry, or the message.
+// The two texts of an entry, or the error.
 std::string shown_for(const sec_acle_t &acle) {
     char *texts[2] = {const_cast<char *>("left over"), nullptr};
-    const int result = sec_display_acle_id(&acle, &texts[0], &texts[1]);
+    const failure error = after(sec_display_acle_id(&acle, &texts[0], &texts[1]));
     const qz::owned<char> owners[] = {qz::owned<char>(texts[0]), qz::owned<char>(texts[1])};
-    const failure error = recorded_error();
-    EXPECT_EQ(result, error.code);
-    if (result != 0)
-        return testing::PrintToString(error) +
-               (texts[0] == nullptr && texts[1] == nullptr ? "" : " and texts");
-    return (texts[0] == nullptr ? "none" : texts[0]) + "/"s + (texts[1] == nullptr ? "none" : texts[1]);
+    const auto text = [](const char *given) { return given == nullptr ? "none"s : given; };
+    return text(texts[0]) + "/" + text(texts[1]) + (error == no_error ? "" : PrintToString(error));
 }
 
 TEST(entries, show_what_their_type_has) {
-    const std::string incomplete = testing::PrintToString(error_of(43, 95));
-    const std::pair<sec_acle_t, std::string> rows[] = {
-        {entry(1, "unix", "x", 0), "none/none"},
-        {entry(2, "", nullptr, 0), "none/none"},
-        {entry(8, "1234567890123456", "x@Y", 0), "1234567890123456/x@Y"},
-        {entry(16, "unix", "staff", 0), "none/staff"},
-        {entry(16, "", nullptr, 0), incomplete},
-        {entry(4, "", "x", 0), incomplete},
-        {entry(4, "unix", "", 0), incomplete},
-        {entry(0, "unix", "x", 0), testing::PrintToString(error_of(43, 94, {"0"}))},
-        {entry(132, "unix", "x", 0), testing::PrintToString(error_of(43, 94, {"132"}))},
-    };
-    for (const auto &[acle, texts] : rows)
-        EXPECT_EQ(shown_for(acle), texts);
+    const auto fails = [](const failure &error) { return "none/none" + PrintToString(error); };
+    const sec_acle_t single = entry(1, "unix", "x", 0);
+    EXPECT_EQ(shown_for(single), "none/none");
+    EXPECT_EQ(shown_for(entry(8, "1234567890123456", "x@Y", 0)), "1234567890123456/x@Y");
+    EXPECT_EQ(shown_for(entry(16, "unix", "staff", 0)), "none/staff");
+    EXPECT_EQ(shown_for(entry(16, "", nullptr, 0)), fails(error_of(43, 95)));
+    EXPECT_EQ(shown_for(entry(4, "", "x", 0)), fails(error_of(43, 95)));
+    EXPECT_EQ(shown_for(entry(4, "unix", "", 0)), fails(error_of(43, 95)));
+    EXPECT_EQ(shown_for(entry(0, "unix", "x", 0)), fails(error_of(43, 94, {"0"})));
+    EXPECT_EQ(shown_for(entry(132, "unix", "x", 0)), fails(error_of(43, 94, {"132"})));
     char *out = nullptr;
-    EXPECT_EQ(sec_display_acle_id(nullptr, nullptr, nullptr), 4);
-    EXPECT_EQ(recorded_error(), missing("sec_display_acle_id", "1"));
-    EXPECT_EQ(sec_display_acle_id(&rows[0].first, nullptr, nullptr), 4);
-    EXPECT_EQ(recorded_error(), missing("sec_display_acle_id", "2"));
-    EXPECT_EQ(sec_display_acle_id(&rows[0].first, &out, nullptr), 4);
-    EXPECT_EQ(recorded_error(), missing("sec_display_acle_id", "3"));
+    const std::string name = "sec_display_acle_id";
+    EXPECT_EQ(after(sec_display_acle_id(nullptr, nullptr, nullptr)), bad_parameter(name, 1, "0"));
+    EXPECT_EQ(after(sec_display_acle_id(&single, nullptr, nullptr)), bad_parameter(name, 2, "0"));
+    EXPECT_EQ(after(sec_display_acle_id(&single, &out, nullptr)), bad_parameter(name, 3, "0"));
 }
 
 TEST(entries, go_with_the_list_that_holds_them) {
@@ -182,52 +138,33 @@ TEST(entries, go_with_the_list_that_holds_them) {
     EXPECT_TRUE(list.count == 0 && list.acles == nullptr);
 }
 
-// A process opens its converters once, so that each code set needs one of its own. It ends with status 0 when all
-// entries are made and shown as expected.
-struct code_set {
-    const char *claimed, *locale;
-    struct answer {
-        const char *mechanism, *identity;
-        std::string made, shown;
-    };
-    std::vector<answer> answers;
-};
-
-void check(const code_set &set) {
-    claimed_code_set = set.claimed;
-    std::setlocale(LC_ALL, set.locale);
-    for (const auto &[mechanism, identity, made, shown] : set.answers) {
-        EXPECT_EQ(made_of(4, mechanism, identity), made);
-        EXPECT_EQ(shown_for(entry(4, mechanism, identity, 0)), shown);
-    }
-    std::exit(testing::Test::HasFailure() ? 1 : 0);
-}
-
+// A process opens its converters once, so that each row has one of its own.
 TEST(entries_DeathTest, are_converted_between_the_code_set_and_utf8) {
     GTEST_FLAG_SET(death_test_style, "threadsafe"); // runs this test alone in a new process
-    const std::string failed = testing::PrintToString(error_of(26, 130)),
-                      unknown = testing::PrintToString(error_of(26, 129));
-    const char *const grows = "abcdefghijklmno\xe9"; // beyond what an entry holds
-    const code_set sets[] = {
-        {nullptr,
-         "C",
-         {{"kdz", "plain", "kdz/plain", "kdz/plain"},
-          {"kdz", "\xc3\xa9", failed, failed},
-          {"k\xe9", "x", failed, failed}}},
-        {nullptr,
-         "C.UTF-8",
-         {{"k\xc3\xa9", "\xf0\x9f\x98\x80", "k\xc3\xa9/\xf0\x9f\x98\x80", "k\xc3\xa9/\xf0\x9f\x98\x80"},
-          {"kdz", "a\xc3", failed, failed}}},
-        {"ISO-8859-1",
-         "C",
-         {{"k\xe9", "\xff", "k\xc3\xa9/\xc3\xbf", failed},
-          {"abcdefghijklmn\xe9", "x", "abcdefghijklmn\xc3\xa9/x", failed},
-          {grows, "x", refused("3", shown(grows)), failed},
-          {"k\xc3\xa9", "\xc3\xbf", "k\xc3\x83\xc2\xa9/\xc3\x83\xc2\xbf", "k\xe9/\xff"},
-          {"kdz", "\xe4\xb8\xad", "kdz/\xc3\xa4\xc2\xb8\xc2\xad", failed}}},
-        {"no-such-code-set", "C", {{"kdz", "plain", unknown, unknown}}}};
-    for (const code_set &set : sets)
-        EXPECT_EXIT(check(set), testing::ExitedWithCode(0), "");
+    const std::string failed = PrintToString(error_of(26, 130)), no_set = PrintToString(error_of(26, 129));
+    const std::string none = "none/none";
+    const auto known = [](const std::string &text) { return text.substr(0, text.find("\tParameter value")); };
+    const auto check = [&](const char *claimed, const char *locale, const char *mechanism,
+                           const char *identity, const std::string &made, const std::string &shown) {
+        const auto show = [&] {
+            claimed_code_set = claimed;
+            std::setlocale(LC_ALL, locale);
+            const std::string found = known(made_of(4, mechanism, identity)) + "][";
+            std::fprintf(stderr, "[%s%s]", found.c_str(),
+                         shown_for(entry(4, mechanism, identity, 0)).c_str());
+            std::exit(0);
+        };
+        EXPECT_EXIT(show(), testing::ExitedWithCode(0), testing::HasSubstr("[" + made + "][" + shown + "]"));
+    };
+    check(nullptr, "C", "kdz", "plain", "kdz/plain", "kdz/plain");
+    check(nullptr, "C", "kdz", "\xc3\xa9", failed, none + failed);
+    check(nullptr, "C", "k\xe9", "x", failed, none + failed);
+    check(nullptr, "C.UTF-8", "k\xc3\xa9", "\xc3\xbf", "k\xc3\xa9/\xc3\xbf", "k\xc3\xa9/\xc3\xbf");
+    check(nullptr, "C.UTF-8", "kdz", "a\xc3", failed, none + failed);
+    check("ISO-8859-1", "C", "k\xc3\xa9", "\xc3\xbf", "k\xc3\x83\xc2\xa9/\xc3\x83\xc2\xbf", "k\xe9/\xff");
+    check("ISO-8859-1", "C", "abcdefghijklmn\xe9", "x", "abcdefghijklmn\xc3\xa9/x", none + failed);
+    check("ISO-8859-1", "C", "abcdefghijklmno\xe9", "x", known(refused(3, "")), none + failed);
+    check("no-such-code-set", "C", "kdz", "plain", no_set, none + no_set);
 }
 
 } // namespace

@@ -1,11 +1,8 @@
-#!/usr/bin/env python3
 """Checks that includes point down only: see the picture of the house in CONTRIBUTING.md.
 
 usage: layering.py [ROOT]   prints each offending line and exits with 1 when there is one
-
-The build keeps most of this by what each layer may see; this also holds the order inside a layer's folder, and
-notices a source without a place in the house.
 """
+import graphlib
 import re
 import sys
 from os.path import dirname, normpath
@@ -35,14 +32,12 @@ ROOTS = ("security/ACL/lib", "security/ACL/cmd", "security", "platform", "includ
 INCLUDE = re.compile(r'\s*#\s*include\s*([<"])([^">]+)[">]')
 
 
-def unit_of(path):
-    """The unit of the house that a file belongs to, or None."""
+def unit_of(path):  # the unit of the house that a file belongs to, or None
     stem, folder = path.rsplit(".", 1)[0], path.rsplit("/", 1)[0] + "/*"
     return stem if stem in UNITS else folder if folder in UNITS else None
 
 
-def allowed(source, target):
-    """Whether the one file may include the other, by their paths."""
+def allowed(source, target):  # whether the one file may include the other, by their paths
     if source.startswith(OUTSIDE):
         return target.startswith((PUBLIC, *OUTSIDE))
     here, there = unit_of(source), unit_of(target)
@@ -51,15 +46,6 @@ def allowed(source, target):
     if target.startswith("platform/") and target != SHARED_FOLDING:
         return False
     return there is not None and UNITS[there] <= UNITS[here]
-
-
-def circle(path, edges):  # the includes that lead from the first file back to it
-    for target in sorted(edges.get(path[-1], ())):
-        if target == path[0]:
-            return path + [target]
-        if target not in path and (found := circle(path + [target], edges)):
-            return found
-    return None
 
 
 def faults(root):
@@ -74,15 +60,14 @@ def faults(root):
                 continue
             places = [dirname(source), *ROOTS] if match[1] == '"' else ROOTS
             target = next((t for p in places if (t := normpath(f"{p}/{match[2]}")) in files), None)
-            if target is None and match[1] == "<":
-                continue
-            if target is None or not allowed(source, target):
+            if target is None and match[1] == '"' or target is not None and not allowed(source, target):
                 yield f"{source}:{number}: {line.strip()}  leads to {target or 'no file of the project'}"
-            elif UNITS.get(unit_of(source)) == UNITS.get(unit_of(target)):
+            elif target is not None and UNITS.get(unit_of(source)) == UNITS.get(unit_of(target)):
                 edges.setdefault(source, set()).add(target)
-    for source in sorted(edges):
-        if found := circle([source], edges):
-            yield "in a circle: " + " -> ".join(found)
+    try:
+        graphlib.TopologicalSorter(edges).prepare()
+    except graphlib.CycleError as error:
+        yield "in a circle, backwards: " + " -> ".join(error.args[1])
 
 
 found = list(faults(Path(sys.argv[1] if sys.argv[1:] else Path(__file__).resolve().parents[1])))

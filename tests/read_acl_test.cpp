@@ -2,14 +2,10 @@
 // and what a cache that is written afterwards looks like. Times are set, never waited for.
 #include "service_support.h"
 
-#include <cerrno>
-#include <cstdarg>
-#include <ctime>
 #include <fcntl.h>
 #include <fstream>
 #include <functional>
 #include <pwd.h>
-#include <sys/stat.h>
 #include <sys/syscall.h>
 
 namespace {
@@ -20,20 +16,14 @@ std::function<void()> after_read;
 
 } // namespace
 
-extern "C" int open(const char *path, int flags, ...) {
-    va_list args;
-    va_start(args, flags);
-    const int mode = (flags & O_CREAT) != 0 ? va_arg(args, int) : 0;
-    va_end(args);
-    if (const int error = before_open ? before_open(path) : 0; error != 0) {
-        errno = error;
-        return -1;
-    }
-    return static_cast<int>(syscall(SYS_openat, AT_FDCWD, path, flags, mode));
+// Under the name of the variadic function, which takes its arguments alike.
+extern "C" int open_hooked(const char *path, int flags, mode_t mode) __asm__("open");
+int open_hooked(const char *path, int flags, mode_t mode) {
+    errno = before_open ? before_open(path) : 0;
+    return errno != 0 ? -1 : static_cast<int>(syscall(SYS_openat, AT_FDCWD, path, flags, mode));
 }
-
-// What open is called as in fortified builds.
-extern "C" int __open_2(const char *path, int flags) { return open(path, flags); }
+// What it is called as in fortified builds.
+extern "C" int __open_2(const char *path, int flags) { return open_hooked(path, flags, 0); }
 
 extern "C" ssize_t read(int fd, void *bytes, size_t count) {
     const ssize_t result = syscall(SYS_read, fd, bytes, count);
@@ -45,18 +35,18 @@ extern "C" ssize_t read(int fd, void *bytes, size_t count) {
 namespace {
 
 using namespace support;
+namespace fs = std::filesystem;
 
 constexpr unsigned text = SEC_READ_ACL_TEXT, cache = SEC_READ_ACL_CACHE, convert = SEC_READ_ACL_CONVERT;
 
 const std::string acl_text = "# users\nu unix alice@host r\n";
 const std::string from_text = one(of_mechanism(4, "unix", 1, named(1, "alice@host")));
 
-void write_file(const std::string &path, const std::string &bytes, time_t age, mode_t mode) {
+void write_file(const std::string &path, const std::string &bytes, int age, unsigned mode) {
     std::ofstream(path, std::ios::binary) << bytes;
-    static const time_t now = time(nullptr); // one moment for all files
-    const timespec times[2] = {{now - age, 0}, {now - age, 0}};
-    EXPECT_EQ(utimensat(AT_FDCWD, path.c_str(), times, 0), 0);
-    EXPECT_EQ(chmod(path.c_str(), mode), 0);
+    static const auto now = std::chrono::floor<std::chrono::seconds>(fs::file_time_type::clock::now());
+    fs::last_write_time(path, now - std::chrono::seconds(age)); // of one moment for all files
+    fs::permissions(path, fs::perms(mode));
 }
 
 std::string read_file(const std::string &path) {
@@ -64,122 +54,69 @@ std::string read_file(const std::string &path) {
     return {std::istreambuf_iterator<char>(file), {}};
 }
 
-struct stat status_of(const std::string &path) {
-    struct stat status = {};
-    EXPECT_EQ(stat(path.c_str(), &status), 0) << path;
-    return status;
-}
-
-struct reading {
-    int result;
-    std::string bytes;
-    unsigned flags;
-    failure error = {};
-    bool operator==(const reading &) const = default;
-};
-
-std::ostream &operator<<(std::ostream &out, const reading &shown) {
-    return out << shown.result << ", " << shown.bytes.size() << " bytes, flags " << shown.flags << ", "
-               << shown.error;
-}
+// The result, the bytes, the flags, and the error.
+using reading = std::tuple<int, std::string, unsigned, failure>;
+reading given(const std::string &bytes, unsigned flags) { return {0, bytes, flags, {}}; }
+reading refused(const failure &error, unsigned flags) { return {error.code, "", flags, error}; }
 
 reading read_acl(const std::string &path, unsigned flags, const char *user = nullptr) {
     buffer held;
     held.acl = {7, &held}; // overwritten whatever comes
-    reading made{0, "", 0xabad1dea};
-    made.result = sec_read_acl_file(path.c_str(), user, nullptr, flags, &held.acl, &made.flags);
+    const int result = sec_read_acl_file(path.c_str(), user, nullptr, flags, &held.acl, &flags);
     EXPECT_EQ(held.acl.data == nullptr, held.acl.length == 0);
-    made.bytes = held.bytes();
-    made.error = recorded_error();
-    return made;
+    return {result, held.bytes(), flags, recorded_error()};
 }
 
-class read_acl_file : public testing::Test {
-protected:
-    void TearDown() override {
-        before_open = nullptr;
-        after_read = nullptr;
-    }
-
+struct read_acl_file : testing::Test {
     const temporary_folder folder;
-    const std::string path = folder / "acl";
-    const std::string cache_path = path + ".cacl";
+    const std::string path = folder / "acl", cache_path = path + ".cacl";
 };
 
 TEST_F(read_acl_file, reads_the_cache_when_it_is_current) {
-    constexpr time_t age = 100; // of the ACL file
     constexpr unsigned other = 0xfffffff8;
-    const struct cached {
-        const char *name;
-        std::string bytes;
-        time_t age;
-        mode_t mode = 0644;
-    } none{"none", "", -1}, current{"current", example, age - 1}, as_old{"of the same second", example, age},
-        older{"older", example, age + 1}, empty{"empty", "", 0}, private_one{"private", example, 0, 0640},
-        sticky{"sticky", example, 0, 01644}, corrupt{"corrupt", example.substr(0, 30), 0},
-        junk{"junk", "junk", 0};
-    const struct {
-        const cached &cache_file;
-        unsigned in, out;
-        const std::string &bytes;
-    } rows[] = {
-        {none, 0, text, from_text},
-        {none, text, text, from_text},
-        {none, convert | other, text | other, from_text},
-        {current, 0, 0, example},
-        {current, cache, 0, example},
-        {current, convert | cache | other, convert | other, example},
-        {current, text, text, from_text},
-        {current, text | cache, text, from_text},
-        {current, text | convert, text, from_text},
-        {as_old, 0, text, from_text},
-        {older, convert, text, from_text},
-        {empty, convert, text, from_text},
-        {private_one, 0, text, from_text},
-        {private_one, cache, text, from_text},
-        {sticky, cache, text, from_text},
-        {corrupt, 0, 0, corrupt.bytes}, // nobody asked for a check
-        {corrupt, convert, text, from_text},
-        {corrupt, convert | cache, text, from_text}, // newer, so left alone
-        {junk, convert, text, from_text},
+    const std::string cut = example.substr(0, 30);
+    const std::string foreign = "\x85\1\1\0\1\0\0\0\x1a\4\0\0\0\1\5abcd\0\1\0\0\0\3\0\4xyz\0"s;
+    // The text, 100 s old; what is cached, its age and mode; the flags before and after; what is read.
+    const std::tuple<std::string, std::string, int, unsigned, unsigned, unsigned, std::string> rows[] = {
+        {acl_text, "", 0, 0, convert | other, text | other, from_text}, // no file
+        {acl_text, "", 0, 0644, convert, text, from_text},
+        {acl_text, example, 99, 0644, convert | cache | other, convert | other, example},
+        {acl_text, example, 99, 0644, text | cache, text, from_text},
+        {acl_text, example, 100, 0644, 0, text, from_text},
+        {acl_text, example, 0, 01644, cache, text, from_text},
+        {acl_text, cut, 0, 0644, 0, 0, cut},                        // nobody asked for a check
+        {acl_text, cut, 0, 0644, convert | cache, text, from_text}, // newer, so left alone
+        {"", example, 0, 0644, cache | convert, convert, ""},
+        {"# nobody\n\n  \t\n", example, 0, 0644, text | cache, text, ""},
+        {acl_text, foreign, 0, 0644, 0, 0, foreign},
     };
-    for (const auto &[cache_file, in, out, bytes] : rows) {
-        std::filesystem::remove(cache_path);
-        write_file(path, acl_text, age, 0644);
-        if (cache_file.age >= 0)
-            write_file(cache_path, cache_file.bytes, cache_file.age, cache_file.mode);
-        EXPECT_EQ(read_acl(path, in), (reading{0, bytes, out})) << cache_file.name << ", flags " << in;
-        EXPECT_EQ(read_file(cache_path), cache_file.bytes) << cache_file.name << ", flags " << in;
+    for (const auto &[written, cached, age, mode, in, out, bytes] : rows) {
+        fs::remove(cache_path);
+        write_file(path, written, 100, 0644);
+        if (mode != 0)
+            write_file(cache_path, cached, age, mode);
+        EXPECT_EQ(read_acl(path, in), given(bytes, out)) << written << age << ' ' << mode << ' ' << in;
+        EXPECT_EQ(read_file(cache_path), cached) << written << age << ' ' << mode << ' ' << in;
     }
-    write_file(cache_path, foreign(example), 0, 0644);
-    EXPECT_EQ(read_acl(path, convert), (reading{0, example, convert}));
-    EXPECT_EQ(read_acl(path, 0), (reading{0, foreign(example), 0}));
-    if (geteuid() == 0) {
-        write_file(cache_path, example, 0, 0644);
-        for (const auto &[uid, gid] : {std::pair(1, 0), std::pair(0, 1)}) {
-            EXPECT_EQ(chown(cache_path.c_str(), static_cast<uid_t>(uid), static_cast<gid_t>(gid)), 0);
-            EXPECT_EQ(read_acl(path, cache), (reading{0, from_text, text}));
-        }
+    EXPECT_EQ(read_acl(path, convert), given(example, convert));
+    for (const uid_t uid : {1u, 0u}) {
+        const bool may = chown(cache_path.c_str(), uid, 1 - uid) == 0; // the superuser only
+        EXPECT_EQ(read_acl(path, cache), may ? given(from_text, text) : given(foreign, 0));
     }
 }
 
 TEST_F(read_acl_file, refreshes_a_cache_and_then_uses_it) {
-    for (const mode_t mode : {0644u, 0600u, 0640u}) {
-        for (const bool is_stale : {false, true}) {
-            std::filesystem::remove(cache_path);
-            write_file(path, acl_text, 100, mode);
-            if (is_stale)
-                write_file(cache_path, example, 200, mode);
-            EXPECT_EQ(read_acl(path, cache | convert), (reading{0, from_text, text | cache}));
-            EXPECT_EQ(read_file(cache_path), from_text);
-            EXPECT_EQ(status_of(cache_path).st_mode & 07777, mode);
-            EXPECT_EQ(read_acl(path, cache | convert), (reading{0, from_text, convert}));
-        }
+    for (const unsigned mode : {0644u, 0600u, 0640u}) { // there is none, then one that is stale
+        write_file(path, acl_text, 100, mode);
+        if (mode != 0644)
+            write_file(cache_path, example, 200, mode);
+        EXPECT_EQ(read_acl(path, cache | convert), given(from_text, text | cache));
+        EXPECT_EQ(read_file(cache_path), from_text);
+        EXPECT_EQ(fs::status(cache_path).permissions(), fs::perms(mode));
+        EXPECT_EQ(read_acl(path, cache | convert), given(from_text, convert));
     }
-    std::size_t files = 0;
-    for (const auto &file : std::filesystem::directory_iterator(folder.path()))
-        files += file.is_regular_file();
-    EXPECT_EQ(files, 2u); // nothing temporary is left
+    const fs::directory_iterator files(folder.path());
+    EXPECT_EQ(std::distance(begin(files), end(files)), 2); // nothing temporary is left
 }
 
 // An edit while the text is being parsed must not leave a cache that looks later than the edit.
@@ -189,91 +126,52 @@ TEST_F(read_acl_file, never_takes_an_edited_text_for_cached) {
         after_read = nullptr;
         std::ofstream(path) << "g staff r\n";
         // Whatever is stamped from here on is later than the edit, even from the clock that moves in ticks.
-        const timespec edited = status_of(path).st_mtim;
-        timespec now = {};
-        do
+        timespec edited = {}, now = {};
+        clock_gettime(CLOCK_REALTIME_COARSE, &edited);
+        for (now = edited; now.tv_nsec == edited.tv_nsec;)
             clock_gettime(CLOCK_REALTIME_COARSE, &now);
-        while (std::tie(now.tv_sec, now.tv_nsec) <= std::tie(edited.tv_sec, edited.tv_nsec));
     };
-    EXPECT_EQ(read_acl(path, cache), (reading{0, from_text, text | cache}));
-    const timespec edited = status_of(path).st_mtim, cached = status_of(cache_path).st_mtim;
-    EXPECT_TRUE(std::tie(cached.tv_sec, cached.tv_nsec) <= std::tie(edited.tv_sec, edited.tv_nsec));
-    EXPECT_EQ(read_acl(path, 0), (reading{0, one(packed_subacl(16, "", 1, named(1, "staff"))), text}));
+    EXPECT_EQ(read_acl(path, cache), given(from_text, text | cache));
+    EXPECT_LE(fs::last_write_time(cache_path), fs::last_write_time(path));
+    EXPECT_EQ(read_acl(path, 0), given(one(packed_subacl(16, "", 1, named(1, "staff"))), text));
 }
 
 TEST_F(read_acl_file, bears_files_that_cannot_be_opened_or_were_exchanged) {
     write_file(path, acl_text, 100, 0644);
     write_file(cache_path, example, 0, 0644);
-    std::string victim = cache_path;
-    before_open = [&](const std::string &opened) { return opened == victim ? EACCES : 0; };
-    EXPECT_EQ(read_acl(path, cache | convert), (reading{0, from_text, text}));
-    victim = path;
-    EXPECT_EQ(read_acl(path, convert), (reading{0, example, convert})); // not needed
-    EXPECT_EQ(read_acl(path, text | cache),
-              (reading{37, "", text | cache, error_of(37, 124, {path, std::to_string(EACCES)})}));
-
-    before_open = [&](const std::string &opened) {
-        if (opened == victim) {
-            write_file(folder / "other", acl_text, 0, 0644);
-            std::filesystem::rename(folder / "other", opened);
+    for (const int error : {EACCES, ESTALE})
+        for (const std::string &victim : {cache_path, path}) {
+            before_open = [&](const std::string &opened) {
+                if (opened != victim || error == EACCES)
+                    return opened == victim ? error : 0;
+                write_file(folder / "other", acl_text, 0, 0644);
+                fs::rename(folder / "other", opened);
+                return 0;
+            };
+            const reading bad = refused(error_of(37, 124, {path, std::to_string(error)}), text | cache);
+            EXPECT_EQ(read_acl(path, victim == path ? text | cache : convert),
+                      victim == path ? bad : given(from_text, text));
         }
-        return 0;
-    };
-    EXPECT_EQ(read_acl(path, text),
-              (reading{37, "", text, error_of(37, 124, {path, std::to_string(ESTALE)})}));
-    victim = cache_path;
-    write_file(path, acl_text, 100, 0644);
-    EXPECT_EQ(read_acl(path, 0), (reading{0, from_text, text}));
-}
-
-TEST_F(read_acl_file, gives_no_bytes_for_no_entries) {
-    write_file(cache_path, example, 0, 0644);
-    write_file(path, "", 100, 0644);
-    EXPECT_EQ(read_acl(path, cache | convert), (reading{0, "", convert})); // no cache was written
-    write_file(path, "# nobody\n\n  \t\n", 100, 0644);
-    EXPECT_EQ(read_acl(path, text | cache), (reading{0, "", text}));
-    EXPECT_EQ(read_file(cache_path), example);
+    before_open = nullptr;
 }
 
 TEST_F(read_acl_file, reports_what_it_refuses) {
     const std::string missing = folder / "missing";
-    const struct {
-        std::string name;
-        const char *user;
-        failure error;
-    } names[] = {
-        {missing, nullptr, error_of(37, 122, {missing, std::to_string(ENOENT)})},
-        {folder.path(), nullptr, error_of(37, 122, {folder.path(), "0"})},
-        {"acl", "", error_of(4, 121)},
-    };
-    for (const auto &[name, user, error] : names)
-        EXPECT_EQ(read_acl(name, 0xf0 | cache, user), (reading{error.code, "", 0xf0 | cache, error}));
-
-    const struct {
-        std::string text;
-        int code, id;
-    } texts[] = {
-        {"o r\no r\n", 43, 160},  {"u unix a@b r\nU UNIX A@B q\n", 43, 144},
-        {"o r\nx r\n", 42, 165},  {"o r\no \0r\n"s, 42, 131},
-        {"g staff z\n", 36, 166},
-    };
-    for (const auto &[bad, code, id] : texts) {
+    EXPECT_EQ(read_acl(missing, 0xf2), refused(error_of(37, 122, {missing, std::to_string(ENOENT)}), 0xf2));
+    EXPECT_EQ(read_acl(folder.path(), 0), refused(error_of(37, 122, {folder.path(), "0"}), 0));
+    EXPECT_EQ(read_acl("acl", cache, ""), refused(error_of(4, 121), cache));
+    for (const auto &[bad, id] : {std::pair("o r\no r\n"s, 160), {"o r\no \0r\n"s, 131}, {"g x z\n"s, 166}}) {
         write_file(path, bad, 100, 0644);
-        const reading made = read_acl(path, cache | convert);
-        EXPECT_EQ(made.result, code) << bad;
-        EXPECT_EQ(made.error.id, id) << bad << made.error;
-        EXPECT_EQ(made.bytes, "") << bad;
-        EXPECT_EQ(made.flags, text | cache) << bad;
-        EXPECT_FALSE(std::filesystem::exists(cache_path)) << bad;
+        const auto [code, bytes, flags, error] = read_acl(path, cache | convert);
+        EXPECT_EQ(std::tuple(code, bytes, flags, id), std::tuple(error.code, "", text | cache, error.id))
+            << bad;
+        EXPECT_FALSE(fs::exists(cache_path)) << bad;
     }
-
     unsigned flags = 9;
     sec_acl_buffer_t acl = {7, &flags};
-    EXPECT_EQ(after(sec_read_acl_file(nullptr, "", nullptr, 2, &acl, &flags)),
-              bad_parameter("sec_read_acl_file", 1, "0"));
-    EXPECT_EQ(flags, 2u);
-    EXPECT_EQ(after(sec_read_acl_file("acl", "", nullptr, 4, nullptr, &flags)),
-              bad_parameter("sec_read_acl_file", 5, "0"));
+    const char *const name = "sec_read_acl_file";
+    EXPECT_EQ(after(sec_read_acl_file(nullptr, "", nullptr, 2, &acl, &flags)), bad_parameter(name, 1, "0"));
+    EXPECT_EQ(after(sec_read_acl_file("acl", "", nullptr, 4, nullptr, &flags)), bad_parameter(name, 5, "0"));
     EXPECT_EQ(flags, 4u);
     EXPECT_EQ(sec_read_acl_file(missing.c_str(), nullptr, nullptr, 0, &acl, nullptr), 37);
 }
@@ -282,42 +180,34 @@ TEST_F(read_acl_file, of_a_user_must_be_that_users_alone) {
     const passwd *user = getpwuid(geteuid());
     if (user == nullptr || access(user->pw_dir, W_OK) != 0)
         GTEST_SKIP() << "no home directory to write to";
-    const std::string name = user->pw_name;
-    const std::string base = ".qzacl-test-"s.append(std::to_string(getpid()));
+    const std::string name = user->pw_name, base = ".qzacl-test-" + std::to_string(getpid());
     const std::string file = user->pw_dir + "/"s + base;
-    for (const mode_t mode : {0600u, 0644u, 0620u, 0602u, 0666u}) {
+    const reading not_private = refused(error_of(36, 128, {file, name}), text);
+    for (const auto &[mode, other] : {std::pair(0644u, 0u), {0620u, 0u}, {0602u, 0u}, {0600u, 1u}}) {
         write_file(file, acl_text, 100, mode);
-        EXPECT_EQ(read_acl(base, text, name.c_str()),
-                  (mode & 022) == 0 ? (reading{0, from_text, text})
-                                    : (reading{36, "", text, error_of(36, 128, {file, name})}));
+        const bool is_given =
+            other != 0 && chown(file.c_str(), geteuid() + other, 0) == 0; // by the superuser
+        const bool is_sound = (mode & 022) == 0 && !is_given;
+        EXPECT_EQ(read_acl(base, text, name.c_str()), is_sound ? given(from_text, text) : not_private);
+        EXPECT_EQ(read_acl(file, text), given(from_text, text)); // without a user nobody asks
     }
-    EXPECT_EQ(read_acl(file, 0).result, 0); // without a user nobody asks
-    write_file(file, "", 100, 0666);
-    EXPECT_EQ(read_acl(base, 0, name.c_str()), (reading{0, "", 0})); // nothing that could be trusted
-    const passwd *other = getpwuid(geteuid() + 1);
-    if (geteuid() == 0 && other != nullptr) {
-        write_file(file, acl_text, 100, 0600);
-        EXPECT_EQ(chown(file.c_str(), other->pw_uid, 0), 0);
-        EXPECT_EQ(read_acl(base, 0, name.c_str()).error, error_of(36, 128, {file, name}));
-    }
-    std::filesystem::remove(file);
+    write_file(file, "", 100, 0666); // nothing that could be trusted
+    EXPECT_EQ(read_acl(base, 0, name.c_str()), given("", 0));
+    fs::remove(file);
 }
 
 // The longest paths have no room for the name of a cache; one that is there all the same is not looked at.
 TEST_F(read_acl_file, leaves_out_the_cache_of_a_long_path) {
     std::string deep = folder.path();
-    while (deep.size() < 4080) {
-        deep.append("/").append(std::min<std::size_t>(4080 - deep.size(), 200), 'd');
-        std::filesystem::create_directory(deep);
-    }
-    for (const std::size_t length : {4089u, 4090u}) {
-        const std::string file = std::string(deep).append("/").append(length - deep.size() - 1, 'f');
+    while (deep.size() < 4080)
+        fs::create_directory(deep.append("/").append(std::min<std::size_t>(4080 - deep.size(), 200), 'd'));
+    for (const bool has_cache : {true, false}) {
+        const std::string file = deep + (has_cache ? "/of-4089-" : "/of-4090--");
+        ASSERT_EQ(file.size(), has_cache ? 4089u : 4090u);
         write_file(file, acl_text, 100, 0644);
-        const bool has_cache = length < 4090;
-        EXPECT_EQ(read_acl(file, cache), (reading{0, from_text, has_cache ? text | cache : text}));
+        EXPECT_EQ(read_acl(file, cache), given(from_text, has_cache ? text | cache : text));
         write_file(file + ".cacl", example, 0, 0644);
-        EXPECT_EQ(read_acl(file, cache),
-                  has_cache ? (reading{0, example, 0}) : (reading{0, from_text, text}));
+        EXPECT_EQ(read_acl(file, 0), has_cache ? given(example, 0) : given(from_text, text));
     }
 }
 

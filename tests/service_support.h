@@ -24,39 +24,27 @@ inline failure after(int result) {
         found.text.replace(at + source.size() + 1, found.text.size() - at - source.size() - 3, "LINE");
     return found;
 }
-
 // A located message: its arguments without the two of the place.
 inline failure located(int code, int id, arguments args = {}) {
     args.insert(args.end(), {source, "LINE"});
     return error_of(code, id, args);
 }
-
 inline failure bad_parameter(const std::string &function, int position, const std::string &value) {
     return error_of(SEC_S_BAD_PARAMETER, 88, {function, std::to_string(position), value});
 }
-
 inline const failure no_error;
 
 // A buffer as the library holds one: its bytes in a block of malloc of exactly their number.
-class buffer {
-public:
-    buffer() = default;
-    explicit buffer(const std::string &bytes) { assign(bytes); }
-    buffer(const buffer &) = delete;
-    buffer &operator=(const buffer &) = delete;
+struct buffer {
+    explicit buffer(const std::string &bytes = "") {
+        if (const std::size_t size = bytes.size(); size != 0)
+            acl = {static_cast<std::int32_t>(size), std::memcpy(std::malloc(size), bytes.data(), size)};
+    }
+    buffer(buffer &&) = delete;
     ~buffer() { std::free(acl.data); }
-
-    void assign(const std::string &bytes) {
-        std::free(acl.data);
-        acl = {static_cast<std::int32_t>(bytes.size()), std::malloc(bytes.size())};
-        std::memcpy(acl.data, bytes.data(), bytes.size());
-    }
     std::string bytes() const {
-        return acl.data == nullptr
-                   ? ""
-                   : std::string(static_cast<char *>(acl.data), static_cast<std::size_t>(acl.length));
+        return {static_cast<char *>(acl.data), static_cast<std::size_t>(acl.length)};
     }
-
     sec_acl_buffer_t acl = {};
 };
 
@@ -67,10 +55,6 @@ struct listed {
     std::uint32_t mask;
     bool operator==(const listed &) const = default;
 };
-
-inline std::ostream &operator<<(std::ostream &out, const listed &shown) {
-    return out << shown.type << ' ' << shown.mechanism << ' ' << shown.identity << ' ' << shown.mask;
-}
 
 // The entries of a list, which is released.
 inline std::vector<listed> taken(sec_aclelist_t &list) {
@@ -84,12 +68,6 @@ inline std::vector<listed> taken(sec_aclelist_t &list) {
     return entries;
 }
 
-inline std::vector<listed> all_entries(const sec_acl_buffer_t &acl) {
-    sec_aclelist_t list = {};
-    EXPECT_EQ(sec_list_acl(&acl, &list), SEC_S_OK) << recorded_error();
-    return taken(list);
-}
-
 // A string field: the text and its NUL. Then an entry and a sub-ACL made of texts.
 inline std::string text_field(std::string_view text) { return std::string(text) + '\0'; }
 inline std::string named(std::uint32_t mask, std::string_view name) {
@@ -101,25 +79,18 @@ inline std::string of_mechanism(int type, std::string_view name, std::uint64_t c
 }
 inline std::string one(const std::string &subacl) { return packed_acl(1, subacl); }
 
-inline std::string with(std::string bytes, std::size_t offset, int value) {
-    bytes[offset] = static_cast<char>(value);
-    return bytes;
-}
-
 inline arguments words(const std::string &text) {
     std::istringstream stream(text);
     return {std::istream_iterator<std::string>(stream), {}};
 }
 
-// Letters fold, all other bytes count as they are, unsigned.
+// Letters fold, all other bytes count as they are. std::string compares bytes as unsigned.
 inline std::string folded(std::string text) {
     for (char &c : text)
         c = c >= 'A' && c <= 'Z' ? static_cast<char>(c + 32) : c;
     return text;
 }
-
 inline bool same(const std::string &a, const std::string &b) { return folded(a) == folded(b); }
-// std::string compares bytes as unsigned.
 inline bool precedes(const std::string &a, const std::string &b) { return folded(a) < folded(b); }
 
 // The 31 bytes that the format is explained with.
@@ -132,32 +103,6 @@ inline const std::string rich = packed_acl(
            of_mechanism(8, "kRb5", 2, named(4, "z") + named(5, "a")) +
            of_mechanism(4, "hba2", 1, named(6, "x")) + packed_subacl(2, "", 1, packed_entry(7, "")) +
            packed_subacl(1, "", 1, packed_entry(8, "")));
-
-// The same buffer as a host of the other byte order would write it.
-inline std::string foreign(std::string bytes) {
-    const auto at = [&](std::size_t offset) {
-        return static_cast<std::size_t>(static_cast<unsigned char>(bytes[offset]));
-    };
-    const auto swap = [&](std::size_t offset, std::size_t width) {
-        std::reverse(bytes.data() + offset, bytes.data() + offset + width);
-    };
-    bytes[2] = 1;
-    std::size_t position = 5;
-    for (std::size_t subacls = at(3) + at(4) * 256; subacls != 0; --subacls) {
-        const std::size_t start = position;
-        position += 10 + at(start + 9);
-        for (std::size_t entries = at(start + 5); entries != 0; --entries) {
-            const std::size_t size = 7 + at(position + 5) + at(position + 6) * 256;
-            swap(position + 1, 4);
-            swap(position + 5, 2);
-            position += size;
-        }
-        swap(start, 4);
-        swap(start + 5, 4);
-    }
-    swap(3, 2);
-    return bytes;
-}
 
 } // namespace support
 
