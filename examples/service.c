@@ -14,8 +14,7 @@
 static const char mechanism[] = "unix";
 
 /* Says why the last operation failed. */
-static int failed(const char *what)
-{
+static int failed(const char *what) {
     cu_error_t *error = NULL;
     char *text = NULL;
 
@@ -27,15 +26,13 @@ static int failed(const char *what)
 }
 
 /* A user-expanded entry of "unix" names a domain: it stands for everybody whose name ends with it. */
-static int is_in_domain(const char *requested, const char *entry)
-{
+static int is_in_domain(const char *requested, const char *entry) {
     size_t length = strlen(requested), end = strlen(entry);
 
     return length < end || strcmp(requested + length - end, entry) != 0;
 }
 
-static int granted(const char *by, uint32_t mask)
-{
+static int granted(const char *by, uint32_t mask) {
     char letters[33];
 
     if (sec_translate_bitmask(mask, NULL, letters) != SEC_S_OK)
@@ -48,8 +45,8 @@ static int granted(const char *by, uint32_t mask)
  * The closest answer wins: what is said about the user, else about the user's domain, else about the
  * groups, else about anybody. SEC_S_BAD_ACLE says that there is no entry, which is an answer and no failure.
  */
-static int decide(const sec_acl_buffer_t *acl, const char *user, const sec_group_ref_t *groups, int32_t count)
-{
+static int decide(const sec_acl_buffer_t *acl, const char *user, const sec_group_ref_t *groups,
+                  int32_t count) {
     uint32_t mask = 0;
     int result;
 
@@ -83,8 +80,7 @@ static int decide(const sec_acl_buffer_t *acl, const char *user, const sec_group
 }
 
 /* Grants a user without an entry of its own reading, asks again, and takes it back; the file does not change. */
-static int edit(sec_acl_buffer_t *acl, const char *user)
-{
+static int edit(sec_acl_buffer_t *acl, const char *user) {
     sec_acle_t *entry = NULL;
     uint32_t mask = 0;
     int status = 0;
@@ -107,8 +103,7 @@ static int edit(sec_acl_buffer_t *acl, const char *user)
     return result == SEC_S_OK ? status : failed("edit");
 }
 
-int main(int argc, char **argv)
-{
+int main(int argc, char **argv) {
     enum { max_groups = 64 };
     sec_group_ref_t groups[max_groups];
     int32_t count = 0;
@@ -126,7 +121,8 @@ int main(int argc, char **argv)
     }
     if (sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, mechanism, is_in_domain) != SEC_S_OK)
         return failed("handler");
-    if (sec_read_acl_file(argv[1], NULL, NULL, SEC_READ_ACL_CONVERT | SEC_READ_ACL_CACHE, &acl, &flags) != SEC_S_OK)
+    if (sec_read_acl_file(argv[1], NULL, NULL, SEC_READ_ACL_CONVERT | SEC_READ_ACL_CACHE, &acl, &flags) !=
+        SEC_S_OK)
         return failed(argv[1]);
     printf("read from %s, %" PRId32 " bytes%s\n", (flags & SEC_READ_ACL_TEXT) != 0 ? "the text" : "the cache",
            acl.length, (flags & SEC_READ_ACL_CACHE) != 0 ? ", cached" : "");

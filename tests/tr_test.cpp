@@ -34,9 +34,9 @@ TEST(Levels, AreReadPartByPart) {
 TEST(Text, IsPrintableUtf8) {
     EXPECT_TRUE(qz::tr::is_printable(
         "a b~\xC2\xA0\xED\x9F\xBF\xEE\x80\x80\xE0\xA0\x80\xF0\x90\x80\x80\xF4\x8F\xBF\xBF"));
-    for (const char *text : {"a\x1F", "\x7F", "\xC2\x80", "\xC2\x9F", "\x80", "\xC3", "\xE2\x82", "\xC3\x28",
-                             "\xC1\xBF", "\xE0\x9F\xBF", "\xF0\x8F\xBF\xBF", "\xED\xA0\x80", "\xED\xBF\xBF",
-                             "\xF4\x90\x80\x80", "\xFF\xBF\xBF\xBF"})
+    for (const char *text :
+         {"a\x1F", "\x7F", "\xC2\x9F", "\x80", "\xE2\x82", "\xC3\x28", "\xC1\xBF", "\xE0\x9F\xBF",
+          "\xF0\x8F\xBF\xBF", "\xED\xA0\x80", "\xED\xBF\xBF", "\xF4\x90\x80\x80", "\xFF\xBF\xBF\xBF"})
         EXPECT_FALSE(qz::tr::is_printable(text)) << testing::PrintToString(text);
 }
 
@@ -83,7 +83,8 @@ TEST_F(Trace, LinesAreExactFromRegisteringUntilTheFileIsLost) {
         EXPECT_EQ(level, off);
         EXPECT_EQ(tr_record_id_1("C", 1), TR_NOT_REGISTERED);
         EXPECT_EQ(enlist(), on);
-        const rlimit limit{std::filesystem::file_size(file) + 9, RLIM_INFINITY};
+        const rlim_t almost_full = std::filesystem::file_size(file) + 9;
+        const rlimit limit{almost_full, almost_full};
         ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &limit), 0);
         EXPECT_EQ(tr_record_id_1("C", 2), TR_FILE_ERROR);
         closefrom(3); // as a daemon does, whose next file then takes the number

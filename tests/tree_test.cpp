@@ -127,7 +127,7 @@ struct inventor {
         std::string name(round % 3 == 2 ? round % 60 : 0, 'z');
         for (auto left = 1 + random() % (round % 3 == 1 ? 70 : 6); left != 0; --left)
             name += static_cast<char>(round % 3 == 0   ? "aAbB"[random() % 4]
-                                      : round % 3 == 1 ? 1 + random() % 255
+                                      : round % 3 == 1 ? static_cast<char>(1 + random() % 255)
                                                        : "aAzZ@[`{\x7f\x80\xff"[random() % 11]);
         return {type, type == 4 || type == 8 ? spelled(of) : "", type < 4 ? "<none>" : spelled(name),
                 random()};
