@@ -9,6 +9,7 @@
 #include <climits>
 #include <cstdlib>
 #include <gmock/gmock.h>
+#include <map>
 #include <memory>
 #include <random>
 #include <string>
@@ -103,8 +104,8 @@ TEST(Catalog, TextsAndFilesThatDoNotFitAreRefused) {
          {"none", "%1$s %2$d", "%1$s %1$s %2$d", "%1$d %2$d %2$d", "%1$s %2$d %2$x", "%1$s %2$d %2$02d",
           "%1$s %2$d %2$d %1$s", "%1$s %2$d %2$d %n", "%1$s %2$d %2$d %", "%1$s %2$d %1$*2$d"})
         EXPECT_FALSE(qz::cu::has_conversions_of(text, "%1$s %2$d %2$d")) << text;
-    // A name that is too long, no such catalogs, and more than are looked into.
-    static const std::string names[] = {std::string(99, 'n'), "1", "2", "3", "4", "5", "6", "7", "8", "9"};
+    // No such catalogs, a name that is too long for the last place, and more than are looked into.
+    static const std::string names[] = {"1", "2", "3", "4", "5", "6", "7", std::string(99, 'n'), "8", "9"};
     errno = EDOM;
     for (const std::string &name : names) {
         cu_set_error_1(1, 0, name.c_str(), 1, 1, "default");
@@ -119,9 +120,9 @@ const std::string refused = "(refused)";
 // Null for a code set that the system lacks. Handles are never closed; a place for them that outlives the
 // test tells the leak checker so.
 cu_iconv_t opened(const char *codeset, uint32_t flags) {
-    static auto &handles = *new std::vector<cu_iconv_t>;
-    cu_iconv_t &handle = handles.emplace_back();
-    const int code = cu_iconv_open_1(codeset, flags, &handle);
+    static auto &handles = *new std::map<std::pair<std::string, uint32_t>, cu_iconv_t>;
+    cu_iconv_t &handle = handles[{codeset, flags}];
+    const int code = handle != nullptr ? CU_OK : cu_iconv_open_1(codeset, flags, &handle);
     EXPECT_EQ(code, handle != nullptr ? CU_OK : CU_ICONV_UNKNOWN_CODESET);
     return handle;
 }
@@ -158,17 +159,15 @@ TEST(Codeset, Conversions) {
         {"UTF-16LE", to_utf8 | CU_ICONV_BMP_ONLY, "a\0\x3d\xd8\0\xde"s, refused},
         {"UTF-16LE", from_utf8 | CU_ICONV_BMP_ONLY, "ab", "a\0b\0"s},
         {"UCS-4LE", to_utf8, "\0\0\x11\0"s, refused},
-        // Shifts are undone at the end, and what looks like ASCII is not taken for it where it can shift.
+        // Shifts are undone at the end and after a failure; what can shift is not taken for ASCII.
         {"ISO-2022-JP", from_utf8, "a\xe6\x97\xa5", "a\x1b$BF|\x1b(B"},
-        {"ISO-2022-JP", to_utf8, "a\x1b$BF|\x1b(B.", "a\xe6\x97\xa5."},
         {"ISO-2022-JP", to_utf8, "\x1b$BF", refused},
+        {"ISO-2022-JP", to_utf8, "a\x1b$BF|\x1b(B.", "a\xe6\x97\xa5."},
         {"UTF-7", to_utf8, "+AOk-", "\xc3\xa9"},
     };
     for (const auto &[codeset, flags, in, wanted] : table) {
         cu_iconv_t handle = opened(codeset, flags);
-        // The second time shows that a failure leaves nothing behind in the converter.
-        for (int time = 1; handle != nullptr && time <= 2; ++time)
-            EXPECT_EQ(converted(handle, in), wanted) << codeset << " " << flags;
+        EXPECT_EQ(handle == nullptr ? wanted : converted(handle, in), wanted) << codeset << " " << flags;
     }
     for (const char *in :
          {"\xff", "\x80", "\xbf", "\xc1\xbf", "\xc3", "\xc3\xc3", "\xc3z", "\xe0\x9f\xbf", "\xed\xa0\x80",

@@ -217,4 +217,14 @@ TEST(edit, replaces_as_many_bytes_as_the_stored_length_says) {
         }
 }
 
+// A handler is shown identities where they stand, and may keep one to add it: the buffer moves while that is done.
+TEST(edit, adds_an_identity_that_lies_in_the_buffer) {
+    const std::string stored = named(1, "of a long name that makes the buffer move");
+    buffer held(packed_acl(1, of_mechanism(4, "unix", 1, stored)));
+    sec_acle_t acle = entry(4, "unix", "", 2);
+    acle.identity = static_cast<char *>(held.acl.data) + held.acl.length - 5;
+    EXPECT_EQ(after(sec_add_acle_to_acl(&acle, &held.acl)), no_error);
+    EXPECT_EQ(held.bytes(), packed_acl(1, of_mechanism(4, "unix", 2, named(2, "move") + stored)));
+}
+
 } // namespace

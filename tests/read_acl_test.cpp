@@ -25,7 +25,8 @@ int open_hooked(const char *path, int flags, mode_t mode) {
 // What it is called as in fortified builds.
 extern "C" int __open_2(const char *path, int flags) { return open_hooked(path, flags, 0); }
 
-extern "C" ssize_t read(int fd, void *bytes, size_t count) {
+extern "C" ssize_t read_hooked(int fd, void *bytes, size_t count) __asm__("read");
+ssize_t read_hooked(int fd, void *bytes, size_t count) {
     const ssize_t result = syscall(SYS_read, fd, bytes, count);
     if (after_read)
         after_read();
@@ -197,7 +198,7 @@ TEST_F(read_acl_file, of_a_user_must_be_that_users_alone) {
 }
 
 // The longest paths have no room for the name of a cache; one that is there all the same is not looked at.
-TEST_F(read_acl_file, leaves_out_the_cache_of_a_long_path) {
+TEST_F(read_acl_file, writes_no_cache_for_a_long_path_but_reads_one) {
     std::string deep = folder.path();
     while (deep.size() < 4080)
         fs::create_directory(deep.append("/").append(std::min<std::size_t>(4080 - deep.size(), 200), 'd'));
@@ -207,7 +208,7 @@ TEST_F(read_acl_file, leaves_out_the_cache_of_a_long_path) {
         write_file(file, acl_text, 100, 0644);
         EXPECT_EQ(read_acl(file, cache), given(from_text, has_cache ? text | cache : text));
         write_file(file + ".cacl", example, 0, 0644);
-        EXPECT_EQ(read_acl(file, 0), has_cache ? given(example, 0) : given(from_text, text));
+        EXPECT_EQ(read_acl(file, 0), given(example, 0));
     }
 }
 

@@ -374,7 +374,7 @@ QZ_ACL_API int sec_read_acl_file(const char *aclfname, const char *username, con
  * Codes: 0; 6
  *   4 (3417-101)    an argument is null
  *   42 (3417-109)   not an ACL of version 1, or data without length
- *   42 (3417-110)   a part extends past the end
+ *   42 (3417-110)   a part extends past the end, a string does not end in its field, or a type is unknown
  *   42 (3417-111)   a sub-ACL of type 1 or 2 with more than one entry
  *   42 (3417-123)   a mechanism longer than 16 bytes
  * Threads: shared for acl, exclusive for list.

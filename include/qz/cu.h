@@ -82,8 +82,8 @@ typedef struct cu_error {
  *                 unchanged as long as the process runs (a literal), because only the pointer is kept.
  *   set           number of the message set in the catalog
  *   message_id    number of the message in the set
- *   default_text  the text for when no catalog supplies one; null: empty. Must stay valid like the catalog's
- *                 name.
+ *   default_text  the text for when no catalog supplies one; null: empty. Must stay valid and unchanged like
+ *                 the catalog's name (a literal).
  *   ...           one argument per position of the default text, in order of the positions up to the highest
  *                 one used: const char * for s, int for the others. A position below the highest that the
  *                 text does not use must be passed as an int. Strings are copied here; the caller's may go

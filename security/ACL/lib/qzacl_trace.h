@@ -52,6 +52,13 @@ inline trace_item item(const char *text) {
     return text == nullptr ? trace_item{"", 1} : trace_item{text, std::strlen(text) + 1};
 }
 
+// A string in an array that a caller filled: no more of it than the array, whether a NUL ends it or not.
+template <std::size_t Size>
+trace_item bounded_item(const char (&text)[Size]) {
+    const std::size_t length = strnlen(text, Size);
+    return {text, length < Size ? length + 1 : Size};
+}
+
 // A number by its address, with the width of its type: 4 bytes, or 8 for sizes, pointers and times.
 template <class Number>
 trace_item number(const Number &value) {

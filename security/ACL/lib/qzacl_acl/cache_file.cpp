@@ -162,8 +162,8 @@ text_origin::text_origin(const struct stat &vetted) : device(vetted.st_dev), ino
 }
 
 bool make_cache_name(const char *aclfname, path_buffer &name) {
-    const std::size_t length = strnlen(aclfname, uncached_path_length);
-    if (length >= uncached_path_length)
+    const std::size_t length = strnlen(aclfname, path_max);
+    if (length + sizeof cache_extension > sizeof name.text)
         return false;
     std::memcpy(name.text, aclfname, length);
     std::memcpy(name.text + length, cache_extension, sizeof cache_extension);
@@ -181,7 +181,7 @@ int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, int 
         return SEC_S_ADVISORY;
     }
     qz::path_buffer cache_name;
-    if (!qz::make_cache_name(aclfname, cache_name)) {
+    if (std::strlen(aclfname) >= qz::uncached_path_length || !qz::make_cache_name(aclfname, cache_name)) {
         const int shown_length = qz::shown_size(std::strlen(aclfname));
         if (qz::traces(qz::trace_category::errors))
             qz::trace_data(108, qz::item(aclfname), qz::number(shown_length));

@@ -12,7 +12,7 @@
 namespace qz {
 
 inline constexpr char cache_extension[] = ".cacl";
-// An ACL file's path that is as long as this, or longer, has no cache.
+// For an ACL file's path that is as long as this, or longer, no cache is written.
 inline constexpr std::size_t uncached_path_length = path_max - sizeof cache_extension;
 
 // Where the text of a cache comes from: the file that is read, and the time, as the kernel stamps files now, before
@@ -26,7 +26,7 @@ struct text_origin {
     timespec time;
 };
 
-// Forms the name of a file's cache; false when the path is too long to have one.
+// Forms the name of a file's cache; false when it would be longer than a path.
 bool make_cache_name(const char *aclfname, path_buffer &name);
 
 } // namespace qz

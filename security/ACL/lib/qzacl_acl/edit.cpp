@@ -204,9 +204,13 @@ bool find_packed(qz::byte_span subacl, const format::subacl &head, const char *i
     return reader.left() == 0;
 }
 
-// Traces show each entry of the tree that the plain way makes.
-bool may_edit_packed(const sec_acle_t &acle) {
-    return qz::has_identity(acle.type) && !qz::traces(qz::trace_category::api);
+// Traces show each entry of the tree that the plain way makes. And an identity that lies in the buffer itself, as the
+// ones that handlers are shown do, would move while it is being added.
+bool may_edit_packed(const sec_acle_t &acle, const sec_acl_buffer_t &acl) {
+    const qz::byte_span bytes = format::bytes_of(acl);
+    const auto place =
+        reinterpret_cast<std::uintptr_t>(acle.identity) - reinterpret_cast<std::uintptr_t>(bytes.data());
+    return qz::has_identity(acle.type) && place >= bytes.size() && !qz::traces(qz::trace_category::api);
 }
 
 void store_subacl_size(const sec_acl_buffer_t &acl, const stored_subacl &stored, std::size_t length,
@@ -289,7 +293,7 @@ int add_to_buffer(const sec_acle_t &acle, int report_duplicates, sec_acl_buffer_
     if (const int result = find(acl, acle, stored); result != SEC_S_OK)
         return result;
     packed_place place;
-    if (stored.start != nullptr && may_edit_packed(acle) &&
+    if (stored.start != nullptr && may_edit_packed(acle, acl) &&
         std::strlen(acle.identity) <= format::identity_max &&
         find_packed({stored.start, stored.head.length}, stored.head, acle.identity, place))
         return add_packed(acle, report_duplicates, stored, place, acl);
@@ -371,7 +375,7 @@ int delete_checked(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
     if (stored.start == nullptr)
         return sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, acle);
     packed_place place;
-    if (may_edit_packed(*acle) &&
+    if (may_edit_packed(*acle, *acl) &&
         find_packed({stored.start, stored.head.length}, stored.head, acle->identity, place))
         return place.size == 0 ? sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, acle)
                                : delete_packed(stored, place, *acl);
@@ -384,7 +388,7 @@ void trace_arguments(int id, const sec_acle_t *acle, const sec_acl_buffer_t *acl
     const std::uint32_t mask = acle == nullptr ? 0 : acle->perm_mask;
     const sec_acl_buffer_t shown = acl == nullptr ? sec_acl_buffer_t{} : *acl;
     qz::trace_data(id, qz::number(acle), qz::number(type), qz::number(mask),
-                   qz::item(acle == nullptr ? nullptr : acle->mechanism),
+                   acle == nullptr ? qz::item(nullptr) : qz::bounded_item(acle->mechanism),
                    qz::item(acle == nullptr ? nullptr : acle->identity), qz::number(acl),
                    qz::number(shown.length), qz::number(shown.data));
 }

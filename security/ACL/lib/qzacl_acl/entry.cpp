@@ -185,7 +185,7 @@ int sec_display_acle_id(const sec_acle_t *acle, char **mechanism, char **identit
         const std::uint32_t type = acle == nullptr ? 0 : acle->type;
         const std::uint32_t mask = acle == nullptr ? 0 : acle->perm_mask;
         qz::trace_data(51, qz::number(acle), qz::number(type), qz::number(mask),
-                       qz::item(acle == nullptr ? nullptr : acle->mechanism),
+                       acle == nullptr ? qz::item(nullptr) : qz::bounded_item(acle->mechanism),
                        qz::item(acle == nullptr ? nullptr : acle->identity), qz::number(mechanism),
                        qz::number(identity));
     });
@@ -202,7 +202,7 @@ void sec__trace_release(const sec_acle_t *acle) {
         const std::uint32_t type = acle == nullptr ? 0 : acle->type;
         const std::uint32_t mask = acle == nullptr ? 0 : acle->perm_mask;
         qz::trace_data(47, qz::number(acle), qz::number(type), qz::number(mask),
-                       qz::item(acle == nullptr ? nullptr : acle->mechanism),
+                       acle == nullptr ? qz::item(nullptr) : qz::bounded_item(acle->mechanism),
                        qz::item(acle == nullptr ? nullptr : acle->identity));
     });
     qz::trace_release_exit(48);

@@ -11,32 +11,13 @@ namespace {
 
 namespace format = qz::format;
 
-// Owns what was listed until all of it is.
-class pending_list {
-public:
-    pending_list() = default;
-    pending_list(const pending_list &) = delete;
-    pending_list &operator=(const pending_list &) = delete;
-    ~pending_list() {
-        if (list_.count != 0) // nothing is released where nothing was listed, nor recorded as released
-            sec_release_aclelist(&list_);
-    }
-
-    // Appends the entries of the sub-ACL at the start of the bytes.
-    int append(qz::byte_span bytes) {
-        sec_acltree_t *tree = nullptr;
-        int result = sec__subacl_to_acltree(bytes, &tree);
-        if (result == SEC_S_OK)
-            result = sec__acltree_to_aclelist(tree, &list_);
-        sec__free_acltree(tree);
-        return result;
-    }
-
-    sec_aclelist_t release() { return std::exchange(list_, {}); }
-
-private:
-    sec_aclelist_t list_ = {};
-};
+// Appends the entries of the sub-ACL at the start of the bytes.
+int append(qz::byte_span bytes, sec_aclelist_t &list) {
+    sec_acltree_t *root = nullptr;
+    const int result = sec__subacl_to_acltree(bytes, &root);
+    const qz::owned_acltree tree(root);
+    return result == SEC_S_OK ? sec__acltree_to_aclelist(root, &list) : result;
+}
 
 // The empty ACL and every buffer whose first two bytes are right.
 bool is_acl(const sec_acl_buffer_t &acl) {
@@ -50,7 +31,7 @@ int corrupt(int line) { return qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupt
 
 // Lists the sub-ACLs that are wanted, in the order in which they stand.
 template <class Wanted>
-int append_all(const sec_acl_buffer_t &acl, pending_list &list, const Wanted &is_wanted) {
+int append_all(const sec_acl_buffer_t &acl, sec_aclelist_t &list, const Wanted &is_wanted) {
     const qz::byte_span bytes = format::bytes_of(acl);
     if (bytes.size() < format::header_size)
         return bytes.empty() ? SEC_S_OK : corrupt(__LINE__);
@@ -66,16 +47,23 @@ int append_all(const sec_acl_buffer_t &acl, pending_list &list, const Wanted &is
         }
         if (!is_wanted(walk.current()))
             continue;
-        if (const int result = list.append(walk.bytes()); result != SEC_S_OK)
+        if (const int result = append(walk.bytes(), list); result != SEC_S_OK)
             return result;
     }
 }
 
-int append_one(const sec_acl_buffer_t &acl, std::uint8_t type, const char *mechanism, pending_list &list) {
+int append_one(const sec_acl_buffer_t &acl, std::uint8_t type, const char *mechanism, sec_aclelist_t &list) {
     const unsigned char *subacl = nullptr;
     if (const int result = sec__find_subacl(&acl, type, mechanism, &subacl); result != SEC_S_OK)
         return result;
-    return subacl == nullptr ? SEC_S_OK : list.append(format::bytes_from(acl, subacl));
+    return subacl == nullptr ? SEC_S_OK : append(format::bytes_from(acl, subacl), list);
+}
+
+// A list that could not be completed is released, and holds nothing.
+int kept_if_whole(int result, sec_aclelist_t *list) {
+    if (result != SEC_S_OK)
+        sec_release_aclelist(list);
+    return result;
 }
 
 int list_checked(const sec_acl_buffer_t *acl, sec_aclelist_t *list) {
@@ -86,11 +74,7 @@ int list_checked(const sec_acl_buffer_t *acl, sec_aclelist_t *list) {
     if (!is_acl(*acl))
         return qz::report(SEC_S_BAD_ACL, qz::msg::not_an_acl_buffer);
     *list = {};
-    pending_list pending;
-    const int result = append_all(*acl, pending, [](const format::subacl &) { return true; });
-    if (result == SEC_S_OK)
-        *list = pending.release();
-    return result;
+    return kept_if_whole(append_all(*acl, *list, [](const format::subacl &) { return true; }), list);
 }
 
 int list_by_type_checked(const sec_acl_buffer_t *acl, std::uint8_t type, const char *mechanism,
@@ -110,14 +94,11 @@ int list_by_type_checked(const sec_acl_buffer_t *acl, std::uint8_t type, const c
     if (!is_acl(*acl))
         return qz::report(SEC_S_BAD_ACL, qz::msg::not_an_acl_buffer);
     *list = {};
-    pending_list pending;
-    const int result =
+    return kept_if_whole(
         qz::has_mechanism(type) && mechanism == nullptr
-            ? append_all(*acl, pending, [type](const format::subacl &head) { return head.type == type; })
-            : append_one(*acl, type, mechanism, pending);
-    if (result == SEC_S_OK)
-        *list = pending.release();
-    return result;
+            ? append_all(*acl, *list, [type](const format::subacl &head) { return head.type == type; })
+            : append_one(*acl, type, mechanism, *list),
+        list);
 }
 
 } // namespace
