@@ -9,15 +9,12 @@ using namespace support;
 
 namespace {
 
-sec_acl_buffer_t descriptor_of(const guarded &bytes) {
-    return {static_cast<std::int32_t>(bytes.size()), bytes.data()};
-}
+sec_acl_buffer_t descriptor_of(const guarded &bytes) { return {static_cast<std::int32_t>(bytes.size()), bytes.data()}; }
 
 const std::string alice = packed_subacl(4, "unix\0"sv, 1, packed_entry(3, "alice\0"sv));
 const std::string bob = packed_subacl(4, "KDZ\0"sv, 1, packed_entry(1, "bob\0"sv));
 const std::string expanded = packed_subacl(8, "unix\0"sv, 1, packed_entry(4, "*@host\0"sv));
-const std::string groups =
-    packed_subacl(16, "", 2, packed_entry(1, "adm\0"sv) + packed_entry(2, "Staff\0"sv));
+const std::string groups = packed_subacl(16, "", 2, packed_entry(1, "adm\0"sv) + packed_entry(2, "Staff\0"sv));
 const std::string any = packed_subacl(2, "", 1, packed_entry(0x1000, ""));
 const std::string all = packed_acl(5, alice + bob + expanded + groups + any);
 
@@ -63,46 +60,7 @@ std::string found_in(const std::string &bytes, int type, const char *mechanism) 
     return found == nullptr ? ""s : std::string(reinterpret_cast<const char *>(found), found[0]);
 }
 
-TEST(buffers, give_the_first_subacl_of_a_key) {
-    const std::string twice = packed_acl(3, any + alice + packed_subacl(4, "unix\0"sv, 0, ""));
-    // A length that leads back into the sub-ACL's own header, where another one could be read.
-    const std::string inner = packed_acl(2, number(5, 4) + "\4"s + number(0, 4) + "\2x\0"s + number(0, 8));
-    EXPECT_EQ(
-        (arguments{found_in(all, 4, "UNIX"), found_in(all, 4, "kdz"), found_in(all, 8, "Unix"),
-                   found_in(all, 16, "whatever"), found_in(all, 2, nullptr), found_in(twice, 4, "unix")}),
-        (arguments{alice, bob, expanded, groups, any, alice}));
-    EXPECT_EQ((arguments{found_in(all, 4, "kd"), found_in(all, 4, "kdzz"), found_in(inner, 2, nullptr),
-                         found_in(packed_acl(0, alice), 4, "unix"), found_in("\x85\1\2", 2, nullptr),
-                         found_in(packed_acl(1, alice + any), 2, nullptr),
-                         found_in(packed_acl(9, alice), 2, nullptr)}),
-              arguments(7));
-}
-
 // ---- The dump ----
-
-TEST(dump, prints_an_entry_by_its_type) {
-    const sec_perm_template_t templates[] = {{0x2000, 'Z', "", ""}};
-    const sec_perm_set_t own = {1, templates};
-    const struct {
-        sec_acle_t acle;
-        const sec_perm_set_t *set;
-        const char *tab;
-        std::string line;
-    } rows[] = {
-        {entry(1, "", nullptr, 0), nullptr, nullptr, "type = n; permission = \n"},
-        {entry(2, "", nullptr, 0x1fff), nullptr, "\t", "\ttype = o; permission = rwcxCqledvsao\n"},
-        {entry(4, "unix", "alice", 3), nullptr, "", "type = u; mech = unix; id = alice; permission = rw\n"},
-        {entry(8, "hba2", "%s%1$s", 4), nullptr, " ",
-         " type = e; mech = hba2; id = %s%1$s; permission = c\n"},
-        {entry(16, "", "staff", 0x2000), &own, "", "type = g; id = staff; permission = Z\n"},
-        {entry(16, "", "staff", 0x2001), nullptr, "x", error_of(36, 164, {"00002000"}).text},
-        {entry(4, "unix", "", 1), nullptr, "x", error_of(43, 95).text},
-        {entry(9, "unix", "x", 1), nullptr, "x", error_of(43, 94, {"9"}).text},
-    };
-    for (const auto &row : rows)
-        EXPECT_EQ(output_of([&] { sec__dump_acle(&row.acle, row.set, row.tab); }), output("", row.line));
-    EXPECT_EQ(recorded_error(), failure{});
-}
 
 TEST(dump, prints_buffers_and_subacls) {
     const auto acl_line = [](std::size_t length, const char *count) {
@@ -131,8 +89,8 @@ TEST(dump, prints_buffers_and_subacls) {
                   "\t\ttype = g; id = Staff; permission = w\n" + any_lines}},
         // What cannot be expanded gives its reason on the other stream, and the dump goes on.
         {partly,
-         {error_of(42, 98).text, acl_line(partly.size(), "2") +
-                                     without_entries.substr(0, without_entries.rfind('\n') + 1) + any_lines}},
+         {error_of(42, 98).text,
+          acl_line(partly.size(), "2") + without_entries.substr(0, without_entries.rfind('\n') + 1) + any_lines}},
     };
     for (const auto &[bytes, printed] : rows) {
         const guarded copy(bytes);

@@ -25,16 +25,14 @@ struct model_subacl {
             const auto at = find(made, identity);
             (at == made.end() ? made.emplace_back(identity, 0) : *at).second = mask;
         }
-        if (type != 8)
-            std::ranges::sort(made, {}, key);
+        if (type != 8) std::ranges::sort(made, {}, key);
         return made;
     }
     std::string bytes() const {
         std::string entries;
         for (const auto &[identity, mask] : stored)
             entries += packed_entry(mask, type < 4 ? "" : text_field(identity) + (flaw == 3 ? "more" : ""));
-        if (flaw == 1 && !entries.empty())
-            entries[0] = 7;
+        if (flaw == 1 && !entries.empty()) entries[0] = 7;
         const std::string field = text_field(mechanism) + (flaw == 2 ? "m" : "");
         return packed_subacl(type, has_mechanism(type) ? field.substr(0, 17) : "", stored.size(), entries);
     }
@@ -44,20 +42,17 @@ struct model {
     std::vector<model_subacl> subacls;
     std::string bytes() const {
         std::string all;
-        for (const model_subacl &each : subacls)
-            all += each.bytes();
+        for (const model_subacl &each : subacls) all += each.bytes();
         return packed_acl(subacls.size(), all);
     }
     std::vector<listed> entries(int type, const char *mechanism) const {
         std::vector<listed> all;
         for (const model_subacl &each : subacls) {
             const bool by_mechanism = has_mechanism(type) && mechanism != nullptr;
-            if (type != 0 && (each.type != type || (by_mechanism && !same(each.mechanism, mechanism))))
-                continue;
+            if (type != 0 && (each.type != type || (by_mechanism && !same(each.mechanism, mechanism)))) continue;
             for (const auto &[identity, mask] : each.expanded())
                 all.push_back({each.type, each.mechanism, each.type < 4 ? "<none>" : identity, mask});
-            if (type != 0 && (by_mechanism || !has_mechanism(type)))
-                break; // the first of the key
+            if (type != 0 && (by_mechanism || !has_mechanism(type))) break; // the first of the key
         }
         return all;
     }
@@ -65,9 +60,7 @@ struct model {
         const std::string mechanism = has_mechanism(acle.type) ? acle.mechanism : "";
         const std::string identity = acle.type < 4 ? "" : acle.identity;
         const bool deletes = how == sec_del_acle_from_acl;
-        const auto is_it = [&](const auto &of) {
-            return of.type == acle.type && same(of.mechanism, mechanism);
-        };
+        const auto is_it = [&](const auto &of) { return of.type == acle.type && same(of.mechanism, mechanism); };
         auto at = std::ranges::find_if(subacls, is_it);
         items held = at == subacls.end() ? items() : at->expanded();
         const auto old = find(held, identity);
@@ -78,16 +71,14 @@ struct model {
         if (old != held.end() && how == sec_add_acle_to_acl2)
             return has_mechanism(acle.type) ? error_of(43, 144, {letter, mechanism, identity})
                                             : error_of(43, acle.type < 4 ? 160 : 161, {letter, identity});
-        if (at == subacls.end())
-            at = subacls.insert(at, {acle.type, ""});
+        if (at == subacls.end()) at = subacls.insert(at, {acle.type, ""});
         const std::string spelled = held.empty() ? mechanism : at->mechanism;
         if (deletes)
             held.erase(old);
         else
             held.emplace_back(identity, acle.perm_mask);
         *at = {acle.type, spelled, model_subacl{acle.type, "", held}.expanded()};
-        if (held.empty())
-            subacls.erase(at);
+        if (held.empty()) subacls.erase(at);
         return no_error;
     }
 };
@@ -109,8 +100,7 @@ struct random_edits {
         model made;
         for (unsigned left = below(6); left != 0; --left) {
             model_subacl subacl{type(), mechanism(), {}, below(8)};
-            if (!has_mechanism(subacl.type))
-                subacl.mechanism.clear();
+            if (!has_mechanism(subacl.type)) subacl.mechanism.clear();
             for (unsigned entries = below(subacl.type < 4 ? 2 : 8); entries != 0; --entries)
                 subacl.stored.emplace_back(subacl.type < 4 ? "" : identity(left % 2 * 15 + 4), below(~0u));
             made.subacls.push_back(subacl);
@@ -173,8 +163,7 @@ TEST(edit, reports_what_it_refuses_and_leaves_the_buffer_alone) {
 
 TEST(edit, holds_at_most_65534_bytes_of_identity_and_65535_subacls) {
     const std::string longest(65534, 'i'), too_long = longest + "i", a = named(1, "a"), b = named(2, "b");
-    const sec_acle_t refused = entry(16, "", too_long.c_str(), 7),
-                     fitting = entry(16, "", longest.c_str(), 7);
+    const sec_acle_t refused = entry(16, "", too_long.c_str(), 7), fitting = entry(16, "", longest.c_str(), 7);
     // A buffer that the call makes, which goes with its failure; one changed in place, one rebuilt.
     for (const std::string &entries : {""s, a + b, b + a}) {
         const std::string bytes = entries.empty() ? "" : one(packed_subacl(16, "", 2, entries));
@@ -186,8 +175,7 @@ TEST(edit, holds_at_most_65534_bytes_of_identity_and_65535_subacls) {
         EXPECT_TRUE(held.bytes().ends_with((bytes.empty() ? "" : a + b) + named(7, longest)));
     }
     std::string subacls;
-    for (int number = 10000; number < 75535; ++number)
-        subacls += of_mechanism(8, std::to_string(number), 1, a);
+    for (int number = 10000; number < 75535; ++number) subacls += of_mechanism(8, std::to_string(number), 1, a);
     const std::string full = packed_acl(65535, subacls), added = of_mechanism(4, "more", 1, a);
     buffer held(full);
     const sec_acle_t more = entry(4, "more", "a", 1), last = entry(8, "75534", "A", 1);
@@ -212,8 +200,7 @@ TEST(edit, replaces_as_many_bytes_as_the_stored_length_says) {
             buffer held(packed_acl(2, first + last));
             const sec_acle_t acle = entry(4, "unix", adds ? "b" : "C", 2);
             EXPECT_EQ(after(edit(&acle, &held.acl)), is_inside ? no_error : located(42, 97)) << length;
-            EXPECT_EQ(held.bytes(),
-                      packed_acl(2, first + (is_inside ? changed + last.substr(length) : last)));
+            EXPECT_EQ(held.bytes(), packed_acl(2, first + (is_inside ? changed + last.substr(length) : last)));
         }
 }
 

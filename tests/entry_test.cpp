@@ -28,8 +28,7 @@ TEST(permissions, turn_letters_into_bits_and_back) {
     // After an error the result is what was found before it.
     const auto bits = [](const char *text, const sec_perm_set_t *set, unsigned wanted, const char *bad) {
         std::uint32_t mask = 0xffffffff;
-        EXPECT_EQ(after(sec_translate_perms(text, set, &mask)),
-                  *bad == 0 ? no_error : error_of(36, 133, {bad}));
+        EXPECT_EQ(after(sec_translate_perms(text, set, &mask)), *bad == 0 ? no_error : error_of(36, 133, {bad}));
         EXPECT_EQ(mask, wanted) << text;
     };
     bits(nullptr, nullptr, 0, "");
@@ -41,8 +40,7 @@ TEST(permissions, turn_letters_into_bits_and_back) {
     bits("xw", &own, 1, "w");
     const auto letters = [](unsigned mask, const sec_perm_set_t *set, const char *wanted, const char *bad) {
         char text[qz::permission_text_size + 1] = {};
-        EXPECT_EQ(after(sec_translate_bitmask(mask, set, text)),
-                  *bad == 0 ? no_error : error_of(36, 164, {bad}));
+        EXPECT_EQ(after(sec_translate_bitmask(mask, set, text)), *bad == 0 ? no_error : error_of(36, 164, {bad}));
         EXPECT_STREQ(text, wanted);
     };
     letters(0, &none, "", "");
@@ -63,8 +61,7 @@ std::string made_of(std::uint8_t type, const char *mechanism, const char *identi
     auto *made = reinterpret_cast<sec_acle_t *>(0x10);
     const failure error = after(sec_create_acle(type, 1u << 31, mechanism, identity, &made));
     const qz::owned_acle owner(made);
-    if (made == nullptr)
-        return PrintToString(error);
+    if (made == nullptr) return PrintToString(error);
     EXPECT_EQ(std::tuple(error, made->type, made->perm_mask), std::tuple(no_error, type, 1u << 31));
     return made->mechanism + "/"s + (made->identity == nullptr ? "none" : made->identity);
 }
@@ -108,50 +105,19 @@ std::string shown_for(const sec_acle_t &acle) {
     return text(texts[0]) + "/" + text(texts[1]) + (error == no_error ? "" : PrintToString(error));
 }
 
-TEST(entries, show_what_their_type_has) {
-    const auto fails = [](const failure &error) { return "none/none" + PrintToString(error); };
-    const sec_acle_t single = entry(1, "unix", "x", 0);
-    EXPECT_EQ(shown_for(single), "none/none");
-    EXPECT_EQ(shown_for(entry(8, "1234567890123456", "x@Y", 0)), "1234567890123456/x@Y");
-    EXPECT_EQ(shown_for(entry(16, "unix", "staff", 0)), "none/staff");
-    EXPECT_EQ(shown_for(entry(16, "", nullptr, 0)), fails(error_of(43, 95)));
-    EXPECT_EQ(shown_for(entry(4, "", "x", 0)), fails(error_of(43, 95)));
-    EXPECT_EQ(shown_for(entry(4, "unix", "", 0)), fails(error_of(43, 95)));
-    EXPECT_EQ(shown_for(entry(0, "unix", "x", 0)), fails(error_of(43, 94, {"0"})));
-    EXPECT_EQ(shown_for(entry(132, "unix", "x", 0)), fails(error_of(43, 94, {"132"})));
-    char *out = nullptr;
-    const std::string name = "sec_display_acle_id";
-    EXPECT_EQ(after(sec_display_acle_id(nullptr, nullptr, nullptr)), bad_parameter(name, 1, "0"));
-    EXPECT_EQ(after(sec_display_acle_id(&single, nullptr, nullptr)), bad_parameter(name, 2, "0"));
-    EXPECT_EQ(after(sec_display_acle_id(&single, &out, nullptr)), bad_parameter(name, 3, "0"));
-}
-
-TEST(entries, go_with_the_list_that_holds_them) {
-    sec_release_aclelist(nullptr);
-    sec_aclelist_t list = {5, nullptr}; // an array that is not there is not looked at
-    sec_release_aclelist(&list);
-    EXPECT_EQ(list.count, 5);
-    list = {3, static_cast<sec_acle_t **>(std::calloc(3, sizeof(sec_acle_t *)))};
-    ASSERT_EQ(sec_create_acle(1, 0, nullptr, nullptr, &list.acles[0]), 0);
-    ASSERT_EQ(sec_create_acle(4, 0, "kdz", "x", &list.acles[2]), 0);
-    sec_release_aclelist(&list);
-    EXPECT_TRUE(list.count == 0 && list.acles == nullptr);
-}
-
 // A process opens its converters once, so that each row has one of its own.
 TEST(entries_DeathTest, are_converted_between_the_code_set_and_utf8) {
     GTEST_FLAG_SET(death_test_style, "threadsafe"); // runs this test alone in a new process
     const std::string failed = PrintToString(error_of(26, 130)), no_set = PrintToString(error_of(26, 129));
     const std::string none = "none/none";
     const auto known = [](const std::string &text) { return text.substr(0, text.find("\tParameter value")); };
-    const auto check = [&](const char *claimed, const char *locale, const char *mechanism,
-                           const char *identity, const std::string &made, const std::string &shown) {
+    const auto check = [&](const char *claimed, const char *locale, const char *mechanism, const char *identity,
+                           const std::string &made, const std::string &shown) {
         const auto show = [&] {
             claimed_code_set = claimed;
             std::setlocale(LC_ALL, locale);
             const std::string found = known(made_of(4, mechanism, identity)) + "][";
-            std::fprintf(stderr, "[%s%s]", found.c_str(),
-                         shown_for(entry(4, mechanism, identity, 0)).c_str());
+            std::fprintf(stderr, "[%s%s]", found.c_str(), shown_for(entry(4, mechanism, identity, 0)).c_str());
             std::exit(0);
         };
         EXPECT_EXIT(show(), testing::ExitedWithCode(0), testing::HasSubstr("[" + made + "][" + shown + "]"));

@@ -38,8 +38,7 @@ failure path_of(const std::string &name, const char *user = nullptr) {
     const int result = sec__get_aclfname(name.c_str(), user, path, &uid);
     const failure error = recorded_error();
     EXPECT_EQ(result, error.code);
-    return result != 0 ? error
-                       : failure{0, 0, (user == nullptr ? "" : std::to_string(uid) + " ") + path.text};
+    return result != 0 ? error : failure{0, 0, (user == nullptr ? "" : std::to_string(uid) + " ") + path.text};
 }
 
 TEST(file_name, stands_as_it_is_or_behind_the_working_directory) {

@@ -19,8 +19,7 @@ line_facts parse_plainly(const std::string &text, std::size_t at, std::uint32_t 
     const std::size_t end = std::min(text.find_first_of("\n\f\r\0"s, at), text.size());
     const std::string line = " " + std::to_string(number);
     length = end - at + 1;
-    if (length > 1096)
-        return "145" + line;
+    if (length > 1096) return "145" + line;
     std::vector<std::string> tokens;
     while ((at = std::min(text.find_first_not_of(" \t\v", at), end)) < end && text[at] != '#') {
         const std::size_t stop = std::min(text.find_first_of(" \t\v", at), end);
@@ -28,42 +27,35 @@ line_facts parse_plainly(const std::string &text, std::size_t at, std::uint32_t 
         at = stop;
     }
     const bool is_cut = end < text.size() && text[end] == '\0';
-    if (tokens.empty())
-        return is_cut ? "131" + line : "-";
+    if (tokens.empty()) return is_cut ? "131" + line : "-";
     if (tokens[0].size() != 1 || "nouegNOUEG"s.find(tokens[0]) == std::string::npos)
         return "165" + line + " " + tokens[0];
     std::string facts = folded(tokens[0]);
     const bool has_mechanism = facts == "u" || facts == "e";
     const std::size_t named = has_mechanism ? 3 : facts == "g" ? 2 : 1;
-    if (has_mechanism && tokens.size() > 1 && tokens[1].size() > 16)
-        return "132 " + tokens[1] + line;
-    if (tokens.size() < named)
-        return "158" + line;
+    if (has_mechanism && tokens.size() > 1 && tokens[1].size() > 16) return "132 " + tokens[1] + line;
+    if (tokens.size() < named) return "158" + line;
     for (std::size_t index = 1; index < named; ++index)
         facts += " " + (has_mechanism && index == 1 ? folded(tokens[index]) : tokens[index]);
     std::uint32_t mask = 0;
     for (char letter : tokens.size() > named ? tokens[named] : "") {
         const std::size_t bit = "rwcxCqledvsao"s.find(letter);
-        if (bit == std::string::npos)
-            return "166" + line + " " + tokens[named];
+        if (bit == std::string::npos) return "166" + line + " " + tokens[named];
         mask |= 1u << bit;
     }
-    if (tokens.size() > named + 1)
-        return "159" + line;
+    if (tokens.size() > named + 1) return "159" + line;
     return is_cut ? "131" + line : facts + " " + std::to_string(mask);
 }
 
 // A text on its way through the parser; it ends right before memory that nobody may touch.
 struct walk {
-    explicit walk(const std::string &source)
-        : text(source + '\0'), cursor(text.data()), remaining(text.size()) {}
+    explicit walk(const std::string &source) : text(source + '\0'), cursor(text.data()), remaining(text.size()) {}
     int next(const sec_perm_set_t *set = nullptr) {
         std::memset(&acle, 0x5a, sizeof acle);
         return sec__read_acle_from_text(set, &cursor, &remaining, &line, &acle);
     }
     std::string entry() const {
-        if (acle.type == 0)
-            return "-";
+        if (acle.type == 0) return "-";
         std::string facts(1, "?no?u???e???????g"[acle.type]);
         for (const char *name : {acle.mechanism, static_cast<const char *>(acle.identity)})
             facts += name == nullptr || *name == '\0' ? "" : " "s + name;
@@ -97,8 +89,7 @@ std::vector<line_facts> lines_of(const std::string &text) {
         const bool is_last = place > text.size() || text[place - 1] == '\0';
         EXPECT_EQ(at.cursor, is_last ? nullptr : at.text.data() + place);
         EXPECT_EQ(at.line, lines.size() + 1);
-        if (is_last || testing::Test::HasFailure())
-            break;
+        if (is_last || testing::Test::HasFailure()) break;
         EXPECT_EQ(at.remaining, text.size() + 1 - place);
     }
     const std::tuple end(at.cursor, at.remaining, at.line);
@@ -132,34 +123,20 @@ TEST(parser, takes_lines_for_what_they_are) {
         {"#\0"s, {"131 1"}},
         {"o r\n\0o r\n"s, {"o 1"}},
     };
-    for (const auto &[text, lines] : texts)
-        EXPECT_EQ(lines_of(text), lines) << text;
+    for (const auto &[text, lines] : texts) EXPECT_EQ(lines_of(text), lines) << text;
 }
 
 TEST(parser, agrees_with_the_plain_parser_on_random_texts) {
     std::mt19937 random(4711);
     const std::string filler = std::string(1080, 'x') + " ";
-    const std::string_view pieces[] = {"u ",    "e ",   "g ",       "n ",  "o",   "r", "rw",
-                                       "Unix ", "\n",   "\n",       "\f",  "\r",  "#", " ",
-                                       "\0"sv,  "\t\v", "\x85\xa0", "q z", filler};
+    const std::string_view pieces[] = {"u ", "e ", "g ", "n ", "o",    "r",    "rw",       "Unix ", "\n",  "\n",
+                                       "\f", "\r", "#",  " ",  "\0"sv, "\t\v", "\x85\xa0", "q z",   filler};
     for (int round = 0; round < 20000 && !HasFailure(); ++round) {
         std::string text;
         for (auto count = random() % 24; count != 0; --count)
             text += round % 4 == 0 ? number(random(), 1) : std::string(pieces[random() % std::size(pieces)]);
         lines_of(text);
     }
-}
-
-TEST(parser, reads_permissions_by_the_templates_it_is_given) {
-    const sec_perm_template_t templates[] = {{0x80000000, 'Z', "", ""}, {2, 'r', "", ""}, {4, 'r', "", ""}};
-    const sec_perm_set_t own = {3, templates}, none = {0, nullptr};
-    walk at("o rZ\no w\no r\no");
-    EXPECT_EQ(at.next(&own), 1);
-    EXPECT_EQ(at.acle.perm_mask, 0x80000002);
-    EXPECT_EQ(at.next(&own), 36);
-    EXPECT_EQ(recorded_error(), error_of(36, 166, {"2", "w"}));
-    EXPECT_EQ(at.next(&none), 36);
-    EXPECT_EQ(at.next(&none), 1);
 }
 
 } // namespace

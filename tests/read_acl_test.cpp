@@ -28,8 +28,7 @@ extern "C" int __open_2(const char *path, int flags) { return open_hooked(path, 
 extern "C" ssize_t read_hooked(int fd, void *bytes, size_t count) __asm__("read");
 ssize_t read_hooked(int fd, void *bytes, size_t count) {
     const ssize_t result = syscall(SYS_read, fd, bytes, count);
-    if (after_read)
-        after_read();
+    if (after_read) after_read();
     return result;
 }
 
@@ -94,8 +93,7 @@ TEST_F(read_acl_file, reads_the_cache_when_it_is_current) {
     for (const auto &[written, cached, age, mode, in, out, bytes] : rows) {
         fs::remove(cache_path);
         write_file(path, written, 100, 0644);
-        if (mode != 0)
-            write_file(cache_path, cached, age, mode);
+        if (mode != 0) write_file(cache_path, cached, age, mode);
         EXPECT_EQ(read_acl(path, in), given(bytes, out)) << written << age << ' ' << mode << ' ' << in;
         EXPECT_EQ(read_file(cache_path), cached) << written << age << ' ' << mode << ' ' << in;
     }
@@ -109,8 +107,7 @@ TEST_F(read_acl_file, reads_the_cache_when_it_is_current) {
 TEST_F(read_acl_file, refreshes_a_cache_and_then_uses_it) {
     for (const unsigned mode : {0644u, 0600u, 0640u}) { // there is none, then one that is stale
         write_file(path, acl_text, 100, mode);
-        if (mode != 0644)
-            write_file(cache_path, example, 200, mode);
+        if (mode != 0644) write_file(cache_path, example, 200, mode);
         EXPECT_EQ(read_acl(path, cache | convert), given(from_text, text | cache));
         EXPECT_EQ(read_file(cache_path), from_text);
         EXPECT_EQ(fs::status(cache_path).permissions(), fs::perms(mode));
@@ -129,8 +126,7 @@ TEST_F(read_acl_file, never_takes_an_edited_text_for_cached) {
         // Whatever is stamped from here on is later than the edit, even from the clock that moves in ticks.
         timespec edited = {}, now = {};
         clock_gettime(CLOCK_REALTIME_COARSE, &edited);
-        for (now = edited; now.tv_nsec == edited.tv_nsec;)
-            clock_gettime(CLOCK_REALTIME_COARSE, &now);
+        for (now = edited; now.tv_nsec == edited.tv_nsec;) clock_gettime(CLOCK_REALTIME_COARSE, &now);
     };
     EXPECT_EQ(read_acl(path, cache), given(from_text, text | cache));
     EXPECT_LE(fs::last_write_time(cache_path), fs::last_write_time(path));
@@ -143,8 +139,7 @@ TEST_F(read_acl_file, bears_files_that_cannot_be_opened_or_were_exchanged) {
     for (const int error : {EACCES, ESTALE})
         for (const std::string &victim : {cache_path, path}) {
             before_open = [&](const std::string &opened) {
-                if (opened != victim || error == EACCES)
-                    return opened == victim ? error : 0;
+                if (opened != victim || error == EACCES) return opened == victim ? error : 0;
                 write_file(folder / "other", acl_text, 0, 0644);
                 fs::rename(folder / "other", opened);
                 return 0;
@@ -164,8 +159,7 @@ TEST_F(read_acl_file, reports_what_it_refuses) {
     for (const auto &[bad, id] : {std::pair("o r\no r\n"s, 160), {"o r\no \0r\n"s, 131}, {"g x z\n"s, 166}}) {
         write_file(path, bad, 100, 0644);
         const auto [code, bytes, flags, error] = read_acl(path, cache | convert);
-        EXPECT_EQ(std::tuple(code, bytes, flags, id), std::tuple(error.code, "", text | cache, error.id))
-            << bad;
+        EXPECT_EQ(std::tuple(code, bytes, flags, id), std::tuple(error.code, "", text | cache, error.id)) << bad;
         EXPECT_FALSE(fs::exists(cache_path)) << bad;
     }
     unsigned flags = 9;
@@ -179,15 +173,13 @@ TEST_F(read_acl_file, reports_what_it_refuses) {
 
 TEST_F(read_acl_file, of_a_user_must_be_that_users_alone) {
     const passwd *user = getpwuid(geteuid());
-    if (user == nullptr || access(user->pw_dir, W_OK) != 0)
-        GTEST_SKIP() << "no home directory to write to";
+    if (user == nullptr || access(user->pw_dir, W_OK) != 0) GTEST_SKIP() << "no home directory to write to";
     const std::string name = user->pw_name, base = ".qzacl-test-" + std::to_string(getpid());
     const std::string file = user->pw_dir + "/"s + base;
     const reading not_private = refused(error_of(36, 128, {file, name}), text);
     for (const auto &[mode, other] : {std::pair(0644u, 0u), {0620u, 0u}, {0602u, 0u}, {0600u, 1u}}) {
         write_file(file, acl_text, 100, mode);
-        const bool is_given =
-            other != 0 && chown(file.c_str(), geteuid() + other, 0) == 0; // by the superuser
+        const bool is_given = other != 0 && chown(file.c_str(), geteuid() + other, 0) == 0; // by the superuser
         const bool is_sound = (mode & 022) == 0 && !is_given;
         EXPECT_EQ(read_acl(base, text, name.c_str()), is_sound ? given(from_text, text) : not_private);
         EXPECT_EQ(read_acl(file, text), given(from_text, text)); // without a user nobody asks
@@ -195,21 +187,6 @@ TEST_F(read_acl_file, of_a_user_must_be_that_users_alone) {
     write_file(file, "", 100, 0666); // nothing that could be trusted
     EXPECT_EQ(read_acl(base, 0, name.c_str()), given("", 0));
     fs::remove(file);
-}
-
-// The longest paths have no room for the name of a cache; one that is there all the same is not looked at.
-TEST_F(read_acl_file, writes_no_cache_for_a_long_path_but_reads_one) {
-    std::string deep = folder.path();
-    while (deep.size() < 4080)
-        fs::create_directory(deep.append("/").append(std::min<std::size_t>(4080 - deep.size(), 200), 'd'));
-    for (const bool has_cache : {true, false}) {
-        const std::string file = deep + (has_cache ? "/of-4089-" : "/of-4090--");
-        ASSERT_EQ(file.size(), has_cache ? 4089u : 4090u);
-        write_file(file, acl_text, 100, 0644);
-        EXPECT_EQ(read_acl(file, cache), given(from_text, has_cache ? text | cache : text));
-        write_file(file + ".cacl", example, 0, 0644);
-        EXPECT_EQ(read_acl(file, 0), given(example, 0));
-    }
 }
 
 } // namespace

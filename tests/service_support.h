@@ -42,9 +42,7 @@ struct buffer {
     }
     buffer(buffer &&) = delete;
     ~buffer() { std::free(acl.data); }
-    std::string bytes() const {
-        return {static_cast<char *>(acl.data), static_cast<std::size_t>(acl.length)};
-    }
+    std::string bytes() const { return {static_cast<char *>(acl.data), static_cast<std::size_t>(acl.length)}; }
     sec_acl_buffer_t acl = {};
 };
 
@@ -70,11 +68,8 @@ inline std::vector<listed> taken(sec_aclelist_t &list) {
 
 // A string field: the text and its NUL. Then an entry and a sub-ACL made of texts.
 inline std::string text_field(std::string_view text) { return std::string(text) + '\0'; }
-inline std::string named(std::uint32_t mask, std::string_view name) {
-    return packed_entry(mask, text_field(name));
-}
-inline std::string of_mechanism(int type, std::string_view name, std::uint64_t count,
-                                const std::string &entries) {
+inline std::string named(std::uint32_t mask, std::string_view name) { return packed_entry(mask, text_field(name)); }
+inline std::string of_mechanism(int type, std::string_view name, std::uint64_t count, const std::string &entries) {
     return packed_subacl(type, text_field(name), count, entries);
 }
 inline std::string one(const std::string &subacl) { return packed_acl(1, subacl); }
@@ -86,8 +81,7 @@ inline arguments words(const std::string &text) {
 
 // Letters fold, all other bytes count as they are. std::string compares bytes as unsigned.
 inline std::string folded(std::string text) {
-    for (char &c : text)
-        c = c >= 'A' && c <= 'Z' ? static_cast<char>(c + 32) : c;
+    for (char &c : text) c = c >= 'A' && c <= 'Z' ? static_cast<char>(c + 32) : c;
     return text;
 }
 inline bool same(const std::string &a, const std::string &b) { return folded(a) == folded(b); }
@@ -100,9 +94,8 @@ inline const std::string example = one(of_mechanism(4, "abcd", 1, named(3, "xyz"
 inline const std::string rich = packed_acl(
     6, packed_subacl(16, "", 2, named(0x11, "Admins") + named(0x12, "staff")) +
            of_mechanism(4, "unix", 2, named(1, "al") + named(2, "bob@host.example")) +
-           of_mechanism(8, "kRb5", 2, named(4, "z") + named(5, "a")) +
-           of_mechanism(4, "hba2", 1, named(6, "x")) + packed_subacl(2, "", 1, packed_entry(7, "")) +
-           packed_subacl(1, "", 1, packed_entry(8, "")));
+           of_mechanism(8, "kRb5", 2, named(4, "z") + named(5, "a")) + of_mechanism(4, "hba2", 1, named(6, "x")) +
+           packed_subacl(2, "", 1, packed_entry(7, "")) + packed_subacl(1, "", 1, packed_entry(8, "")));
 
 } // namespace support
 

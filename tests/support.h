@@ -67,8 +67,7 @@ inline failure error_of(int code, int id, const arguments &args = {}) {
 // A pointer as the parameter message shows it.
 inline std::string shown(const void *pointer) {
     char text[9];
-    std::snprintf(text, sizeof text, "%x",
-                  static_cast<std::uint32_t>(reinterpret_cast<std::uintptr_t>(pointer)));
+    std::snprintf(text, sizeof text, "%x", static_cast<std::uint32_t>(reinterpret_cast<std::uintptr_t>(pointer)));
     return text;
 }
 
@@ -77,8 +76,7 @@ class guarded {
 public:
     explicit guarded(std::string_view bytes) : size_(bytes.size()), page_((size_ | 4095) + 1) {
         const int access = PROT_READ | PROT_WRITE;
-        memory_ =
-            static_cast<char *>(mmap(nullptr, page_ + 4096, access, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0));
+        memory_ = static_cast<char *>(mmap(nullptr, page_ + 4096, access, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0));
         mprotect(memory_ + page_, 4096, PROT_NONE);
         bytes.copy(data(), size_);
     }
@@ -147,8 +145,7 @@ inline sec_acle_t entry(int type, std::string_view mechanism, const char *identi
 // Parts of a compiled buffer. Numbers stand low byte first; strings are given with their NUL.
 inline std::string number(std::uint64_t value, std::size_t width) {
     std::string bytes;
-    for (; width != 0; --width, value >>= 8)
-        bytes += static_cast<char>(value & 0xff);
+    for (; width != 0; --width, value >>= 8) bytes += static_cast<char>(value & 0xff);
     return bytes;
 }
 

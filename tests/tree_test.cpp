@@ -15,7 +15,7 @@ static thread_local int allocations_left = -1;
 #ifndef __has_feature
 #define __has_feature(feature) 0
 #endif
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__) || __has_feature(address_sanitizer) ||     \
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__) || __has_feature(address_sanitizer) ||               \
     __has_feature(thread_sanitizer)
 constexpr int a_million = 100000; // stands for it where everything takes its time
 #else
@@ -44,33 +44,28 @@ struct plain_tree {
     }
     // The entries of a node, the first of these, and of those below it; before them the one that is met first.
     void walk(const std::vector<const listed *> &these, std::vector<listed> &out) const {
-        if (these.empty())
-            return;
+        if (these.empty()) return;
         const listed &node = *these[0];
         std::vector<const listed *> left, right;
         for (std::size_t at = 1; at < these.size(); ++at) {
             const bool precedes = strcasecmp(these[at]->identity.c_str(), node.identity.c_str()) < 0;
             (precedes && type != 8 ? left : right).push_back(these[at]);
         }
-        if (node.type != 0 && out.empty())
-            out.push_back(node);
+        if (node.type != 0 && out.empty()) out.push_back(node);
         walk(left, out);
-        if (node.type != 0)
-            out.push_back(node);
+        if (node.type != 0) out.push_back(node);
         walk(right, out);
     }
     std::vector<listed> entries() const {
         std::vector<const listed *> all;
-        for (const listed &node : nodes)
-            all.push_back(&node);
+        for (const listed &node : nodes) all.push_back(&node);
         std::vector<listed> out;
         walk(all, out);
         return out;
     }
     std::string compiled() const {
         const std::vector<listed> held = entries();
-        if (held.empty())
-            return "";
+        if (held.empty()) return "";
         std::string packed;
         for (const listed &each : std::span(held).subspan(1))
             packed += packed_entry(each.mask, type < 4 ? "" : text_field(each.identity));
@@ -91,8 +86,7 @@ int patiently(Step step) {
         allocations_left = allowed;
         const int result = step();
         allocations_left = -1;
-        if (result != 6)
-            return result;
+        if (result != 6) return result;
         EXPECT_EQ(recorded_error().id, 89);
     }
 }
@@ -129,12 +123,10 @@ struct inventor {
             name += static_cast<char>(round % 3 == 0   ? "aAbB"[random() % 4]
                                       : round % 3 == 1 ? static_cast<char>(1 + random() % 255)
                                                        : "aAzZ@[`{\x7f\x80\xff"[random() % 11]);
-        return {type, type == 4 || type == 8 ? spelled(of) : "", type < 4 ? "<none>" : spelled(name),
-                random()};
+        return {type, type == 4 || type == 8 ? spelled(of) : "", type < 4 ? "<none>" : spelled(name), random()};
     }
     std::string spelled(std::string word) {
-        for (char &letter : word)
-            letter = random() % 2 == 0 ? letter : static_cast<char>(std::toupper(letter & 255));
+        for (char &letter : word) letter = random() % 2 == 0 ? letter : static_cast<char>(std::toupper(letter & 255));
         return word;
     }
     std::uint32_t random() { return static_cast<std::uint32_t>(generator()); }
@@ -154,11 +146,9 @@ TEST(tree, is_what_plain_insertion_and_deletion_make) {
             auto at = std::find_if(plain.begin(), plain.end(), [&](const plain_tree &each) {
                 return each.type == added.type && same(each.mechanism, added.mechanism);
             });
-            if (at == plain.end())
-                at = plain.insert(at, {added.type, added.mechanism});
+            if (at == plain.end()) at = plain.insert(at, {added.type, added.mechanism});
             const bool is_new = at->find(added.identity) == at->nodes.end();
-            if (is_new)
-                at->nodes.push_back(added);
+            if (is_new) at->nodes.push_back(added);
             const sec_acle_t acle = acle_of(added);
             ASSERT_EQ(patiently([&] { return sec__add_acle_to_trees(&acle, array); }), is_new ? 0 : 43);
             ASSERT_EQ(recorded_error().id, is_new ? 0 : added.type < 4 ? 160 : added.type == 16 ? 161 : 144);
@@ -173,13 +163,11 @@ TEST(tree, is_what_plain_insertion_and_deletion_make) {
 
         auto tree = plain.begin();
         for (sec_acltree_t *root : array.trees()) {
-            if (root == nullptr)
-                continue; // a slot that was left when memory failed
+            if (root == nullptr) continue; // a slot that was left when memory failed
             // One that may be there; else one that was, every other time from the top, where the spelling of the
             // compiled mechanism comes from.
             const auto pick = [&](std::size_t count) {
-                const auto &known =
-                    tree->nodes[(round % 2 == 0 ? count : invent.random()) % tree->nodes.size()];
+                const auto &known = tree->nodes[(round % 2 == 0 ? count : invent.random()) % tree->nodes.size()];
                 listed made = invent(tree->type);
                 made.identity = below(4) == 0 ? made.identity : invent.spelled(known.identity);
                 return made;
@@ -220,8 +208,7 @@ TEST(tree, takes_a_million_entries_in_any_order_on_a_small_stack) {
         names.push_back((index % 2 == 0 ? "user" : "User") + std::to_string(a_million + index));
     const auto bytes_of_names = [&](int type) {
         std::string entries;
-        for (const std::string &name : names)
-            entries += named(1, name);
+        for (const std::string &name : names) entries += named(1, name);
         return of_mechanism(type, "kdz", names.size(), entries);
     };
     const std::string sorted = bytes_of_names(4);
@@ -271,8 +258,7 @@ TEST(compiling, writes_these_bytes_and_no_more_than_fit) {
 }
 
 TEST(expanding, refuses_hostile_bytes) {
-    const std::string single = packed_entry(1, ""), x1 = named(1, "x"),
-                      sound = of_mechanism(4, "unix", 2, x1 + x1);
+    const std::string single = packed_entry(1, ""), x1 = named(1, "x"), sound = of_mechanism(4, "unix", 2, x1 + x1);
     std::vector<std::pair<std::string, int>> rows = {
         {packed_subacl(0, "", 1, x1), 97},
         {packed_subacl(1, "", 2, single + single), 98},
@@ -283,8 +269,7 @@ TEST(expanding, refuses_hostile_bytes) {
         {of_mechanism(4, "unix", 2, x1 + single), 97},
         {packed_subacl(16, "", 2, x1 + packed_entry(1, "y")), 97},
     };
-    for (std::size_t length = 0; length < sound.size(); ++length)
-        rows.emplace_back(sound.substr(0, length), 97);
+    for (std::size_t length = 0; length < sound.size(); ++length) rows.emplace_back(sound.substr(0, length), 97);
     for (const auto &[bytes, id] : rows) {
         EXPECT_EQ(recompiled(bytes, 42), ""); // no tree is left
         EXPECT_EQ(recorded_error().id, id) << testing::PrintToString(bytes);

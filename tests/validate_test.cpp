@@ -41,8 +41,7 @@ TEST(validate, checks_every_rule_in_its_order) {
     const std::tuple<const char *, std::string, failure> rows[] = {
         {"bytes behind the end", packed_acl(0, "behind"), no_error},
         {"all types", rich, no_error},
-        {"any order", packed_acl(3, packed_subacl(16, "", 3, named(~0u, "z") + xyz + xyz) + user + user),
-         no_error},
+        {"any order", packed_acl(3, packed_subacl(16, "", 3, named(~0u, "z") + xyz + xyz) + user + user), no_error},
         {"an empty identity", one(packed_subacl(16, "", 1, named(0, ""))), no_error},
         {"no entries", packed_acl(2, packed_subacl(1, "", 0, "") + of_mechanism(8, "m", 0, "")), no_error},
         {"a mechanism of 254 bytes", one(of_mechanism(8, std::string(254, 'm'), 1, xyz)), no_error},
@@ -75,8 +74,8 @@ TEST(validate, checks_every_rule_in_its_order) {
          located(43, 112, {"7"})},
         // After a faulty entry the walk stands at that entry, where no further sub-ACL starts.
         {"a faulty entry before a sub-ACL", packed_acl(2, with(other, 10, 2) + other), structural},
-        {"a faulty entry where a sub-ACL starts",
-         packed_acl(2, with(packed_subacl(2, "", 1, ""), 0, 10) + other), located(43, 112, {"17"})},
+        {"a faulty entry where a sub-ACL starts", packed_acl(2, with(packed_subacl(2, "", 1, ""), 0, 10) + other),
+         located(43, 112, {"17"})},
     };
     for (const auto &[name, bytes, error] : rows) {
         const guarded memory(bytes);
@@ -124,8 +123,7 @@ TEST(list, refuses_what_it_cannot_list) {
     const std::string good = packed_subacl(2, "", 1, packed_entry(1, ""));
     const char *const long_name = "seventeen-bytes-x", *const blank = "";
     const std::pair<std::string, failure> rows[] = {
-        {packed_acl(2, good + packed_subacl(1, "", 2, packed_entry(1, "") + packed_entry(2, ""))),
-         error_of(42, 98)},
+        {packed_acl(2, good + packed_subacl(1, "", 2, packed_entry(1, "") + packed_entry(2, ""))), error_of(42, 98)},
         {packed_acl(2, good + of_mechanism(4, long_name, 0, "")), located(42, 110, {"18"})},
         {packed_acl(2, good), located(42, 97)},
         {packed_acl(3, with(good, 0, 0)), located(42, 97)}, // would be listed three times
@@ -170,8 +168,7 @@ void use_everywhere(const std::string &bytes) {
         EXPECT_EQ(recorded_error().code, result);
     };
     const bool is_host_order = bytes.size() > 2 && bytes[2] == 2;
-    if (is_host_order)
-        expect_one_of({0, 42, 43}, sec__check_acl_buffer(&acl));
+    if (is_host_order) expect_one_of({0, 42, 43}, sec__check_acl_buffer(&acl));
     sec_aclelist_t list = {};
     expect_one_of({0, 42}, sec_list_acl(&acl, &list));
     sec_release_aclelist(&list);
