@@ -7,17 +7,13 @@
 #include "qz/acl.h"
 #include "qz/cu.h"
 
-#include <gtest/gtest.h>
-
-#include <cstdio>
 #include <cstring>
 #include <filesystem>
-#include <ostream>
+#include <gtest/gtest.h>
+#include <memory>
+#include <sstream>
 #include <string>
-#include <string_view>
 #include <sys/mman.h>
-#include <tuple>
-#include <unistd.h>
 #include <vector>
 
 namespace support {
@@ -26,15 +22,13 @@ using namespace std::literals;
 using arguments = std::vector<std::string>;
 
 struct failure {
-    int code = 0;
-    int id = 0;
+    int code = 0, id = 0;
     std::string text = {};
     bool operator==(const failure &) const = default;
+    friend std::ostream &operator<<(std::ostream &out, const failure &error) {
+        return out << "code " << error.code << ", message " << error.id << ": " << error.text;
+    }
 };
-
-inline std::ostream &operator<<(std::ostream &out, const failure &error) {
-    return out << "code " << error.code << ", message " << error.id << ": " << error.text;
-}
 
 // The error of this thread, which is cleared.
 inline failure recorded_error() {
@@ -51,80 +45,56 @@ inline failure recorded_error() {
 
 // The error that a message with these arguments, each as it is shown, would be recorded as.
 inline failure error_of(int code, int id, const arguments &args = {}) {
-    const std::string_view text = qz::msg::default_text(id);
-    failure made{code, id};
-    for (std::size_t at = 0; at < text.size(); ++at) {
-        if (text[at] != '%' || text.substr(at + 2, 1) != "$") {
-            made.text += text[at];
-            continue;
-        }
-        made.text += args.at(static_cast<std::size_t>(text[at + 1] - '1'));
-        at = text.find_first_of("sdxc", at);
+    failure made{code, id, std::string(qz::msg::default_text(id))};
+    for (std::size_t at = 0; (at = made.text.find('$', at)) != std::string::npos;) {
+        const std::string &arg = args.at(static_cast<std::size_t>(made.text[at - 1] - '1'));
+        at -= 2;
+        made.text.replace(at, made.text.find_first_of("sdxc", at) + 1 - at, arg);
+        at += arg.size();
     }
     return made;
 }
 
 // A pointer as the parameter message shows it.
 inline std::string shown(const void *pointer) {
-    char text[9];
-    std::snprintf(text, sizeof text, "%x", static_cast<std::uint32_t>(reinterpret_cast<std::uintptr_t>(pointer)));
-    return text;
+    std::ostringstream text;
+    text << std::hex << static_cast<std::uint32_t>(reinterpret_cast<std::uintptr_t>(pointer));
+    return text.str();
 }
 
 // A copy of bytes whose last one lies right before a page that nothing may touch.
 class guarded {
 public:
-    explicit guarded(std::string_view bytes) : size_(bytes.size()), page_((size_ | 4095) + 1) {
-        const int access = PROT_READ | PROT_WRITE;
-        memory_ = static_cast<char *>(mmap(nullptr, page_ + 4096, access, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0));
-        mprotect(memory_ + page_, 4096, PROT_NONE);
+    explicit guarded(std::string_view bytes) : size_(bytes.size()) {
+        const std::size_t page = (size_ | 4095) + 1;
+        void *memory = mmap(nullptr, page + 4096, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
+        char *const start = static_cast<char *>(memory);
+        mprotect(start + page, 4096, PROT_NONE);
+        bytes_ = {start + page - size_, [=](char *) { munmap(start, page + 4096); }};
         bytes.copy(data(), size_);
     }
-    guarded(const guarded &) = delete;
-    guarded &operator=(const guarded &) = delete;
-    ~guarded() { munmap(memory_, page_ + 4096); }
-
-    char *data() const { return memory_ + page_ - size_; }
+    char *data() const { return bytes_.get(); }
     std::size_t size() const { return size_; }
 
 private:
     std::size_t size_;
-    std::size_t page_; // where the page is
-    char *memory_;
+    std::shared_ptr<char> bytes_;
 };
 
 // What a call writes to standard output and to standard error.
 using output = std::pair<std::string, std::string>;
-
-template <class Call>
-output output_of(const Call &call) {
-    output written;
-    const std::tuple<FILE *, int, int, std::string *> streams[] = {
-        {stdout, dup(1), memfd_create("out", 0), &written.first},
-        {stderr, dup(2), memfd_create("err", 0), &written.second}};
-    for (const auto &[stream, kept, file, text] : streams) {
-        std::fflush(stream);
-        dup2(file, fileno(stream));
-    }
+output output_of(const auto &call) {
+    testing::internal::CaptureStdout();
+    testing::internal::CaptureStderr();
     call();
-    for (const auto &[stream, kept, file, text] : streams) {
-        std::fflush(stream);
-        dup2(kept, fileno(stream));
-        text->resize(static_cast<std::size_t>(lseek(file, 0, SEEK_END)));
-        EXPECT_EQ(pread(file, text->data(), text->size(), 0), static_cast<ssize_t>(text->size()));
-        close(kept);
-        close(file);
-    }
-    return written;
+    return {testing::internal::GetCapturedStdout(), testing::internal::GetCapturedStderr()};
 }
 
 class temporary_folder {
 public:
     temporary_folder() { EXPECT_NE(mkdtemp(path_.data()), nullptr); }
     temporary_folder(const temporary_folder &) = delete;
-    temporary_folder &operator=(const temporary_folder &) = delete;
     ~temporary_folder() { std::filesystem::remove_all(path_); }
-
     std::string operator/(std::string_view name) const { return path_ + "/" + std::string(name); }
     const std::string &path() const { return path_; }
 
@@ -134,31 +104,23 @@ private:
 
 // An entry that borrows its texts.
 inline sec_acle_t entry(int type, std::string_view mechanism, const char *identity, std::uint32_t mask) {
-    sec_acle_t made = {};
-    made.type = static_cast<std::uint8_t>(type);
-    made.perm_mask = mask;
+    sec_acle_t made = {mask, "", static_cast<std::uint8_t>(type), const_cast<char *>(identity)};
     mechanism.copy(made.mechanism, sizeof made.mechanism - 1);
-    made.identity = const_cast<char *>(identity);
     return made;
 }
 
 // Parts of a compiled buffer. Numbers stand low byte first; strings are given with their NUL.
 inline std::string number(std::uint64_t value, std::size_t width) {
-    std::string bytes;
-    for (; width != 0; --width, value >>= 8) bytes += static_cast<char>(value & 0xff);
-    return bytes;
+    return width == 0 ? "" : static_cast<char>(value & 0xff) + number(value >> 8, width - 1);
 }
-
 inline std::string packed_entry(std::uint32_t mask, std::string_view identity) {
     return "\1"s + number(mask, 4) + number(identity.size(), 2) + std::string(identity);
 }
-
 inline std::string packed_subacl(int type, std::string_view mechanism, std::uint64_t count,
                                  const std::string &entries) {
     return number(10 + mechanism.size() + entries.size(), 4) + static_cast<char>(type) + number(count, 4) +
            static_cast<char>(mechanism.size()) + std::string(mechanism) + entries;
 }
-
 inline std::string packed_acl(std::uint64_t count, const std::string &subacls) {
     return "\x85\1\2"s + number(count, 2) + subacls;
 }
