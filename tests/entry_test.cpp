@@ -133,4 +133,16 @@ TEST(entries_DeathTest, are_converted_between_the_code_set_and_utf8) {
     check("no-such-code-set", "C", "kdz", "plain", no_set, none + no_set);
 }
 
+TEST(entries, go_with_the_list_that_holds_them) {
+    sec_release_aclelist(nullptr);
+    sec_aclelist_t list = {5, nullptr}; // an array that is not there is not looked at
+    sec_release_aclelist(&list);
+    EXPECT_EQ(list.count, 5);
+    list = {3, static_cast<sec_acle_t **>(std::calloc(3, sizeof(sec_acle_t *)))};
+    ASSERT_EQ(sec_create_acle(1, 0, nullptr, nullptr, &list.acles[0]), 0);
+    ASSERT_EQ(sec_create_acle(4, 0, "kdz", "x", &list.acles[2]), 0);
+    sec_release_aclelist(&list);
+    EXPECT_TRUE(list.count == 0 && list.acles == nullptr);
+}
+
 } // namespace

@@ -139,4 +139,16 @@ TEST(parser, agrees_with_the_plain_parser_on_random_texts) {
     }
 }
 
+TEST(parser, reads_permissions_by_the_templates_it_is_given) {
+    const sec_perm_template_t templates[] = {{0x80000000, 'Z', "", ""}, {2, 'r', "", ""}, {4, 'r', "", ""}};
+    const sec_perm_set_t own = {3, templates}, none = {0, nullptr};
+    walk at("o rZ\no w\no r\no");
+    EXPECT_EQ(at.next(&own), 1);
+    EXPECT_EQ(at.acle.perm_mask, 0x80000002);
+    EXPECT_EQ(at.next(&own), 36);
+    EXPECT_EQ(recorded_error(), error_of(36, 166, {"2", "w"}));
+    EXPECT_EQ(at.next(&none), 36);
+    EXPECT_EQ(at.next(&none), 1);
+}
+
 } // namespace

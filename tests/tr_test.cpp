@@ -150,4 +150,14 @@ TEST_F(Trace, OnlyRegularFilesAreWrittenTo) {
     }
 }
 
+TEST_F(Trace, BadParametersAreRefused) {
+    for (const std::string &name : {""s, "a\n"s, "\xFF"s, std::string(64, 'n')})
+        EXPECT_EQ(enlist(name.c_str(), TR_BAD_PARAMETER), std::vector<uint8_t>(4, 9));
+    const auto bad = [](auto... c) { EXPECT_THAT((std::vector{c...}), testing::Each(TR_BAD_PARAMETER)); };
+    bad(tr_register_component_1(nullptr, level.data(), table, 1), tr_register_component_1("C", nullptr, table, 1),
+        tr_register_component_1("C", level.data(), nullptr, 1), tr_register_component_1("C", level.data(), table, -1),
+        tr_unregister_component_1(nullptr), tr_record_id_1(nullptr, 1), tr_record_data_1("C", 1, -1),
+        tr_get_size_1(nullptr), tr_get_filename_1(nullptr));
+}
+
 } // namespace
