@@ -29,7 +29,7 @@ inline failure located(int code, int id, arguments args = {}) {
     args.insert(args.end(), {source, "LINE"});
     return error_of(code, id, args);
 }
-inline failure bad_parameter(const std::string &function, int position, const std::string &value) {
+inline failure bad_parameter(const std::string &function, int position, const std::string &value = "0") {
     return error_of(SEC_S_BAD_PARAMETER, 88, {function, std::to_string(position), value});
 }
 inline const failure no_error;

@@ -1,12 +1,13 @@
 // Tests of validation and byte order, and of how every operation bears bytes that were cut short or changed.
-#include "service_support.h"
-
 #include "qzacl_acl/buffer.h"
 #include "qzacl_acl/validate.h"
+#include "service_support.h"
 
 namespace {
 
 using namespace support;
+
+const std::string xyz = named(3, "xyz"), bare = packed_entry(1, ""), other = packed_subacl(2, "", 1, bare);
 
 std::string with(std::string bytes, std::size_t offset, int value) {
     bytes[offset] = static_cast<char>(value);
@@ -35,17 +36,14 @@ std::string foreign(std::string bytes) {
 }
 
 TEST(validate, checks_every_rule_in_its_order) {
-    const std::string xyz = named(3, "xyz"), user = of_mechanism(4, "abcd", 1, xyz);
-    const std::string other = packed_subacl(2, "", 1, packed_entry(1, "")), endless = packed_entry(1, "xyz");
+    const std::string user = of_mechanism(4, "abcd", 1, xyz), endless = packed_entry(1, "xyz");
+    const std::string group = packed_subacl(16, "", 4, named(~0u, "z") + xyz + xyz + named(0, ""));
+    const std::string headless = with(packed_subacl(2, "", 1, ""), 0, 10);
     const failure structural = located(42, 97), bad_identity = located(43, 114);
     const std::tuple<const char *, std::string, failure> rows[] = {
-        {"bytes behind the end", packed_acl(0, "behind"), no_error},
-        {"all types", rich, no_error},
-        {"any order", packed_acl(3, packed_subacl(16, "", 3, named(~0u, "z") + xyz + xyz) + user + user), no_error},
-        {"an empty identity", one(packed_subacl(16, "", 1, named(0, ""))), no_error},
-        {"no entries", packed_acl(2, packed_subacl(1, "", 0, "") + of_mechanism(8, "m", 0, "")), no_error},
-        {"a mechanism of 254 bytes", one(of_mechanism(8, std::string(254, 'm'), 1, xyz)), no_error},
-        {"a last length that is too long", one(with(user, 3, 255)), no_error},
+        {"all types, and bytes behind the end", rich + "behind", no_error},
+        {"repetitions and none", packed_acl(4, user + user + of_mechanism(8, "m", 0, "") + group), no_error},
+        {"long mechanism", one(with(of_mechanism(8, std::string(254, 'm'), 1, xyz), 3, 9)), no_error},
         {"4 bytes", "\x85\1\2\0"s, located(42, 106, {"4"})},
         {"a sub-ACL too many", packed_acl(2, user), structural},
         {"a length that is too short", packed_acl(2, with(user, 0, 25) + other), structural},
@@ -53,11 +51,9 @@ TEST(validate, checks_every_rule_in_its_order) {
         {"a header cut short", one(user.substr(0, 9)), structural},
         {"a mechanism cut short", one(user.substr(0, 14)), structural},
         {"an entry cut short", one(user.substr(0, 21)), structural},
-        {"the example cut short", example.substr(0, 30), structural},
         {"the example with a length of 5", with(example, 25, 5), bad_identity},
-        {"an entry too many", one(of_mechanism(4, "m", 2, xyz)), structural},
+        {"the same cut short", with(example, 25, 5).substr(0, 30), structural},
         {"entries beyond number", one(of_mechanism(4, "m", ~0u, xyz)), structural},
-        {"type 0", one(packed_subacl(0, "", 9, "")), located(42, 107, {"0"})},
         {"type 132", one(packed_subacl(132, "m", 0, "")), located(42, 107, {"132"})},
         {"a group's mechanism", one(packed_subacl(16, "abcde", 1, xyz)), located(42, 108, {"16"})},
         {"an unauthenticated mechanism", one(packed_subacl(1, "m", 2, "")), located(42, 108, {"1"})},
@@ -66,26 +62,23 @@ TEST(validate, checks_every_rule_in_its_order) {
         {"an empty mechanism", one(packed_subacl(8, "\0"s, 1, xyz)), located(42, 110, {"1"})},
         {"a mechanism that ends early", one(packed_subacl(4, "ab\0\0"s, 1, xyz)), located(42, 111, {"ab"})},
         {"a mechanism that does not end", one(packed_subacl(4, "ab", 1, xyz)), located(42, 111, {"ab\1\3"})},
-        {"version 0", one(of_mechanism(4, "m", 1, with(xyz, 0, 0))), located(43, 112, {"0"})},
         {"any other with an identity", one(packed_subacl(2, "", 1, xyz)), located(43, 113)},
         {"an identity that ends late", one(packed_subacl(16, "", 2, endless + xyz)), bad_identity},
-        {"no identity field", one(of_mechanism(8, "m", 1, packed_entry(1, ""))), bad_identity},
-        {"a faulty entry before another", one(packed_subacl(16, "", 2, with(xyz, 0, 7) + endless)),
-         located(43, 112, {"7"})},
+        {"no identity field", one(of_mechanism(8, "m", 1, bare)), bad_identity},
+        {"two faults", one(of_mechanism(4, "m", 2, with(xyz, 0, 0) + endless)), located(43, 112, {"0"})},
         // After a faulty entry the walk stands at that entry, where no further sub-ACL starts.
         {"a faulty entry before a sub-ACL", packed_acl(2, with(other, 10, 2) + other), structural},
-        {"a faulty entry where a sub-ACL starts", packed_acl(2, with(packed_subacl(2, "", 1, ""), 0, 10) + other),
-         located(43, 112, {"17"})},
+        {"one where a sub-ACL starts", packed_acl(2, headless + other), located(43, 112, {"17"})},
     };
     for (const auto &[name, bytes, error] : rows) {
         const guarded memory(bytes);
         sec_acl_buffer_t acl = {static_cast<std::int32_t>(bytes.size()), memory.data()};
         EXPECT_EQ(after(sec__check_acl_buffer(&acl)), error) << name;
         EXPECT_EQ(after(sec_convert_acl_to_host(1, &acl)), error) << name;
-        EXPECT_EQ(sec_convert_acl_to_host(0, &acl), 0) << name; // nothing to convert
+        EXPECT_EQ(after(sec_convert_acl_to_host(0, &acl)), no_error) << name; // nothing to convert
         EXPECT_EQ(std::string(memory.data(), memory.size()), bytes) << name;
     }
-    sec_acl_buffer_t negative = {-7, nullptr};
+    const sec_acl_buffer_t negative = {-7, nullptr};
     EXPECT_EQ(after(sec__check_acl_buffer(&negative)), located(42, 106, {"-7"}));
 }
 
@@ -104,7 +97,6 @@ TEST(validate, converts_the_other_byte_order) {
         {"\x84\1\1\0\0"s, error_of(42, 96)},
         {"\x85\2"s, error_of(42, 96)},
         {"\x85\1"s, located(42, 106, {"2"})},
-        {"\x85\1\1\0"s, located(42, 97)},
         {with(foreign(packed_acl(2, unsound + unsound)), 8, 11), located(42, 97)},
         {foreign(rich).substr(0, rich.size() - 1), located(42, 97)},
     };
@@ -113,20 +105,17 @@ TEST(validate, converts_the_other_byte_order) {
         EXPECT_EQ(after(sec_convert_acl_to_host(1, &held.acl)), error);
         EXPECT_EQ(held.bytes().substr(0, 3), bytes.substr(0, 3)) << error; // only success marks the order
     }
-    sec_acl_buffer_t none = {0, spelled.acl.data}, missing = {5, nullptr};
-    EXPECT_EQ(after(sec_convert_acl_to_host(0, &none)), error_of(42, 96));
-    EXPECT_EQ(after(sec_convert_acl_to_host(0, &missing)), error_of(42, 96));
-    EXPECT_EQ(after(sec_convert_acl_to_host(1, nullptr)), bad_parameter("sec_convert_acl_to_host", 2, "0"));
+    for (sec_acl_buffer_t bad : {sec_acl_buffer_t{0, spelled.acl.data}, {5, nullptr}})
+        EXPECT_EQ(after(sec_convert_acl_to_host(0, &bad)), error_of(42, 96));
+    EXPECT_EQ(after(sec_convert_acl_to_host(1, nullptr)), bad_parameter("sec_convert_acl_to_host", 2));
 }
 
 TEST(list, refuses_what_it_cannot_list) {
-    const std::string good = packed_subacl(2, "", 1, packed_entry(1, ""));
     const char *const long_name = "seventeen-bytes-x", *const blank = "";
     const std::pair<std::string, failure> rows[] = {
-        {packed_acl(2, good + packed_subacl(1, "", 2, packed_entry(1, "") + packed_entry(2, ""))), error_of(42, 98)},
-        {packed_acl(2, good + of_mechanism(4, long_name, 0, "")), located(42, 110, {"18"})},
-        {packed_acl(2, good), located(42, 97)},
-        {packed_acl(3, with(good, 0, 0)), located(42, 97)}, // would be listed three times
+        {packed_acl(2, other + packed_subacl(1, "", 2, bare + bare)), error_of(42, 98)},
+        {packed_acl(2, other), located(42, 97)},
+        {packed_acl(3, with(other, 0, 0)), located(42, 97)}, // would be listed three times
         {"\x85\1"s, located(42, 97)},
         {"\x85\2\2\0\0"s, error_of(42, 96)},
         {"\x85"s, error_of(42, 96)},
@@ -136,24 +125,21 @@ TEST(list, refuses_what_it_cannot_list) {
         sec_aclelist_t list = {7, nullptr};
         EXPECT_EQ(after(sec_list_acl(&held.acl, &list)), error);
         EXPECT_EQ(list.count, error.id == 96 ? 7 : 0) << error; // touched once the first bytes are right
-        EXPECT_EQ(list.acles, nullptr);
     }
-    const buffer held(rich);
-    const sec_acl_buffer_t empty = {}, no_length = {0, held.acl.data};
+    sec_acl_buffer_t empty = {}, no_length = {0, &empty};
     sec_aclelist_t list = {7, nullptr};
-    const char *const name = "sec_list_acl_by_type";
-    const auto call = sec_list_acl_by_type;
-    EXPECT_EQ(after(call(nullptr, 0, blank, nullptr)), bad_parameter(name, 1, "0"));
-    EXPECT_EQ(after(call(&no_length, 0x84, blank, nullptr)), bad_parameter(name, 2, "84"));
-    EXPECT_EQ(after(call(&no_length, 4, long_name, nullptr)), bad_parameter(name, 3, shown(long_name)));
-    EXPECT_EQ(after(call(&held.acl, 8, blank, &list)), bad_parameter(name, 3, shown(blank)));
-    EXPECT_EQ(after(call(&no_length, 16, long_name, nullptr)), bad_parameter(name, 4, "0"));
-    EXPECT_EQ(after(call(&no_length, 1, blank, &list)), error_of(42, 96));
+    EXPECT_EQ(after(sec_list_acl(nullptr, nullptr)), bad_parameter("sec_list_acl", 1));
+    EXPECT_EQ(after(sec_list_acl(&no_length, nullptr)), bad_parameter("sec_list_acl", 2));
     EXPECT_EQ(after(sec_list_acl(&no_length, &list)), error_of(42, 96));
-    EXPECT_EQ(list.count, 7);
-    EXPECT_EQ(after(sec_list_acl(nullptr, nullptr)), bad_parameter("sec_list_acl", 1, "0"));
-    EXPECT_EQ(after(sec_list_acl(&held.acl, nullptr)), bad_parameter("sec_list_acl", 2, "0"));
     EXPECT_EQ(sec_list_acl(&empty, &list) + list.count, 0);
+    const std::string of = "sec_list_acl_by_type";
+    const auto call = sec_list_acl_by_type;
+    EXPECT_EQ(after(call(nullptr, 0, blank, nullptr)), bad_parameter(of, 1));
+    EXPECT_EQ(after(call(&no_length, 0x84, blank, nullptr)), bad_parameter(of, 2, "84"));
+    for (const char *bad : {blank, long_name})
+        EXPECT_EQ(after(call(&no_length, 4, bad, nullptr)), bad_parameter(of, 3, shown(bad)));
+    EXPECT_EQ(after(call(&no_length, 16, long_name, nullptr)), bad_parameter(of, 4));
+    EXPECT_EQ(after(call(&no_length, 1, blank, &list)), error_of(42, 96));
 }
 
 int accept_anything(const char *, const char *held) { return held[0] == '\0' ? 0 : 1; }
@@ -163,35 +149,31 @@ void use_everywhere(const std::string &bytes) {
     const guarded memory(bytes);
     sec_acl_buffer_t acl = {static_cast<std::int32_t>(bytes.size()), memory.data()};
     SCOPED_TRACE(testing::PrintToString(bytes));
-    const auto expect_one_of = [](std::initializer_list<int> codes, int result) {
-        EXPECT_EQ(std::ranges::count(codes, result), 1) << result;
-        EXPECT_EQ(recorded_error().code, result);
+    const auto bears = [](int result) {
+        EXPECT_TRUE(result == 0 || result == 18 || result == 42 || result == 43) << result;
+        return after(result).code == 0;
     };
-    const bool is_host_order = bytes.size() > 2 && bytes[2] == 2;
-    if (is_host_order) expect_one_of({0, 42, 43}, sec__check_acl_buffer(&acl));
+    bears(sec__check_acl_buffer(&acl));
     sec_aclelist_t list = {};
-    expect_one_of({0, 42}, sec_list_acl(&acl, &list));
+    bears(sec_list_acl(&acl, &list));
     sec_release_aclelist(&list);
-    expect_one_of({0, 42}, sec_list_acl_by_type(&acl, 4, "UNIX", &list));
+    bears(sec_list_acl_by_type(&acl, 4, "UNIX", &list));
     sec_release_aclelist(&list);
     std::uint32_t mask = 0;
     const char *const bob = "bob@host.example";
     for (const auto &[type, mechanism] : std::initializer_list<std::pair<std::uint8_t, const char *>>{
              {1, ""}, {2, ""}, {4, "unix"}, {8, "krb5"}, {0x84, "hba2"}})
-        expect_one_of({0, 42, 43}, sec__single_acle_perm(&acl, type, mechanism, nullptr, bob, &mask));
+        bears(sec__single_acle_perm(&acl, type, mechanism, nullptr, bob, &mask));
     const sec_group_ref_t groups[] = {{0, "staff"}, {0, "admins"}, {0, "none"}};
-    expect_one_of({0, 42, 43}, sec__group_acles_perm(&acl, 3, groups, &mask));
+    bears(sec__group_acles_perm(&acl, 3, groups, &mask));
     for (const auto &acle : {entry(4, "unix", "BOB@host.example", 9), entry(4, "unix", "new", 9),
                              entry(8, "krb5", "a", 9), entry(16, "", "admins", 9), entry(1, "", nullptr, 9)})
         for (const auto edit : {sec_add_acle_to_acl, sec_add_acle_to_acl2, sec_del_acle_from_acl}) {
             buffer held(bytes);
-            const int result = edit(&acle, &held.acl);
-            expect_one_of({0, 18, 42, 43}, result);
-            EXPECT_TRUE(result == 0 || held.bytes() == bytes);
+            EXPECT_TRUE(bears(edit(&acle, &held.acl)) || held.bytes() == bytes);
         }
     EXPECT_EQ(std::string(memory.data(), memory.size()), bytes);
-    expect_one_of({0, 42, 43}, sec_convert_acl_to_host(1, &acl));
-    EXPECT_TRUE(!is_host_order || std::string(memory.data(), memory.size()) == bytes);
+    bears(sec_convert_acl_to_host(1, &acl));
 }
 
 TEST(every_operation, stays_inside_its_bytes) {
