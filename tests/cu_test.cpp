@@ -184,6 +184,26 @@ TEST(Codeset, ThreadsShareAHandle) {
     for (std::thread &thread : threads) thread.join();
 }
 
+TEST(Parameters, AreChecked) {
+    cu_iconv_t held = opened("ISO-8859-1", to_utf8), handle = held;
+    EXPECT_EQ(cu_iconv_open_1("no-such", from_utf8, &handle), CU_ICONV_UNKNOWN_CODESET);
+    EXPECT_EQ(handle, nullptr);
+    const cu_timeinfo_t unfilled = {}, speed = {{1, 1}};
+    cu_time_t time;
+    char text[46] = "", *out = nullptr;
+    size_t n = 1;
+    const auto bad = [](auto... c) { EXPECT_THAT((std::vector{c...}), testing::Each(CU_BAD_PARAMETER)); };
+    bad(cu_get_error_1(nullptr), cu_pset_error_1(nullptr), cu_get_errmsg_1(nullptr, &out),
+        cu_get_errmsg_1(current().get(), nullptr), cu_get_ctr_1(nullptr), cu_get_procspeed_1(nullptr),
+        cu_cvt_time_1(1, &unfilled, &time), cu_cvt_time_1(1, nullptr, &time), cu_cvt_time_1(1, &speed, nullptr),
+        cu_ipaddr_ntop_1(nullptr, text), cu_ipaddr_ntop_1(text, nullptr), cu_iconv_open_1("UTF-8", 0, nullptr),
+        cu_iconv_open_1(nullptr, 0, &handle), cu_iconv_open_1("", 0, &handle), cu_iconv_open_1("UTF-8", 2, &handle),
+        cu_iconv_open_1("ISO-8859-1//TRANSLIT", 1, &handle), cu_iconv_str_1(nullptr, 0, "a", &n, &out, &n),
+        cu_iconv_str_1(held, 1, "a", &n, &out, &n), cu_iconv_str_1(held, 0, nullptr, &n, &out, &n),
+        cu_iconv_str_1(held, 0, "a", nullptr, &out, &n), cu_iconv_str_1(held, 0, "a", &n, nullptr, &n),
+        cu_iconv_str_1(held, 0, "a", &n, &out, nullptr));
+}
+
 TEST(Fold, BytesWordsAndStringsAgreeWithTheCLibraryInItsOwnLocale) {
     // Every byte in every place of a word, its neighbours being what could carry into it.
     for (int byte = 0; byte < 256; ++byte) {

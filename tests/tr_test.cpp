@@ -160,4 +160,24 @@ TEST_F(Trace, BadParametersAreRefused) {
         tr_get_size_1(nullptr), tr_get_filename_1(nullptr));
 }
 
+TEST_F(Trace, TimeAndIdsAreTheMakers) {
+    const auto record_in_thread = [&] {
+        const time_t before = time(nullptr);
+        tr_record_id_1("C", 2);
+        std::ifstream in(file);
+        std::string line;
+        std::getline(std::getline(in, line), line);
+        const std::string ids = std::to_string(getpid()) + ",\"tid\":" + std::to_string(gettid());
+        EXPECT_THAT(line, testing::HasSubstr(",\"pid\":" + ids + ","));
+        tm parts{};
+        strptime(line.c_str(), "{\"time\":\"%Y-%m-%dT%H:%M:%S.", &parts);
+        EXPECT_TRUE(before <= timegm(&parts) && timegm(&parts) <= time(nullptr)) << line;
+    };
+    in_child([&] {
+        enlist();
+        tr_record_id_1("C", 1); // must not settle the ids of what its process forks
+        in_child([&] { std::thread(record_in_thread).join(); });
+    });
+}
+
 } // namespace
