@@ -22,8 +22,8 @@ pthread_mutex_t catalogs_mutex = PTHREAD_MUTEX_INITIALIZER;
 void lock() { pthread_mutex_lock(&catalogs_mutex); }
 void unlock() { pthread_mutex_unlock(&catalogs_mutex); }
 
-// A child forked while another thread opens a catalog would otherwise wait for ever for a thread that it does not
-// have.
+// A child forked while another thread opens a catalog would otherwise wait for ever for a thread that it does
+// not have.
 [[gnu::constructor]] void keep_free_over_fork() { pthread_atfork(lock, unlock, unlock); }
 
 const nl_catd no_catalog = reinterpret_cast<nl_catd>(-1);

@@ -143,8 +143,8 @@ using namespace qz::cu;
 int cu_set_error_1(int code, int, const char *catalog, int set, int message_id, const char *default_text,
                    ...) {
     recorded_error &error = current.error;
-    // A message of a catalog has one text for the life of the process: what arguments it took the last time is still
-    // known when it comes again, as that of denials does.
+    // A message of a catalog has one text for the life of the process: what arguments it took the last time
+    // is still known when it comes again, as that of denials does.
     const bool is_known = catalog != nullptr && default_text != nullptr && catalog == error.catalog &&
                           set == error.set && message_id == error.head.message_id &&
                           default_text == error.default_text;

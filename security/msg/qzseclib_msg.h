@@ -588,8 +588,8 @@ static_assert(text_count == 79);
 // The message table that the error facility is given default texts from; null where no text is raised.
 extern const std::array<const char *, qz::msg::table_size> cu_mesgtbl_qzseclib_msg;
 
-// What is shown for a message id outside the table. The ids of this library are checked when it is compiled, so
-// none of its messages comes to this; other users of the table may.
+// What is shown for a message id outside the table. The ids of this library are checked when it is compiled,
+// so none of its messages comes to this; other users of the table may.
 extern const char cu_badid_qzseclib_msg[];
 
 #endif

@@ -21,18 +21,7 @@ namespace {
 // Given back when there is none left to say so.
 qz::owned<void> spare_memory;
 
-// The file that was found and vetted; whatever is opened later must still be this one.
-struct acl_file {
-    qz::path_buffer path;
-    struct stat status = {};
-};
-
-struct file_contents {
-    qz::owned<char> text;
-    std::size_t length = 0;
-};
-
-int aclfck__get_aclfile(const char *aclfname, const char *username, acl_file &file) {
+int aclfck__get_aclfile(const char *aclfname, const char *username, qz::vetted_file &file) {
     std::uint32_t user_id = 0;
     if (const int result = sec__get_aclfname(aclfname, username, file.path, &user_id); result != SEC_S_OK)
         return result;
@@ -46,17 +35,11 @@ int aclfck__get_aclfile(const char *aclfname, const char *username, acl_file &fi
     return qz::report(SEC_S_BAD_PERMISSION, qz::msg::acl_file_not_private, file.path.text, username);
 }
 
-int read_contents(const acl_file &file, file_contents &contents) {
-    constexpr int lock_for_reading = 1;
+int read_contents(const qz::vetted_file &file, qz::file_bytes &contents) {
     const qz::descriptor opened = qz::open_vetted(file.path.text, O_RDONLY, file.status);
     if (!opened)
         return qz::report(SEC_S_FILE_ERROR, qz::msg::cannot_open_acl_file, file.path.text, errno);
-    if (const int result = acl__lock_acl_file(file.path.text, opened.get(), lock_for_reading); result != 0)
-        return result;
-    char *text = nullptr;
-    const int result = acl__read_acl_file(file.path.text, opened.get(), &text, &contents.length);
-    contents.text.reset(text);
-    return result;
+    return qz::lock_and_read(file.path.text, opened, contents);
 }
 
 // Prints the current error and passes its code on.
@@ -75,10 +58,10 @@ void warn_of_skipped_cache(unsigned flags) {
 
 // Collects the entries of every line. Returns the failure that ends the check; failures that are passed over
 // clear `is_clean` instead.
-int read_entries(file_contents &contents, unsigned flags, sec_acltree_array &trees, bool &is_clean) {
+int read_entries(qz::file_bytes &contents, unsigned flags, sec_acltree_array &trees, bool &is_clean) {
     constexpr int line_consumed = 1;
     const bool goes_on = (flags & ACLFCK_OPT_CONTINUE) != 0;
-    char *cursor = contents.text.get();
+    char *cursor = contents.data.get();
     std::size_t remaining = contents.length + 1;
     std::uint32_t line = 1;
     sec_acle_t entry = {};
@@ -104,7 +87,8 @@ int read_entries(file_contents &contents, unsigned flags, sec_acltree_array &tre
     }
 }
 
-int compile_and_cache(const acl_file &file, const sec_acltree_array &trees, const qz::text_origin &origin) {
+int compile_and_cache(const qz::vetted_file &file, const sec_acltree_array &trees,
+                      const qz::text_origin &origin) {
     constexpr int even_when_current = 1;
     sec_acl_buffer_t buffer = {};
     if (const int result = sec__acltrees_to_acl(trees.trees(), &buffer); result != SEC_S_OK)
@@ -116,11 +100,11 @@ int compile_and_cache(const acl_file &file, const sec_acltree_array &trees, cons
 } // namespace
 
 int aclfck__bulk_aclfile(const char *aclfname, const char *username, unsigned flags) {
-    acl_file file;
+    qz::vetted_file file;
     if (const int result = aclfck__get_aclfile(aclfname, username, file); result != SEC_S_OK)
         return printed(result);
     const qz::text_origin origin(file.status);
-    file_contents contents;
+    qz::file_bytes contents;
     if (const int result = read_contents(file, contents); result != SEC_S_OK)
         return printed(result);
     if (contents.length == 0) {

@@ -136,3 +136,17 @@ int acl__read_acl_file(const char *file_name, int fd, char **text, std::size_t *
         qz::trace_elapsed(6, start);
     return result;
 }
+
+namespace qz {
+
+int lock_and_read(const char *path, const descriptor &file, file_bytes &bytes) {
+    constexpr int for_reading = 1;
+    if (const int result = acl__lock_acl_file(path, file.get(), for_reading); result != 0)
+        return result;
+    char *data = nullptr;
+    const int result = acl__read_acl_file(path, file.get(), &data, &bytes.length);
+    bytes.data.reset(data);
+    return result;
+}
+
+} // namespace qz

@@ -14,6 +14,15 @@ namespace qz {
 // another file. A file that turned into a FIFO or a terminal neither blocks nor becomes the controlling one.
 descriptor open_vetted(const char *path, int access, const struct stat &vetted);
 
+// The bytes of a file, and a NUL behind them; none of an empty file.
+struct file_bytes {
+    owned<char> data;
+    std::size_t length = 0;
+};
+
+// Asks the lock hook and reads the whole file. Returns SEC_S_OK, the hook's result, or that of the read.
+int lock_and_read(const char *path, const descriptor &file, file_bytes &bytes);
+
 } // namespace qz
 
 // Convert the `*in_length` bytes at `in`, the terminating NUL included, into a new string that the caller

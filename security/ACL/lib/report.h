@@ -43,6 +43,10 @@ inline int report_bad_parameter(const char *function, int position, int value) {
     return report(SEC_S_BAD_PARAMETER, msg::incorrect_parameter, function, position, value);
 }
 
+// A buffer that is wrong in a way without a message of its own: a part does not end where it should, or the
+// bytes end early.
+inline int report_corrupt(int line) { return report(SEC_S_BAD_ACL, msg::buffer_corrupted, acl_source, line); }
+
 // A pointer as the parameter message shows it, cut to the width of its conversion.
 inline int shown_pointer(const void *pointer) {
     return static_cast<int>(static_cast<std::uint32_t>(reinterpret_cast<std::uintptr_t>(pointer)));

@@ -45,7 +45,6 @@ inline constexpr std::size_t order_offset = 2;
 inline constexpr std::size_t count_offset = 3;
 
 inline constexpr std::size_t subacl_header_size = 10;
-inline constexpr std::size_t subacl_type_offset = 4;
 inline constexpr std::size_t subacl_count_offset = 5;
 
 inline constexpr std::size_t entry_fixed_size = 7;
@@ -143,10 +142,10 @@ struct entry_walk {
     std::uint32_t left = 0;
 };
 
-// Steps over entries while `passes` says so of the first `readable` bytes of their identities. Stops as well before an
-// entry that ends the buffer too early, whose field does not end in NUL, or that has fewer bytes behind it than are
-// asked for: those are left to the checked reader. This is the loop that a decision spends its time in, so each step
-// makes do with one test for where the bytes end and one for the field.
+// Steps over entries while `passes` says so of the first `readable` bytes of their identities. Stops as well
+// before an entry that ends the buffer too early, whose field does not end in NUL, or that has fewer bytes
+// behind it than are asked for: those are left to the checked reader. This is the loop that a decision spends
+// its time in, so each step makes do with one test for where the bytes end and one for the field.
 template <class Passes>
 void pass_entries(entry_walk &walk, std::size_t readable, const Passes &passes) {
     const unsigned char *const start = walk.entries.position();
@@ -195,9 +194,9 @@ public:
     }
 
     const subacl &current() const { return current_; }
-    // The bytes that the current sub-ACL may take: up to where the next one starts, and for the last up to the end of
-    // the buffer. So however sub-ACLs are made to overlap, walking over all their entries takes no more than the bytes
-    // can hold.
+    // The bytes that the current sub-ACL may take: up to where the next one starts, and for the last up to
+    // the end of the buffer. So however sub-ACLs are made to overlap, walking over all their entries takes no
+    // more than the bytes can hold.
     byte_span bytes() const {
         return {next_.position(),
                 left_ == 0 ? next_.left() : std::min<std::size_t>(current_.length, next_.left())};

@@ -102,8 +102,8 @@ qz::descriptor create_temporary(const char *aclfname, qz::path_buffer &name) {
     return {};
 }
 
-// One write. Past a file size limit it fails like on a full disk: the signal that would end the process, and leave half
-// a cache behind, is held back and taken away again.
+// One write. Past a file size limit it fails like on a full disk: the signal that would end the process, and
+// leave half a cache behind, is held back and taken away again.
 ssize_t write_once(int fd, const sec_acl_buffer_t &acl) {
     sigset_t limit_signal;
     sigset_t before;

@@ -15,9 +15,9 @@ inline constexpr char cache_extension[] = ".cacl";
 // For an ACL file's path that is as long as this, or longer, no cache is written.
 inline constexpr std::size_t uncached_path_length = path_max - sizeof cache_extension;
 
-// Where the text of a cache comes from: the file that is read, and the time, as the kernel stamps files now, before
-// any of it is read. The cache is stamped with that time, so that an edit that comes later is never older than it;
-// and no other file that was exchanged for the one read lends its owner and mode to the cache.
+// Where the text of a cache comes from: the file that is read, and the time, as the kernel stamps files now,
+// before any of it is read. The cache is stamped with that time, so that an edit that comes later is never
+// older than it; and no other file that was exchanged for the one read lends its owner and mode to the cache.
 struct text_origin {
     explicit text_origin(const struct stat &vetted);
 
@@ -31,10 +31,10 @@ bool make_cache_name(const char *aclfname, path_buffer &name);
 
 } // namespace qz
 
-// Writes the buffer to the ACL file's cache, through a temporary file that takes the cache's place whole. Without
-// `force` a cache that is later than the ACL file is left alone. Returns SEC_S_OK when a new cache is in place;
-// SEC_S_ADVISORY, without a message, when the buffer is empty or the cache current; else SEC_S_FILE_ERROR, leaving a
-// cache that was there as it was and nothing else behind.
+// Writes the buffer to the ACL file's cache, through a temporary file that takes the cache's place whole.
+// Without `force` a cache that is later than the ACL file is left alone. Returns SEC_S_OK when a new cache is
+// in place; SEC_S_ADVISORY, without a message, when the buffer is empty or the cache current; else
+// SEC_S_FILE_ERROR, leaving a cache that was there as it was and nothing else behind.
 int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, int force,
                          const qz::text_origin &origin);
 

@@ -53,14 +53,12 @@ void write(qz::byte_writer &writer, const measured_subacl &subacl) {
 
 bool has_entries(const sec_acltree_t *root) { return root != nullptr && root->held_count() != 0; }
 
-int corrupt(int line) { return qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupted, qz::acl_source, line); }
-
 // The parts of an expanded entry that all entries of a sub-ACL share.
 int common_part(const format::subacl &head, sec_acle_t &acle) {
     acle = {};
     acle.type = head.type;
     if (!qz::is_acle_type(head.type))
-        return corrupt(__LINE__);
+        return qz::report_corrupt(__LINE__);
     if (!qz::has_mechanism(head.type))
         return SEC_S_OK;
     const char *mechanism = format::string_in(head.mechanism);
@@ -69,7 +67,7 @@ int common_part(const format::subacl &head, sec_acle_t &acle) {
         return qz::report(SEC_S_BAD_ACL, qz::msg::bad_mechanism_length, qz::shown_size(head.mechanism.size()),
                           qz::acl_source, __LINE__);
     if (mechanism == nullptr)
-        return corrupt(__LINE__);
+        return qz::report_corrupt(__LINE__);
     std::memcpy(acle.mechanism, mechanism, length);
     return SEC_S_OK;
 }
@@ -82,12 +80,12 @@ int expand(qz::byte_reader reader, const format::subacl &head, sec_acltree_t **r
     for (std::uint32_t left = head.entry_count; left != 0; --left) {
         format::entry entry;
         if (!format::read(reader, entry))
-            return corrupt(__LINE__);
+            return qz::report_corrupt(__LINE__);
         acle.perm_mask = entry.perm_mask;
         if (qz::has_identity(head.type)) {
             const char *identity = format::string_in(entry.identity);
             if (identity == nullptr)
-                return corrupt(__LINE__);
+                return qz::report_corrupt(__LINE__);
             // The tree copies the identity; nothing writes through this pointer.
             acle.identity = const_cast<char *>(identity);
         }
@@ -114,7 +112,7 @@ int sec__acltree_to_subacl(const sec_acltree_t *root, qz::loose_subacl &out) {
     qz::byte_writer writer({memory.get(), subacl.head.length});
     write(writer, subacl);
     if (!writer.is_full())
-        return corrupt(__LINE__);
+        return qz::report_corrupt(__LINE__);
     out = {std::move(memory), subacl.head.length};
     return SEC_S_OK;
 }
@@ -150,7 +148,7 @@ int sec__acltrees_to_acl(std::span<sec_acltree_t *const> trees, sec_acl_buffer_t
         write(writer, subacl);
     }
     if (!writer.is_full())
-        return corrupt(__LINE__);
+        return qz::report_corrupt(__LINE__);
     *acl = {static_cast<std::int32_t>(size), memory.release()};
     return SEC_S_OK;
 }
@@ -160,7 +158,7 @@ int sec__subacl_to_acltree(qz::byte_span bytes, sec_acltree_t **root) {
     qz::byte_reader reader(bytes);
     format::subacl head;
     if (!format::read(reader, head))
-        return corrupt(__LINE__);
+        return qz::report_corrupt(__LINE__);
     if (qz::is_single_type(head.type) && head.entry_count > 1)
         return qz::report(SEC_S_BAD_ACL, qz::msg::single_acle_repeated);
     const int result = expand(reader, head, root);

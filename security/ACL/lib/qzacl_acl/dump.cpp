@@ -31,7 +31,7 @@ void dump_subacl(qz::byte_span bytes, const char *indentation) {
     if (format::read(reader, head))
         mechanism = qz::has_mechanism(head.type) ? format::string_in(head.mechanism) : "";
     if (mechanism == nullptr) {
-        qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupted, qz::acl_source, __LINE__);
+        qz::report_corrupt(__LINE__);
         print_and_clear(stdout, as_it_stands);
         return;
     }
@@ -144,7 +144,7 @@ void sec__dump_acl(const sec_acl_buffer_t *acl) {
     for (; step == format::subacl_walk::step::found; step = walk.next())
         dump_subacl(walk.bytes(), "\t");
     if (step == format::subacl_walk::step::corrupt) {
-        qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupted, qz::acl_source, __LINE__);
+        qz::report_corrupt(__LINE__);
         print_and_clear(stdout, as_it_stands);
     }
 }

@@ -21,8 +21,6 @@ namespace format = qz::format;
 constexpr char add_function[] = "sec_add_acle_to_acl";
 constexpr char delete_function[] = "sec_del_acle_from_acl";
 
-int corrupt(int line) { return qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupted, qz::acl_source, line); }
-
 int check_entry(const sec_acle_t &acle) {
     if (!qz::is_acle_type(acle.type))
         return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_type_unknown, acle.type);
@@ -51,7 +49,7 @@ int check_header(const sec_acl_buffer_t &acl) {
         return qz::report(SEC_S_BAD_ACL, qz::msg::buffer_version_unsupported);
     if (order != format::host_order)
         return qz::report(SEC_S_BAD_ACL, qz::msg::wrong_byte_order);
-    return is_whole ? SEC_S_OK : corrupt(__LINE__);
+    return is_whole ? SEC_S_OK : qz::report_corrupt(__LINE__);
 }
 
 std::span<unsigned char> writable(const sec_acl_buffer_t &acl) {
@@ -69,8 +67,8 @@ void set_subacl_count(const sec_acl_buffer_t &acl, std::size_t count) {
     qz::store_field(writable(acl), format::count_offset, static_cast<std::uint16_t>(count));
 }
 
-// Replaces `old_size` bytes at `offset` by a gap of `new_size` bytes, which the caller fills. Only growing can fail,
-// and then nothing has changed; what shrank keeps its memory until it is given back.
+// Replaces `old_size` bytes at `offset` by a gap of `new_size` bytes, which the caller fills. Only growing
+// can fail, and then nothing has changed; what shrank keeps its memory until it is given back.
 int make_gap(sec_acl_buffer_t &acl, std::size_t offset, std::size_t old_size, std::size_t new_size,
              const char *function) {
     const auto length = static_cast<std::size_t>(acl.length);
@@ -88,7 +86,8 @@ int make_gap(sec_acl_buffer_t &acl, std::size_t offset, std::size_t old_size, st
     return SEC_S_OK;
 }
 
-// Gives back the memory that a buffer shrank by. False leaves the buffer sound, with more memory than it needs.
+// Gives back the memory that a buffer shrank by. False leaves the buffer sound, with more memory than it
+// needs.
 bool give_back(sec_acl_buffer_t &acl) {
     void *shrunk = std::realloc(acl.data, static_cast<std::size_t>(acl.length));
     if (shrunk == nullptr)
@@ -120,7 +119,7 @@ int find(const sec_acl_buffer_t &acl, const sec_acle_t &acle, stored_subacl &out
     out.offset = static_cast<std::size_t>(acl.length) - bytes.size();
     // The bytes that the edit replaces must all be there.
     if (!format::read(reader, out.head) || out.head.length > bytes.size())
-        return corrupt(__LINE__);
+        return qz::report_corrupt(__LINE__);
     return SEC_S_OK;
 }
 
@@ -204,8 +203,8 @@ bool find_packed(qz::byte_span subacl, const format::subacl &head, const char *i
     return reader.left() == 0;
 }
 
-// Traces show each entry of the tree that the plain way makes. And an identity that lies in the buffer itself, as the
-// ones that handlers are shown do, would move while it is being added.
+// Traces show each entry of the tree that the plain way makes. And an identity that lies in the buffer
+// itself, as the ones that handlers are shown do, would move while it is being added.
 bool may_edit_packed(const sec_acle_t &acle, const sec_acl_buffer_t &acl) {
     const qz::byte_span bytes = format::bytes_of(acl);
     const auto place =
@@ -280,7 +279,8 @@ int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_suba
     if (compiled.length == 0)
         return qz::report(SEC_S_INTERNAL, qz::msg::internal_failure, qz::acl_source, __LINE__,
                           SEC_S_INTERNAL);
-    // Entries with equal identities may have become one; an entry that was added is no failure for want of less memory.
+    // Entries with equal identities may have become one; an entry that was added is no failure for want of
+    // less memory.
     const std::int32_t old_length = acl.length;
     const int spliced = splice(compiled, stored, add_function, acl);
     if (spliced == SEC_S_OK && acl.length < old_length)
@@ -318,12 +318,11 @@ int add_checked(const sec_acle_t *acle, int report_duplicates, sec_acl_buffer_t 
     std::memcpy(memory.get(), format::empty_acl, format::header_size);
     sec_acl_buffer_t made = {format::header_size, memory.release()};
     const int result = add_to_buffer(*acle, report_duplicates, made);
-    if (result == SEC_S_OK)
-        *acl = made;
-    else
+    if (result != SEC_S_OK) {
         std::free(made.data);
-    if (result != SEC_S_OK)
-        *acl = {};
+        made = {};
+    }
+    *acl = made;
     return result;
 }
 

@@ -53,7 +53,8 @@ using owned_acle = std::unique_ptr<sec_acle_t, release_acle>;
 
 } // namespace qz
 
-// Records the trace points of releasing an entry, which may be null: also for entries that others hold memory for.
+// Records the trace points of releasing an entry, which may be null: also for entries that others hold memory
+// for.
 void sec__trace_release(const sec_acle_t *acle);
 
 // Makes an entry whose arguments were checked by the caller: a mechanism of at most 16 bytes for types 4 and

@@ -18,8 +18,6 @@ namespace format = qz::format;
 
 constexpr unsigned type_bits = 0x1f;
 
-int corrupt(int line) { return qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupted, qz::acl_source, line); }
-
 int check_buffer(const sec_acl_buffer_t &acl) {
     const qz::byte_span bytes = format::bytes_of(acl);
     if (bytes.size() < format::order_offset || bytes[0] != format::buffer_type ||
@@ -27,7 +25,7 @@ int check_buffer(const sec_acl_buffer_t &acl) {
         return qz::report(SEC_S_BAD_ACL, qz::msg::not_an_acl_buffer);
     if (bytes.size() > format::order_offset && bytes[format::order_offset] != format::host_order)
         return qz::report(SEC_S_BAD_ACL, qz::msg::wrong_byte_order);
-    return bytes.size() < format::header_size ? corrupt(__LINE__) : SEC_S_OK;
+    return bytes.size() < format::header_size ? qz::report_corrupt(__LINE__) : SEC_S_OK;
 }
 
 // Looks up the sub-ACL and reads its header. Inline, so that the reader stays in registers.
@@ -64,7 +62,7 @@ int evaluate_single_entry(const single_request &request, const format::subacl &h
         return no_match(request, "");
     format::entry entry;
     if (!format::read(entries, entry))
-        return corrupt(__LINE__);
+        return qz::report_corrupt(__LINE__);
     mask = entry.perm_mask;
     return SEC_S_OK;
 }
@@ -76,10 +74,10 @@ int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler
     for (std::uint32_t left = head.entry_count; left != 0; --left) {
         format::entry entry;
         if (!format::read(entries, entry))
-            return corrupt(__LINE__);
+            return qz::report_corrupt(__LINE__);
         const char *identity = format::string_in(entry.identity);
         if (identity == nullptr)
-            return corrupt(__LINE__);
+            return qz::report_corrupt(__LINE__);
         const int order = handler(request.identity, identity);
         if (order == 0) {
             mask = entry.perm_mask;
@@ -92,7 +90,8 @@ int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler
     return no_match(request, request.identity);
 }
 
-// Passes by the entries that sort before the wanted identity, all but those whose order is not clear at first sight.
+// Passes by the entries that sort before the wanted identity, all but those whose order is not clear at first
+// sight.
 [[gnu::noinline]] void pass_by(const qz::wanted_identity &wanted, format::entry_walk &walk) {
     const qz::wanted_identity held_in_registers = wanted;
     format::pass_entries(walk, qz::identity_block::size, [&](const unsigned char *identity) {
@@ -127,7 +126,7 @@ int evaluate_user(const single_request &request, const format::subacl &head, qz:
         mask = entry.perm_mask;
         return SEC_S_OK;
     case qz::identity_order::unknown:
-        return corrupt(__LINE__);
+        return qz::report_corrupt(__LINE__);
     default:
         return no_match(request, request.identity);
     }
@@ -194,7 +193,7 @@ public:
             format::entry entry;
             const auto order = compare_next(qz::wanted_identity(names_[index]), walk, entry);
             if (order == qz::identity_order::unknown)
-                return corrupt(__LINE__);
+                return qz::report_corrupt(__LINE__);
             if (order == qz::identity_order::same) {
                 mask |= entry.perm_mask;
                 is_found = true;

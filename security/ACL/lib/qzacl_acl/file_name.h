@@ -4,6 +4,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <sys/stat.h>
 
 namespace qz {
 
@@ -12,6 +13,12 @@ inline constexpr std::size_t path_max = 4096;
 
 struct path_buffer {
     char text[path_max + 1] = {};
+};
+
+// A file that was found and vetted by its name; whatever is opened later must still be this one.
+struct vetted_file {
+    path_buffer path;
+    struct stat status = {};
 };
 
 } // namespace qz

@@ -27,21 +27,19 @@ bool is_acl(const sec_acl_buffer_t &acl) {
     return bytes.size() > 1 && bytes[0] == format::buffer_type && bytes[1] == format::buffer_version;
 }
 
-int corrupt(int line) { return qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupted, qz::acl_source, line); }
-
 // Lists the sub-ACLs that are wanted, in the order in which they stand.
 template <class Wanted>
 int append_all(const sec_acl_buffer_t &acl, sec_aclelist_t &list, const Wanted &is_wanted) {
     const qz::byte_span bytes = format::bytes_of(acl);
     if (bytes.size() < format::header_size)
-        return bytes.empty() ? SEC_S_OK : corrupt(__LINE__);
+        return bytes.empty() ? SEC_S_OK : qz::report_corrupt(__LINE__);
     format::subacl_walk walk(bytes);
     for (;;) {
         switch (walk.next()) {
         case format::subacl_walk::step::end:
             return SEC_S_OK;
         case format::subacl_walk::step::corrupt:
-            return corrupt(__LINE__);
+            return qz::report_corrupt(__LINE__);
         case format::subacl_walk::step::found:
             break;
         }

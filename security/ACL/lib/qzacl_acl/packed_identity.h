@@ -27,8 +27,8 @@ public:
     explicit identity_block(const unsigned char *bytes)
         : identity_block(_mm_loadu_si128(reinterpret_cast<const __m128i *>(bytes))) {}
 
-    // The block of a string, padded with NULs. It is put together in registers: to read sixteen bytes right after
-    // fewer were stored would stall a decision for as long as comparing some entries takes.
+    // The block of a string, padded with NULs. It is put together in registers: to read sixteen bytes right
+    // after fewer were stored would stall a decision for as long as comparing some entries takes.
     static identity_block of_string(const char *text) {
         const std::size_t length = strnlen(text, size);
         std::uint64_t low = 0;

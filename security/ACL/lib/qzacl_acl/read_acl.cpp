@@ -17,16 +17,6 @@ namespace {
 
 constexpr mode_t permission_bits = 07777;
 
-struct vetted_file {
-    qz::path_buffer path;
-    struct stat status = {};
-};
-
-struct file_bytes {
-    qz::owned<char> data;
-    std::size_t length = 0;
-};
-
 // One call's work: from the arguments to the buffer and the flags that the caller gets.
 class acl_file_reader {
 public:
@@ -44,10 +34,10 @@ private:
     int vet(const char *aclfname);
     bool cache_is_current();
     bool read_cache(sec_acl_buffer_t &out);
-    int open_and_read(const vetted_file &file, file_bytes &bytes) const;
+    int open_and_read(const qz::vetted_file &file, qz::file_bytes &bytes) const;
     int read_text(sec_acl_buffer_t &out);
-    int parse(file_bytes &text, sec_acl_buffer_t &out);
-    int parse_lines(file_bytes &text, sec_acltree_array &trees);
+    int parse(qz::file_bytes &text, sec_acl_buffer_t &out);
+    int parse_lines(qz::file_bytes &text, sec_acltree_array &trees);
     bool reads_text() const { return (flags_ & SEC_READ_ACL_TEXT) != 0; }
 
     const char *username_;
@@ -56,8 +46,8 @@ private:
     std::uint32_t line_ = 1;
     unsigned perf_level_;
     std::uint64_t start_;
-    vetted_file acl_;
-    vetted_file cache_;
+    qz::vetted_file acl_;
+    qz::vetted_file cache_;
 };
 
 int acl_file_reader::vet(const char *aclfname) {
@@ -104,8 +94,7 @@ bool acl_file_reader::cache_is_current() {
     return true;
 }
 
-int acl_file_reader::open_and_read(const vetted_file &file, file_bytes &bytes) const {
-    constexpr int lock_for_reading = 1;
+int acl_file_reader::open_and_read(const qz::vetted_file &file, qz::file_bytes &bytes) const {
     const char *path = file.path.text;
     if (qz::traces(qz::trace_category::info))
         qz::trace_data(121, qz::item(path));
@@ -119,12 +108,7 @@ int acl_file_reader::open_and_read(const vetted_file &file, file_bytes &bytes) c
     }
     if (perf_level_ == 2)
         qz::trace_elapsed(4, start, qz::item(path));
-    int result = acl__lock_acl_file(path, opened.get(), lock_for_reading);
-    if (result == 0) {
-        char *data = nullptr;
-        result = acl__read_acl_file(path, opened.get(), &data, &bytes.length);
-        bytes.data.reset(data);
-    }
+    const int result = qz::lock_and_read(path, opened, bytes);
     opened.close();
     if (perf_level_ == 1)
         qz::trace_elapsed(2, start, qz::item(path));
@@ -133,7 +117,7 @@ int acl_file_reader::open_and_read(const vetted_file &file, file_bytes &bytes) c
 
 // Takes the buffer from the cache. False, with nothing recorded, when anything about it is wrong.
 bool acl_file_reader::read_cache(sec_acl_buffer_t &out) {
-    file_bytes bytes;
+    qz::file_bytes bytes;
     int result = open_and_read(cache_, bytes);
     if (result == SEC_S_OK && (bytes.length == 0 || bytes.length > INT32_MAX))
         return false;
@@ -149,7 +133,7 @@ bool acl_file_reader::read_cache(sec_acl_buffer_t &out) {
     return true;
 }
 
-int acl_file_reader::parse_lines(file_bytes &text, sec_acltree_array &trees) {
+int acl_file_reader::parse_lines(qz::file_bytes &text, sec_acltree_array &trees) {
     constexpr int line_consumed = 1;
     constexpr unsigned every_entry = 7; // the Info level above which each line is traced
     const bool traces_lines = qz::trace_level(qz::trace_category::info) > every_entry;
@@ -172,7 +156,7 @@ int acl_file_reader::parse_lines(file_bytes &text, sec_acltree_array &trees) {
     }
 }
 
-int acl_file_reader::parse(file_bytes &text, sec_acl_buffer_t &out) {
+int acl_file_reader::parse(qz::file_bytes &text, sec_acl_buffer_t &out) {
     const std::uint64_t start = perf_level_ == 1 ? qz::read_counter() : 0;
     flags_ &= ~std::uint32_t{SEC_READ_ACL_CONVERT};
     sec_acltree_array trees;
@@ -186,7 +170,7 @@ int acl_file_reader::parse(file_bytes &text, sec_acl_buffer_t &out) {
 
 int acl_file_reader::read_text(sec_acl_buffer_t &out) {
     const qz::text_origin origin(acl_.status);
-    file_bytes text;
+    qz::file_bytes text;
     if (const int result = open_and_read(acl_, text); result != SEC_S_OK)
         return result;
     if (const int result = parse(text, out); result != SEC_S_OK)

@@ -198,7 +198,8 @@ sec_acle_t *sec_acltree::find(const char *identity) const {
                                          });
         return at != entries.end() && is_match(*at) ? *at : nullptr;
     }
-    // Deleting is one step of an edit that has read all entries before; it must not need memory to hash a name.
+    // Deleting is one step of an edit that has read all entries before; it must not need memory to hash a
+    // name.
     const auto at = std::find_if(entries.begin(), entries.end(), is_match);
     return at == entries.end() ? nullptr : *at;
 }

@@ -11,20 +11,17 @@ namespace {
 
 namespace format = qz::format;
 
-// Corrupt in a way that has no message of its own: something does not end where it should, or the bytes end
-// early.
-int corrupt(int line) { return qz::report(SEC_S_BAD_ACL, qz::msg::buffer_corrupted, qz::acl_source, line); }
-
 int report_shorter_than_header(std::int32_t length, int line) {
     return qz::report(SEC_S_BAD_ACL, qz::msg::shorter_than_header, length, qz::acl_source, line);
 }
 
 enum class field_fault : std::uint8_t { none, inexact, cut_short };
 
-// Checks that the string which starts here ends exactly with its field, and steps behind it. Bytes that are too few are
-// a fault of their own only where the string does not end before them either.
+// Checks that the string which starts here ends exactly with its field, and steps behind it. Bytes that are
+// too few are a fault of their own only where the string does not end before them either.
 field_fault skip_exact_string(qz::byte_reader &reader, std::size_t length) {
-    // Most strings end within the first block, and a call for each would cost more than all the rest of the walk.
+    // Most strings end within the first block, and a call for each would cost more than all the rest of the
+    // walk.
     if (reader.left() >= qz::identity_block::size) {
         const std::size_t size = std::size_t{qz::nul_in_block(reader.position())} + 1;
         if (size <= qz::identity_block::size) {
@@ -45,8 +42,8 @@ field_fault skip_exact_string(qz::byte_reader &reader, std::size_t length) {
     return field_fault::none;
 }
 
-// A mechanism that does not end with its field, shown up to the first NUL that follows; where none does, as much of what
-// is left as a mechanism's field can hold.
+// A mechanism that does not end with its field, shown up to the first NUL that follows; where none does, as
+// much of what is left as a mechanism's field can hold.
 int report_bad_mechanism(qz::byte_reader at_mechanism, int line) {
     const qz::byte_span left(at_mechanism.position(), at_mechanism.left());
     char cut[256] = {};
@@ -75,7 +72,7 @@ int check_mechanism(qz::byte_reader &reader, format::subacl &head) {
                           __LINE__);
     switch (skip_exact_string(reader, head.mechanism_length)) {
     case field_fault::cut_short:
-        return corrupt(__LINE__);
+        return qz::report_corrupt(__LINE__);
     case field_fault::inexact:
         return report_bad_mechanism(reader, __LINE__);
     case field_fault::none:
@@ -89,7 +86,7 @@ int check_entry(qz::byte_reader &reader, std::uint8_t type) {
     format::entry entry;
     std::uint16_t identity_length = 0;
     if (!format::read_fixed_part(reader, entry, identity_length))
-        return corrupt(__LINE__);
+        return qz::report_corrupt(__LINE__);
     if (entry.version != format::entry_version)
         return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_version_unsupported, entry.version, qz::acl_source,
                           __LINE__);
@@ -99,7 +96,7 @@ int check_entry(qz::byte_reader &reader, std::uint8_t type) {
                    : qz::report(SEC_S_BAD_ACLE, qz::msg::unexpected_identity, qz::acl_source, __LINE__);
     switch (skip_exact_string(reader, identity_length)) {
     case field_fault::cut_short:
-        return corrupt(__LINE__);
+        return qz::report_corrupt(__LINE__);
     case field_fault::inexact:
         return qz::report(SEC_S_BAD_ACLE, qz::msg::bad_identity_length, qz::acl_source, __LINE__);
     case field_fault::none:
@@ -139,23 +136,23 @@ int convert(std::span<unsigned char> bytes) {
     qz::byte_swapper swapper(bytes);
     std::uint16_t subacl_count = 0;
     if (!swapper.skip(format::count_offset) || !swapper.swap(subacl_count))
-        return corrupt(__LINE__);
+        return qz::report_corrupt(__LINE__);
     expected_end end;
     for (; subacl_count != 0; --subacl_count) {
         if (!end.is_at(swapper.position()))
-            return corrupt(__LINE__);
+            return qz::report_corrupt(__LINE__);
         const unsigned char *start = swapper.position();
         format::subacl head;
         if (!swapper.swap(head.length) || !swapper.byte(head.type) || !swapper.swap(head.entry_count) ||
             !swapper.byte(head.mechanism_length) || !swapper.skip(head.mechanism_length))
-            return corrupt(__LINE__);
+            return qz::report_corrupt(__LINE__);
         end.set(start, head.length);
         for (std::uint32_t left = head.entry_count; left != 0; --left) {
             format::entry entry;
             std::uint16_t identity_length = 0;
             if (!swapper.byte(entry.version) || !swapper.swap(entry.perm_mask) ||
                 !swapper.swap(identity_length) || !swapper.skip(identity_length))
-                return corrupt(__LINE__);
+                return qz::report_corrupt(__LINE__);
         }
     }
     qz::store_field(bytes, format::order_offset, format::host_order);
@@ -177,7 +174,7 @@ int convert_checked(int check, sec_acl_buffer_t *acl) {
         version != format::buffer_version)
         return qz::report(SEC_S_BAD_ACL, qz::msg::not_an_acl_buffer);
     if (!reader.field(order))
-        return check != 0 ? report_shorter_than_header(acl->length, __LINE__) : corrupt(__LINE__);
+        return check != 0 ? report_shorter_than_header(acl->length, __LINE__) : qz::report_corrupt(__LINE__);
 
     if (order == format::host_order) {
         if (qz::traces(qz::trace_category::info))
@@ -203,11 +200,11 @@ int sec__check_acl_buffer(const sec_acl_buffer_t *acl) {
     expected_end end;
     for (unsigned left = header.subacl_count; left != 0; --left) {
         if (!end.is_at(reader.position()))
-            return corrupt(__LINE__);
+            return qz::report_corrupt(__LINE__);
         const unsigned char *start = reader.position();
         format::subacl head;
         if (!format::read_fixed_part(reader, head))
-            return corrupt(__LINE__);
+            return qz::report_corrupt(__LINE__);
         end.set(start, head.length);
         if (const int fault = check_mechanism(reader, head); fault != SEC_S_OK)
             return fault;
