@@ -142,29 +142,31 @@ struct entry_walk {
     std::uint32_t left = 0;
 };
 
-// Steps over entries while `passes` says so of the first `readable` bytes of their identities. Stops as well
-// before an entry that ends the buffer too early, whose field does not end in NUL, or that has fewer bytes
-// behind it than are asked for: those are left to the checked reader. This is the loop that a decision spends
-// its time in, so each step makes do with one test for where the bytes end and one for the field.
+// Steps over entries while `passes` says so of their version and identity, of which `readable` bytes may be read
+// even if it is shorter. Stops as well before an entry that ends the buffer too early, whose field does not end
+// in NUL, or that has fewer bytes behind it than the next would need: those are left to the checked reader. This
+// is the loop that a decision spends its time in, so each step makes do with one test for where the bytes end
+// and one for the field.
 template <class Passes>
 void pass_entries(entry_walk &walk, std::size_t readable, const Passes &passes) {
-    const unsigned char *const start = walk.entries.position();
-    const std::size_t size = walk.entries.left();
-    if (size < entry_fixed_size + readable)
+    const std::size_t needed = entry_fixed_size + readable;
+    if (walk.entries.left() < needed)
         return;
-    const unsigned char *const end = start + size;
-    const unsigned char *const last = end - (entry_fixed_size + readable);
+    const unsigned char *const start = walk.entries.position();
+    const std::uintptr_t last = reinterpret_cast<std::uintptr_t>(start) + walk.entries.left() - needed;
     const unsigned char *at = start;
     std::uint32_t left = walk.left;
-    for (; left != 0 && at <= last; --left) {
+    for (; left != 0; --left) {
         std::uint16_t length = 0;
         std::memcpy(&length, at + entry_length_offset, sizeof length);
-        const unsigned char *identity = at + entry_fixed_size;
-        // A length of 0 wraps around and is beyond any end.
-        const std::size_t nul = std::size_t{length} - 1;
-        if (nul >= static_cast<std::size_t>(end - identity) || identity[nul] != '\0' || !passes(identity))
+        const unsigned char *const identity = at + entry_fixed_size;
+        const std::size_t size = length;
+        if (size == 0 || reinterpret_cast<std::uintptr_t>(identity) + size > last ||
+            identity[size - 1] != '\0')
             break;
-        at = identity + length;
+        if (!passes(*at, byte_span(identity, size)))
+            break;
+        at = identity + size;
     }
     walk.entries.skip(static_cast<std::size_t>(at - start));
     walk.left = left;

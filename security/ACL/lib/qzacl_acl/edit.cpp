@@ -129,42 +129,42 @@ struct packed_place {
     std::size_t size = 0;   // of the entry found there, 0 when the identity is not among them
 };
 
-// A packed identity beside its first bytes.
-struct packed_identity {
-    qz::byte_span field;
-    qz::identity_block block;
-
-    bool is_exact_string() const {
-        if (block.nul_at() < qz::identity_block::size)
-            return block.nul_at() + 1 == field.size();
-        return format::holds_exact_string(field);
-    }
-
-    bool sorts_before(const packed_identity &other) const {
-        // Only bytes up to the NUL count; behind it stand other fields.
-        const std::size_t place = block.lower_at(other.block);
-        if (place < qz::identity_block::size && place < field.size())
-            return true;
-        return cu_strcasecmp_posix_1(format::string_in(field), format::string_in(other.field)) < 0;
-    }
-};
-
-// The block of a field close to the end of the buffer, with what follows it taken as NULs.
-qz::identity_block block_of(qz::byte_span field, std::size_t left_behind) {
-    if (field.size() + left_behind >= qz::identity_block::size)
-        return qz::identity_block(field.data());
-    unsigned char padded[qz::identity_block::size] = {};
-    if (!field.empty())
-        std::memcpy(padded, field.data(), field.size());
-    return qz::identity_block(padded);
-}
-
 bool has_sorted_form(const format::subacl &head) {
     if (head.entry_count == 0)
         return false;
     if (head.type == SEC_ACLE_USER)
         return format::holds_exact_string(head.mechanism) && head.mechanism.size() <= qz::mechanism_max + 1;
     return head.type == SEC_ACLE_GROUP && head.mechanism_length == 0;
+}
+
+// Passes by entries that are clearly what compiling gives, each behind the one before it: up to where the wanted
+// identity may stand, or all of them once its place is known. `previous` is the identity before the next entry.
+void pass_ascending(const qz::wanted_identity &wanted, bool is_placed, qz::byte_span &previous,
+                    format::entry_walk &walk) {
+    constexpr std::size_t block_size = qz::identity_block::size;
+    if (walk.left == 0 || previous.size() + walk.entries.left() < block_size)
+        return;
+    const qz::wanted_identity held_in_registers = wanted;
+    qz::identity_block before(previous.data());
+    std::size_t before_size = previous.size();
+    const unsigned char *last = previous.data();
+    format::pass_entries(walk, block_size, [&](std::uint8_t version, qz::byte_span identity) {
+        const qz::identity_block block(identity.data());
+        const std::size_t nul = block.nul_at();
+        const bool is_exact =
+            nul < block_size ? nul + 1 == identity.size() : format::holds_exact_string(identity);
+        // Behind the NUL of the one before stand other fields, which say nothing of the order.
+        if (version != format::entry_version || !is_exact || !before.sorts_before(block) ||
+            before.differs_at(block) >= before_size)
+            return false;
+        if (!is_placed && !held_in_registers.is_clearly_behind(block))
+            return false;
+        before = block;
+        before_size = identity.size();
+        last = identity.data();
+        return true;
+    });
+    previous = {last, before_size};
 }
 
 // Looks for an identity in a user or group sub-ACL. False unless the bytes are exactly what compiling a tree
@@ -174,33 +174,35 @@ bool find_packed(qz::byte_span subacl, const format::subacl &head, const char *i
     if (!has_sorted_form(head))
         return false;
     const qz::wanted_identity wanted(identity);
-    qz::byte_reader reader(subacl);
-    if (!reader.skip(format::subacl_header_size + head.mechanism_length))
+    format::entry_walk walk{qz::byte_reader(subacl), head.entry_count};
+    if (!walk.entries.skip(format::subacl_header_size + head.mechanism_length))
         return false;
-    packed_identity previous = {{}, block_of({}, 0)};
+    qz::byte_span previous;
     bool is_placed = false;
-    for (std::uint32_t left = head.entry_count; left != 0; --left) {
-        const std::size_t offset = subacl.size() - reader.left();
+    while (walk.left != 0) {
+        const std::size_t offset = subacl.size() - walk.entries.left();
         format::entry entry;
-        if (!format::read(reader, entry) || entry.version != format::entry_version || entry.identity.empty())
+        if (!format::read(walk.entries, entry) || entry.version != format::entry_version ||
+            !format::holds_exact_string(entry.identity))
             return false;
-        const packed_identity held = {entry.identity, block_of(entry.identity, reader.left())};
-        if (!held.is_exact_string() || (!previous.field.empty() && !previous.sorts_before(held)))
+        if (!previous.empty() &&
+            qz::fold_compare(format::string_in(previous), format::string_in(entry.identity)) >= 0)
             return false;
-        previous = held;
-        if (is_placed || wanted.is_clearly_behind(held.block))
-            continue;
-        const qz::identity_order order = wanted.compare(entry.identity);
+        const qz::identity_order order =
+            is_placed ? qz::identity_order::behind : wanted.compare(entry.identity);
         if (order != qz::identity_order::behind) {
             is_placed = true;
-            place.offset = offset;
-            place.size =
-                order == qz::identity_order::same ? format::entry_fixed_size + entry.identity.size() : 0;
+            place = {offset, order == qz::identity_order::same
+                                 ? format::entry_fixed_size + entry.identity.size()
+                                 : 0};
         }
+        previous = entry.identity;
+        --walk.left;
+        pass_ascending(wanted, is_placed, previous, walk);
     }
     if (!is_placed)
-        place = {subacl.size() - reader.left(), 0};
-    return reader.left() == 0;
+        place = {subacl.size() - walk.entries.left(), 0};
+    return walk.entries.left() == 0;
 }
 
 // Traces show each entry of the tree that the plain way makes. And an identity that lies in the buffer

@@ -94,8 +94,8 @@ int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler
 // sight.
 [[gnu::noinline]] void pass_by(const qz::wanted_identity &wanted, format::entry_walk &walk) {
     const qz::wanted_identity held_in_registers = wanted;
-    format::pass_entries(walk, qz::identity_block::size, [&](const unsigned char *identity) {
-        return held_in_registers.is_clearly_behind(qz::identity_block(identity));
+    format::pass_entries(walk, qz::identity_block::size, [&](std::uint8_t, qz::byte_span identity) {
+        return held_in_registers.is_clearly_behind(qz::identity_block(identity.data()));
     });
 }
 

@@ -46,24 +46,22 @@ public:
         return identity_block(_mm_set_epi64x(static_cast<long long>(high), static_cast<long long>(low)));
     }
 
-    // The place of the first byte that differs, where that byte sorts before the other's; else at least
-    // `size`.
-    unsigned lower_at(const identity_block &other) const {
-        const unsigned equal = mask_of(_mm_cmpeq_epi8(bytes_, other.bytes_));
-        const unsigned not_above = mask_of(_mm_cmpeq_epi8(_mm_min_epu8(bytes_, other.bytes_), bytes_));
-        // Adding one carries through the equal bytes to the first that differs.
-        return static_cast<unsigned>(std::countr_zero((equal + 1) & ~equal & not_above & 0xffff));
-    }
+    // The two halves as numbers of which the lesser is that of the string that sorts first.
+    std::uint64_t first() const { return ordered(_mm_cvtsi128_si64(bytes_)); }
+    std::uint64_t second() const { return ordered(_mm_cvtsi128_si64(_mm_unpackhi_epi64(bytes_, bytes_))); }
 
     // The place of the first NUL; at least `size` where there is none.
     unsigned nul_at() const {
-        return static_cast<unsigned>(std::countr_zero(mask_of(_mm_cmpeq_epi8(bytes_, _mm_setzero_si128()))));
+        const int nuls = _mm_movemask_epi8(_mm_cmpeq_epi8(bytes_, _mm_setzero_si128()));
+        return static_cast<unsigned>(std::countr_zero(static_cast<unsigned>(nuls)));
     }
 
 private:
     explicit identity_block(__m128i raw) {
-        const __m128i is_upper = _mm_and_si128(_mm_cmpgt_epi8(raw, _mm_set1_epi8('A' - 1)),
-                                               _mm_cmplt_epi8(raw, _mm_set1_epi8('Z' + 1)));
+        // Moved to where 'A' is the least of all signed values, the letters are those below a limit.
+        constexpr int least = -128;
+        const __m128i moved = _mm_add_epi8(raw, _mm_set1_epi8(static_cast<char>(least - 'A')));
+        const __m128i is_upper = _mm_cmplt_epi8(moved, _mm_set1_epi8(least + 26));
         bytes_ = _mm_or_si128(raw, _mm_and_si128(is_upper, _mm_set1_epi8('a' - 'A')));
     }
 
@@ -73,13 +71,16 @@ private:
         return word;
     }
 
-    static unsigned mask_of(__m128i bytes) { return static_cast<unsigned>(_mm_movemask_epi8(bytes)); }
+    static std::uint64_t ordered(long long word) {
+        return __builtin_bswap64(static_cast<std::uint64_t>(word));
+    }
 
     __m128i bytes_;
 #else
     explicit identity_block(const unsigned char *bytes) {
-        for (std::size_t index = 0; index < size; ++index)
-            bytes_[index] = fold(bytes[index]);
+        const char *at = reinterpret_cast<const char *>(bytes);
+        words_[0] = fold8(load8(at));
+        words_[1] = fold8(load8(at + 8));
     }
 
     static identity_block of_string(const char *text) {
@@ -88,22 +89,39 @@ private:
         return identity_block(padded);
     }
 
-    unsigned lower_at(const identity_block &other) const {
-        unsigned at = 0;
-        while (at < size && bytes_[at] == other.bytes_[at])
-            ++at;
-        return at < size && bytes_[at] < other.bytes_[at] ? at : unsigned{size};
-    }
+    std::uint64_t first() const { return ordered(words_[0]); }
+    std::uint64_t second() const { return ordered(words_[1]); }
 
     unsigned nul_at() const {
-        const void *nul = std::memchr(bytes_, '\0', size);
-        return nul == nullptr ? unsigned{size}
-                              : static_cast<unsigned>(static_cast<const unsigned char *>(nul) - bytes_);
+        unsigned char bytes[size];
+        std::memcpy(bytes, words_, size);
+        return static_cast<unsigned>(std::find(bytes, bytes + size, 0) - bytes);
     }
 
 private:
-    unsigned char bytes_[size];
+    static std::uint64_t ordered(std::uint64_t word) {
+        return std::endian::native == std::endian::little ? __builtin_bswap64(word) : word;
+    }
+
+    std::uint64_t words_[2];
 #endif
+
+public:
+    bool sorts_before(const identity_block &other) const {
+        const std::uint64_t mine = first();
+        const std::uint64_t others = other.first();
+        if (mine == others)
+            return second() < other.second();
+        return mine < others;
+    }
+
+    // The place of the first byte that differs; `size` where all are equal.
+    unsigned differs_at(const identity_block &other) const {
+        const std::uint64_t front = first() ^ other.first();
+        if (front != 0)
+            return static_cast<unsigned>(std::countl_zero(front)) / 8;
+        return 8 + static_cast<unsigned>(std::countl_zero(second() ^ other.second())) / 8;
+    }
 };
 
 // The place of the first NUL among the sixteen bytes of a block; at least sixteen where there is none.
@@ -134,9 +152,7 @@ public:
     // field, of which the last byte is NUL, and `block` its start: what stands behind that NUL takes no part,
     // as the wanted identity differs before, or ends there too and is padded with bytes that nothing sorts
     // before.
-    bool is_clearly_behind(const identity_block &block) const {
-        return block.lower_at(block_) < identity_block::size;
-    }
+    bool is_clearly_behind(const identity_block &block) const { return block.sorts_before(block_); }
 
     identity_order compare(byte_span stored) const {
         for (std::size_t index = 0; index < stored.size(); ++index) {

@@ -20,17 +20,6 @@ enum class field_fault : std::uint8_t { none, inexact, cut_short };
 // Checks that the string which starts here ends exactly with its field, and steps behind it. Bytes that are
 // too few are a fault of their own only where the string does not end before them either.
 field_fault skip_exact_string(qz::byte_reader &reader, std::size_t length) {
-    // Most strings end within the first block, and a call for each would cost more than all the rest of the
-    // walk.
-    if (reader.left() >= qz::identity_block::size) {
-        const std::size_t size = std::size_t{qz::nul_in_block(reader.position())} + 1;
-        if (size <= qz::identity_block::size) {
-            if (size != length)
-                return field_fault::inexact;
-            reader.skip(size);
-            return field_fault::none;
-        }
-    }
     const void *nul = reader.left() == 0 ? nullptr : std::memchr(reader.position(), '\0', reader.left());
     if (nul == nullptr)
         return length > reader.left() ? field_fault::cut_short : field_fault::inexact;
@@ -105,15 +94,29 @@ int check_entry(qz::byte_reader &reader, std::uint8_t type) {
     return SEC_S_OK;
 }
 
+// Passes by sound entries with identities, save for those close to the end.
+void pass_sound_entries(format::entry_walk &walk) {
+    format::pass_entries(walk, qz::identity_block::size, [](std::uint8_t version, qz::byte_span identity) {
+        const std::size_t nul = qz::nul_in_block(identity.data());
+        return version == format::entry_version &&
+               (nul < qz::identity_block::size ? nul + 1 == identity.size()
+                                               : format::holds_exact_string(identity));
+    });
+}
+
 // Checks the entries of one sub-ACL. A faulty one ends its walk, with the reader standing before it.
 int check_entries(qz::byte_reader &reader, const format::subacl &head) {
-    for (std::uint32_t left = head.entry_count; left != 0; --left) {
-        qz::byte_reader next = reader;
-        if (const int result = check_entry(next, head.type); result != SEC_S_OK)
+    format::entry_walk walk{reader, head.entry_count};
+    for (;;) {
+        if (qz::has_identity(head.type))
+            pass_sound_entries(walk);
+        reader = walk.entries;
+        if (walk.left == 0)
+            return SEC_S_OK;
+        if (const int result = check_entry(walk.entries, head.type); result != SEC_S_OK)
             return result;
-        reader = next;
+        --walk.left;
     }
-    return SEC_S_OK;
 }
 
 // Where a sub-ACL's length says that it ends, against where the walk arrived.
