@@ -5,10 +5,11 @@ import errno
 import json
 import os
 import pathlib
+import subprocess
 import sys
 import unittest
 
-from command_test import IS_ROOT, TEXTS, CommandCase, entry, message
+from command_test import BUILD, IS_ROOT, TEXTS, CommandCase, entry, message
 
 ENTRIES = "# n\nn r\nU UNIX alice wr\ng staff q\n"
 LONG_LINES = "n" + " " * 1200 + "\nn\n" + "o" + " " * 1200
@@ -47,6 +48,36 @@ RECORDS = [  # levels, options, file text, and each record: its id and its items
 ]
 
 
+RESULT, REFUSED = number(0), number(43)
+EDIT = (WIDE, number(4), number(3), "kRb", "Bob", WIDE, number(75), WIDE)
+EDIT_AGAIN = EDIT[:6] + (number(100), WIDE)
+SHARED = (WIDE, number(182), WIDE)
+# What each public operation, called as operations_test does, leaves at the level of arguments and results.
+OPERATIONS = [
+    (11, None, "", WIDE, number(6), WIDE), (14, RESULT, number(4)),
+    (17, number(75), WIDE, WIDE), (19, RESULT),
+    (57, number(1), WIDE, number(75), WIDE), (59, RESULT),
+    (72, WIDE, number(5), WIDE), (73,),
+    (93, "wr", WIDE, WIDE), (96, RESULT, number(3)),
+    (99, number(3), WIDE, ""), (102, RESULT, "rw"),
+    (42, number(4), number(3), "kRb", "Bob", WIDE), (44, RESULT),
+    (51, WIDE, number(4), number(3), "kRb", "Bob", WIDE, WIDE), (54, RESULT, "kRb", "Bob"),
+    (62, *EDIT), (64, RESULT), (62, *EDIT_AGAIN), (64, REFUSED),
+    (24, number(100), WIDE, WIDE), (27, RESULT, number(4)), (38, WIDE, number(4)), (39,),
+    (32, number(100), WIDE, number(4), "krb", WIDE), (35, RESULT, number(1)), (38, WIDE, number(1)), (39,),
+    (67, *EDIT_AGAIN), (69, RESULT),
+    (76, number(1), "kRb5", WIDE), (78, RESULT),
+    (81, *SHARED, number(4), "unix", "AL", WIDE), (84, RESULT, number(1)),
+    (81, *SHARED, number(8), "krb5", "apple", WIDE), (84, RESULT, number(5)),
+    (81, *SHARED, number(4), "unix", "nobody", WIDE), (83, REFUSED),
+    (87, *SHARED, number(3), WIDE, WIDE), (90, RESULT, number(0x13)),
+    (72, WIDE, number(75), WIDE), (73,), (72, WIDE, number(75), WIDE), (73,),
+]
+# The bare numbers of entry and exit of the same calls.
+BARE = [9, 12, 15, 18, 55, 58, 70, 73, 91, 94, 97, 100, 40, 43, 49, 52, 60, 63, 60, 63, 20, 25, 36, 39, 28, 33, 36, 39,
+        65, 68, 74, 77, 79, 82, 79, 82, 79, 82, 85, 88, 70, 73, 70, 73]
+
+
 class Trace(CommandCase):
     def traced(self, levels, options, status, errors, makes=()):
         environment = {"QZ_TRACE_LEVELS": "_SEL:" + levels, "QZ_TRACE_FILE": self.dir + ".trace"}
@@ -64,7 +95,7 @@ class Trace(CommandCase):
             items = [bytes.fromhex(item["hex"]) for item in record["items"]]
             wanted = [item.replace("{dir}", self.dir).encode("latin-1") + b"\0" if isinstance(item, str) else item
                       for item in wanted]
-            shown = [len(item) if want == WIDE else item for item, want in zip(items, wanted)]
+            shown = [len(item) if want == WIDE else want and item for item, want in zip(items, wanted)]
             self.assertEqual((len(items), shown), (len(wanted), wanted))
 
     def test_records(self):
@@ -74,6 +105,16 @@ class Trace(CommandCase):
                 self.write("a", text)
                 self.traced(levels, options, 0, "" if options == "-s" else PRINTED[text],
                             [("a.cacl", None)] if "-s" in options else [])
+                self.expect_records(expected)
+
+    def test_every_operation(self):
+        program = [BUILD / "tests" / "operations_test", "--gtest_filter=*answer_once"]
+        releases = [(73,), (39,), (39,), (73,), (73,)]
+        for level, expected in [(1, [(bare,) for bare in BARE]), (8, OPERATIONS), (5, releases)]:
+            with self.subTest(level):
+                self.fresh()
+                subprocess.run(program, check=True, stdout=subprocess.DEVNULL, env=os.environ | {
+                    "QZ_TRACE_LEVELS": f"_SEL:API={level}", "QZ_TRACE_FILE": self.dir + ".trace"})
                 self.expect_records(expected)
 
     def test_failures_of_caching(self):

@@ -61,7 +61,7 @@ private:
         // Moved to where 'A' is the least of all signed values, the letters are those below a limit.
         constexpr int least = -128;
         const __m128i moved = _mm_add_epi8(raw, _mm_set1_epi8(static_cast<char>(least - 'A')));
-        const __m128i is_upper = _mm_cmplt_epi8(moved, _mm_set1_epi8(least + 26));
+        const __m128i is_upper = _mm_cmplt_epi8(moved, _mm_set1_epi8(static_cast<char>(least + 26)));
         bytes_ = _mm_or_si128(raw, _mm_and_si128(is_upper, _mm_set1_epi8('a' - 'A')));
     }
 

@@ -1,0 +1,97 @@
+// Every public operation, as a service that uses all of the library would call it: once, so that trace_test can
+// read what that leaves, and from many threads at once.
+#include "service_support.h"
+#include <cstdio>
+#include <fcntl.h>
+#include <fstream>
+#include <thread>
+#include <unistd.h>
+
+namespace {
+
+using namespace support;
+
+int prefix_matches(const char *requested, const char *entry) {
+    return std::strncmp(requested, entry, std::strlen(entry));
+}
+
+struct note { // made with braces, which evaluate from left to right
+    explicit note(std::vector<std::string> &found, auto... values) {
+        std::ostringstream line;
+        ((line << values << ' '), ...);
+        found.push_back(line.str());
+    }
+};
+
+// What one round through the operations came to. Each thread has files and buffers of its own, and shares one.
+std::vector<std::string> use_all(const std::string &path, const sec_acl_buffer_t &shared) {
+    std::vector<std::string> found;
+    std::uint32_t mask = 0, flags = SEC_READ_ACL_CONVERT | SEC_READ_ACL_CACHE;
+    sec_acl_buffer_t acl = {}, copy = {}, empty = {};
+    note{found, sec_read_acl_file(path.c_str(), nullptr, nullptr, flags, &acl, &flags), acl.length};
+    note{found, sec_read_acl_from_data(acl.length, acl.data, &copy)};
+    note{found, sec_convert_acl_to_host(1, &copy)};
+    note{found, sec_create_empty_acl(&empty), empty.length};
+    note{found, sec_release_acl(&empty)};
+
+    char letters[33] = "";
+    note{found, sec_translate_perms("wr", nullptr, &mask), mask};
+    note{found, sec_translate_bitmask(mask, nullptr, letters), letters};
+    sec_acle_t *entry = nullptr;
+    char *mechanism = nullptr, *identity = nullptr;
+    note{found, sec_create_acle(SEC_ACLE_USER, mask, "kRb", "Bob", &entry)};
+    note{found, sec_display_acle_id(entry, &mechanism, &identity), mechanism, identity};
+    std::free(mechanism);
+    std::free(identity);
+    note{found, sec_add_acle_to_acl(entry, &copy), copy.length};
+    note{found, sec_add_acle_to_acl2(entry, &copy), copy.length};
+    sec_aclelist_t list = {};
+    note{found, sec_list_acl(&copy, &list), list.count};
+    sec_release_aclelist(&list);
+    note{found, sec_list_acl_by_type(&copy, SEC_ACLE_USER, "krb", &list), list.count,
+         list.count ? list.acles[0]->identity : ""};
+    sec_release_aclelist(&list);
+    note{found, sec_del_acle_from_acl(entry, &copy), copy.length};
+    sec_release_acle(entry);
+
+    note{found, sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "kRb5", prefix_matches)};
+    note{found, sec__single_acle_perm(&shared, SEC_ACLE_USER, "unix", nullptr, "AL", &mask), mask};
+    note{found, sec__single_acle_perm(&shared, SEC_ACLE_EXPANDED, "krb5", nullptr, "apple", &mask), mask};
+    note{found, sec__single_acle_perm(&shared, SEC_ACLE_USER, "unix", nullptr, "nobody", &mask), mask};
+    const sec_group_ref_t groups[] = {{1, "STAFF"}, {2, "admins"}, {3, "none"}};
+    note{found, sec__group_acles_perm(&shared, 3, groups, &mask), mask};
+    note{found, recorded_error().code};
+    sec_release_acl(&copy);
+    sec_release_acl(&acl);
+    return found;
+}
+
+// As a thread of a service would see it that is alone.
+const std::vector<std::string> expected = {"0 75 ", "0 ",         "0 ",     "0 5 ",    "0 ",    "0 3 ",     "0 rw ",
+                                           "0 ",    "0 kRb Bob ", "0 100 ", "43 100 ", "0 4 ",  "0 1 Bob ", "0 75 ",
+                                           "0 ",    "0 1 ",       "0 5 ",   "43 0 ",   "0 19 ", "0 "};
+
+TEST(operations, answer_alike_in_every_thread) {
+    const temporary_folder folder;
+    const buffer shared(rich);
+    const std::string paths[] = {folder / "a", folder / "b", folder / "c"};
+    for (const std::string &path : paths) std::ofstream(path) << "n r\nu unix alice@h rw\ng staff q\n";
+    std::vector<std::thread> threads;
+    std::vector<int> agreed(8);
+    for (std::size_t index = 0; index < agreed.size(); ++index)
+        threads.emplace_back([&, index] {
+            for (int round = 0; round < 30; ++round) agreed[index] += use_all(paths[index % 3], shared.acl) == expected;
+        });
+    for (std::thread &thread : threads) thread.join();
+    EXPECT_EQ(agreed, std::vector<int>(8, 30));
+}
+
+TEST(operations, answer_once) {
+    const temporary_folder folder;
+    const buffer shared(rich);
+    const std::string path = folder / "acl";
+    std::ofstream(path) << "n r\nu unix alice@h rw\ng staff q\n";
+    EXPECT_EQ(use_all(path, shared.acl), expected);
+}
+
+} // namespace
