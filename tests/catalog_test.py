@@ -2,6 +2,7 @@
 Usage: catalog_test.py BUILD_DIR [unittest arguments]."""
 import ctypes
 import errno
+import os
 import pathlib
 import re
 import shutil
@@ -9,7 +10,7 @@ import subprocess
 import sys
 import unittest
 
-from command_test import BUILD, TEXTS, UNKNOWN_X, CommandCase, entry, message
+from command_test import BUILD, TABLE, TEXTS, UNKNOWN_X, CommandCase, entry, message, run
 
 SOURCE = (BUILD / "share" / "qzseclib.msg").read_text("latin-1")
 TRANSLATIONS = [  # a text, its translation, arguments, status and what is then shown
@@ -21,6 +22,20 @@ TRANSLATIONS = [  # a text, its translation, arguments, status and what is then 
 REFUSED = [  # translations of text 154, on a missing file, that do not have its conversions
     "nothing", "%1$s", "%1$d %2$s", "%1$s %2$x", "%1$s %2$d %3$s", "%1$s %1$s %2$d", "%1$s %2$d %n", "%s %d",
     "%1$s %2$d %", "%1$s %2$*1$d", "%1$s %2$ld", "%1$s %2$08d", "%1$s %2$d %0$s"]
+GERMAN = (TABLE.parents[2] / "translations" / "de.msg").read_text("utf-8")
+BROKEN = [  # what stands in the German source, what in its place, and what is then said; {82}: the line of message 82
+    ("$set 1\n", "\n", '{0}: there is no "$set 1"'), ("$set 1", "$set 2", "4: every message is in set 1"),
+    ("codeset=UTF-8", "", '{81}: message 81 is not ASCII, and no "$ codeset=" stands before it'),
+    ('81 "', '80 "', "{81}: message 80 stands at line {80} already", "{0}: message 81 is missing"),
+    ('82 "', '4294967378 "', "{82}: message 4294967378 is not one of the library's", "{0}: message 82 is missing"),
+    ('82 "', '82"', "{82}: a blank and a text must follow the id"), ("$quote", "$qoute", "5: unknown directive"),
+    ("ungültig!", "ung\\ltig!", '{82}: an escape sequence other than \\n, \\t, \\\\ and \\"'),
+    ('ungültig!\\n\\\n"', 'ungültig!"', "{82}: message 82 does not end with a line feed (\\n)"),
+    ('ungültig!\\n\\\n"', 'ungültig!\\n"?', "{82}: text behind the closing quotation mark"),
+    ("ungültig!\\n\\", "ungültig!\\n", "{82}: no closing quotation mark"),
+    ("%4$d\\n", "%4$s\\n", "{83}: message 83 does not have the conversions of the English text"),
+    ("3417-101 ", "3417-102 ", "{88}: message 88 does not begin with its number 3417-101 "),
+]
 
 
 def translated(number, text):  # the whole source with one text replaced; a number comes only once in a set
@@ -69,6 +84,35 @@ class Catalog(CommandCase):
             self.catalog.unlink()  # because the C library may still look into the old file
             self.catalog.write_bytes(content)
             self.shows_defaults()
+
+
+class Translation(CommandCase):
+    def complaints(self, source):
+        path = self.write("de.msg", source.encode())
+        done = subprocess.run([BUILD / "tools/check_catalog", path], stdout=subprocess.PIPE, check=False)
+        told = done.stdout.decode().replace(path + ":", "").splitlines()
+        self.assertEqual(done.returncode, int(told != []))
+        return told
+
+    def test_checker(self):
+        self.assertEqual([self.complaints(GERMAN), self.complaints(SOURCE)], [[], []])
+        lines = [GERMAN.count("\n", 0, GERMAN.find(f'\n{number} "') + 1) + 1 for number in range(100)]
+        lines[0] = GERMAN.count("\n")
+        for old, new, *told in BROKEN:
+            with self.subTest(new):
+                found = self.complaints(GERMAN.replace(old, new, 1))
+                self.assertEqual([found[0], found[-1]][:len(told)], [text.format(*lines) for text in told])
+
+    @unittest.skipUnless(shutil.which("gencat") and os.path.exists("/usr/share/i18n/locales/de_DE"), "no German locale")
+    def test_german(self):
+        for codeset in ("UTF-8", "ISO-8859-1"):
+            locale, places = "de_DE." + codeset, [f"{BUILD}/share/locale/%{part}/LC_MESSAGES/%N" for part in "Ll"]
+            subprocess.run(["localedef", "-i", "de_DE", "-f", codeset, f"{self.root}/{locale}"], check=True)
+            environment = {"LC_ALL": locale, "LOCPATH": self.root, "NLSPATH": ":".join(places)}  # as under /usr
+            _, shown = run(["-c", "-f", str(TABLE.parents[2] / "examples/mistakes.acl")], self.root, environment)
+            shown = shown.encode("latin-1").decode(codeset)
+            self.assertIn("Der ACL-Eintrag in Zeile 5 der ACL-Datei\nist länger als die höchstens zuläss", shown)
+            self.assertEqual(re.findall(r"^3417-\d+ (\w+):", shown, re.MULTILINE), ["Fehler"] * 12)
 
 
 if __name__ == "__main__":

@@ -1,0 +1,38 @@
+# Compiles the translations for catopen. Under /usr its default search finds LANGUAGE/LC_MESSAGES in every locale of the
+# language, whatever the code set; elsewhere NLSPATH must name the place. catgets converts nothing, so that
+# the locales of an older code set get, under their own names, which are searched first, a catalog in it.
+find_program(GENCAT gencat)
+find_program(ICONV iconv)
+
+# qz_catalog(LOCALE SOURCE CODESET)
+function(qz_catalog locale source codeset)
+  set(folder ${PROJECT_BINARY_DIR}/share/locale/${locale}/LC_MESSAGES)
+  file(MAKE_DIRECTORY ${folder})
+  if(codeset STREQUAL "UTF-8")
+    set(converted ${source})
+  else()
+    set(converted ${folder}/qzseclib.msg)
+    add_custom_command(OUTPUT ${converted} DEPENDS ${source} VERBATIM
+      COMMAND sed "1s/UTF-8/${codeset}/" ${source} > ${converted}.utf8
+      COMMAND ${ICONV} -f UTF-8 -t ${codeset} ${converted}.utf8 > ${converted})
+  endif()
+  # Removed first, because gencat adds to a catalog that is there.
+  add_custom_command(OUTPUT ${folder}/qzseclib.cat DEPENDS ${converted} VERBATIM
+    COMMAND ${CMAKE_COMMAND} -E rm -f ${folder}/qzseclib.cat
+    COMMAND ${GENCAT} ${folder}/qzseclib.cat ${converted})
+  set_property(GLOBAL APPEND PROPERTY qz_catalogs ${folder}/qzseclib.cat)
+  install(FILES ${folder}/qzseclib.cat DESTINATION ${CMAKE_INSTALL_DATADIR}/locale/${locale}/LC_MESSAGES)
+endfunction()
+
+if(NOT GENCAT)
+  message(STATUS "gencat not found: the translations are not compiled")
+  return()
+endif()
+qz_catalog(de ${PROJECT_SOURCE_DIR}/translations/de.msg UTF-8)
+if(ICONV)
+  foreach(locale IN ITEMS de_DE de_DE.ISO-8859-1)
+    qz_catalog(${locale} ${PROJECT_SOURCE_DIR}/translations/de.msg ISO-8859-1)
+  endforeach()
+endif()
+get_property(catalogs GLOBAL PROPERTY qz_catalogs)
+add_custom_target(translations ALL DEPENDS ${catalogs})
