@@ -1,0 +1,134 @@
+// Stands between the code under test and the system: counts allocations and system calls, and lets tests fail, cut
+// short or precede each. The linker leads the calls of the layers and of the tests here (see CMakeLists.txt).
+#ifndef QZ_TESTS_FAULTS_H
+#define QZ_TESTS_FAULTS_H
+
+#include <cerrno>
+#include <cstring>
+#include <fcntl.h>
+#include <functional>
+#include <pwd.h>
+#include <string>
+#include <sys/stat.h>
+#include <unistd.h>
+#include <vector>
+
+namespace faults {
+
+struct allocations_seen {
+    std::size_t count = 0, fails_at = 0; // from 1; 0 fails none
+    bool fails_on = false;               // also all behind that one
+    std::ptrdiff_t live = 0;
+};
+inline allocations_seen allocations;
+
+constexpr int short_transfer = -1;
+inline bool is_watching = false;
+inline std::vector<std::string> calls;
+inline std::string home;                       // of every user
+inline std::function<int(std::size_t)> before; // told the place in `calls`; gives an errno value, short_transfer or 0
+
+inline int next(const char *name) {
+    if (!is_watching) return 0;
+    is_watching = false; // what the test itself calls now is not looked at
+    calls.emplace_back(name);
+    const int fault = before ? before(calls.size() - 1) : 0;
+    is_watching = true;
+    errno = fault > 0 ? fault : errno;
+    return fault;
+}
+
+// Runs something with its system calls watched.
+template <class Call>
+auto watched(const std::function<int(std::size_t)> &fault, const Call &call) {
+    calls.clear();
+    before = fault;
+    is_watching = true;
+    auto result = call();
+    is_watching = false;
+    return result;
+}
+
+inline bool fails_now() {
+    ++allocations.count;
+    return allocations.fails_at != 0 && (allocations.fails_on ? allocations.count >= allocations.fails_at
+                                                              : allocations.count == allocations.fails_at);
+}
+
+} // namespace faults
+
+#define QZ_WRAPPED(result, name, parameters)                                                                           \
+    result __real_##name parameters;                                                                                   \
+    result __wrap_##name parameters;                                                                                   \
+    result __wrap_##name parameters
+// A call that fails with -1.
+#define QZ_WRAPPED_CALL(name, parameters, arguments)                                                                   \
+    QZ_WRAPPED(int, name, parameters) { return faults::next(#name) > 0 ? -1 : __real_##name arguments; }
+
+extern "C" {
+
+QZ_WRAPPED(void *, malloc, (size_t size)) {
+    void *made = faults::fails_now() ? nullptr : __real_malloc(size);
+    faults::allocations.live += made != nullptr;
+    return made;
+}
+QZ_WRAPPED(void *, calloc, (size_t count, size_t size)) {
+    void *made = faults::fails_now() ? nullptr : __real_calloc(count, size);
+    faults::allocations.live += made != nullptr;
+    return made;
+}
+QZ_WRAPPED(void *, realloc, (void *old, size_t size)) {
+    void *made = faults::fails_now() ? nullptr : __real_realloc(old, size);
+    faults::allocations.live += made != nullptr && old == nullptr;
+    return made;
+}
+QZ_WRAPPED(char *, strdup, (const char *text)) {
+    const std::string copy = text;
+    void *made = __wrap_malloc(copy.size() + 1);
+    return made == nullptr ? nullptr : static_cast<char *>(memcpy(made, copy.c_str(), copy.size() + 1));
+}
+void __real_free(void *memory);
+void __wrap_free(void *memory);
+void __wrap_free(void *memory) {
+    faults::allocations.live -= memory != nullptr;
+    __real_free(memory);
+}
+
+QZ_WRAPPED_CALL(stat, (const char *path, struct stat *out), (path, out))
+QZ_WRAPPED_CALL(lstat, (const char *path, struct stat *out), (path, out))
+QZ_WRAPPED_CALL(fstat, (int fd, struct stat *out), (fd, out))
+QZ_WRAPPED_CALL(open, (const char *path, int flags, mode_t mode), (path, flags, mode))
+int __wrap___open_2(const char *path, int flags); // what a fortified call without a mode becomes
+int __wrap___open_2(const char *path, int flags) { return __wrap_open(path, flags, 0); }
+QZ_WRAPPED_CALL(fchown, (int fd, uid_t user, gid_t group), (fd, user, group))
+QZ_WRAPPED_CALL(fchmod, (int fd, mode_t mode), (fd, mode))
+QZ_WRAPPED_CALL(futimens, (int fd, const timespec *times), (fd, times))
+QZ_WRAPPED_CALL(fdatasync, (int fd), (fd))
+QZ_WRAPPED_CALL(rename, (const char *from, const char *to), (from, to))
+QZ_WRAPPED_CALL(unlink, (const char *path), (path))
+QZ_WRAPPED(int, close, (int fd)) { // which closes even as it fails
+    const bool fails = faults::next("close") > 0;
+    const int result = __real_close(fd);
+    return fails ? -1 : result;
+}
+QZ_WRAPPED(ssize_t, read, (int fd, void *bytes, size_t size)) {
+    const int fault = faults::next("read");
+    return fault > 0 ? -1 : __real_read(fd, bytes, fault < 0 ? size - 1 : size);
+}
+QZ_WRAPPED(ssize_t, write, (int fd, const void *bytes, size_t size)) {
+    const int fault = faults::next("write");
+    return fault > 0 ? -1 : __real_write(fd, bytes, fault < 0 ? size - 1 : size);
+}
+QZ_WRAPPED(char *, getcwd, (char *path, size_t size)) {
+    return faults::next("getcwd") > 0 ? nullptr : __real_getcwd(path, size);
+}
+QZ_WRAPPED(int, getpwnam_r, (const char *name, passwd *entry, char *memory, size_t size, passwd **found)) {
+    const int fault = faults::next("getpwnam_r");
+    const int result = __real_getpwnam_r(name, entry, memory, size, found);
+    entry->pw_dir = faults::home.data();
+    return fault > 0 ? (*found = nullptr, fault) : result;
+}
+
+} // extern "C"
+
+#endif
