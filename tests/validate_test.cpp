@@ -1,4 +1,5 @@
-// Tests of validation and byte order, and of how every operation bears bytes that were cut short or changed.
+// Tests of validation and byte order. How every operation bears bytes that were cut short or changed is tested by
+// fuzz/buffer_fuzz.cpp.
 #include "qzacl_acl/buffer.h"
 #include "qzacl_acl/validate.h"
 #include "service_support.h"
@@ -140,51 +141,6 @@ TEST(list, refuses_what_it_cannot_list) {
         EXPECT_EQ(after(call(&no_length, 4, bad, nullptr)), bad_parameter(of, 3, shown(bad)));
     EXPECT_EQ(after(call(&no_length, 16, long_name, nullptr)), bad_parameter(of, 4));
     EXPECT_EQ(after(call(&no_length, 1, blank, &list)), error_of(42, 96));
-}
-
-int accept_anything(const char *, const char *held) { return held[0] == '\0' ? 0 : 1; }
-
-// Every operation on the same bytes: none may look behind them, run for ever, or fail otherwise than it may.
-void use_everywhere(const std::string &bytes) {
-    const guarded memory(bytes);
-    sec_acl_buffer_t acl = {static_cast<std::int32_t>(bytes.size()), memory.data()};
-    SCOPED_TRACE(testing::PrintToString(bytes));
-    const auto bears = [](int result) {
-        EXPECT_TRUE(result == 0 || result == 18 || result == 42 || result == 43) << result;
-        return after(result).code == 0;
-    };
-    bears(sec__check_acl_buffer(&acl));
-    sec_aclelist_t list = {};
-    bears(sec_list_acl(&acl, &list));
-    sec_release_aclelist(&list);
-    bears(sec_list_acl_by_type(&acl, 4, "UNIX", &list));
-    sec_release_aclelist(&list);
-    std::uint32_t mask = 0;
-    const char *const bob = "bob@host.example";
-    for (const auto &[type, mechanism] : std::initializer_list<std::pair<std::uint8_t, const char *>>{
-             {1, ""}, {2, ""}, {4, "unix"}, {8, "krb5"}, {0x84, "hba2"}})
-        bears(sec__single_acle_perm(&acl, type, mechanism, nullptr, bob, &mask));
-    const sec_group_ref_t groups[] = {{0, "staff"}, {0, "admins"}, {0, "none"}};
-    bears(sec__group_acles_perm(&acl, 3, groups, &mask));
-    for (const auto &acle : {entry(4, "unix", "BOB@host.example", 9), entry(4, "unix", "new", 9),
-                             entry(8, "krb5", "a", 9), entry(16, "", "admins", 9), entry(1, "", nullptr, 9)})
-        for (const auto edit : {sec_add_acle_to_acl, sec_add_acle_to_acl2, sec_del_acle_from_acl}) {
-            buffer held(bytes);
-            EXPECT_TRUE(bears(edit(&acle, &held.acl)) || held.bytes() == bytes);
-        }
-    EXPECT_EQ(std::string(memory.data(), memory.size()), bytes);
-    bears(sec_convert_acl_to_host(1, &acl));
-}
-
-TEST(every_operation, stays_inside_its_bytes) {
-    EXPECT_EQ(sec__register_id_handler(1, "krb5", accept_anything), 0);
-    EXPECT_EQ(sec__register_id_handler(2, "hba2", accept_anything), 0);
-    for (const std::string &whole : {rich, foreign(rich)})
-        for (std::size_t at = 0; at < whole.size(); ++at) {
-            use_everywhere(whole.substr(0, at + 1));
-            for (const int change : {1, 2, 3, 4, 5, 7, 8, 16, 32, 64, 127, 128, 129, 254, 255})
-                use_everywhere(with(whole, at, whole[at] + change));
-        }
 }
 
 } // namespace

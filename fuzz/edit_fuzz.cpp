@@ -1,0 +1,69 @@
+// Adding and deleting against the plain model: many spellings of few keys, on buffers that edits made and on such as
+// no edit leaves them. A step is four letters: what to do (+ add, ! add if new, - delete), a type, a mechanism and an
+// identity.
+#include "fuzz.h"
+#include "model.h"
+
+namespace {
+
+using namespace fuzz;
+
+// In several spellings each. The bytes between the cases and beyond ASCII do not fold.
+const arguments mechanisms = words("unix UNIX uNix hba2 HBA2 a_[`{ A_[`{ sixteen-bytes-xx");
+const arguments identities =
+    words("a A b B ab aB Ab@x ab@X a_b a[b \xc3 \xe3 longer-name-1 LONGER-name-1 sixteen-bytes-16 "
+          "sixteen-BYTES-16 seventeen-byte-17 seventeen-byte-1_ seventeen-byte-1Z");
+
+int type(std::string_view &from) { return std::array{1, 2, 4, 8, 16, 4, 8, 16}[one_of("nouegUEG", from)]; }
+const char *mechanism(std::string_view &from) { return mechanisms[one_of("01234567", from)].c_str(); }
+const char *identity(std::string_view &from) {
+    const unsigned at = one_of("abcdefghijklmnopqrs_", from);
+    return at == identities.size() ? "" : identities[at].c_str();
+}
+
+// Sub-ACLs as no edit leaves them: unsorted, repeated, empty, flawed, the same key twice.
+model untidy(std::string_view &from) {
+    model made;
+    for (unsigned left = one_of("012345", from); left != 0; --left) {
+        model_subacl subacl{type(from), mechanism(from), {}, one_of("01234567", from)};
+        if (!has_mechanism(subacl.type)) subacl.mechanism.clear();
+        for (unsigned entries = one_of("01234567", from) % (subacl.type < 4 ? 2 : 8); entries != 0; --entries)
+            subacl.stored.emplace_back(subacl.type < 4 ? "" : identity(from), left * 10 + entries);
+        made.subacls.push_back(subacl);
+    }
+    return made;
+}
+
+void expect_edit(edit_function edit, const sec_acle_t &acle, buffer &held, model &wanted) {
+    EXPECT_EQ(after(edit(&acle, &held.acl)), wanted.edit(edit, acle));
+    EXPECT_EQ(held.bytes(), wanted.bytes());
+}
+
+} // namespace
+
+int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
+    std::string_view from = input(data, size);
+    const bool is_untidy = one_of("nu", from) == 1;
+    model wanted = is_untidy ? untidy(from) : model();
+    buffer held(is_untidy ? wanted.bytes() : ""); // the first addition makes one
+    for (std::uint32_t step = 1; !from.empty() && step < 200; ++step) {
+        const edit_function edits[] = {sec_add_acle_to_acl, sec_add_acle_to_acl2, sec_del_acle_from_acl};
+        const edit_function edit = edits[one_of("+!-", from) % (held.acl.data == nullptr ? 2 : 3)];
+        const int of = type(from);
+        const char *const by = mechanism(from), *const name = identity(from);
+        // What a type has no use for must not matter.
+        const sec_acle_t acle =
+            entry(of, of < 4 && step % 2 == 0 ? "" : by, of < 4 && step % 3 == 0 ? nullptr : name, step * 0x1010101);
+        // No sub-ACL with a flaw is changed in place, so that the long way must come to the same.
+        model flawed = wanted;
+        for (model_subacl &each : flawed.subacls) each.flaw = each.flaw == 0 ? 1 : each.flaw;
+        if (buffer long_way(flawed.bytes()); held.acl.data != nullptr) expect_edit(edit, acle, long_way, flawed);
+        expect_edit(edit, acle, held, wanted);
+        EXPECT_TRUE(is_untidy || after(sec_convert_acl_to_host(1, &held.acl)) == no_error);
+        EXPECT_EQ(list_of(held.acl), wanted.entries(0, nullptr));
+        for (const int other : {1, 2, 4, 8, 16})
+            for (const char *with : {static_cast<const char *>(nullptr), by, "none"})
+                EXPECT_EQ(list_of(held.acl, other, with), wanted.entries(other, with));
+    }
+    return 0;
+}

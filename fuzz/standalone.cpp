@@ -1,0 +1,47 @@
+// Runs a fuzzer as an ordinary test: over each file of its corpus cut short everywhere and changed everywhere, and
+// over many inputs that are made of them at random but always alike.
+#include "fuzz.h"
+#include <filesystem>
+#include <fstream>
+#include <random>
+
+static void run(const std::string &input) {
+    // A block of its own, so that a look behind it is seen where such are looked for.
+    const std::vector<std::uint8_t> bytes(input.begin(), input.end());
+    try {
+        LLVMFuzzerTestOneInput(bytes.data(), bytes.size());
+    } catch (const std::exception &) {
+        std::printf("failed with the input %s\n", testing::PrintToString(input).c_str());
+        std::exit(1);
+    }
+}
+
+int main(int, char **arguments) {
+    std::vector<std::string> corpus;
+    for (const auto &each : std::filesystem::directory_iterator(arguments[1])) {
+        std::ifstream file(each.path(), std::ios::binary);
+        corpus.emplace_back(std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>());
+    }
+    std::ranges::sort(corpus); // folders are in any order
+    for (const std::string &input : corpus)
+        for (std::size_t at = 0; at < input.size(); ++at) {
+            run(input.substr(0, at + 1));
+            for (const int change : {1, 2, 3, 4, 5, 7, 8, 16, 32, 64, 127, 128, 129, 254, 255}) {
+                std::string changed = input;
+                changed[at] = static_cast<char>(changed[at] + change);
+                run(changed);
+            }
+        }
+    std::mt19937 random(1);
+    const auto below = [&](std::size_t limit) { return random() % limit; };
+    for (int left = 4000; left != 0; --left) {
+        std::string made = corpus[below(corpus.size())];
+        for (auto changes = 1 + below(6); changes != 0; --changes) {
+            const std::string other = below(2) == 0 ? made : corpus[below(corpus.size())];
+            const std::string piece = other.substr(below(other.size() + 1), below(4) == 0 ? below(200) : below(8));
+            const std::string bytes(1 + below(3), "\0\1\x7f\x80\xff \n"[below(7)]);
+            made.replace(below(made.size() + 1), below(2) * below(6), below(3) == 0 ? bytes : piece);
+        }
+        run(made);
+    }
+}
