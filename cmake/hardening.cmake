@@ -4,8 +4,9 @@ include(CheckCXXCompilerFlag)
 include(CheckPIESupported)
 check_pie_supported()
 
+option(QZ_HARDENING "Compile with the checks of cmake/hardening.cmake" ON)
 add_link_options(-Wl,-z,relro,-z,now,-z,noexecstack)
-if(QZ_SANITIZE)
+if(QZ_SANITIZE OR NOT QZ_HARDENING)
   return() # the sanitizers see more, and some of these hide what they look for
 endif()
 

@@ -21,6 +21,7 @@ import time
 import unittest
 
 BUILD = pathlib.Path(sys.argv[1]).resolve()
+SANITIZED = "QZ_SANITIZE:STRING=\n" not in (BUILD / "CMakeCache.txt").read_text()
 IS_ROOT, NOBODY = os.geteuid() == 0, 65534
 # A copy of the command and its libraries that any user can reach, wherever the build folder lies.
 PLACE = tempfile.TemporaryDirectory()
@@ -61,9 +62,10 @@ def compiled(*subacls):
     return out
 
 
-def run(arguments, cwd, environment=(), ordinary=False, child=None):
+def run(arguments, cwd, environment=(), ordinary=False, child=None, user=NOBODY):
     """Gives the status and what was printed; `ordinary` is without root's rights, `child` is called just before."""
-    rights = {"user": NOBODY, "group": NOBODY, "extra_groups": []} if ordinary and IS_ROOT else {}
+    ordinary = ordinary or user != NOBODY
+    rights = {"user": user, "group": user, "extra_groups": []} if ordinary and IS_ROOT else {}
     kept = {name: value for name, value in os.environ.items() if name.endswith("SAN_OPTIONS")}
     done = subprocess.run([COMMAND] + [text.encode("latin-1") for text in arguments], cwd=cwd, preexec_fn=child,
                           env={**kept, "LC_ALL": "C", **dict(environment)}, stdin=subprocess.DEVNULL,
@@ -227,6 +229,37 @@ class Command(CommandCase):
         # The cache is as old as the text that it was made from, so that a later edit finds it stale.
         stamp = os.stat(path + ".cacl").st_mtime_ns
         self.assertTrue(started <= stamp and (stamp <= read or read == 0))  # 0: when a file was read is not noted
+
+    def test_locales_and_users_that_nobody_knows(self):
+        """Letters and white space mean the same under any rules; neither a locale nor a user need be known."""
+        text = "u UNIX I@Host r\nu unix i@hoSt w\nu kI \u0130 r\nu k\xa0i x\xa0 r\ng \xc7 r\ng \xe7 w\n"
+        cache = compiled((8, "m", [("i", 1)]))
+        self.write("a", "e m i r\n", owner=NOBODY - 1 if IS_ROOT else None)
+        self.write("b", text.encode("utf-8"))
+        os.chmod(self.dir, 0o777)
+        told = run(["-c", "-f", "b"], self.dir)
+        self.assertEqual(told[1].count("3417-157"), 1)  # the user, and neither of the groups
+        for name, charset in (("tr_TR", "ISO-8859-9"), ("tr_TR", "UTF-8"), ("ru_RU", "KOI8-R"), (None, None), ("xx", "x")):
+            locale = f"{name}.{charset}"
+            made = name is None or not os.path.exists("/usr/share/i18n/locales/" + name) or subprocess.run(
+                ["localedef", "-i", name, "-f", charset, f"{self.root}/{locale}"], check=True, capture_output=True)
+            environment = {"LOCPATH": self.root, "LC_ALL": locale if name else ""}
+            with self.subTest(environment, made=bool(made)):
+                self.assertEqual(run(["-c", "-f", "b"], self.dir, environment), told)
+                self.expect(["-s", "-f", "a"], 0, "", [("a.cacl", cache)], environment=environment, user=NOBODY - 1)
+
+    @unittest.skipIf(SANITIZED, "the sanitizers need much address space")
+    def test_little_address_space(self):
+        self.write("a", "".join(f"u m user{number} r\n" for number in range(100000)))
+        codes = []
+        for megabytes in range(4, 44, 2):
+            limits = (megabytes << 20, megabytes << 20)
+            code, errors = run(["-s", "-f", "a"], self.dir, child=lambda: resource.setrlimit(resource.RLIMIT_AS, limits))
+            started = "error while loading" not in errors and code >= 0
+            self.assertTrue(not started or (code, errors[:8]) in ((0, ""), (6, "3417-102")), (megabytes, code, errors))
+            codes += [code] if started else []
+            self.assertEqual(os.path.exists(self.dir + "/a.cacl"), code == 0)
+        self.assertEqual((codes[0], codes[-1]), (6, 0))
 
     def test_hostile_names(self):
         pipe, folder = stat.S_IFIFO | 0o644, stat.S_IFDIR | 0o644

@@ -1,7 +1,9 @@
 """Checks what other programs compile, link and run against: headers, records, libraries, and the example service.
 
 usage: interface_test.py BUILD-FOLDER"""
+import json
 import os
+import platform
 import re
 import shutil
 import subprocess
@@ -64,6 +66,23 @@ class Interface(unittest.TestCase):
             self.assertTrue(SANITIZED or not foreign, f"{library} needs {foreign}")
             symbols = run("nm", "-D", "--defined-only", str(BUILD / f"lib/{library}.so"))
             self.assertEqual(sorted(re.findall(r" [^A ] (\w+)", symbols)), declared(header), library)
+
+    @unittest.skipIf(SANITIZED, "the sanitizers stand in the place of the hardening")
+    def test_binaries_are_hardened(self):
+        headers = {"full RELRO": r"GNU_RELRO", "immediate binding": r"FLAGS.*BIND_NOW|FLAGS_1.*NOW",
+                   "no executable stack": r"GNU_STACK.* RW +0x", "stack protector": r"__stack_chk_fail"}
+        for path in [BUILD / f"lib/{library}.so" for library in HEADERS] + [BUILD / "bin/qzaclfck"]:
+            found = run("readelf", "-lWd", "--dyn-syms", str(path))
+            for what, pattern in headers.items():
+                self.assertRegex(found, pattern, f"{path}: {what}")
+            if path.suffix != ".so":
+                self.assertRegex(found, r"FLAGS_1.*PIE")
+        # What leaves no mark in a binary is read off the commands that made it.
+        branches = "-fcf-protection=full " if platform.machine() == "x86_64" else ""
+        for entry in json.loads((BUILD / "compile_commands.json").read_text()):
+            if "/security/ACL/" in entry["file"] or "/platform/" in entry["file"]:
+                self.assertRegex(entry["command"], f"-fstack-clash-protection {branches}-ftrivial-auto-var-init=.*"
+                                                  "-D_FORTIFY_SOURCE=[23]")
 
     def test_example_service(self):
         folder = tempfile.TemporaryDirectory()

@@ -29,6 +29,8 @@ std::vector<std::string> use_all(const std::string &path, const sec_acl_buffer_t
     std::uint32_t mask = 0, flags = SEC_READ_ACL_CONVERT | SEC_READ_ACL_CACHE;
     sec_acl_buffer_t acl = {}, copy = {}, empty = {};
     note{found, sec_read_acl_file(path.c_str(), nullptr, nullptr, flags, &acl, &flags), acl.length};
+    sec_release_acl(&acl);
+    note{found, sec_read_acl_file(path.c_str(), nullptr, nullptr, SEC_READ_ACL_CONVERT, &acl, nullptr), acl.length};
     note{found, sec_read_acl_from_data(acl.length, acl.data, &copy)};
     note{found, sec_convert_acl_to_host(1, &copy)};
     note{found, sec_create_empty_acl(&empty), empty.length};
@@ -43,6 +45,7 @@ std::vector<std::string> use_all(const std::string &path, const sec_acl_buffer_t
     note{found, sec_display_acle_id(entry, &mechanism, &identity), mechanism, identity};
     std::free(mechanism);
     std::free(identity);
+    note{found, sec_add_acle_to_acl(entry, &copy), copy.length};
     note{found, sec_add_acle_to_acl(entry, &copy), copy.length};
     note{found, sec_add_acle_to_acl2(entry, &copy), copy.length};
     sec_aclelist_t list = {};
@@ -67,9 +70,10 @@ std::vector<std::string> use_all(const std::string &path, const sec_acl_buffer_t
 }
 
 // As a thread of a service would see it that is alone.
-const std::vector<std::string> expected = {"0 75 ", "0 ",         "0 ",     "0 5 ",    "0 ",    "0 3 ",     "0 rw ",
-                                           "0 ",    "0 kRb Bob ", "0 100 ", "43 100 ", "0 4 ",  "0 1 Bob ", "0 75 ",
-                                           "0 ",    "0 1 ",       "0 5 ",   "43 0 ",   "0 19 ", "0 "};
+const std::vector<std::string> expected = {"0 75 ", "0 75 ",    "0 ",         "0 ",     "0 5 ",   "0 ",      "0 3 ",
+                                           "0 rw ", "0 ",       "0 kRb Bob ", "0 100 ", "0 100 ", "43 100 ", //
+                                           "0 4 ",  "0 1 Bob ", "0 75 ",      "0 ",     "0 1 ",   "0 5 ",    "43 0 ",
+                                           "0 19 ", "0 "};
 
 TEST(operations, answer_alike_in_every_thread) {
     const temporary_folder folder;

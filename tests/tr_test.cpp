@@ -39,12 +39,20 @@ TEST(Text, IsPrintableUtf8) {
         EXPECT_FALSE(qz::tr::is_printable(text)) << testing::PrintToString(text);
 }
 
+extern "C" [[gnu::weak]] void __gcov_dump();
+
 struct Trace : testing::Test {
     ~Trace() override { std::filesystem::remove_all(folder); }
     void in_child(const auto &body) const {
         setenv("QZ_TRACE_LEVELS", "C:On=8,Max=255", 1);
         setenv("QZ_TRACE_FILE", file.c_str(), 1);
-        if (fork() == 0) _exit((body(), HasFailure()) ? 1 : 0);
+        if (fork() == 0) {
+            body();
+            const rlimit unlimited{RLIM_INFINITY, RLIM_INFINITY};
+            setrlimit(RLIMIT_FSIZE, &unlimited);
+            if (__gcov_dump != nullptr) __gcov_dump(); // which only exit does by itself
+            _exit(HasFailure());
+        }
         int status = -1;
         EXPECT_TRUE(wait(&status) > 0 && status == 0) << status;
     }
@@ -82,7 +90,7 @@ TEST_F(Trace, LinesAreExactFromRegisteringUntilTheFileIsLost) {
         EXPECT_EQ(tr_record_id_1("C", 1), TR_NOT_REGISTERED);
         EXPECT_EQ(enlist(), on);
         const rlim_t almost_full = std::filesystem::file_size(file) + 9;
-        const rlimit limit{almost_full, almost_full};
+        const rlimit limit{almost_full, RLIM_INFINITY};
         ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &limit), 0);
         EXPECT_EQ(tr_record_id_1("C", 2), TR_FILE_ERROR);
         closefrom(3); // as a daemon does, whose next file then takes the number

@@ -5,11 +5,12 @@ import errno
 import json
 import os
 import pathlib
+import shutil
 import subprocess
 import sys
 import unittest
 
-from command_test import BUILD, IS_ROOT, TEXTS, CommandCase, entry, message
+from command_test import BUILD, IS_ROOT, NOBODY, TEXTS, CommandCase, entry, message
 
 ENTRIES = "# n\nn r\nU UNIX alice wr\ng staff q\n"
 LONG_LINES = "n" + " " * 1200 + "\nn\n" + "o" + " " * 1200
@@ -54,7 +55,8 @@ EDIT_AGAIN = EDIT[:6] + (number(100), WIDE)
 SHARED = (WIDE, number(182), WIDE)
 # What each public operation, called as operations_test does, leaves at the level of arguments and results.
 OPERATIONS = [
-    (11, None, "", WIDE, number(6), WIDE), (14, RESULT, number(4)),
+    (11, None, "", WIDE, number(6), WIDE), (14, RESULT, number(4)), (72, WIDE, number(75), WIDE), (73,),
+    (11, None, "", WIDE, number(4), WIDE), (14, RESULT, number(4)),
     (17, number(75), WIDE, WIDE), (19, RESULT),
     (57, number(1), WIDE, number(75), WIDE), (59, RESULT),
     (72, WIDE, number(5), WIDE), (73,),
@@ -62,7 +64,7 @@ OPERATIONS = [
     (99, number(3), WIDE, ""), (102, RESULT, "rw"),
     (42, number(4), number(3), "kRb", "Bob", WIDE), (44, RESULT),
     (51, WIDE, number(4), number(3), "kRb", "Bob", WIDE, WIDE), (54, RESULT, "kRb", "Bob"),
-    (62, *EDIT), (64, RESULT), (62, *EDIT_AGAIN), (64, REFUSED),
+    (62, *EDIT), (64, RESULT), (62, *EDIT_AGAIN), (64, RESULT), (62, *EDIT_AGAIN), (64, REFUSED),
     (24, number(100), WIDE, WIDE), (27, RESULT, number(4)), (38, WIDE, number(4)), (39,),
     (32, number(100), WIDE, number(4), "krb", WIDE), (35, RESULT, number(1)), (38, WIDE, number(1)), (39,),
     (67, *EDIT_AGAIN), (69, RESULT),
@@ -73,8 +75,19 @@ OPERATIONS = [
     (87, *SHARED, number(3), WIDE, WIDE), (90, RESULT, number(0x13)),
     (72, WIDE, number(75), WIDE), (73,), (72, WIDE, number(75), WIDE), (73,),
 ]
+LINES_READ = [(114, number(2), number(1), "", "", number(1)), (114, number(3), number(4), "unix", "alice@h", number(3)),
+              (114, number(4), number(16), "", "staff", number(32))]
+# What reading, converting, replacing and deciding tell of their decisions and times.
+DECISIONS = [(117, None), (118, None, number(errno.ENOENT)), (121, None), *LINES_READ, (110, None),
+             (117, None), (119, None), (121, None), *LINES_READ, (104,), (113, "user", "kRb", "Bob")]
+TIMES = {1: [(0, number(1)), *[(1, None, WIDE, WIDE, WIDE), (2, None, WIDE, WIDE, WIDE),
+                               (3, None, number(4), WIDE, WIDE, WIDE)] * 2],
+         2: [(0, number(2)), *[(4, None, WIDE, WIDE, WIDE), (6, WIDE, WIDE, WIDE)] * 2,
+             (7, number(2), number(4), "unix", "AL", WIDE, WIDE, WIDE),
+             (7, number(0xffffffff), number(8), "krb5", "apple", WIDE, WIDE, WIDE),
+             (7, number(2), number(4), "unix", "nobody", WIDE, WIDE, WIDE), (8, WIDE, WIDE, WIDE)]}
 # The bare numbers of entry and exit of the same calls.
-BARE = [9, 12, 15, 18, 55, 58, 70, 73, 91, 94, 97, 100, 40, 43, 49, 52, 60, 63, 60, 63, 20, 25, 36, 39, 28, 33, 36, 39,
+BARE = [9, 12, 70, 73, 9, 12, 15, 18, 55, 58, 70, 73, 91, 94, 97, 100, 40, 43, 49, 52, 60, 63, 60, 63, 60, 63, 20, 25, 36, 39, 28, 33, 36, 39,
         65, 68, 74, 77, 79, 82, 79, 82, 79, 82, 85, 88, 70, 73, 70, 73]
 
 
@@ -109,13 +122,29 @@ class Trace(CommandCase):
 
     def test_every_operation(self):
         program = [BUILD / "tests" / "operations_test", "--gtest_filter=*answer_once"]
-        releases = [(73,), (39,), (39,), (73,), (73,)]
-        for level, expected in [(1, [(bare,) for bare in BARE]), (8, OPERATIONS), (5, releases)]:
-            with self.subTest(level):
+        releases = [(73,), (73,), (39,), (39,), (73,), (73,)]
+        for levels, expected in [("API=1", [(bare,) for bare in BARE]), ("API=8", OPERATIONS), ("API=5", releases),
+                                 ("Info=8,Errors=1", DECISIONS), ("Perf=1", TIMES[1]), ("Perf=2", TIMES[2])]:
+            with self.subTest(levels):
                 self.fresh()
                 subprocess.run(program, check=True, stdout=subprocess.DEVNULL, env=os.environ | {
-                    "QZ_TRACE_LEVELS": f"_SEL:API={level}", "QZ_TRACE_FILE": self.dir + ".trace"})
+                    "QZ_TRACE_LEVELS": "_SEL:" + levels, "QZ_TRACE_FILE": self.dir + ".trace"})
                 self.expect_records(expected)
+
+    @unittest.skipUnless(IS_ROOT, "only root can make a program privileged")
+    def test_privileged_programs_are_not_traced(self):
+        os.chmod(self.dir, 0o777)
+        program = shutil.copy(BUILD / "tests" / "operations_test", self.dir)
+        for owner, mode in ((0, 0o755), (1, 0o4755)):
+            os.chown(program, owner, owner)
+            os.chmod(program, mode)
+            trace = pathlib.Path(f"{self.dir}/{mode:o}")
+            done = subprocess.run([program, "--gtest_filter=*answer_once"], cwd=self.dir, user=NOBODY, group=NOBODY,
+                                  extra_groups=[], capture_output=True, check=False, env={
+                                      "QZ_TRACE_LEVELS": "_SEL:API=1", "QZ_TRACE_FILE": str(trace)})
+            if done.returncode == 127:
+                self.skipTest("the libraries are not where every user can reach them")
+            self.assertEqual((done.returncode, trace.exists()), (0, owner == 0))
 
     def test_failures_of_caching(self):
         self.write("a", "n\n")
