@@ -12,6 +12,7 @@ import re
 import resource
 import shutil
 import signal
+import socket
 import stat
 import struct
 import subprocess
@@ -356,6 +357,16 @@ class Command(CommandCase):
                 os.chown(file.name, owner, -1)
                 self.expect(["-sv", "-u", user, "-f", os.path.basename(file.name)], status, message(150) + errors)
             self.assertFalse(os.path.exists(file.name + ".cacl"))
+
+    def test_entries_are_gathered_into_large_writes(self):
+        names = [f"user{number}" for number in range(5000)]
+        self.write("a", "".join(f"u m {name} r\n" for name in names))
+        reader, writer = socket.socketpair(socket.AF_UNIX, socket.SOCK_SEQPACKET)  # which keeps writes apart
+        with reader, subprocess.Popen([COMMAND, "-v", "-f", "a"], cwd=self.dir, stderr=writer) as command:
+            writer.close()
+            sizes = [len(text) for text in iter(lambda: reader.recv(1 << 20), b"")]
+        self.assertEqual((command.returncode, sum(sizes)), (0, sum(len(entry("u", "r", "m", name)) for name in names)))
+        self.assertLess(len(sizes), 10)
 
 
 if __name__ == "__main__":
