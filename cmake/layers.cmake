@@ -28,7 +28,7 @@ endfunction()
 # A shared library made of whole layers. It is linked as C because it may need libc alone, and exports what its map
 # names and nothing else. REQUIRES names the project's libraries whose headers and symbols its users need, too.
 function(qz_shared_library name)
-  cmake_parse_arguments(arg "" "MAP;HEADER;DESCRIPTION" "LAYERS;REQUIRES" ${ARGN})
+  cmake_parse_arguments(arg "" "MAP;DESCRIPTION" "LAYERS;HEADERS;REQUIRES" ${ARGN})
   list(TRANSFORM arg_LAYERS REPLACE "(.+)" "$<TARGET_OBJECTS:\\1>" OUTPUT_VARIABLE objects)
   add_library(${name} SHARED ${objects})
   set_target_properties(${name} PROPERTIES
@@ -49,11 +49,11 @@ function(qz_shared_library name)
   target_include_directories(${name} INTERFACE
     $<BUILD_INTERFACE:${PROJECT_BINARY_DIR}/layers/layer_interface>
     $<INSTALL_INTERFACE:${CMAKE_INSTALL_INCLUDEDIR}>)
-  qz_install_library(${name} "${arg_HEADER}" "${arg_REQUIRES}" "${arg_DESCRIPTION}")
+  qz_install_library(${name} "${arg_HEADERS}" "${arg_REQUIRES}" "${arg_DESCRIPTION}")
 endfunction()
 
 # Installs a library for those who run with it and for those who build against it, by pkg-config or by CMake.
-function(qz_install_library name header requires_list arg_DESCRIPTION)
+function(qz_install_library name headers requires_list arg_DESCRIPTION)
   set(package_dir ${CMAKE_INSTALL_LIBDIR}/cmake/${name})
   list(JOIN requires_list " " requires)
   # Relative, so that an installed tree may be moved.
@@ -61,8 +61,8 @@ function(qz_install_library name header requires_list arg_DESCRIPTION)
   string(REGEX REPLACE "/$" "" prefix_from_pc "${prefix_from_pc}")
   install(TARGETS ${name} EXPORT ${name}-targets
     LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR} NAMELINK_COMPONENT development)
-  install(FILES ${PROJECT_SOURCE_DIR}/include/qz/${header} DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/qz
-    COMPONENT development)
+  list(TRANSFORM headers PREPEND ${PROJECT_SOURCE_DIR}/include/qz/)
+  install(FILES ${headers} DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/qz COMPONENT development)
   install(EXPORT ${name}-targets NAMESPACE ${name}:: DESTINATION ${package_dir} COMPONENT development)
 
   include(CMakePackageConfigHelpers)

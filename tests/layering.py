@@ -40,6 +40,8 @@ def unit_of(path):  # the unit of the house that a file belongs to, or None
 def allowed(source, target):  # whether the one file may include the other, by their paths
     if source.startswith(OUTSIDE):
         return target.startswith((PUBLIC, *OUTSIDE))
+    if target.endswith(".hpp"):  # what it defines stands beside the house's own definitions
+        return False
     here, there = unit_of(source), unit_of(target)
     if source.startswith("platform/"):  # knows of nothing but itself
         return here == there or target == PUBLIC + here.split("/")[1].removeprefix("libqz_") + ".h"
@@ -50,7 +52,7 @@ def allowed(source, target):  # whether the one file may include the other, by t
 
 def faults(root):
     edges = {}  # within a layer; across layers there are no circles when every include points down
-    files = {p.relative_to(root).as_posix() for p in root.rglob("*.*") if p.suffix in (".c", ".cpp", ".h")}
+    files = {p.relative_to(root).as_posix() for p in root.rglob("*.*") if p.suffix in (".c", ".cpp", ".h", ".hpp")}
     for source in sorted(f for f in files if not f.startswith(("build", ".", *FREE))):
         if not source.startswith(OUTSIDE) and unit_of(source) is None:
             yield f"{source}: is in no layer"

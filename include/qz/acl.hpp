@@ -1,0 +1,571 @@
+/*
+ * Access control lists for C++17 and later: owners, views and results over <qz/acl.h> and <qz/cu.h>.
+ *
+ * Everything here is inline, needs neither exceptions nor RTTI, and links to libqzacl and libqz_cu alone. It
+ * adds owners that release what the C interface hands out, and keeps its rules: codes, recorded errors, code
+ * sets, trust and threads are those that stand at the top of <qz/acl.h> and at the C function that a
+ * description names. "Codes: those of F" includes its messages. What takes no owner is called as in C:
+ * sec__register_id_handler, and the flags, types and codes SEC_... .
+ *
+ * Texts that go in are pointers to NUL-terminated strings, as the C functions need them; texts that come out
+ * are views whose data() ends with a NUL.
+ *
+ * Owners are movable and not copyable. One that was moved from, or made by default, is empty: all its
+ * operations may be called, and it may be assigned to. Destroying or assigning an owner leaves the recorded
+ * error as it is, so that a failure may be asked about after the owner is gone. Const operations are
+ * "Threads: shared", others "Threads: exclusive".
+ */
+#ifndef QZ_ACL_HPP
+#define QZ_ACL_HPP
+
+#include <qz/acl.h>
+#include <qz/cu.h>
+
+#include <cstddef>
+#include <cstdint>
+#include <cstdlib>
+#include <iterator>
+#include <limits>
+#include <memory>
+#include <string_view>
+#include <type_traits>
+#include <utility>
+
+namespace qz {
+
+/* ---- Results ---- */
+
+/*
+ * A code, and after SEC_S_OK what was made. After a failure the value is empty (an owner without anything, no
+ * permissions) unless the operation says otherwise.
+ */
+template <class T>
+class [[nodiscard]] result {
+public:
+    result(int code, T value) noexcept : code_(code), value_(std::move(value)) {}
+
+    /* SEC_S_..., of the operation. */
+    [[nodiscard]] int code() const noexcept { return code_; }
+
+    /* Whether the operation succeeded. */
+    explicit operator bool() const noexcept { return code_ == SEC_S_OK; }
+
+    /*
+     * The value; moved out of a result that is about to go, so that a range-for over "*acl.list()" is sound.
+     */
+    [[nodiscard]] T &operator*() &noexcept { return value_; }
+    [[nodiscard]] const T &operator*() const &noexcept { return value_; }
+    [[nodiscard]] T operator*() &&noexcept { return std::move(value_); }
+    [[nodiscard]] T *operator->() noexcept { return &value_; }
+    [[nodiscard]] const T *operator->() const noexcept { return &value_; }
+
+private:
+    int code_;
+    T value_;
+};
+
+/* A copy of a thread's recorded error, with its text. Movable; other threads may read it. */
+class error {
+public:
+    /*
+     * Copies the calling thread's recorded error, which stays recorded. When there is no memory for the copy
+     * the code is CU_NO_MEMORY, without message and text; when there is none for the text alone, the text is
+     * empty.
+     *
+     * Uses cu_get_error_1 and cu_get_errmsg_1.
+     */
+    [[nodiscard]] static error current() noexcept {
+        error made;
+        cu_error_t *handle = nullptr;
+        char *text = nullptr;
+        made.code_ = cu_get_error_1(&handle);
+        if (handle != nullptr) {
+            made.code_ = handle->code;
+            made.message_id_ = handle->message_id;
+            if (cu_get_errmsg_1(handle, &text) == CU_OK)
+                made.text_.reset(text);
+            cu_rel_error_1(handle);
+        }
+        return made;
+    }
+
+    /* The code that the failing operation returned; 0 when no error was recorded. */
+    [[nodiscard]] int code() const noexcept { return code_; }
+
+    /* The message's index in the message table; the number that descriptions name stands in the text. */
+    [[nodiscard]] int message_id() const noexcept { return message_id_; }
+
+    /* The message, as it is to be shown: with its number, and a line feed at its end. */
+    [[nodiscard]] std::string_view text() const noexcept { return text_ ? text_.get() : ""; }
+
+    /* Whether an error was recorded. */
+    explicit operator bool() const noexcept { return code_ != CU_OK; }
+
+private:
+    struct release {
+        void operator()(char *text) const noexcept { cu_rel_errmsg_1(text); }
+    };
+
+    error() noexcept = default;
+
+    int code_ = CU_OK;
+    int message_id_ = 0;
+    std::unique_ptr<char, release> text_;
+};
+
+/* ---- Permissions ---- */
+
+/* The letters of a mask. */
+class permission_letters {
+public:
+    /* The letters, from the lowest bit to the highest. */
+    [[nodiscard]] std::string_view view() const noexcept { return text_; }
+    [[nodiscard]] const char *c_str() const noexcept { return text_; }
+
+private:
+    friend result<permission_letters> to_letters(std::uint32_t mask, const sec_perm_set_t *set) noexcept;
+
+    char text_[33] = "";
+};
+
+/*
+ * Turns permission letters into a mask.
+ *
+ *   letters   may be null, as for sec_translate_perms
+ *   set       null: acl__default_perm_set
+ *
+ * Codes: those of sec_translate_perms. After 36 the value holds the letters before the refused one.
+ */
+inline result<std::uint32_t> to_mask(const char *letters, const sec_perm_set_t *set = nullptr) noexcept {
+    std::uint32_t mask = 0;
+    const int code = sec_translate_perms(letters, set, &mask);
+    return {code, mask};
+}
+
+/*
+ * Turns a mask into permission letters. Allocates nothing.
+ *
+ *   set   null: acl__default_perm_set
+ *
+ * Codes: those of sec_translate_bitmask. After a failure there are no letters.
+ */
+inline result<permission_letters> to_letters(std::uint32_t mask,
+                                             const sec_perm_set_t *set = nullptr) noexcept {
+    permission_letters letters;
+    const int code = sec_translate_bitmask(mask, set, letters.text_);
+    if (code != SEC_S_OK)
+        letters.text_[0] = '\0';
+    return {code, letters};
+}
+
+/* ---- Entries ---- */
+
+/* The mechanism and identity of an entry in the locale's code set. Owns both texts. */
+class entry_texts {
+public:
+    /* No texts. */
+    entry_texts() noexcept = default;
+
+    /* The texts; empty where the entry's type takes none. */
+    [[nodiscard]] std::string_view mechanism() const noexcept { return mechanism_ ? mechanism_.get() : ""; }
+    [[nodiscard]] std::string_view identity() const noexcept { return identity_ ? identity_.get() : ""; }
+
+private:
+    friend class entry_view;
+
+    struct release {
+        void operator()(char *text) const noexcept { std::free(text); }
+    };
+
+    std::unique_ptr<char, release> mechanism_;
+    std::unique_ptr<char, release> identity_;
+};
+
+/*
+ * An entry that somebody else keeps: a list, an acl_entry, or a record of the caller's. As cheap to copy as a
+ * pointer, and good as long as what it looks at. The view of an empty acl_entry, or of null, shows type 0 and
+ * no texts or permissions; operations refuse it as they do a null entry.
+ */
+class entry_view {
+public:
+    entry_view(const sec_acle_t &entry) noexcept : entry_(&entry) {}
+    explicit entry_view(const sec_acle_t *entry) noexcept : entry_(entry) {}
+
+    /* SEC_ACLE_... */
+    [[nodiscard]] std::uint8_t type() const noexcept {
+        return entry_ != nullptr ? entry_->type : std::uint8_t{0};
+    }
+
+    /* The permissions, one bit each. */
+    [[nodiscard]] std::uint32_t permissions() const noexcept {
+        return entry_ != nullptr ? entry_->perm_mask : 0;
+    }
+
+    /* The texts in UTF-8; empty where the type takes none. */
+    [[nodiscard]] std::string_view mechanism() const noexcept {
+        return entry_ != nullptr ? entry_->mechanism : "";
+    }
+    [[nodiscard]] std::string_view identity() const noexcept {
+        return entry_ != nullptr && entry_->identity != nullptr ? entry_->identity : "";
+    }
+
+    /* The texts as they are to be shown, in the locale's code set. Codes: those of sec_display_acle_id. */
+    [[nodiscard]] result<entry_texts> displayed() const noexcept {
+        entry_texts texts;
+        char *mechanism = nullptr;
+        char *identity = nullptr;
+        const int code = sec_display_acle_id(entry_, &mechanism, &identity);
+        texts.mechanism_.reset(mechanism);
+        texts.identity_.reset(identity);
+        return {code, std::move(texts)};
+    }
+
+    /* Prints the entry as sec__dump_acle does. */
+    void dump(const sec_perm_set_t *set = nullptr, const char *indentation = "") const noexcept {
+        sec__dump_acle(entry_, set, indentation);
+    }
+
+    /* The record, for functions of the C interface; may be null. */
+    [[nodiscard]] const sec_acle_t *get() const noexcept { return entry_; }
+
+private:
+    const sec_acle_t *entry_;
+};
+
+/* An entry of one's own. */
+class acl_entry {
+public:
+    /* No entry. */
+    acl_entry() noexcept = default;
+
+    /*
+     * Makes an entry from texts in the locale's code set.
+     *
+     *   type         SEC_ACLE_...
+     *   mechanism    types 4 and 8; others: ignored, may be null
+     *   identity     types 4, 8 and 16; others: ignored, may be null
+     *
+     * Codes: those of sec_create_acle.
+     */
+    [[nodiscard]] static result<acl_entry> create(std::uint8_t type, std::uint32_t permissions,
+                                                  const char *mechanism = nullptr,
+                                                  const char *identity = nullptr) noexcept {
+        sec_acle_t *made = nullptr;
+        const int code = sec_create_acle(type, permissions, mechanism, identity, &made);
+        return {code, acl_entry(made)};
+    }
+
+    /* Takes over an entry that sec_create_acle made; may be null. */
+    explicit acl_entry(sec_acle_t *owned) noexcept : entry_(owned) {}
+
+    /* The entry as operations take it and its parts are read. */
+    [[nodiscard]] entry_view view() const noexcept { return entry_view(entry_.get()); }
+    operator entry_view() const noexcept { return view(); }
+
+    /* The record, for functions of the C interface, or to change its permissions; null when empty. */
+    [[nodiscard]] sec_acle_t *get() const noexcept { return entry_.get(); }
+
+private:
+    struct release {
+        void operator()(sec_acle_t *entry) const noexcept { sec_release_acle(entry); }
+    };
+
+    std::unique_ptr<sec_acle_t, release> entry_;
+};
+
+/* The entries that a listing hands out: a range of entry_view in the order of the list. */
+class acl_entries {
+public:
+    /* Goes through the entries. A forward iterator whose elements are values; good as long as the list. */
+    class iterator {
+    public:
+        using iterator_concept = std::forward_iterator_tag;
+        using iterator_category = std::input_iterator_tag;
+        using value_type = entry_view;
+        using difference_type = std::ptrdiff_t;
+        using reference = entry_view;
+        using pointer = void;
+
+        iterator() noexcept = default;
+        [[nodiscard]] entry_view operator*() const noexcept { return entry_view(*at_); }
+        iterator &operator++() noexcept { return ++at_, *this; }
+        iterator operator++(int) noexcept { return iterator(at_++); }
+        [[nodiscard]] friend bool operator==(iterator a, iterator b) noexcept { return a.at_ == b.at_; }
+        [[nodiscard]] friend bool operator!=(iterator a, iterator b) noexcept { return a.at_ != b.at_; }
+
+    private:
+        friend class acl_entries;
+        explicit iterator(sec_acle_t *const *at) noexcept : at_(at) {}
+
+        sec_acle_t *const *at_ = nullptr;
+    };
+    using const_iterator = iterator;
+
+    /* No entries. */
+    acl_entries() noexcept = default;
+
+    /* Takes over a list of the C interface. */
+    explicit acl_entries(sec_aclelist_t owned) noexcept : list_(owned) {}
+
+    acl_entries(acl_entries &&other) noexcept : list_(std::exchange(other.list_, sec_aclelist_t{})) {}
+    acl_entries &operator=(acl_entries &&other) noexcept {
+        acl_entries taken(std::move(other));
+        std::swap(list_, taken.list_);
+        return *this;
+    }
+    ~acl_entries() { sec_release_aclelist(&list_); }
+
+    [[nodiscard]] std::size_t size() const noexcept { return static_cast<std::size_t>(list_.count); }
+    [[nodiscard]] bool empty() const noexcept { return list_.count == 0; }
+
+    /* The entry at a place below size(). */
+    [[nodiscard]] entry_view operator[](std::size_t place) const noexcept { return *list_.acles[place]; }
+
+    [[nodiscard]] iterator begin() const noexcept { return iterator(list_.acles); }
+    [[nodiscard]] iterator end() const noexcept { return iterator(list_.acles + list_.count); }
+
+private:
+    sec_aclelist_t list_ = {};
+};
+
+/* ---- Access decisions ---- */
+
+/*
+ * What an ACL says to a question: permissions, that no entry speaks of the party, or that it could not be
+ * asked.
+ */
+class [[nodiscard]] decision {
+public:
+    decision(int code, std::uint32_t permissions) noexcept : code_(code), permissions_(permissions) {}
+
+    /* SEC_S_OK, SEC_S_BAD_ACLE or the failure. */
+    [[nodiscard]] int code() const noexcept { return code_; }
+
+    /* Whether an entry decided, be it that it grants nothing. */
+    explicit operator bool() const noexcept { return code_ == SEC_S_OK; }
+
+    /* Whether there is no entry for the party: nothing is granted, and the next question may be asked. */
+    [[nodiscard]] bool no_entry() const noexcept { return code_ == SEC_S_BAD_ACLE; }
+
+    /* Whether the question failed: nothing is granted, and the recorded error says why. */
+    [[nodiscard]] bool failed() const noexcept { return !*this && !no_entry(); }
+
+    /* The permissions; none unless an entry decided. */
+    [[nodiscard]] std::uint32_t permissions() const noexcept { return *this ? permissions_ : 0; }
+
+    /* Whether an entry decided and grants all of these permissions. */
+    [[nodiscard]] bool grants(std::uint32_t wanted) const noexcept {
+        return *this && (permissions_ & wanted) == wanted;
+    }
+
+private:
+    int code_;
+    std::uint32_t permissions_;
+};
+
+/* Whom a decision is about. Keeps the pointers that it is given. */
+class party {
+public:
+    /* Who did not authenticate, and any authenticated party. */
+    [[nodiscard]] static constexpr party unauthenticated() noexcept { return {SEC_ACLE_UNAUTHENTICATED}; }
+    [[nodiscard]] static constexpr party any_other() noexcept { return {SEC_ACLE_ANYOTHER}; }
+
+    /* An identity of a mechanism, both UTF-8, as user and as user-expanded entries mean it. */
+    [[nodiscard]] static constexpr party user(const char *mechanism, const char *identity) noexcept {
+        return {SEC_ACLE_USER, mechanism, identity};
+    }
+    [[nodiscard]] static constexpr party expanded(const char *mechanism, const char *identity) noexcept {
+        return {SEC_ACLE_EXPANDED, mechanism, identity};
+    }
+
+    /* The same party, compared with user entries through the mechanism's SEC_ID_HANDLER_USER. */
+    [[nodiscard]] constexpr party through_handler() const noexcept {
+        party changed = *this;
+        changed.type_ = static_cast<std::uint8_t>(type_ | SEC_ACLE_USE_ID_HANDLER);
+        return changed;
+    }
+
+    /* The same party, looked for among the entries of another mechanism; null: its own. */
+    [[nodiscard]] constexpr party among_entries_of(const char *mechanism) const noexcept {
+        party changed = *this;
+        changed.subacl_mechanism_ = mechanism;
+        return changed;
+    }
+
+private:
+    friend class acl;
+
+    constexpr party(std::uint8_t type, const char *mechanism = nullptr,
+                    const char *identity = nullptr) noexcept
+        : type_(type), mechanism_(mechanism), identity_(identity) {}
+
+    std::uint8_t type_;
+    const char *mechanism_;
+    const char *subacl_mechanism_ = nullptr;
+    const char *identity_;
+};
+
+/* ---- Buffers ---- */
+
+/*
+ * A compiled ACL. Made by default it has no bytes: that is also what a file without entries gives. Listing
+ * and editing take such an ACL; asking it fails with 42 (3417-109), so look at bytes().empty() first.
+ */
+class acl {
+public:
+    /* An ACL without bytes. */
+    acl() noexcept = default;
+
+    /* Takes over a buffer of the C interface. */
+    explicit acl(sec_acl_buffer_t owned) noexcept : buffer_(owned) {}
+
+    acl(acl &&other) noexcept : buffer_(other.release()) {}
+    acl &operator=(acl &&other) noexcept {
+        acl taken(std::move(other));
+        std::swap(buffer_, taken.buffer_);
+        return *this;
+    }
+    /* Not by sec_release_acl, which keeps bytes that are no ACL and clears the recorded error. */
+    ~acl() { std::free(buffer_.data); }
+
+    /*
+     * Makes an ACL without entries, which has bytes and may be asked. Codes: those of sec_create_empty_acl.
+     */
+    [[nodiscard]] static result<acl> create_empty() noexcept {
+        acl made;
+        const int code = sec_create_empty_acl(&made.buffer_);
+        if (code != SEC_S_OK)
+            made.buffer_ = {};
+        return {code, std::move(made)};
+    }
+
+    /*
+     * Reads an ACL file.
+     *
+     *   path        the file; with user a bare file name
+     *   user        null, or the user in whose home directory the file lies
+     *   set         the permissions of the text; null: acl__default_perm_set
+     *   flags       SEC_READ_ACL_...; by default bytes of a cache file are checked
+     *   out_flags   out, may be null: the flags as they came to hold
+     *
+     * Codes: those of sec_read_acl_file.
+     */
+    [[nodiscard]] static result<acl> read_file(const char *path, const char *user = nullptr,
+                                               const sec_perm_set_t *set = nullptr,
+                                               std::uint32_t flags = SEC_READ_ACL_CONVERT,
+                                               std::uint32_t *out_flags = nullptr) noexcept {
+        acl made;
+        const int code = sec_read_acl_file(path, user, set, flags, &made.buffer_, out_flags);
+        return {code, std::move(made)};
+    }
+
+    /*
+     * Copies bytes from elsewhere, unexamined: call to_host before anything else. More than 2^31 - 1 bytes
+     * are refused like none.
+     *
+     * Codes: those of sec_read_acl_from_data.
+     */
+    [[nodiscard]] static result<acl> from_bytes(const void *data, std::size_t size) noexcept {
+        constexpr std::size_t most = std::numeric_limits<std::int32_t>::max();
+        acl made;
+        const int code =
+            sec_read_acl_from_data(size <= most ? static_cast<int>(size) : 0, data, &made.buffer_);
+        return {code, std::move(made)};
+    }
+
+    /*
+     * Brings the ACL into host byte order, in place. With check its structure is checked as well, also when
+     * it had to be converted, which takes the C function two calls. After a failure only destroy or assign.
+     *
+     * Codes: those of sec_convert_acl_to_host.
+     */
+    [[nodiscard]] int to_host(bool check = true) noexcept {
+        const std::string_view held = bytes();
+        const bool converts = held.size() > 2 && held[2] != '\2';
+        const int code = sec_convert_acl_to_host(check ? 1 : 0, &buffer_);
+        return code == SEC_S_OK && check && converts ? sec_convert_acl_to_host(1, &buffer_) : code;
+    }
+
+    /*
+     * Adds an entry, or gives the one that is there the new permissions; add_new refuses one that is there;
+     * remove deletes it. Of the entry that is removed the permissions do not matter.
+     *
+     * Codes: those of sec_add_acle_to_acl, sec_add_acle_to_acl2 and sec_del_acle_from_acl.
+     */
+    [[nodiscard]] int add(entry_view entry) noexcept { return sec_add_acle_to_acl(entry.get(), &buffer_); }
+    [[nodiscard]] int add_new(entry_view entry) noexcept {
+        return sec_add_acle_to_acl2(entry.get(), &buffer_);
+    }
+    [[nodiscard]] int remove(entry_view entry) noexcept {
+        return sec_del_acle_from_acl(entry.get(), &buffer_);
+    }
+
+    /* Lists all entries. Codes: those of sec_list_acl. */
+    [[nodiscard]] result<acl_entries> list() const noexcept {
+        sec_aclelist_t entries = {};
+        const int code = sec_list_acl(&buffer_, &entries);
+        return {code, acl_entries(entries)};
+    }
+
+    /*
+     * Lists the entries of a type, of one mechanism or of all (null). Codes: those of sec_list_acl_by_type.
+     */
+    [[nodiscard]] result<acl_entries> list(std::uint8_t type,
+                                           const char *mechanism = nullptr) const noexcept {
+        sec_aclelist_t entries = {};
+        const int code = sec_list_acl_by_type(&buffer_, type, mechanism, &entries);
+        return {code, acl_entries(entries)};
+    }
+
+    /* Tells what is granted to a party. Allocates nothing. Codes: those of sec__single_acle_perm. */
+    decision single(party whom) const noexcept {
+        std::uint32_t mask = 0;
+        const int code = sec__single_acle_perm(&buffer_, whom.type_, whom.mechanism_, whom.subacl_mechanism_,
+                                               whom.identity_, &mask);
+        return {code, mask};
+    }
+
+    /*
+     * Tells what is granted to groups together. Allocates nothing. More than 2^31 - 1 groups count as groups
+     * without an entry.
+     *
+     *   first    the groups, in a row; may be null when count is 0
+     *   range    or a container, array or span of them
+     *
+     * Codes: those of sec__group_acles_perm.
+     */
+    decision groups(const sec_group_ref_t *first, std::size_t count) const noexcept {
+        constexpr std::size_t most = std::numeric_limits<std::int32_t>::max();
+        std::uint32_t mask = 0;
+        const int code = sec__group_acles_perm(
+            &buffer_, count <= most ? static_cast<std::int32_t>(count) : -1, first, &mask);
+        return {code, mask};
+    }
+    template <class Range, class = std::enable_if_t<std::is_convertible_v<
+                               decltype(std::data(std::declval<const Range &>())), const sec_group_ref_t *>>>
+    decision groups(const Range &range) const noexcept {
+        return groups(std::data(range), std::size(range));
+    }
+
+    /* The compiled bytes, good until the ACL changes. */
+    [[nodiscard]] std::string_view bytes() const noexcept {
+        return {static_cast<const char *>(buffer_.data), static_cast<std::size_t>(buffer_.length)};
+    }
+
+    /* Prints the ACL as sec__dump_acl does. */
+    void dump() const noexcept { sec__dump_acl(&buffer_); }
+
+    /* The descriptor, for functions of the C interface. */
+    [[nodiscard]] sec_acl_buffer_t *get() noexcept { return &buffer_; }
+    [[nodiscard]] const sec_acl_buffer_t *get() const noexcept { return &buffer_; }
+
+    /* Gives up the bytes, which the caller then releases; the ACL is left without. */
+    [[nodiscard]] sec_acl_buffer_t release() noexcept { return std::exchange(buffer_, sec_acl_buffer_t{}); }
+
+private:
+    sec_acl_buffer_t buffer_ = {};
+};
+
+} // namespace qz
+
+#endif

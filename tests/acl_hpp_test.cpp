@@ -1,0 +1,26 @@
+// Tests of acl.hpp where its example does not reach: moves, ranges, what failures leave, decisions in no memory.
+#include <algorithm>
+#include <gtest/gtest.h>
+#include <qz/acl.hpp>
+
+static int allocations = 0;
+#ifndef QZ_SANITIZED
+extern "C" void *__libc_malloc(size_t);
+extern "C" void *malloc(size_t size) noexcept { return ++allocations, __libc_malloc(size); }
+#endif
+
+TEST(AclHpp, MovesDecidesAndFails) {
+    static qz::acl acl, other, &self = acl;
+    ASSERT_EQ(acl.add(*qz::acl_entry::create(SEC_ACLE_GROUP, 5, nullptr, "staff")), SEC_S_OK);
+    other = std::move(acl = std::move(self));
+    EXPECT_TRUE(std::ranges::equal(*other.list(), std::array{"staff"}, {}, &qz::entry_view::identity));
+    const sec_group_ref_t groups[] = {{0, "none"}, {1, "STAFF"}};
+    const int before = allocations;
+    const qz::decision found = other.groups(groups), denied = other.single(qz::party::user("unix", "a@b"));
+    EXPECT_EQ(allocations, before);
+    EXPECT_TRUE(found.grants(4) && !found.grants(6) && denied.no_entry() && acl.groups(groups).failed());
+    EXPECT_EQ(qz::acl::from_bytes("none", 4)->to_host(), SEC_S_BAD_ACL);
+    const char swapped[] = "\x85\1\1\0\1\0\0\0\x0a\x7f\0\0\0\0"; // a sub-ACL of unknown type
+    EXPECT_EQ(qz::acl::from_bytes(swapped, sizeof swapped)->to_host(), SEC_S_BAD_ACL);
+    EXPECT_EQ(qz::error::current().text().substr(0, 8), "3417-120"); // its owner being gone
+}
