@@ -143,17 +143,21 @@ struct entry_walk {
 };
 
 // Steps over entries while `passes` says so of their version and identity, of which `readable` bytes may be read
-// even if it is shorter. Stops as well before an entry that ends the buffer too early, whose field does not end
-// in NUL, or that has fewer bytes behind it than the next would need: those are left to the checked reader. This
-// is the loop that a decision spends its time in, so each step makes do with one test for where the bytes end
-// and one for the field.
+// even if it is shorter. Stops as well before an entry that reaches beyond the end, whose field does not end in
+// NUL, or that has fewer bytes behind it than another one would take with the readable bytes of its identity:
+// those, and so the last ones of a buffer, are left to the checked reader. This is the loop that a decision
+// spends its time in, so each step makes do with one test for where the bytes end and one for the field.
 template <class Passes>
 void pass_entries(entry_walk &walk, std::size_t readable, const Passes &passes) {
-    const std::size_t needed = entry_fixed_size + readable;
-    if (walk.entries.left() < needed)
+    if (walk.entries.left() < entry_fixed_size + readable)
         return;
     const unsigned char *const start = walk.entries.position();
-    const std::uintptr_t last = reinterpret_cast<std::uintptr_t>(start) + walk.entries.left() - needed;
+    // Where an entry may start at the latest, as a number: sums of these do not wrap, and form no pointer to
+    // where nothing is.
+    const auto number_of = [](const unsigned char *place) {
+        return std::uint64_t{reinterpret_cast<std::uintptr_t>(place)};
+    };
+    const std::uint64_t last = number_of(start) + (walk.entries.left() - (entry_fixed_size + readable));
     const unsigned char *at = start;
     std::uint32_t left = walk.left;
     for (; left != 0; --left) {
@@ -161,8 +165,7 @@ void pass_entries(entry_walk &walk, std::size_t readable, const Passes &passes) 
         std::memcpy(&length, at + entry_length_offset, sizeof length);
         const unsigned char *const identity = at + entry_fixed_size;
         const std::size_t size = length;
-        if (size == 0 || reinterpret_cast<std::uintptr_t>(identity) + size > last ||
-            identity[size - 1] != '\0')
+        if (size == 0 || number_of(identity) + size > last || identity[size - 1] != '\0')
             break;
         if (!passes(*at, byte_span(identity, size)))
             break;

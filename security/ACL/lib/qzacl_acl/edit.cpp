@@ -144,17 +144,14 @@ void pass_ascending(const qz::wanted_identity &wanted, bool is_placed, qz::byte_
     constexpr std::size_t block_size = qz::identity_block::size;
     if (walk.left == 0 || previous.size() + walk.entries.left() < block_size)
         return;
-    const qz::wanted_identity held_in_registers = wanted;
+    const qz::wanted_identity held_in_registers = wanted; // a copy, which nothing else can change meanwhile
     qz::identity_block before(previous.data());
     std::size_t before_size = previous.size();
     const unsigned char *last = previous.data();
     format::pass_entries(walk, block_size, [&](std::uint8_t version, qz::byte_span identity) {
         const qz::identity_block block(identity.data());
-        const std::size_t nul = block.nul_at();
-        const bool is_exact =
-            nul < block_size ? nul + 1 == identity.size() : format::holds_exact_string(identity);
         // Behind the NUL of the one before stand other fields, which say nothing of the order.
-        if (version != format::entry_version || !is_exact || !before.sorts_before(block) ||
+        if (version != format::entry_version || !qz::ends_exactly(identity) || !before.sorts_before(block) ||
             before.differs_at(block) >= before_size)
             return false;
         if (!is_placed && !held_in_registers.is_clearly_behind(block))

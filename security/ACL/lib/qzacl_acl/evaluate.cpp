@@ -93,7 +93,7 @@ int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler
 // Passes by the entries that sort before the wanted identity, all but those whose order is not clear at first
 // sight.
 [[gnu::noinline]] void pass_by(const qz::wanted_identity &wanted, format::entry_walk &walk) {
-    const qz::wanted_identity held_in_registers = wanted;
+    const qz::wanted_identity held_in_registers = wanted; // a copy, which nothing else can change meanwhile
     format::pass_entries(walk, qz::identity_block::size, [&](std::uint8_t, qz::byte_span identity) {
         return held_in_registers.is_clearly_behind(qz::identity_block(identity.data()));
     });

@@ -6,24 +6,25 @@
 #include "bytes.h"
 #include "libqz_cu/posix_fold.h"
 
+#include <algorithm>
 #include <bit>
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
 
-#ifdef __SSE2__
+#ifdef __x86_64__
 #include <emmintrin.h>
 #endif
 
 namespace qz {
 
 // The first sixteen bytes of an identity, folded. Behind the NUL of a shorter one stand whatever bytes follow
-// it.
+// it in the buffer, or NULs where it was made of a string.
 class identity_block {
 public:
     static constexpr std::size_t size = 16;
 
-#ifdef __SSE2__
+#ifdef __x86_64__
     explicit identity_block(const unsigned char *bytes)
         : identity_block(_mm_loadu_si128(reinterpret_cast<const __m128i *>(bytes))) {}
 
@@ -49,12 +50,6 @@ public:
     // The two halves as numbers of which the lesser is that of the string that sorts first.
     std::uint64_t first() const { return ordered(_mm_cvtsi128_si64(bytes_)); }
     std::uint64_t second() const { return ordered(_mm_cvtsi128_si64(_mm_unpackhi_epi64(bytes_, bytes_))); }
-
-    // The place of the first NUL; at least `size` where there is none.
-    unsigned nul_at() const {
-        const int nuls = _mm_movemask_epi8(_mm_cmpeq_epi8(bytes_, _mm_setzero_si128()));
-        return static_cast<unsigned>(std::countr_zero(static_cast<unsigned>(nuls)));
-    }
 
 private:
     explicit identity_block(__m128i raw) {
@@ -92,12 +87,6 @@ private:
     std::uint64_t first() const { return ordered(words_[0]); }
     std::uint64_t second() const { return ordered(words_[1]); }
 
-    unsigned nul_at() const {
-        unsigned char bytes[size];
-        std::memcpy(bytes, words_, size);
-        return static_cast<unsigned>(std::find(bytes, bytes + size, 0) - bytes);
-    }
-
 private:
     static std::uint64_t ordered(std::uint64_t word) {
         return std::endian::native == std::endian::little ? __builtin_bswap64(word) : word;
@@ -126,13 +115,22 @@ public:
 
 // The place of the first NUL among the sixteen bytes of a block; at least sixteen where there is none.
 inline unsigned nul_in_block(const unsigned char *bytes) {
-#ifdef __SSE2__
+#ifdef __x86_64__
     const __m128i raw = _mm_loadu_si128(reinterpret_cast<const __m128i *>(bytes));
     const int nuls = _mm_movemask_epi8(_mm_cmpeq_epi8(raw, _mm_setzero_si128()));
     return static_cast<unsigned>(std::countr_zero(static_cast<unsigned>(nuls)));
 #else
-    return identity_block(bytes).nul_at();
+    return static_cast<unsigned>(std::find(bytes, bytes + identity_block::size, 0) - bytes);
 #endif
+}
+
+// True when the string of a field of which a whole block may be read ends where the field does. Most end within
+// the block, and a call for each would cost more than all the rest of a walk.
+inline bool ends_exactly(byte_span field) {
+    const std::size_t nul = nul_in_block(field.data());
+    if (nul < identity_block::size)
+        return nul + 1 == field.size();
+    return !field.empty() && std::memchr(field.data(), '\0', field.size()) == &field.back();
 }
 
 // How one identity stands to another, without regard to letter case.
@@ -148,10 +146,9 @@ class wanted_identity {
 public:
     explicit wanted_identity(const char *text) : text_(text), block_(identity_block::of_string(text)) {}
 
-    // True for most entries that the wanted identity sorts behind, and for no others. `stored` is the entry's
-    // field, of which the last byte is NUL, and `block` its start: what stands behind that NUL takes no part,
-    // as the wanted identity differs before, or ends there too and is padded with bytes that nothing sorts
-    // before.
+    // True for most entries that the wanted identity sorts behind, and for no others. `block` is the start of an
+    // entry's field, which ends in NUL: what stands behind that NUL takes no part, as the wanted identity
+    // differs before, or ends there too and is padded with bytes that nothing sorts before.
     bool is_clearly_behind(const identity_block &block) const { return block.sorts_before(block_); }
 
     identity_order compare(byte_span stored) const {

@@ -97,10 +97,7 @@ int check_entry(qz::byte_reader &reader, std::uint8_t type) {
 // Passes by sound entries with identities, save for those close to the end.
 void pass_sound_entries(format::entry_walk &walk) {
     format::pass_entries(walk, qz::identity_block::size, [](std::uint8_t version, qz::byte_span identity) {
-        const std::size_t nul = qz::nul_in_block(identity.data());
-        return version == format::entry_version &&
-               (nul < qz::identity_block::size ? nul + 1 == identity.size()
-                                               : format::holds_exact_string(identity));
+        return version == format::entry_version && qz::ends_exactly(identity);
     });
 }
 
