@@ -56,11 +56,17 @@ endfunction()
 function(qz_install_library name header requires_list arg_DESCRIPTION)
   set(package_dir ${CMAKE_INSTALL_LIBDIR}/cmake/${name})
   list(JOIN requires_list " " requires)
-  # Relative, so that an installed tree may be moved.
-  file(RELATIVE_PATH prefix_from_pc /${CMAKE_INSTALL_LIBDIR}/pkgconfig /)
-  string(REGEX REPLACE "/$" "" prefix_from_pc "${prefix_from_pc}")
+  # Relative, so that an installed tree may be moved, unless the libraries have a place of their own.
+  if(IS_ABSOLUTE ${CMAKE_INSTALL_LIBDIR})
+    set(pc_prefix ${CMAKE_INSTALL_PREFIX})
+  else()
+    file(RELATIVE_PATH pc_prefix /${CMAKE_INSTALL_LIBDIR}/pkgconfig /)
+    string(REGEX REPLACE "(.*)/$" "\${pcfiledir}/\\1" pc_prefix "${pc_prefix}")
+  endif()
+  cmake_path(APPEND pc_includedir "\${prefix}" ${CMAKE_INSTALL_INCLUDEDIR})
+  cmake_path(APPEND pc_libdir "\${prefix}" ${CMAKE_INSTALL_LIBDIR})
   install(TARGETS ${name} EXPORT ${name}-targets
-    LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR} NAMELINK_COMPONENT development)
+    LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR} COMPONENT library NAMELINK_COMPONENT development)
   install(FILES ${PROJECT_SOURCE_DIR}/include/qz/${header} DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/qz
     COMPONENT development)
   install(EXPORT ${name}-targets NAMESPACE ${name}:: DESTINATION ${package_dir} COMPONENT development)
