@@ -104,7 +104,7 @@ QZ_CU_API int cu_set_no_error_1(void);
  * Hands out a copy of the calling thread's current error, also in the no-error state.
  *
  *   error  out: a handle of the caller's own, released with cu_rel_error_1; later records do not change it.
- * Null: CU_BAD_PARAMETER.
+ *          Null: CU_BAD_PARAMETER.
  *
  * Returns CU_OK; CU_BAD_PARAMETER; CU_NO_MEMORY, and then *error is null.
  */
@@ -122,7 +122,7 @@ QZ_CU_API int cu_get_error_1(cu_error_t **error);
  *
  *   error  the handle; it stays the caller's. Null: CU_BAD_PARAMETER.
  *   text   out: a NUL-terminated string of the caller's own, released with cu_rel_errmsg_1; empty in the
- * no-error state. Null: CU_BAD_PARAMETER.
+ *          no-error state. Null: CU_BAD_PARAMETER.
  *
  * Returns CU_OK; CU_BAD_PARAMETER, and then *text is null where there is a text; CU_NO_MEMORY, and then *text
  * is null.
@@ -167,7 +167,7 @@ typedef struct cu_iconv *cu_iconv_t;
  *            CU_BAD_PARAMETER. The name is copied.
  *   flags    the sum of flags above; any other bit: CU_BAD_PARAMETER
  *   handle   out: the handle, valid as long as the process runs; null after any failure. Null:
- * CU_BAD_PARAMETER.
+ *            CU_BAD_PARAMETER.
  *
  * Returns CU_OK; CU_BAD_PARAMETER; CU_ICONV_UNKNOWN_CODESET when the system cannot convert in the direction
  * asked for; CU_ICONV_NO_MEMORY; CU_NO_RESOURCE when the system gives no converter or no more keys for data
