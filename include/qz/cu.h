@@ -60,7 +60,7 @@ extern "C" {
  *                         x  an int, taken as unsigned, lower-case hexadecimal
  *                         c  an int, one byte; 0 adds no byte
  *                       width: 1 to 999, filled at the left with blanks or, for d, u and x after the flag 0,
- * with zeros
+ *                       with zeros
  *     %%                a percent sign
  *
  * Anything else stands for itself. A position may occur more than once; one that is first used as a string
