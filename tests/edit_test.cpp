@@ -1,6 +1,6 @@
 // Tests of adding and deleting entries: refusals, limits, and bytes that nothing checks. What edits do otherwise is
 // compared with a plain model by fuzz/edit_fuzz.cpp.
-#include "service_support.h"
+#include "support.h"
 
 namespace {
 

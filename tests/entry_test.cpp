@@ -2,7 +2,7 @@
 #include "owned.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/permission.h"
-#include "service_support.h"
+#include "support.h"
 
 #include <clocale>
 #include <dlfcn.h>

@@ -1,8 +1,7 @@
 // Tests of access decisions and identity handlers. Decisions on any buffer that passes the check are compared with a
 // walk over its entries one by one by fuzz/buffer_fuzz.cpp.
 #include "qzacl_acl/id_handlers.h"
-#include "service_support.h"
-#include <thread>
+#include "support.h"
 
 namespace {
 
@@ -147,21 +146,6 @@ TEST(evaluate, registrations_stay_in_the_order_in_which_they_came) {
     EXPECT_EQ(single(acl, 0x84, "sixteen-BYTES-xx", "a", "m"), granted(2));
     EXPECT_EQ(single(acl, 0x84, "sixteen-bytes-x", "a", "m"), granted(1));
     EXPECT_EQ(single(acl, 8, "sixteen-bytes-xx", "a", "m"), denied(8, "sixteen-bytes-xx", "a"));
-}
-
-TEST(evaluate, threads_register_and_decide_at_once) {
-    const std::string bytes = one(of_mechanism(4, "exact", 1, named(7, "a")));
-    std::vector<std::thread> threads;
-    for (int thread = 0; thread < 4; ++thread)
-        threads.emplace_back([&, thread] {
-            for (int turn = 0; turn < 200; ++turn) {
-                const std::string key = "t"s.append(std::to_string(thread * 1000 + turn));
-                EXPECT_EQ(single(bytes, 0x84, key.c_str(), "b", "exact"), denied(132, key, "b"));
-                EXPECT_EQ(sec__register_id_handler(2, key.c_str(), [](auto, auto) { return 0; }), 0);
-                EXPECT_EQ(single(bytes, 0x84, key.c_str(), "b", "exact"), granted(7));
-            }
-        });
-    for (std::thread &thread : threads) thread.join();
 }
 
 } // namespace

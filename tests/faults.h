@@ -55,6 +55,11 @@ inline bool fails_now() {
                                                               : allocations.count == allocations.fails_at);
 }
 
+inline void *counted(void *made) {
+    allocations.live += made != nullptr;
+    return made;
+}
+
 } // namespace faults
 
 #define QZ_WRAPPED(result, name, parameters)                                                                           \
@@ -68,19 +73,14 @@ inline bool fails_now() {
 extern "C" {
 
 QZ_WRAPPED(void *, malloc, (size_t size)) {
-    void *made = faults::fails_now() ? nullptr : __real_malloc(size);
-    faults::allocations.live += made != nullptr;
-    return made;
+    return faults::counted(faults::fails_now() ? nullptr : __real_malloc(size));
 }
 QZ_WRAPPED(void *, calloc, (size_t count, size_t size)) {
-    void *made = faults::fails_now() ? nullptr : __real_calloc(count, size);
-    faults::allocations.live += made != nullptr;
-    return made;
+    return faults::counted(faults::fails_now() ? nullptr : __real_calloc(count, size));
 }
 QZ_WRAPPED(void *, realloc, (void *old, size_t size)) {
     void *made = faults::fails_now() ? nullptr : __real_realloc(old, size);
-    faults::allocations.live += made != nullptr && old == nullptr;
-    return made;
+    return old == nullptr ? faults::counted(made) : made;
 }
 QZ_WRAPPED(char *, strdup, (const char *text)) {
     const std::string copy = text;

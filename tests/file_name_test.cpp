@@ -1,12 +1,9 @@
-// Where an ACL file is, and reading it whole. The user database answers here as a case wants it to.
+// Where an ACL file is. The user database answers here as a case wants it to.
 #include "qzacl_acl/file_name.h"
-#include "qzacl_utils.h"
 #include "support.h"
 
 #include <cerrno>
 #include <dlfcn.h>
-#include <fcntl.h>
-#include <fstream>
 #include <pwd.h>
 
 using namespace support;
@@ -93,33 +90,6 @@ TEST(file_name, lies_in_the_home_directory_of_a_user) {
     const passwd *self = getpwuid(getuid());
     ASSERT_NE(self, nullptr);
     EXPECT_EQ(path_of("x", self->pw_name).text, std::to_string(getuid()) + " " + self->pw_dir + "/x");
-}
-
-TEST(reading, takes_the_whole_file_or_nothing) {
-    const temporary_folder folder;
-    const std::string name = folder / "acl", missing = folder / "missing", empty = folder / "empty";
-    std::ofstream(name) << "n r\0\n"sv;
-    std::ofstream(empty) << "";
-    // Opened, named, how, where it stands; the text with the NUL behind it, or the failure.
-    const std::tuple<std::string, std::string, int, off_t, std::string_view, failure> rows[] = {
-        {name, name, O_RDONLY, 0, "n r\0\n\0"sv, {}},
-        {empty, empty, O_RDONLY, 0, "", {}},
-        {name, name, O_RDONLY, 2, "", error_of(37, 126, {"3", "5", "0"})},
-        {name, name, O_WRONLY, 0, "", error_of(37, 126, {"-1", "5", std::to_string(EBADF)})},
-        {name, missing, O_RDONLY, 0, "", error_of(37, 122, {missing, std::to_string(ENOENT)})},
-    };
-    for (const auto &[opened, named, flags, start, wanted, error] : rows) {
-        const qz::descriptor file(open(opened.c_str(), flags));
-        lseek(file.get(), start, SEEK_SET);
-        errno = EPERM; // a stale number is not reported
-        char *text = const_cast<char *>("left over");
-        std::size_t length = 99;
-        EXPECT_EQ(acl__read_acl_file(named.c_str(), file.get(), &text, &length), error.code);
-        EXPECT_EQ(recorded_error(), error);
-        EXPECT_EQ(text == nullptr ? ""sv : std::string_view(text, length + 1), wanted);
-        EXPECT_EQ(length, wanted.empty() ? 0 : wanted.size() - 1);
-        std::free(text);
-    }
 }
 
 } // namespace

@@ -1,6 +1,6 @@
 // Every public operation, as a service that uses all of the library would call it: once, so that trace_test can
 // read what that leaves, and from many threads at once.
-#include "service_support.h"
+#include "support.h"
 #include <cstdio>
 #include <fcntl.h>
 #include <fstream>

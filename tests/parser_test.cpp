@@ -1,7 +1,7 @@
 // The syntax of ACL files: texts and what their lines are, and random bytes, all of them also against a
 // second parser that is plain enough to be right at a glance.
 #include "qzacl_acl/entry_parser.h"
-#include "service_support.h"
+#include "support.h"
 
 #include <algorithm>
 #include <random>
