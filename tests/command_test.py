@@ -199,11 +199,6 @@ class Command(CommandCase):
         for locale, shown in (("C", TEXTS[130]), ("C.UTF-8", entry("u", "r", "m", "\xc3\xa9"))):
             self.expect(["-v", "-f", "a"], 0, shown + TEXTS[130] + LINE_OF_A, environment={"LC_ALL": locale})
 
-    def test_every_bad_line_is_reported(self):
-        self.write("a", "".join(f"bad{number}\n" for number in range(10000)))
-        self.expect(["-c", "-s", "-f", "a"], 0,
-                    "".join(message(165, number + 1, f"bad{number}") for number in range(10000)) + message(162))
-
     def test_many_sorted_entries_on_a_small_stack(self):
         names = [f"user{number:06}" for number in range(100000)]
         path = self.write("a", "".join(f"u m {name} r\ne m {name}\n" for name in names))

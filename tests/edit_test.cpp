@@ -2,8 +2,6 @@
 // compared with a plain model by fuzz/edit_fuzz.cpp.
 #include "support.h"
 
-namespace {
-
 using namespace support;
 
 TEST(edit, reports_what_it_refuses_and_leaves_the_buffer_alone) {
@@ -83,5 +81,3 @@ TEST(edit, adds_an_identity_that_lies_in_the_buffer) {
     EXPECT_EQ(after(sec_add_acle_to_acl(&acle, &held.acl)), no_error);
     EXPECT_EQ(held.bytes(), packed_acl(1, of_mechanism(4, "unix", 2, named(2, "move") + stored)));
 }
-
-} // namespace

@@ -18,7 +18,7 @@ decision denied(int type, const std::string &mechanism, const std::string &ident
 // The bytes lie right before memory that nothing may touch.
 decision decided(const std::string &bytes, const auto &call) {
     const guarded memory(bytes);
-    const sec_acl_buffer_t acl = {static_cast<std::int32_t>(bytes.size()), memory.data()};
+    const sec_acl_buffer_t acl = memory.acl();
     std::uint32_t mask = untouched;
     const failure error = after(call(&acl, &mask));
     return {mask, error};
@@ -91,6 +91,10 @@ TEST(evaluate, refuses_bytes_that_are_no_acl_of_this_host) {
         EXPECT_EQ(single(bytes, 99, nullptr, nullptr), refused(error)); // before the type
         EXPECT_EQ(groups(bytes, {}), refused(error));
     }
+    // Groups that are none, and none at all.
+    EXPECT_EQ(groups(rich, std::vector<const char *>(65, nullptr)), denied(16, "", ""));
+    EXPECT_EQ(groups(example, {"staff"}), denied(16, "", ""));
+    EXPECT_EQ(groups(rich, {}), granted(0));
     const buffer acl(rich);
     const sec_acl_buffer_t none = {5, nullptr}, negative = {-1, acl.acl.data};
     const sec_group_ref_t group = {1, "staff"};
@@ -104,12 +108,6 @@ TEST(evaluate, refuses_bytes_that_are_no_acl_of_this_host) {
     EXPECT_EQ(after(sec__group_acles_perm(&none, -1, nullptr, nullptr)), bad_parameter(of_groups, 3));
     EXPECT_EQ(after(sec__group_acles_perm(&none, 1, &group, nullptr)), bad_parameter(of_groups, 4));
     EXPECT_EQ(after(sec__group_acles_perm(&acl.acl, -1, &group, &mask)), error_of(43, 134, {"16", "", ""}));
-}
-
-TEST(evaluate, passes_over_groups_that_are_none) {
-    EXPECT_EQ(groups(rich, std::vector<const char *>(65, nullptr)), denied(16, "", ""));
-    EXPECT_EQ(groups(example, {"staff"}), denied(16, "", ""));
-    EXPECT_EQ(groups(rich, {}), granted(0));
 }
 
 // A walk stops at what it cannot read, but only when it gets there.

@@ -7,6 +7,7 @@
 #include <cstring>
 #include <fcntl.h>
 #include <functional>
+#include <optional>
 #include <pwd.h>
 #include <string>
 #include <sys/stat.h>
@@ -25,7 +26,8 @@ inline allocations_seen allocations;
 constexpr int short_transfer = -1;
 inline bool is_watching = false;
 inline std::vector<std::string> calls;
-inline std::string home;                       // of every user
+inline std::string home;                                   // of every user, and what the database answers besides
+inline std::optional<std::pair<int, const char *>> answer; // a result, and the name; without it there is no such user
 inline std::function<int(std::size_t)> before; // told the place in `calls`; gives an errno value, short_transfer or 0
 
 inline int next(const char *name) {
@@ -126,6 +128,11 @@ QZ_WRAPPED(int, getpwnam_r, (const char *name, passwd *entry, char *memory, size
     const int fault = faults::next("getpwnam_r");
     const int result = __real_getpwnam_r(name, entry, memory, size, found);
     entry->pw_dir = faults::home.data();
+    if (faults::answer) {
+        entry->pw_name = const_cast<char *>(faults::answer->second);
+        entry->pw_uid = 4242;
+        return *found = entry->pw_name == nullptr ? nullptr : entry, faults::answer->first;
+    }
     return fault > 0 ? (*found = nullptr, fault) : result;
 }
 

@@ -1,7 +1,6 @@
 // Tests of reading an ACL file through its cache: which of the two files is read, what the flags then say,
 // and what a cache that is written afterwards looks like. Times are set, never waited for.
 #include "support.h"
-#include <fstream>
 #include <pwd.h>
 
 namespace {
@@ -12,17 +11,6 @@ namespace fs = std::filesystem;
 constexpr unsigned text = SEC_READ_ACL_TEXT, cache = SEC_READ_ACL_CACHE, convert = SEC_READ_ACL_CONVERT;
 const std::string acl_text = "# users\nu unix alice@host r\n";
 const std::string from_text = one(of_mechanism(4, "unix", 1, named(1, "alice@host")));
-
-void write_file(const std::string &path, const std::string &bytes, int age, unsigned mode) {
-    std::ofstream(path, std::ios::binary) << bytes;
-    static const auto now = std::chrono::floor<std::chrono::seconds>(fs::file_time_type::clock::now());
-    fs::last_write_time(path, now - std::chrono::seconds(age)); // of one moment for all files
-    fs::permissions(path, fs::perms(mode));
-}
-std::string read_file(const std::string &path) {
-    std::ifstream file(path, std::ios::binary);
-    return {std::istreambuf_iterator<char>(file), {}};
-}
 
 using reading = std::tuple<std::string, unsigned, failure>; // the bytes, the flags, and the error
 reading given(const std::string &bytes, unsigned flags) { return {bytes, flags, no_error}; }

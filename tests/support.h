@@ -11,6 +11,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
+#include <fstream>
 #include <gtest/gtest.h>
 #include <iterator>
 #include <memory>
@@ -78,6 +79,7 @@ public:
         bytes.copy(data(), size_);
     }
     char *data() const { return bytes_.get(); }
+    sec_acl_buffer_t acl() const { return {static_cast<std::int32_t>(size_), data()}; }
     std::size_t size() const { return size_; }
 
 private:
@@ -105,6 +107,17 @@ public:
 private:
     std::string path_ = std::filesystem::temp_directory_path() / ("qzacl-test-" + std::string(6, 'X'));
 };
+
+inline void write_file(const std::string &path, const std::string &bytes, int age = 0, unsigned mode = 0644) {
+    using namespace std::filesystem;
+    std::ofstream(path, std::ios::binary) << bytes;
+    last_write_time(path, file_time_type::clock::now() - std::chrono::seconds(age));
+    permissions(path, perms(mode));
+}
+inline std::string read_file(const std::string &path) {
+    std::ifstream file(path, std::ios::binary);
+    return {std::istreambuf_iterator<char>(file), {}};
+}
 
 // An entry that borrows its texts.
 inline sec_acle_t entry(int type, std::string_view mechanism, const char *identity, std::uint32_t mask) {

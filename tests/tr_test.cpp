@@ -1,14 +1,11 @@
 // The trace facility. A process reads its configuration once, so whatever needs one runs in a child.
 #include "qz/tr.h"
-#include <cerrno>
-#include <cstdlib>
 #include <fcntl.h>
 #include <filesystem>
 #include <fstream>
 #include <gmock/gmock.h>
 #include <regex>
 #include <sys/resource.h>
-#include <sys/stat.h>
 #include <sys/wait.h>
 #include <thread>
 #include <unistd.h>

@@ -4,13 +4,11 @@
 #include "qzacl_acl/validate.h"
 #include "support.h"
 
-namespace {
-
 using namespace support;
 
 const std::string xyz = named(3, "xyz"), bare = packed_entry(1, ""), other = packed_subacl(2, "", 1, bare);
 
-std::string with(std::string bytes, std::size_t offset, int value) {
+static std::string with(std::string bytes, std::size_t offset, int value) {
     bytes[offset] = static_cast<char>(value);
     return bytes;
 }
@@ -52,7 +50,7 @@ TEST(validate, checks_every_rule_in_its_order) {
     };
     for (const auto &[name, bytes, error] : rows) {
         const guarded memory(bytes);
-        sec_acl_buffer_t acl = {static_cast<std::int32_t>(bytes.size()), memory.data()};
+        sec_acl_buffer_t acl = memory.acl();
         EXPECT_EQ(after(sec__check_acl_buffer(&acl)), error) << name;
         EXPECT_EQ(after(sec_convert_acl_to_host(1, &acl)), error) << name;
         EXPECT_EQ(after(sec_convert_acl_to_host(0, &acl)), no_error) << name; // nothing to convert
@@ -115,13 +113,10 @@ TEST(list, refuses_what_it_cannot_list) {
     EXPECT_EQ(after(sec_list_acl(&no_length, &list)), error_of(42, 96));
     EXPECT_EQ(sec_list_acl(&empty, &list) + list.count, 0);
     const std::string of = "sec_list_acl_by_type";
-    const auto call = sec_list_acl_by_type;
-    EXPECT_EQ(after(call(nullptr, 0, blank, nullptr)), bad_parameter(of, 1));
-    EXPECT_EQ(after(call(&no_length, 0x84, blank, nullptr)), bad_parameter(of, 2, "84"));
+    EXPECT_EQ(after(sec_list_acl_by_type(nullptr, 0, blank, nullptr)), bad_parameter(of, 1));
+    EXPECT_EQ(after(sec_list_acl_by_type(&no_length, 0x84, blank, nullptr)), bad_parameter(of, 2, "84"));
     for (const char *bad : {blank, long_name})
-        EXPECT_EQ(after(call(&no_length, 4, bad, nullptr)), bad_parameter(of, 3, shown(bad)));
-    EXPECT_EQ(after(call(&no_length, 16, long_name, nullptr)), bad_parameter(of, 4));
-    EXPECT_EQ(after(call(&no_length, 1, blank, &list)), error_of(42, 96));
+        EXPECT_EQ(after(sec_list_acl_by_type(&no_length, 4, bad, nullptr)), bad_parameter(of, 3, shown(bad)));
+    EXPECT_EQ(after(sec_list_acl_by_type(&no_length, 16, long_name, nullptr)), bad_parameter(of, 4));
+    EXPECT_EQ(after(sec_list_acl_by_type(&no_length, 1, blank, &list)), error_of(42, 96));
 }
-
-} // namespace
