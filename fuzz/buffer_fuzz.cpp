@@ -106,7 +106,7 @@ void try_edits(const std::string &bytes, const model &held, const std::string &n
 
 void use_everywhere(const std::string &bytes, const std::string &name) {
     const guarded memory(bytes);
-    sec_acl_buffer_t acl = {static_cast<std::int32_t>(bytes.size()), memory.data()};
+    sec_acl_buffer_t acl = memory.acl();
     buffer copy;
     EXPECT_EQ(after(sec_read_acl_from_data(acl.length, acl.data, &copy.acl)), no_error);
     EXPECT_EQ(copy.bytes(), bytes);

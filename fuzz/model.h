@@ -2,7 +2,7 @@
 // to expand the sub-ACL of the entry's key, change it, and compile it again.
 #ifndef QZ_FUZZ_MODEL_H
 #define QZ_FUZZ_MODEL_H
-#include "service_support.h"
+#include "support.h"
 
 namespace fuzz {
 

@@ -7,7 +7,6 @@ import itertools
 import os
 import pathlib
 import pwd
-import random
 import re
 import resource
 import shutil
@@ -201,22 +200,6 @@ class Command(CommandCase):
         for locale, shown in (("C", TEXTS[130]), ("C.UTF-8", entry("u", "r", "m", "\xc3\xa9"))):
             self.expect(["-v", "-f", "a"], 0, shown + TEXTS[130] + LINE_OF_A, environment={"LC_ALL": locale})
 
-    def test_every_bad_line_is_reported(self):
-        self.write("a", "".join(f"bad{number}\n" for number in range(10000)))
-        self.expect(["-c", "-s", "-f", "a"], 0,
-                    "".join(message(165, number + 1, f"bad{number}") for number in range(10000)) + message(162))
-
-    def test_random_bytes(self):
-        numbers = random.Random(20261124)
-        pieces = "n|o r|u unix |e K |g |\n|\r|\f|\0| |\t|#|rwx|\xff\xfe|\xc3\xa9|%s%n".split("|") + ["x" * 1090]
-        for number in range(300):
-            text = "".join(numbers.choices(pieces, k=numbers.randrange(1, 200)))
-            self.write("a", text if number % 2 else numbers.randbytes(numbers.randrange(1, 4000)))
-            options = [["-c", "-v"], ["-c", "-v", "-s"], ["-s"], []][number // 2 % 4]
-            status, _ = run([*options, "-f", "a"], self.dir)
-            self.assertIn(status, (0,) if "-c" in options else (0, *CODES.values()), number)
-        self.assertLessEqual(set(os.listdir(self.dir)), {"a", "a.cacl"})
-
     def test_many_sorted_entries_on_a_small_stack(self):
         names = [f"user{number:06}" for number in range(100000)]
         path = self.write("a", "".join(f"u m {name} r\ne m {name}\n" for name in names))
@@ -291,16 +274,6 @@ class Command(CommandCase):
             self.write("a", A_TEXT, mode, NOBODY if IS_ROOT else None)
             self.expect(["-s", "-f", "a"], 0, "", MADE, child=lambda: os.umask(0o077))
             self.assertEqual(*[(info.st_uid, info.st_gid, info.st_mode) for info in map(os.stat, os.scandir(self.dir))])
-
-    def test_cache_is_replaced_in_one_step(self):
-        self.write("file", A_TEXT)
-        held = self.write("old", "what readers hold open stays as it is")
-        os.symlink("file", self.dir + "/a")
-        for put in (os.symlink, os.link):
-            put(held, self.dir + "/a.cacl")
-            self.expect(["-s", "-f", "a"], 0, "", MADE)
-            self.assertFalse(os.path.islink(self.dir + "/a.cacl"))
-            os.unlink(self.dir + "/a.cacl")
 
     def test_full_disk(self):
         for room, count, error, action in ((7, 7, 0, signal.SIG_IGN), (0, -1, errno.EFBIG, signal.SIG_DFL)):

@@ -1,8 +1,6 @@
 // Tests of adding and deleting entries: refusals, limits, and bytes that nothing checks. What edits do otherwise is
 // compared with a plain model by fuzz/edit_fuzz.cpp.
-#include "service_support.h"
-
-namespace {
+#include "support.h"
 
 using namespace support;
 
@@ -83,5 +81,3 @@ TEST(edit, adds_an_identity_that_lies_in_the_buffer) {
     EXPECT_EQ(after(sec_add_acle_to_acl(&acle, &held.acl)), no_error);
     EXPECT_EQ(held.bytes(), packed_acl(1, of_mechanism(4, "unix", 2, named(2, "move") + stored)));
 }
-
-} // namespace

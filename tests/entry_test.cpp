@@ -2,7 +2,7 @@
 #include "owned.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/permission.h"
-#include "service_support.h"
+#include "support.h"
 
 #include <clocale>
 #include <dlfcn.h>
@@ -134,7 +134,6 @@ TEST(entries_DeathTest, are_converted_between_the_code_set_and_utf8) {
 }
 
 TEST(entries, go_with_the_list_that_holds_them) {
-    sec_release_aclelist(nullptr);
     sec_aclelist_t list = {5, nullptr}; // an array that is not there is not looked at
     sec_release_aclelist(&list);
     EXPECT_EQ(list.count, 5);

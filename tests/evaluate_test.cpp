@@ -1,8 +1,7 @@
 // Tests of access decisions and identity handlers. Decisions on any buffer that passes the check are compared with a
 // walk over its entries one by one by fuzz/buffer_fuzz.cpp.
 #include "qzacl_acl/id_handlers.h"
-#include "service_support.h"
-#include <thread>
+#include "support.h"
 
 namespace {
 
@@ -19,7 +18,7 @@ decision denied(int type, const std::string &mechanism, const std::string &ident
 // The bytes lie right before memory that nothing may touch.
 decision decided(const std::string &bytes, const auto &call) {
     const guarded memory(bytes);
-    const sec_acl_buffer_t acl = {static_cast<std::int32_t>(bytes.size()), memory.data()};
+    const sec_acl_buffer_t acl = memory.acl();
     std::uint32_t mask = untouched;
     const failure error = after(call(&acl, &mask));
     return {mask, error};
@@ -92,6 +91,10 @@ TEST(evaluate, refuses_bytes_that_are_no_acl_of_this_host) {
         EXPECT_EQ(single(bytes, 99, nullptr, nullptr), refused(error)); // before the type
         EXPECT_EQ(groups(bytes, {}), refused(error));
     }
+    // Groups that are none, and none at all.
+    EXPECT_EQ(groups(rich, std::vector<const char *>(65, nullptr)), denied(16, "", ""));
+    EXPECT_EQ(groups(example, {"staff"}), denied(16, "", ""));
+    EXPECT_EQ(groups(rich, {}), granted(0));
     const buffer acl(rich);
     const sec_acl_buffer_t none = {5, nullptr}, negative = {-1, acl.acl.data};
     const sec_group_ref_t group = {1, "staff"};
@@ -105,12 +108,6 @@ TEST(evaluate, refuses_bytes_that_are_no_acl_of_this_host) {
     EXPECT_EQ(after(sec__group_acles_perm(&none, -1, nullptr, nullptr)), bad_parameter(of_groups, 3));
     EXPECT_EQ(after(sec__group_acles_perm(&none, 1, &group, nullptr)), bad_parameter(of_groups, 4));
     EXPECT_EQ(after(sec__group_acles_perm(&acl.acl, -1, &group, &mask)), error_of(43, 134, {"16", "", ""}));
-}
-
-TEST(evaluate, passes_over_groups_that_are_none) {
-    EXPECT_EQ(groups(rich, std::vector<const char *>(65, nullptr)), denied(16, "", ""));
-    EXPECT_EQ(groups(example, {"staff"}), denied(16, "", ""));
-    EXPECT_EQ(groups(rich, {}), granted(0));
 }
 
 // A walk stops at what it cannot read, but only when it gets there.
@@ -147,21 +144,6 @@ TEST(evaluate, registrations_stay_in_the_order_in_which_they_came) {
     EXPECT_EQ(single(acl, 0x84, "sixteen-BYTES-xx", "a", "m"), granted(2));
     EXPECT_EQ(single(acl, 0x84, "sixteen-bytes-x", "a", "m"), granted(1));
     EXPECT_EQ(single(acl, 8, "sixteen-bytes-xx", "a", "m"), denied(8, "sixteen-bytes-xx", "a"));
-}
-
-TEST(evaluate, threads_register_and_decide_at_once) {
-    const std::string bytes = one(of_mechanism(4, "exact", 1, named(7, "a")));
-    std::vector<std::thread> threads;
-    for (int thread = 0; thread < 4; ++thread)
-        threads.emplace_back([&, thread] {
-            for (int turn = 0; turn < 200; ++turn) {
-                const std::string key = "t"s.append(std::to_string(thread * 1000 + turn));
-                EXPECT_EQ(single(bytes, 0x84, key.c_str(), "b", "exact"), denied(132, key, "b"));
-                EXPECT_EQ(sec__register_id_handler(2, key.c_str(), [](auto, auto) { return 0; }), 0);
-                EXPECT_EQ(single(bytes, 0x84, key.c_str(), "b", "exact"), granted(7));
-            }
-        });
-    for (std::thread &thread : threads) thread.join();
 }
 
 } // namespace

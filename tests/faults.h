@@ -7,6 +7,7 @@
 #include <cstring>
 #include <fcntl.h>
 #include <functional>
+#include <optional>
 #include <pwd.h>
 #include <string>
 #include <sys/stat.h>
@@ -25,7 +26,8 @@ inline allocations_seen allocations;
 constexpr int short_transfer = -1;
 inline bool is_watching = false;
 inline std::vector<std::string> calls;
-inline std::string home;                       // of every user
+inline std::string home;                                   // of every user, and what the database answers besides
+inline std::optional<std::pair<int, const char *>> answer; // a result, and the name; without it there is no such user
 inline std::function<int(std::size_t)> before; // told the place in `calls`; gives an errno value, short_transfer or 0
 
 inline int next(const char *name) {
@@ -55,6 +57,11 @@ inline bool fails_now() {
                                                               : allocations.count == allocations.fails_at);
 }
 
+inline void *counted(void *made) {
+    allocations.live += made != nullptr;
+    return made;
+}
+
 } // namespace faults
 
 #define QZ_WRAPPED(result, name, parameters)                                                                           \
@@ -68,19 +75,14 @@ inline bool fails_now() {
 extern "C" {
 
 QZ_WRAPPED(void *, malloc, (size_t size)) {
-    void *made = faults::fails_now() ? nullptr : __real_malloc(size);
-    faults::allocations.live += made != nullptr;
-    return made;
+    return faults::counted(faults::fails_now() ? nullptr : __real_malloc(size));
 }
 QZ_WRAPPED(void *, calloc, (size_t count, size_t size)) {
-    void *made = faults::fails_now() ? nullptr : __real_calloc(count, size);
-    faults::allocations.live += made != nullptr;
-    return made;
+    return faults::counted(faults::fails_now() ? nullptr : __real_calloc(count, size));
 }
 QZ_WRAPPED(void *, realloc, (void *old, size_t size)) {
     void *made = faults::fails_now() ? nullptr : __real_realloc(old, size);
-    faults::allocations.live += made != nullptr && old == nullptr;
-    return made;
+    return old == nullptr ? faults::counted(made) : made;
 }
 QZ_WRAPPED(char *, strdup, (const char *text)) {
     const std::string copy = text;
@@ -126,6 +128,11 @@ QZ_WRAPPED(int, getpwnam_r, (const char *name, passwd *entry, char *memory, size
     const int fault = faults::next("getpwnam_r");
     const int result = __real_getpwnam_r(name, entry, memory, size, found);
     entry->pw_dir = faults::home.data();
+    if (faults::answer) {
+        entry->pw_name = const_cast<char *>(faults::answer->second);
+        entry->pw_uid = 4242;
+        return *found = entry->pw_name == nullptr ? nullptr : entry, faults::answer->first;
+    }
     return fault > 0 ? (*found = nullptr, fault) : result;
 }
 

@@ -1,38 +1,12 @@
-// Where an ACL file is, and reading it whole. The user database answers here as a case wants it to.
+// Where an ACL file is. The user database answers here as a case wants it to.
+#include "faults.h"
 #include "qzacl_acl/file_name.h"
-#include "qzacl_utils.h"
 #include "support.h"
-
-#include <cerrno>
-#include <dlfcn.h>
-#include <fcntl.h>
-#include <fstream>
-#include <pwd.h>
 
 using namespace support;
 
-struct database_answer {
-    int result;
-    const char *name, *home; // no name: no such user
-};
-static const database_answer *staged = nullptr;
-
-extern "C" int getpwnam_r(const char *name, passwd *resultbuf, char *buffer, size_t buflen, passwd **result) {
-    if (staged == nullptr) {
-        static const auto real = reinterpret_cast<decltype(&getpwnam_r)>(dlsym(RTLD_NEXT, "getpwnam_r"));
-        return real(name, resultbuf, buffer, buflen, result);
-    }
-    resultbuf->pw_name = const_cast<char *>(staged->name);
-    resultbuf->pw_dir = const_cast<char *>(staged->home);
-    resultbuf->pw_uid = 4242;
-    *result = staged->name == nullptr ? nullptr : resultbuf;
-    return staged->result;
-}
-
-namespace {
-
 // The path that a name stands for, behind the user's id where there is a user; or the failure.
-failure path_of(const std::string &name, const char *user = nullptr) {
+static failure path_of(const std::string &name, const char *user = nullptr) {
     qz::path_buffer path;
     std::uint32_t uid = 0;
     const int result = sec__get_aclfname(name.c_str(), user, path, &uid);
@@ -73,53 +47,22 @@ TEST(file_name, stands_as_it_is_or_behind_the_working_directory) {
 TEST(file_name, lies_in_the_home_directory_of_a_user) {
     const std::string h4090 = "/" + std::string(4089, 'h'), h9000(9000, 'h');
     const failure unknown = error_of(15, 127, {"alice"});
-    const std::tuple<const char *, database_answer, failure> rows[] = {
-        {"acl", {0, "alice", "/home/alice"}, {0, 0, "4242 /home/alice/acl"}},
-        {"..", {0, "alice", "/h/"}, {0, 0, "4242 /h/.."}},
-        {"12345", {0, "alice", h4090.c_str()}, {0, 0, "4242 " + h4090 + "/12345"}},
-        {"123456", {0, "alice", h4090.c_str()}, error_of(4, 151, {"123456", "alice"})},
-        {"", {0, "alice", h9000.c_str()}, error_of(4, 151, {"", "alice"})},
-        {"sub/acl", {EIO}, error_of(4, 151, {"sub/acl", "alice"})},
-        {"acl", {}, unknown},
-        {"acl", {EIO, "alice", "/h"}, unknown},
-        {"acl", {0, "ALICE", "/h"}, unknown},
-        {"acl", {0, "alice2", "/h"}, unknown},
+    // The name; what the database answers, and as whose home; the path or the failure.
+    const std::tuple<const char *, std::pair<int, const char *>, std::string, failure> rows[] = {
+        {"acl", {0, "alice"}, "/home/alice", {0, 0, "4242 /home/alice/acl"}},
+        {"..", {0, "alice"}, "/h/", {0, 0, "4242 /h/.."}},
+        {"12345", {0, "alice"}, h4090, {0, 0, "4242 " + h4090 + "/12345"}},
+        {"123456", {0, "alice"}, h4090, error_of(4, 151, {"123456", "alice"})},
+        {"", {0, "alice"}, h9000, error_of(4, 151, {"", "alice"})},
+        {"sub/acl", {EIO, nullptr}, "", error_of(4, 151, {"sub/acl", "alice"})},
+        {"acl", {}, "", unknown},
+        {"acl", {EIO, "alice"}, "/h", unknown},
+        {"acl", {0, "ALICE"}, "/h", unknown},
+        {"acl", {0, "alice2"}, "/h", unknown},
     };
-    for (const auto &[name, answer, path] : rows) {
-        staged = &answer;
+    for (const auto &[name, answer, home, path] : rows) {
+        faults::answer = answer;
+        faults::home = home;
         EXPECT_EQ(path_of(name, "alice"), path);
     }
-    staged = nullptr; // and now the users of this system
-    const passwd *self = getpwuid(getuid());
-    ASSERT_NE(self, nullptr);
-    EXPECT_EQ(path_of("x", self->pw_name).text, std::to_string(getuid()) + " " + self->pw_dir + "/x");
 }
-
-TEST(reading, takes_the_whole_file_or_nothing) {
-    const temporary_folder folder;
-    const std::string name = folder / "acl", missing = folder / "missing", empty = folder / "empty";
-    std::ofstream(name) << "n r\0\n"sv;
-    std::ofstream(empty) << "";
-    // Opened, named, how, where it stands; the text with the NUL behind it, or the failure.
-    const std::tuple<std::string, std::string, int, off_t, std::string_view, failure> rows[] = {
-        {name, name, O_RDONLY, 0, "n r\0\n\0"sv, {}},
-        {empty, empty, O_RDONLY, 0, "", {}},
-        {name, name, O_RDONLY, 2, "", error_of(37, 126, {"3", "5", "0"})},
-        {name, name, O_WRONLY, 0, "", error_of(37, 126, {"-1", "5", std::to_string(EBADF)})},
-        {name, missing, O_RDONLY, 0, "", error_of(37, 122, {missing, std::to_string(ENOENT)})},
-    };
-    for (const auto &[opened, named, flags, start, wanted, error] : rows) {
-        const qz::descriptor file(open(opened.c_str(), flags));
-        lseek(file.get(), start, SEEK_SET);
-        errno = EPERM; // a stale number is not reported
-        char *text = const_cast<char *>("left over");
-        std::size_t length = 99;
-        EXPECT_EQ(acl__read_acl_file(named.c_str(), file.get(), &text, &length), error.code);
-        EXPECT_EQ(recorded_error(), error);
-        EXPECT_EQ(text == nullptr ? ""sv : std::string_view(text, length + 1), wanted);
-        EXPECT_EQ(length, wanted.empty() ? 0 : wanted.size() - 1);
-        std::free(text);
-    }
-}
-
-} // namespace

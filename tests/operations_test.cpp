@@ -1,9 +1,7 @@
 // Every public operation, as a service that uses all of the library would call it: once, so that trace_test can
 // read what that leaves, and from many threads at once.
-#include "service_support.h"
-#include <cstdio>
+#include "support.h"
 #include <fcntl.h>
-#include <fstream>
 #include <thread>
 #include <unistd.h>
 
@@ -75,11 +73,17 @@ const std::vector<std::string> expected = {"0 75 ", "0 75 ",    "0 ",         "0
                                            "0 4 ",  "0 1 Bob ", "0 75 ",      "0 ",     "0 1 ",   "0 5 ",    "43 0 ",
                                            "0 19 ", "0 "};
 
-TEST(operations, answer_alike_in_every_thread) {
+struct operations : testing::Test {
+    std::string written(const std::string &name) const {
+        write_file(folder / name, "n r\nu unix alice@h rw\ng staff q\n");
+        return folder / name;
+    }
     const temporary_folder folder;
-    const buffer shared(rich);
-    const std::string paths[] = {folder / "a", folder / "b", folder / "c"};
-    for (const std::string &path : paths) std::ofstream(path) << "n r\nu unix alice@h rw\ng staff q\n";
+    const buffer shared{rich};
+};
+
+TEST_F(operations, answer_alike_in_every_thread) {
+    const std::string paths[] = {written("a"), written("b"), written("c")};
     std::vector<std::thread> threads;
     std::vector<int> agreed(8);
     for (std::size_t index = 0; index < agreed.size(); ++index)
@@ -90,12 +94,6 @@ TEST(operations, answer_alike_in_every_thread) {
     EXPECT_EQ(agreed, std::vector<int>(8, 30));
 }
 
-TEST(operations, answer_once) {
-    const temporary_folder folder;
-    const buffer shared(rich);
-    const std::string path = folder / "acl";
-    std::ofstream(path) << "n r\nu unix alice@h rw\ng staff q\n";
-    EXPECT_EQ(use_all(path, shared.acl), expected);
-}
+TEST_F(operations, answer_once) { EXPECT_EQ(use_all(written("acl"), shared.acl), expected); }
 
 } // namespace

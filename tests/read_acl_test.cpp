@@ -1,29 +1,7 @@
 // Tests of reading an ACL file through its cache: which of the two files is read, what the flags then say,
 // and what a cache that is written afterwards looks like. Times are set, never waited for.
-#include "service_support.h"
-#include <fcntl.h>
-#include <fstream>
-#include <functional>
+#include "support.h"
 #include <pwd.h>
-#include <sys/syscall.h>
-
-// What happens to files between two steps of a call; what opening a path then fails with, or 0.
-static std::function<int(const std::string &)> before_open;
-static std::function<void()> after_read;
-
-// Under the name of the variadic function, which takes its arguments alike.
-extern "C" int open_hooked(const char *path, int flags, mode_t mode) __asm__("open");
-int open_hooked(const char *path, int flags, mode_t mode) {
-    errno = before_open ? before_open(path) : 0;
-    return errno != 0 ? -1 : static_cast<int>(syscall(SYS_openat, AT_FDCWD, path, flags, mode));
-}
-extern "C" int __open_2(const char *path, int flags) { return open_hooked(path, flags, 0); } // if fortified
-extern "C" ssize_t read_hooked(int fd, void *bytes, size_t count) __asm__("read");
-ssize_t read_hooked(int fd, void *bytes, size_t count) {
-    const ssize_t result = syscall(SYS_read, fd, bytes, count);
-    if (after_read) after_read();
-    return result;
-}
 
 namespace {
 
@@ -33,17 +11,6 @@ namespace fs = std::filesystem;
 constexpr unsigned text = SEC_READ_ACL_TEXT, cache = SEC_READ_ACL_CACHE, convert = SEC_READ_ACL_CONVERT;
 const std::string acl_text = "# users\nu unix alice@host r\n";
 const std::string from_text = one(of_mechanism(4, "unix", 1, named(1, "alice@host")));
-
-void write_file(const std::string &path, const std::string &bytes, int age, unsigned mode) {
-    std::ofstream(path, std::ios::binary) << bytes;
-    static const auto now = std::chrono::floor<std::chrono::seconds>(fs::file_time_type::clock::now());
-    fs::last_write_time(path, now - std::chrono::seconds(age)); // of one moment for all files
-    fs::permissions(path, fs::perms(mode));
-}
-std::string read_file(const std::string &path) {
-    std::ifstream file(path, std::ios::binary);
-    return {std::istreambuf_iterator<char>(file), {}};
-}
 
 using reading = std::tuple<std::string, unsigned, failure>; // the bytes, the flags, and the error
 reading given(const std::string &bytes, unsigned flags) { return {bytes, flags, no_error}; }
@@ -104,39 +71,6 @@ TEST_F(read_acl_file, refreshes_a_cache_then_uses_it_and_leaves_no_other_file) {
     EXPECT_EQ(std::distance(fs::directory_iterator(folder.path()), fs::directory_iterator()), 2);
 }
 
-// An edit while the text is being parsed must not leave a cache that looks later than the edit.
-TEST_F(read_acl_file, never_takes_an_edited_text_for_cached) {
-    write_file(path, acl_text, 100, 0600);
-    after_read = [this] {
-        after_read = nullptr;
-        std::ofstream(path) << "g staff r\n";
-        // Whatever is stamped from here on is later than the edit, even from the clock that moves in ticks.
-        do std::ofstream(folder / "later") << '-';
-        while (fs::last_write_time(folder / "later") <= fs::last_write_time(path));
-    };
-    EXPECT_EQ(read_acl(path, cache), given(from_text, text | cache));
-    EXPECT_LE(fs::last_write_time(cache_path), fs::last_write_time(path));
-    EXPECT_EQ(read_acl(path, 0), given(one(packed_subacl(16, "", 1, named(1, "staff"))), text));
-}
-
-TEST_F(read_acl_file, bears_files_that_cannot_be_opened_or_were_exchanged) {
-    write_file(path, acl_text, 100, 0644);
-    write_file(cache_path, example, 0, 0644);
-    for (const int error : {EACCES, ESTALE})
-        for (const std::string &victim : {cache_path, path}) {
-            write_file(folder / "other", acl_text, 0, 0644);
-            before_open = [&](const std::string &opened) {
-                if (opened == victim && error == ESTALE) // as if by another who puts a new file there
-                    fs::rename(folder / "other", opened);
-                return opened == victim && error == EACCES ? error : 0;
-            };
-            const reading bad = refused(error_of(37, 124, {path, std::to_string(error)}), text | cache);
-            EXPECT_EQ(read_acl(path, victim == path ? text | cache : convert),
-                      victim == path ? bad : given(from_text, text));
-        }
-    before_open = nullptr;
-}
-
 TEST_F(read_acl_file, reports_what_it_refuses) {
     const std::string missing = folder / "missing";
     EXPECT_EQ(read_acl(missing, 0xf2), refused(error_of(37, 122, {missing, std::to_string(ENOENT)}), 0xf2));
@@ -169,18 +103,6 @@ TEST_F(read_acl_file, of_a_user_must_be_that_users_alone) {
     write_file(file, "", 100, 0666); // nothing that could be trusted
     EXPECT_EQ(read_acl(base, 0, name.c_str()), given("", 0));
     fs::remove(file);
-}
-
-// The longest paths leave the name of a cache no room for the temporary one that it is written under.
-TEST_F(read_acl_file, writes_no_cache_for_a_long_path_but_reads_one) {
-    std::string deep = folder.path();
-    while (deep.size() < 4080)
-        fs::create_directory(deep.append("/").append(std::min<std::size_t>(4080 - deep.size(), 200), 'd'));
-    const std::string file = (deep + "/").append(4089 - deep.size(), 'f');
-    write_file(file, acl_text, 100, 0644);
-    EXPECT_EQ(read_acl(file, cache), given(from_text, text));
-    write_file(file + ".cacl", example, 0, 0644);
-    EXPECT_EQ(read_acl(file, 0), given(example, 0));
 }
 
 } // namespace

@@ -1,4 +1,4 @@
-"""Tries what docs/recipes.md and docs/tracing.md tell: their code blocks are taken out and run.
+"""Tries what README.md, docs/recipes.md and docs/tracing.md tell: their code blocks are taken out and run.
 
 Usage: recipes_test.py BUILD_DIR [unittest arguments]; with --write the outputs in the documents are written anew."""
 import json
@@ -14,6 +14,7 @@ import unittest
 SOURCE, BUILD = pathlib.Path(__file__).resolve().parent.parent, pathlib.Path(sys.argv[1]).resolve()
 DOCS = {path: path.read_text() for path in (SOURCE / "docs/recipes.md", SOURCE / "docs/tracing.md")}
 RECIPES = dict(re.findall(r"<!-- recipe: (.*?) -->\n```\w*\n(.*?)```\n", "".join(DOCS.values()), re.DOTALL))
+OUTPUT = re.compile(r"(<!-- output: (.*?) -->\n```\n)(.*?)(?=```\n)", re.DOTALL)
 WRITE = "--write" in sys.argv
 PLACES = ["examples/mistakes.acl:" + place for place in  # line 1 for duplicates
           "5:158 8:179 11:172 14:145 17:180 20:173 1:157 1:157 1:175 1:174 1:174 43:144".split()]
@@ -22,6 +23,21 @@ RUNS = [  # what is done to the ACL and its cache, and who then asks the service
     ("touch -d '1 hour ago' service.acl.cacl", "mallory@login.cluster.example"), ("true", "eve@example.org strangers"),
     ("chmod 600 service.acl.cacl", "root@head.cluster.example"), ("touch service.acl", "root@head.cluster.example"),
     ("chmod 644 *.cacl; echo >service.acl.cacl; touch -d '1 hour ago' service.acl", "root@head.cluster.example")]
+
+
+class Readme(unittest.TestCase):
+    def test_outputs(self):
+        def real(found):  # what the command prints on either stream, run as built instead of through ./dev
+            command = found[2].replace("build/release/", f"{BUILD}/").replace("./dev run", f"{BUILD}/bin/qzaclfck")
+            with tempfile.TemporaryDirectory() as folder:
+                shutil.copytree(SOURCE / "examples", folder + "/examples")
+                return found[1] + subprocess.run(command, shell=True, cwd=folder, check=False, stdout=subprocess.PIPE,
+                                                 stderr=subprocess.STDOUT).stdout.decode()
+        readme = SOURCE / "README.md"
+        shown, count = OUTPUT.subn(real, readme.read_text())
+        if WRITE:
+            readme.write_text(shown)
+        self.assertEqual((shown, count > 2), (readme.read_text(), True))
 
 
 @unittest.skipUnless(os.path.exists("/usr/share/i18n/locales/de_DE") and shutil.which("git") and shutil.which("jq")
@@ -75,8 +91,7 @@ class Recipes(unittest.TestCase):
         for step, user in RUNS:
             self.assertEqual(self.run_in_shell(f"({step}) && service service.acl {user} >&2", **traced), (0, ""))
         for path, text in DOCS.items():
-            shown = re.sub(r"(<!-- output: (.*?) -->\n```\n).*?(?=```\n)", lambda found: found[1] + self.run_in_shell(
-                found[2])[1].replace(str(self.dir), "/etc"), text, flags=re.DOTALL)
+            shown = OUTPUT.sub(lambda found: found[1] + self.run_in_shell(found[2])[1].replace(str(self.dir), "/etc"), text)
             if WRITE:
                 path.write_text(shown)
             self.assertEqual(*[re.sub(r"\d+:\d+:\d+|\d+(?= us)", "", each) for each in (shown, path.read_text())])

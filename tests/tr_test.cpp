@@ -1,16 +1,11 @@
 // The trace facility. A process reads its configuration once, so whatever needs one runs in a child.
-#include "libqz_tr/levels.h"
-#include "libqz_tr/text.h"
 #include "qz/tr.h"
-#include <cerrno>
-#include <cstdlib>
 #include <fcntl.h>
 #include <filesystem>
 #include <fstream>
 #include <gmock/gmock.h>
 #include <regex>
 #include <sys/resource.h>
-#include <sys/stat.h>
 #include <sys/wait.h>
 #include <thread>
 #include <unistd.h>
@@ -19,25 +14,6 @@ namespace {
 
 using namespace std::string_literals;
 const std::vector<uint8_t> off = {0, 0, 0, 0}, on = {8, 0, 0, 255};
-
-TEST(Levels, AreReadPartByPart) {
-    const std::pair<int, std::vector<const char *>> rows[] = {
-        {8, {"A:API=1;_SEL:API=008,X=2;B:API=3", "_SEL:API=1,API=8;_SEL:X=2", ";;_SEL:,,junk,=3,API=8,;"}},
-        {7, {"_SEL:API=7,API=256,API=,API,API=-1,API=+1,API=1x,API= 1,API=1=1,API=4294967304"}},
-        {0, {"", "API=8", "_SEL", "_SEL:API", "_sel:API=8", "_SEL:api=8", "_SEL: API=8", " _SEL:API=8"}},
-        {0, {"_SELX:API=8;_SE:API=8", "_SEL:APIX=8,AP=8", "_SEL,API=8", "_SEL;API=8"}}};
-    for (const auto &[level, texts] : rows)
-        for (const char *text : texts) EXPECT_EQ(qz::tr::configured_level(text, "_SEL", "API"), level) << text;
-}
-
-TEST(Text, IsPrintableUtf8) {
-    EXPECT_TRUE(
-        qz::tr::is_printable("a b~\xC2\xA0\xED\x9F\xBF\xEE\x80\x80\xE0\xA0\x80\xF0\x90\x80\x80\xF4\x8F\xBF\xBF"));
-    for (const char *text :
-         {"a\x1F", "\x7F", "\xC2\x9F", "\x80", "\xE2\x82", "\xC3\x28", "\xC1\xBF", "\xE0\x9F\xBF", "\xF0\x8F\xBF\xBF",
-          "\xED\xA0\x80", "\xED\xBF\xBF", "\xF4\x90\x80\x80", "\xFF\xBF\xBF\xBF"})
-        EXPECT_FALSE(qz::tr::is_printable(text)) << testing::PrintToString(text);
-}
 
 extern "C" [[gnu::weak]] void __gcov_dump();
 
