@@ -21,7 +21,8 @@ function(qz_catalog locale source codeset)
     COMMAND ${CMAKE_COMMAND} -E rm -f ${folder}/qzseclib.cat
     COMMAND ${GENCAT} ${folder}/qzseclib.cat ${converted})
   set_property(GLOBAL APPEND PROPERTY qz_catalogs ${folder}/qzseclib.cat)
-  install(FILES ${folder}/qzseclib.cat DESTINATION ${CMAKE_INSTALL_DATADIR}/locale/${locale}/LC_MESSAGES)
+  install(FILES ${folder}/qzseclib.cat DESTINATION ${CMAKE_INSTALL_DATADIR}/locale/${locale}/LC_MESSAGES
+    COMPONENT command)
 endfunction()
 
 if(NOT GENCAT)

@@ -20,12 +20,14 @@ struct allocations_seen {
     std::size_t count = 0, fails_at = 0; // from 1; 0 fails none
     bool fails_on = false;               // also all behind that one
     std::ptrdiff_t live = 0;
+    std::size_t refused = 0; // bytes that the last one to fail asked for
 };
 inline allocations_seen allocations;
 
 constexpr int short_transfer = -1;
 inline bool is_watching = false;
 inline std::vector<std::string> calls;
+inline std::string opened;                                 // the name that was last opened or is about to be
 inline std::string home;                                   // of every user, and what the database answers besides
 inline std::optional<std::pair<int, const char *>> answer; // a result, and the name; without it there is no such user
 inline std::function<int(std::size_t)> before; // told the place in `calls`; gives an errno value, short_transfer or 0
@@ -51,10 +53,12 @@ auto watched(const std::function<int(std::size_t)> &fault, const Call &call) {
     return result;
 }
 
-inline bool fails_now() {
+inline bool fails_now(std::size_t size) {
     ++allocations.count;
-    return allocations.fails_at != 0 && (allocations.fails_on ? allocations.count >= allocations.fails_at
-                                                              : allocations.count == allocations.fails_at);
+    const bool fails = allocations.fails_at != 0 && (allocations.fails_on ? allocations.count >= allocations.fails_at
+                                                                          : allocations.count == allocations.fails_at);
+    if (fails) allocations.refused = size;
+    return fails;
 }
 
 inline void *counted(void *made) {
@@ -75,13 +79,13 @@ inline void *counted(void *made) {
 extern "C" {
 
 QZ_WRAPPED(void *, malloc, (size_t size)) {
-    return faults::counted(faults::fails_now() ? nullptr : __real_malloc(size));
+    return faults::counted(faults::fails_now(size) ? nullptr : __real_malloc(size));
 }
 QZ_WRAPPED(void *, calloc, (size_t count, size_t size)) {
-    return faults::counted(faults::fails_now() ? nullptr : __real_calloc(count, size));
+    return faults::counted(faults::fails_now(count * size) ? nullptr : __real_calloc(count, size));
 }
 QZ_WRAPPED(void *, realloc, (void *old, size_t size)) {
-    void *made = faults::fails_now() ? nullptr : __real_realloc(old, size);
+    void *made = faults::fails_now(size) ? nullptr : __real_realloc(old, size);
     return old == nullptr ? faults::counted(made) : made;
 }
 QZ_WRAPPED(char *, strdup, (const char *text)) {
@@ -99,7 +103,10 @@ void __wrap_free(void *memory) {
 QZ_WRAPPED_CALL(stat, (const char *path, struct stat *out), (path, out))
 QZ_WRAPPED_CALL(lstat, (const char *path, struct stat *out), (path, out))
 QZ_WRAPPED_CALL(fstat, (int fd, struct stat *out), (fd, out))
-QZ_WRAPPED_CALL(open, (const char *path, int flags, mode_t mode), (path, flags, mode))
+QZ_WRAPPED(int, open, (const char *path, int flags, mode_t mode)) {
+    if (faults::is_watching) faults::opened = path;
+    return faults::next("open") > 0 ? -1 : __real_open(path, flags, mode);
+}
 int __wrap___open_2(const char *path, int flags); // what a fortified call without a mode becomes
 int __wrap___open_2(const char *path, int flags) { return __wrap_open(path, flags, 0); }
 QZ_WRAPPED_CALL(fchown, (int fd, uid_t user, gid_t group), (fd, user, group))

@@ -4,6 +4,7 @@
 #include "bulk_aclfile.h"
 #include "faults.h"
 #include "support.h"
+#include <regex>
 #include <sys/wait.h>
 
 namespace {
@@ -100,7 +101,11 @@ TEST_F(files, every_allocation_fails) {
     char *mechanism = nullptr, *identity = nullptr;
     const auto reading = [&](unsigned flags) {
         lay_out(from_text.bytes);
-        return freed(sec_read_acl_file("acl", user_name(), nullptr, flags, &made, nullptr), made.data);
+        const int result = sec_read_acl_file("acl", user_name(), nullptr, flags, &made, nullptr);
+        if (result == 0) {
+            EXPECT_EQ(std::string(static_cast<char *>(made.data), from_text.bytes.size()), from_text.bytes);
+        }
+        return freed(result, made.data);
     };
     using bytes = sec_acl_buffer_t;
     const use uses[] = {
@@ -128,6 +133,7 @@ TEST_F(files, every_allocation_fails) {
         {"read the cache", [&](bytes &) { return reading(checked); }, "", true},
         {"check", [&](bytes &) { return lay_out(), check(path, ACLFCK_OPT_COMPILE | ACLFCK_OPT_VERBOSE); }, "", true},
     };
+    std::size_t sites = 0;
     for (const use &row : uses) {
         SCOPED_TRACE(row.name);
         bool is_warm = false;
@@ -139,7 +145,8 @@ TEST_F(files, every_allocation_fails) {
             const auto live = faults::allocations.live;
             faults::allocations = {0, at, and_on, live};
             const int result = row.call(held.acl);
-            count = std::exchange(faults::allocations, {0, 0, false, faults::allocations.live}).count;
+            const auto seen = std::exchange(faults::allocations, {0, 0, false, faults::allocations.live});
+            count = seen.count;
             const std::string printed = testing::internal::GetCapturedStderr();
             const failure error = recorded_error();
             if (is_warm) { EXPECT_EQ(faults::allocations.live, live) << "leaks"; }
@@ -154,6 +161,14 @@ TEST_F(files, every_allocation_fails) {
             const arguments functions = words(row.functions);
             const auto is_named = [&](auto &name) { return error.text.find(name) != error.text.npos; };
             EXPECT_TRUE(functions.empty() || std::ranges::any_of(functions, is_named)) << error;
+            if (error.id == 89 && !and_on) {
+                // A text is read with room for a NUL, and what is converted is told without the converter's room.
+                const auto tells = [&](std::size_t size) {
+                    return std::regex_search(error.text, std::regex("\\b" + std::to_string(size) + " bytes"));
+                };
+                EXPECT_TRUE(tells(seen.refused) || tells(seen.refused - 1) || tells(seen.refused - 16))
+                    << seen.refused << " in " << error;
+            }
             // A deletion may have happened all the same, with the memory kept.
             if (!std::string_view(row.name).starts_with("delete")) { EXPECT_EQ(held.bytes(), rich); }
         };
@@ -167,7 +182,9 @@ TEST_F(files, every_allocation_fails) {
                 SCOPED_TRACE(testing::Message() << "allocation " << at << (and_on ? " and all behind" : ""));
                 run(at, and_on);
             }
+        sites += row_sites;
     }
+    std::cout << sites << " allocations\n";
 }
 
 TEST(work, takes_as_many_allocations_as_it_should) {
@@ -221,6 +238,7 @@ TEST_F(files, every_system_call_fails) {
         {"first cache", "", command, checks + "open 37:138" + replaces},
         {"next cache", "old", command, checks + "open 37:138 fstat 37:138" + replaces},
     };
+    std::size_t sites = 0, runs = 0;
     for (const way &row : ways) {
         SCOPED_TRACE(row.name);
         const auto prepare = [&] { lay_out(row.cache_bytes, row.cache_bytes == "old" ? 200 : 0); };
@@ -248,26 +266,34 @@ TEST_F(files, every_system_call_fails) {
                 result = told;
                 // These messages show the system's error, or that the file is another.
                 if (std::ranges::count(std::array{122, 124, 126, 139, 152, 154, 156}, now.message) != 0) {
-                    EXPECT_NE(now.text.find(std::to_string(calls[at] == "fstat" ? ESTALE : std::max(fault, 0))),
-                              now.text.npos)
+                    const int shown = calls[at] == "fstat" ? ESTALE : std::max(fault, 0);
+                    EXPECT_TRUE(std::regex_search(now.text, std::regex("\\b" + std::to_string(shown) + "\\b")))
                         << now.text;
                 }
                 if (now.code == 0) { EXPECT_EQ(now.bytes, whole.bytes); }
                 EXPECT_EQ(open_descriptors(), descriptors);
                 const auto left = names_in(folder.path());
                 EXPECT_TRUE(left == before || (now.code == 0 && left == made)) << calls[at] << " with " << fault;
-                if (now.code != 0) { EXPECT_EQ(read_file(cache), row.cache_bytes); }
+                const std::string kept = read_file(cache);
+                EXPECT_TRUE(kept == row.cache_bytes || (now.code == 0 && kept == from_text.bytes)) << calls[at];
+                ++runs;
             }
             found += (found.empty() ? "" : " ") + calls[at] + " " + result;
         }
         EXPECT_EQ(found, row.expected);
+        sites += calls.size();
     }
+    std::cout << sites << " system calls, failed " << runs << " times\n";
 }
 
 TEST_F(files, writers_are_killed_after_each_step) {
+    constexpr uid_t owner = 65534; // of the text, when root writes its cache
+    const bool is_root = geteuid() == 0;
     for (const std::string &stale : {""s, "old"s})
         for (std::size_t at = 0, steps = 1; at < steps; ++at) {
             lay_out(stale, 200);
+            for (const std::string &name : {path, cache})
+                if (is_root && fs::exists(name)) { ASSERT_EQ(chown(name.c_str(), owner, owner), 0); }
             const pid_t child = fork();
             if (child == 0) {
                 std::size_t left = at;
@@ -280,11 +306,14 @@ TEST_F(files, writers_are_killed_after_each_step) {
             ASSERT_TRUE(WIFEXITED(status));
             if (WEXITSTATUS(status) == 7) steps = at + 2;
             EXPECT_EQ(read_acl(path, checked), from_text) << "killed before step " << at;
+            EXPECT_LE(names_in(folder.path()).size(), 3u);
+            const bool is_blocked = stale.empty() && fs::exists(cache) && fs::file_size(cache) == 0;
             testing::internal::CaptureStderr();
             const int next = check(path);
             testing::internal::GetCapturedStderr();
             const int id = recorded_error().id;
-            EXPECT_TRUE(next == 0 || (next == 37 && id == 137)) << next << ':' << id; // an empty cache of mode 0
+            EXPECT_EQ(std::pair(next, next == 0 ? 0 : id),
+                      is_blocked ? std::pair(37, is_root ? 136 : 137) : std::pair(0, 0));
             EXPECT_EQ(read_acl(path, checked), from_text) << "killed before step " << at;
             if (next != 0) { // as an administrator would mend it
                 fs::remove(cache);
@@ -331,11 +360,20 @@ const std::pair<std::string, std::function<void(const std::string &)>> disturban
     {"a dangling link", [](const std::string &path) { fs::remove(path), fs::create_symlink("nowhere", path); }},
     {"a link at the cache",
      [](const std::string &path) { fs::remove(path + ".cacl"), fs::create_symlink("nowhere", path + ".cacl"); }},
+    {"a link to another",
+     [](const std::string &path) {
+         put(other_text, path, 0), fs::rename(path, path + "3"), fs::create_symlink("acl3", path);
+     }},
+    {"a FIFO at the cache",
+     [](const std::string &path) { fs::remove(path + ".cacl"), mkfifo((path + ".cacl").c_str(), 0644); }},
+    {"a directory at the cache",
+     [](const std::string &path) { fs::remove(path + ".cacl"), fs::create_directory(path + ".cacl"); }},
     {"cached by another", [](const std::string &path) { check(path); }},
     {"a foreign cache", [](const std::string &path) { write_file(path + ".cacl", rich); }},
 };
 
 TEST_F(files, are_disturbed_between_any_two_steps) {
+    std::size_t races = 0;
     for (const std::string &stale : {""s, "old"s})
         for (const bool by_command : {false, true})
             for (const auto &row : disturbances)
@@ -364,8 +402,67 @@ TEST_F(files, are_disturbed_between_any_two_steps) {
                     const auto closed =
                         std::find(faults::calls.begin(), faults::calls.end(), "close") - faults::calls.begin();
                     const bool is_late = row.first.ends_with("old file") && static_cast<long>(at) > closed + 1;
-                    if (!is_late && read_file(cache) != rich) { EXPECT_EQ(read_acl(path, checked), now); }
+                    if (!is_late && (!fs::is_regular_file(cache) || read_file(cache) != rich)) {
+                        EXPECT_EQ(read_acl(path, checked), now);
+                    }
+                    ++races;
                 }
+    std::cout << races << " races\n";
+}
+
+// Somebody puts a link at the temporary name just before it is made, or another file in its place before its time.
+TEST_F(files, temporary_names_are_taken) {
+    for (const bool exchanges : {false, true}) {
+        lay_out();
+        std::string taken;
+        testing::internal::CaptureStderr();
+        const int result = faults::watched(
+            [&](std::size_t) {
+                const std::string &call = faults::calls.back(), &name = faults::opened;
+                const bool is_temporary = name != path && name != cache && name.starts_with(path);
+                if (taken.empty() && is_temporary && call == (exchanges ? "write" : "open")) {
+                    taken = name;
+                    fs::remove(name);
+                    exchanges ? write_file(name, other_text) : fs::create_symlink(folder / "nowhere", name);
+                }
+                return exchanges && call == "write" ? ENOSPC : 0;
+            },
+            [&] { return check(path); });
+        testing::internal::GetCapturedStderr();
+        EXPECT_EQ(std::pair(result, recorded_error().id), exchanges ? std::pair(37, 139) : std::pair(0, 0));
+        EXPECT_FALSE(taken.empty() || fs::exists(folder / "nowhere"));
+        if (exchanges) { EXPECT_EQ(read_file(taken), other_text); }
+        if (!exchanges) { EXPECT_TRUE(fs::is_symlink(taken) && read_acl(path, checked) == from_text); }
+    }
+}
+
+TEST_F(files, are_read_by_many_while_they_change) {
+    put(other_text, path, 100);
+    const outcome other = read_acl(path, text_only);
+    std::vector<pid_t> readers;
+    for (int index = 0; index < 4; ++index)
+        if (readers.push_back(fork()); readers.back() == 0) {
+            int wrong = 0;
+            for (int round = 0; round < 200; ++round) {
+                const outcome found = read_acl(path, checked | cached);
+                wrong += found != from_text && found != other && found.code != 37; // exchanged while it was read
+            }
+            _exit(wrong != 0);
+        }
+    for (int round = 0; round < 200; ++round) put(round % 2 == 0 ? acl_text : other_text, path, 0);
+    for (const pid_t reader : readers) {
+        int status = 0;
+        EXPECT_TRUE(waitpid(reader, &status, 0) == reader && status == 0) << status;
+    }
+    EXPECT_EQ(read_acl(path, checked), other);
+}
+
+TEST_F(files, homes_may_be_missing_or_links) {
+    faults::home = folder / "nowhere";
+    EXPECT_EQ(read_acl("acl", text_only, user_name()).message, 122);
+    fs::create_directory_symlink(folder.path(), folder / "link");
+    faults::home = folder / "link";
+    EXPECT_EQ(read_acl("acl", text_only, user_name()), from_text);
 }
 
 } // namespace

@@ -50,7 +50,7 @@ SHELLS = {"bash": ("qzaclfck.bash", lambda script, line: run("bash", "--norc", "
 
 class Install(unittest.TestCase):
     def check(self, prefix, libraries, folder):
-        shutil.copytree(SOURCE / "examples", folder)
+        shutil.copytree(SOURCE / "examples", folder, ignore=shutil.ignore_patterns("*.cacl"))
         (folder / "CMakeLists.txt").write_text(CONSUMER)
         flags = run("pkg-config", "--cflags", "--libs", "qzacl", "qz_cu",
                     env=os.environ | {"PKG_CONFIG_PATH": f"{libraries}/pkgconfig"}).split()

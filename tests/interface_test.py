@@ -82,7 +82,11 @@ class Interface(unittest.TestCase):
         for entry in json.loads((BUILD / "compile_commands.json").read_text()):
             if "/security/ACL/" in entry["file"] or "/platform/" in entry["file"]:
                 self.assertRegex(entry["command"], f"-fstack-clash-protection {branches}-ftrivial-auto-var-init=.*"
-                                                  "-D_FORTIFY_SOURCE=[23]")
+                                                  "-D_FORTIFY_SOURCE=3")
+        for path in BUILD / "lib/libqzacl.so", BUILD / "bin/qzaclfck":
+            self.assertRegex(run("nm", "-D", str(path)), r"U __\w+(?<!stack)_chk@")
+            if branches and shutil.which("objdump"):
+                self.assertIn("endbr64", run("objdump", "-d", "--no-show-raw-insn", str(path)))
 
     def test_example_service(self):
         folder = tempfile.TemporaryDirectory()

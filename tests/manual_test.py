@@ -39,7 +39,9 @@ if set(options) != set(re.findall(r"\s\[?-(\w)\b", printed("qzaclfck"))):
     FAULTS.append(f"qzaclfck.1 has other options than the usage: {options}")
 if shutil.which("mandoc"):
     pages = (page for page in MAN.glob("man*/*") if not page.read_text().startswith(".so "))
-    FAULTS += printed("mandoc", "-T", "lint", "-W", "warning", *pages).splitlines()
+    # Whether other manuals are installed is the machine's affair; what is shown as it was printed may end in blanks.
+    harmless = re.compile("referenced manual not found|outdated mandoc.db|whitespace at end of input line")
+    FAULTS += [line for line in printed("mandoc", "-T", "lint", *pages).splitlines() if not harmless.search(line)]
 else:
     print("mandoc is not there: the form of the pages is not checked")
 sys.exit("\n".join(FAULTS) or None)

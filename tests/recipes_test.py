@@ -30,7 +30,7 @@ class Readme(unittest.TestCase):
         def real(found):  # what the command prints on either stream, run as built instead of through ./dev
             command = found[2].replace("build/release/", f"{BUILD}/").replace("./dev run", f"{BUILD}/bin/qzaclfck")
             with tempfile.TemporaryDirectory() as folder:
-                shutil.copytree(SOURCE / "examples", folder + "/examples")
+                shutil.copytree(SOURCE / "examples", folder + "/examples", ignore=shutil.ignore_patterns("*.cacl"))
                 return found[1] + subprocess.run(command, shell=True, cwd=folder, check=False, stdout=subprocess.PIPE,
                                                  stderr=subprocess.STDOUT).stdout.decode()
         readme = SOURCE / "README.md"
@@ -46,7 +46,7 @@ class Recipes(unittest.TestCase):
     def setUp(self):
         self.dir = pathlib.Path(tempfile.mkdtemp()).resolve()
         self.addCleanup(shutil.rmtree, self.dir)
-        shutil.copytree(SOURCE / "examples", self.dir / "examples")
+        shutil.copytree(SOURCE / "examples", self.dir / "examples", ignore=shutil.ignore_patterns("*.cacl"))
         for name, text in RECIPES.items():
             (self.dir / name).write_text(text)
             (self.dir / name).chmod(0o755)

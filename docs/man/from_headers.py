@@ -7,6 +7,7 @@ import pathlib
 import re
 import shutil
 import sys
+import textwrap
 
 SOURCE, MAN = map(pathlib.Path, sys.argv[1:])
 DATE = "November 25, 2026"  # of the last change of contents, so that a build gives the same bytes on any day
@@ -103,13 +104,26 @@ class Prose:
                 yield ".El"
 
 
+def folded(text):
+    """Text lines of at most 79 bytes; requests, and what is shown as it stands, are left alone."""
+    lines, is_literal = [], False
+    for line in text.split("\n"):
+        is_literal = line.startswith(".Bd") or (is_literal and not line.startswith(".Ed"))
+        if is_literal or line.startswith((".", "'")) or len(line) < 80:
+            lines.append(line)
+            continue
+        made = textwrap.wrap(line, 79, break_long_words=False, break_on_hyphens=False)
+        lines += made[:1] + [("\\&" if each[0] in ".'" else "") + each for each in made[1:]]
+    return "\n".join(lines)
+
+
 def page(name, section, names, about, body):
     title = [f".Dd {DATE}", f".Dt {name.upper()} {section}", ".Os", ".Sh NAME"]
     title += [f".Nm {each} ," for each in names[:-1]] + [f".Nm {names[-1]}", f".Nd {about}"]
     folder = MAN / f"man{section}"
     folder.mkdir(parents=True, exist_ok=True)
     text = "\n".join([*title, *body]) + "\n"
-    (folder / f"{name}.{section}").write_text(re.sub(r"(?m)^(\.S[hs] .*\n)\.Pp\n", r"\1", text), encoding="utf-8")
+    (folder / f"{name}.{section}").write_text(folded(re.sub(r"(?m)^(\.S[hs] .*\n)\.Pp\n", r"\1", text)), encoding="utf-8")
 
 
 # ---- Headers -------------------------------------------------------------------------------------------------------

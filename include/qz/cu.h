@@ -184,7 +184,7 @@ QZ_CU_API int cu_iconv_open_1(const char *codeset, uint32_t flags, cu_iconv_t *h
  *   options     0; any other value: CU_BAD_PARAMETER
  *   in          the bytes to convert. Null: CU_BAD_PARAMETER.
  *   in_length   their number. Null: CU_BAD_PARAMETER.
- *   out         out: a buffer of the caller's own that holds the converted bytes, released with free(); never
+ *   out         out: a buffer of the caller's own that holds the converted bytes, released with free; never
  *               null after success, even for no bytes. Null: CU_BAD_PARAMETER.
  *   out_length  out: the number of converted bytes. Null: CU_BAD_PARAMETER.
  *
