@@ -5,7 +5,7 @@ import re
 import shutil
 import sys
 import tempfile
-from subprocess import PIPE, STDOUT, run
+from subprocess import DEVNULL, PIPE, STDOUT, run
 
 BUILD, SOURCE = pathlib.Path(sys.argv[1]).resolve(), pathlib.Path(__file__).resolve().parent.parent
 MAN, FAULTS, MARKUP = BUILD / "share/man", [], str.maketrans({"\\": "\\e", "-": "\\-", "'": "\\(aq"})
@@ -41,7 +41,8 @@ if shutil.which("mandoc"):
     pages = (page for page in MAN.glob("man*/*") if not page.read_text().startswith(".so "))
     # Whether other manuals are installed is the machine's affair; what is shown as it was printed may end in blanks.
     harmless = re.compile("referenced manual not found|outdated mandoc.db|whitespace at end of input line")
-    FAULTS += [line for line in printed("mandoc", "-T", "lint", *pages).splitlines() if not harmless.search(line)]
+    FAULTS += [line for line in run(["mandoc", "-T", "lint", *pages], stdout=PIPE,
+                                  stderr=DEVNULL, check=False).stdout.decode().splitlines() if not harmless.search(line)]
 else:
     print("mandoc is not there: the form of the pages is not checked")
 sys.exit("\n".join(FAULTS) or None)
