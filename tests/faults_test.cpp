@@ -187,6 +187,24 @@ TEST_F(files, every_allocation_fails) {
     std::cout << sites << " allocations\n";
 }
 
+int comparisons = 0;
+int counted(const char *requested, const char *entry) { return ++comparisons, std::strcmp(requested, entry); }
+
+TEST(work, compares_once_a_step_and_stops_early) {
+    ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_USER, "counted", counted), 0);
+    std::string entries;
+    for (char letter = 'a'; letter <= 'z'; ++letter) entries += named(1, std::string(1, letter));
+    const buffer held(one(of_mechanism(4, "counted", 26, entries)));
+    std::uint32_t mask = 0;
+    const std::tuple<const char *, int, int> rows[] = {{"a", 0, 1}, {"m", 0, 13}, {"mm", 43, 14}, {"zz", 43, 26}};
+    for (const auto &[name, code, steps] : rows) {
+        comparisons = 0;
+        const int type = SEC_ACLE_USER | SEC_ACLE_USE_ID_HANDLER;
+        EXPECT_EQ(sec__single_acle_perm(&held.acl, type, "counted", nullptr, name, &mask), code);
+        EXPECT_EQ(comparisons, steps) << name;
+    }
+}
+
 TEST(work, takes_as_many_allocations_as_it_should) {
     const buffer held(rich);
     std::uint32_t mask = 0;
