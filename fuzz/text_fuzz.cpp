@@ -70,7 +70,8 @@ model compile(const std::string &text, buffer &out) {
         if (result != 1) {
             const arguments facts = words(wanted);
             const int code = facts[0] == "145" ? 37 : facts[0] == "166" ? 36 : 42;
-            EXPECT_EQ(after(result), error_of(code, std::stoi(facts[0]), {facts.begin() + 1, facts.end()}));
+            EXPECT_EQ(result, code);
+            EXPECT_EQ(recorded_error(), error_of(code, std::stoi(facts[0]), {facts.begin() + 1, facts.end()}));
         } else {
             EXPECT_EQ(facts_of(acle), wanted);
         }

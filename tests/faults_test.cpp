@@ -156,10 +156,10 @@ TEST_F(files, every_allocation_fails) {
             }
             EXPECT_EQ(result, 6);
             // What is printed needs memory, too: the command sets some aside, which does not help it here.
-            EXPECT_TRUE(error.id == 89 || printed.find("3417-102") != printed.npos || (and_on && error.id == 162))
+            EXPECT_TRUE(error.id == 89 || printed.find("3417-102") != std::string::npos || (and_on && error.id == 162))
                 << error;
             const arguments functions = words(row.functions);
-            const auto is_named = [&](auto &name) { return error.text.find(name) != error.text.npos; };
+            const auto is_named = [&](auto &name) { return error.text.find(name) != std::string::npos; };
             EXPECT_TRUE(functions.empty() || std::ranges::any_of(functions, is_named)) << error;
             if (error.id == 89 && !and_on) {
                 // A text is read with room for a NUL, and what is converted is told without the converter's room.
@@ -188,7 +188,10 @@ TEST_F(files, every_allocation_fails) {
 }
 
 int comparisons = 0;
-int counted(const char *requested, const char *entry) { return ++comparisons, std::strcmp(requested, entry); }
+int counted(const char *requested, const char *entry) {
+    ++comparisons;
+    return std::strcmp(requested, entry);
+}
 
 TEST(work, compares_once_a_step_and_stops_early) {
     ASSERT_EQ(sec__register_id_handler(SEC_ID_HANDLER_USER, "counted", counted), 0);
