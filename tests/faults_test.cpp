@@ -5,6 +5,7 @@
 #include "faults.h"
 #include "support.h"
 #include <regex>
+#include <set>
 #include <sys/wait.h>
 
 namespace {
@@ -305,6 +306,34 @@ TEST_F(files, every_system_call_fails) {
         sites += calls.size();
     }
     std::cout << sites << " system calls, failed " << runs << " times\n";
+}
+
+// A second failure while the first is cleaned up: what is told is the first, and only what could not be removed is left.
+TEST_F(files, cleaning_up_fails) {
+    std::set<std::string> failed;
+    for (const std::string &stale : {""s, "old"s})
+        for (std::size_t at = 0, steps = 1; at < steps; ++at) {
+            lay_out(stale, 200);
+            std::size_t written = 0;
+            testing::internal::CaptureStderr();
+            const int result = faults::watched(
+                [&](std::size_t index) {
+                    if (faults::calls.back() == "write") written = index;
+                    return faults::calls.back() == "write"             ? ENOSPC
+                           : written != 0 && index == written + 1 + at ? EIO
+                                                                       : 0;
+                },
+                [&] { return check(path); });
+            testing::internal::GetCapturedStderr();
+            EXPECT_EQ(std::pair(result, recorded_error().id), std::pair(37, 139));
+            steps = faults::calls.size() - written - 1;
+            const std::string call = faults::calls.at(written + 1 + at);
+            failed.insert(call);
+            const std::size_t left = names_in(folder.path()).size();
+            EXPECT_EQ(left, (stale.empty() ? 1u : 2u) + (call != "close")) << call;
+            EXPECT_EQ(read_acl(path, checked), from_text);
+        }
+    EXPECT_EQ(failed, (std::set<std::string>{"close", "fstat", "lstat", "unlink"}));
 }
 
 TEST_F(files, writers_are_killed_after_each_step) {
