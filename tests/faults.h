@@ -22,7 +22,7 @@ struct allocations_seen {
     std::ptrdiff_t live = 0;
     std::size_t refused = 0; // bytes that the last one to fail asked for
 };
-inline allocations_seen allocations;
+inline thread_local allocations_seen allocations; // of this thread
 
 constexpr int short_transfer = -1;
 inline bool is_watching = false;
