@@ -5,6 +5,7 @@
 
 #include "bytes.h"
 #include "libqz_cu/posix_fold.h"
+#include "qzacl_acl/buffer_format.h"
 
 #include <algorithm>
 #include <bit>
@@ -130,7 +131,7 @@ inline bool ends_exactly(byte_span field) {
     const std::size_t nul = nul_in_block(field.data());
     if (nul < identity_block::size)
         return nul + 1 == field.size();
-    return !field.empty() && std::memchr(field.data(), '\0', field.size()) == &field.back();
+    return format::holds_exact_string(field);
 }
 
 // How one identity stands to another, without regard to letter case.
