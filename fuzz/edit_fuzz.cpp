@@ -7,6 +7,7 @@
 namespace {
 
 using namespace fuzz;
+using namespace support;
 
 // In several spellings each. The bytes between the cases and beyond ASCII do not fold.
 const arguments mechanisms = words("unix UNIX uNix hba2 HBA2 a_[`{ A_[`{ sixteen-bytes-xx");

@@ -8,6 +8,7 @@
 namespace {
 
 using namespace fuzz;
+using namespace support;
 
 // What a line is: "-" for none; an entry as its type, its mechanism, its identity and its mask; a failure as
 // its message and the message's arguments.
@@ -56,9 +57,10 @@ line_facts facts_of(const sec_acle_t &acle) {
 
 // Compiles a text beside the model, which in the end is as the bytes are.
 model compile(const std::string &text, buffer &out) {
-    const guarded copy(text_field(text));
-    char *cursor = copy.data();
-    std::size_t left = copy.size();
+    const buffer copy(text_field(text));
+    char *const start = static_cast<char *>(copy.acl.data), *cursor = start;
+    const std::size_t size = text.size() + 1;
+    std::size_t left = size;
     std::uint32_t line = 1;
     model plain;
     sec_acltree_array array;
@@ -83,9 +85,9 @@ model compile(const std::string &text, buffer &out) {
         }
         const std::size_t end = place + length;
         const bool is_last = end > text.size() || text[end - 1] == '\0';
-        EXPECT_EQ(cursor, is_last ? nullptr : copy.data() + end);
+        EXPECT_EQ(cursor, is_last ? nullptr : start + end);
         if (is_last) break;
-        EXPECT_EQ(left, copy.size() - end);
+        EXPECT_EQ(left, size - end);
     }
     EXPECT_EQ(sec__read_acle_from_text(nullptr, &cursor, &left, &line, &acle), 0);
     // The trees, in the order in which their keys appeared, are compiled the last first.

@@ -54,10 +54,10 @@ auto watched(const std::function<int(std::size_t)> &fault, const Call &call) {
 }
 
 inline bool fails_now(std::size_t size) {
-    ++allocations.count;
-    const bool fails = allocations.fails_at != 0 && (allocations.fails_on ? allocations.count >= allocations.fails_at
-                                                                          : allocations.count == allocations.fails_at);
-    if (fails) allocations.refused = size;
+    auto &all = allocations;
+    ++all.count;
+    const bool fails = all.fails_at != 0 && (all.count == all.fails_at || (all.fails_on && all.count > all.fails_at));
+    if (fails) all.refused = size;
     return fails;
 }
 
@@ -70,11 +70,15 @@ inline void *counted(void *made) {
 
 #define QZ_WRAPPED(result, name, parameters)                                                                           \
     result __real_##name parameters;                                                                                   \
-    result __wrap_##name parameters;                                                                                   \
     result __wrap_##name parameters
-// A call that fails with -1.
+// A call that fails with -1, and one that may also fall short of what was asked for.
 #define QZ_WRAPPED_CALL(name, parameters, arguments)                                                                   \
     QZ_WRAPPED(int, name, parameters) { return faults::next(#name) > 0 ? -1 : __real_##name arguments; }
+#define QZ_WRAPPED_TRANSFER(name, memory)                                                                              \
+    QZ_WRAPPED(ssize_t, name, (int fd, memory bytes, size_t size)) {                                                   \
+        const int fault = faults::next(#name);                                                                         \
+        return fault > 0 ? -1 : __real_##name(fd, bytes, fault < 0 ? size - 1 : size);                                 \
+    }
 
 extern "C" {
 
@@ -89,13 +93,10 @@ QZ_WRAPPED(void *, realloc, (void *old, size_t size)) {
     return old == nullptr ? faults::counted(made) : made;
 }
 QZ_WRAPPED(char *, strdup, (const char *text)) {
-    const std::string copy = text;
-    void *made = __wrap_malloc(copy.size() + 1);
-    return made == nullptr ? nullptr : static_cast<char *>(memcpy(made, copy.c_str(), copy.size() + 1));
+    void *made = faults::fails_now(strlen(text) + 1) ? nullptr : __real_strdup(text);
+    return static_cast<char *>(faults::counted(made));
 }
-void __real_free(void *memory);
-void __wrap_free(void *memory);
-void __wrap_free(void *memory) {
+QZ_WRAPPED(void, free, (void *memory)) {
     faults::allocations.live -= memory != nullptr;
     __real_free(memory);
 }
@@ -107,7 +108,7 @@ QZ_WRAPPED(int, open, (const char *path, int flags, mode_t mode)) {
     if (faults::is_watching) faults::opened = path;
     return faults::next("open") > 0 ? -1 : __real_open(path, flags, mode);
 }
-int __wrap___open_2(const char *path, int flags); // what a fortified call without a mode becomes
+// What a fortified call without a mode becomes.
 int __wrap___open_2(const char *path, int flags) { return __wrap_open(path, flags, 0); }
 QZ_WRAPPED_CALL(fchown, (int fd, uid_t user, gid_t group), (fd, user, group))
 QZ_WRAPPED_CALL(fchmod, (int fd, mode_t mode), (fd, mode))
@@ -115,18 +116,12 @@ QZ_WRAPPED_CALL(futimens, (int fd, const timespec *times), (fd, times))
 QZ_WRAPPED_CALL(fdatasync, (int fd), (fd))
 QZ_WRAPPED_CALL(rename, (const char *from, const char *to), (from, to))
 QZ_WRAPPED_CALL(unlink, (const char *path), (path))
+QZ_WRAPPED_TRANSFER(read, void *)
+QZ_WRAPPED_TRANSFER(write, const void *)
 QZ_WRAPPED(int, close, (int fd)) { // which closes even as it fails
     const bool fails = faults::next("close") > 0;
     const int result = __real_close(fd);
     return fails ? -1 : result;
-}
-QZ_WRAPPED(ssize_t, read, (int fd, void *bytes, size_t size)) {
-    const int fault = faults::next("read");
-    return fault > 0 ? -1 : __real_read(fd, bytes, fault < 0 ? size - 1 : size);
-}
-QZ_WRAPPED(ssize_t, write, (int fd, const void *bytes, size_t size)) {
-    const int fault = faults::next("write");
-    return fault > 0 ? -1 : __real_write(fd, bytes, fault < 0 ? size - 1 : size);
 }
 QZ_WRAPPED(char *, getcwd, (char *path, size_t size)) {
     return faults::next("getcwd") > 0 ? nullptr : __real_getcwd(path, size);

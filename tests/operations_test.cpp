@@ -13,65 +13,56 @@ int prefix_matches(const char *requested, const char *entry) {
     return std::strncmp(requested, entry, std::strlen(entry));
 }
 
-struct note { // made with braces, which evaluate from left to right
-    explicit note(std::vector<std::string> &found, auto... values) {
-        std::ostringstream line;
-        ((line << values << ' '), ...);
-        found.push_back(line.str());
-    }
-};
-
 // What one round through the operations came to. Each thread has files and buffers of its own, and shares one.
-std::vector<std::string> use_all(const std::string &path, const sec_acl_buffer_t &shared) {
-    std::vector<std::string> found;
+std::string use_all(const std::string &path, const sec_acl_buffer_t &shared) {
+    std::ostringstream found;
     std::uint32_t mask = 0, flags = SEC_READ_ACL_CONVERT | SEC_READ_ACL_CACHE;
     sec_acl_buffer_t acl = {}, copy = {}, empty = {};
-    note{found, sec_read_acl_file(path.c_str(), nullptr, nullptr, flags, &acl, &flags), acl.length};
+    found << sec_read_acl_file(path.c_str(), nullptr, nullptr, flags, &acl, &flags) << ' ' << acl.length << '\n';
     sec_release_acl(&acl);
-    note{found, sec_read_acl_file(path.c_str(), nullptr, nullptr, SEC_READ_ACL_CONVERT, &acl, nullptr), acl.length};
-    note{found, sec_read_acl_from_data(acl.length, acl.data, &copy)};
-    note{found, sec_convert_acl_to_host(1, &copy)};
-    note{found, sec_create_empty_acl(&empty), empty.length};
-    note{found, sec_release_acl(&empty)};
+    found << sec_read_acl_file(path.c_str(), nullptr, nullptr, SEC_READ_ACL_CONVERT, &acl, nullptr) << ' ' << acl.length
+          << '\n';
+    found << sec_read_acl_from_data(acl.length, acl.data, &copy) << '\n';
+    found << sec_convert_acl_to_host(1, &copy) << '\n';
+    found << sec_create_empty_acl(&empty) << ' ' << empty.length << '\n';
+    found << sec_release_acl(&empty) << '\n';
 
     char letters[33] = "";
-    note{found, sec_translate_perms("wr", nullptr, &mask), mask};
-    note{found, sec_translate_bitmask(mask, nullptr, letters), letters};
+    found << sec_translate_perms("wr", nullptr, &mask) << ' ' << mask << '\n';
+    found << sec_translate_bitmask(mask, nullptr, letters) << ' ' << letters << '\n';
     sec_acle_t *entry = nullptr;
     char *mechanism = nullptr, *identity = nullptr;
-    note{found, sec_create_acle(SEC_ACLE_USER, mask, "kRb", "Bob", &entry)};
-    note{found, sec_display_acle_id(entry, &mechanism, &identity), mechanism, identity};
+    found << sec_create_acle(SEC_ACLE_USER, mask, "kRb", "Bob", &entry) << '\n';
+    found << sec_display_acle_id(entry, &mechanism, &identity) << ' ' << mechanism << ' ' << identity << '\n';
     std::free(mechanism);
     std::free(identity);
-    note{found, sec_add_acle_to_acl(entry, &copy), copy.length};
-    note{found, sec_add_acle_to_acl(entry, &copy), copy.length};
-    note{found, sec_add_acle_to_acl2(entry, &copy), copy.length};
+    found << sec_add_acle_to_acl(entry, &copy) << ' ' << copy.length << '\n';
+    found << sec_add_acle_to_acl(entry, &copy) << ' ' << copy.length << '\n';
+    found << sec_add_acle_to_acl2(entry, &copy) << ' ' << copy.length << '\n';
     sec_aclelist_t list = {};
-    note{found, sec_list_acl(&copy, &list), list.count};
+    found << sec_list_acl(&copy, &list) << ' ' << list.count << '\n';
     sec_release_aclelist(&list);
-    note{found, sec_list_acl_by_type(&copy, SEC_ACLE_USER, "krb", &list), list.count,
-         list.count ? list.acles[0]->identity : ""};
+    found << sec_list_acl_by_type(&copy, SEC_ACLE_USER, "krb", &list) << ' ' << list.count << ' '
+          << (list.count ? list.acles[0]->identity : "") << '\n';
     sec_release_aclelist(&list);
-    note{found, sec_del_acle_from_acl(entry, &copy), copy.length};
+    found << sec_del_acle_from_acl(entry, &copy) << ' ' << copy.length << '\n';
     sec_release_acle(entry);
 
-    note{found, sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "kRb5", prefix_matches)};
-    note{found, sec__single_acle_perm(&shared, SEC_ACLE_USER, "unix", nullptr, "AL", &mask), mask};
-    note{found, sec__single_acle_perm(&shared, SEC_ACLE_EXPANDED, "krb5", nullptr, "apple", &mask), mask};
-    note{found, sec__single_acle_perm(&shared, SEC_ACLE_USER, "unix", nullptr, "nobody", &mask), mask};
+    found << sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "kRb5", prefix_matches) << '\n';
+    found << sec__single_acle_perm(&shared, SEC_ACLE_USER, "unix", nullptr, "AL", &mask) << ' ' << mask << '\n';
+    found << sec__single_acle_perm(&shared, SEC_ACLE_EXPANDED, "krb5", nullptr, "apple", &mask) << ' ' << mask << '\n';
+    found << sec__single_acle_perm(&shared, SEC_ACLE_USER, "unix", nullptr, "nobody", &mask) << ' ' << mask << '\n';
     const sec_group_ref_t groups[] = {{1, "STAFF"}, {2, "admins"}, {3, "none"}};
-    note{found, sec__group_acles_perm(&shared, 3, groups, &mask), mask};
-    note{found, recorded_error().code};
+    found << sec__group_acles_perm(&shared, 3, groups, &mask) << ' ' << mask << '\n';
+    found << recorded_error().code << '\n';
     sec_release_acl(&copy);
     sec_release_acl(&acl);
-    return found;
+    return found.str();
 }
 
 // As a thread of a service would see it that is alone.
-const std::vector<std::string> expected = {"0 75 ", "0 75 ",    "0 ",         "0 ",     "0 5 ",   "0 ",      "0 3 ",
-                                           "0 rw ", "0 ",       "0 kRb Bob ", "0 100 ", "0 100 ", "43 100 ", //
-                                           "0 4 ",  "0 1 Bob ", "0 75 ",      "0 ",     "0 1 ",   "0 5 ",    "43 0 ",
-                                           "0 19 ", "0 "};
+const std::string expected = "0 75\n0 75\n0\n0\n0 5\n0\n0 3\n0 rw\n0\n0 kRb Bob\n0 100\n0 100\n43 100\n"
+                             "0 4\n0 1 Bob\n0 75\n0\n0 1\n0 5\n43 0\n0 19\n0\n";
 
 struct operations : testing::Test {
     std::string written(const std::string &name) const {

@@ -1,9 +1,8 @@
-// Tests of reading an ACL file through its cache: which of the two files is read, what the flags then say,
-// and what a cache that is written afterwards looks like. Times are set, never waited for.
+// Where an ACL file is, which of it and its cache is read, and what the flags then say. Times are set, never waited
+// for; the user database answers as a case wants it to.
+#include "faults.h"
+#include "qzacl_acl/file_name.h"
 #include "support.h"
-#include <pwd.h>
-
-namespace {
 
 using namespace support;
 namespace fs = std::filesystem;
@@ -12,18 +11,16 @@ constexpr unsigned text = SEC_READ_ACL_TEXT, cache = SEC_READ_ACL_CACHE, convert
 const std::string acl_text = "# users\nu unix alice@host r\n";
 const std::string from_text = one(of_mechanism(4, "unix", 1, named(1, "alice@host")));
 
-using reading = std::tuple<std::string, unsigned, failure>; // the bytes, the flags, and the error
-reading given(const std::string &bytes, unsigned flags) { return {bytes, flags, no_error}; }
-reading refused(const failure &error, unsigned flags) { return {"", flags, error}; }
-reading read_acl(const std::string &path, unsigned flags, const char *user = nullptr) {
-    buffer held;
-    held.acl = {7, &held}; // overwritten whatever comes
-    const int result = sec_read_acl_file(path.c_str(), user, nullptr, flags, &held.acl, &flags);
-    EXPECT_EQ(held.acl.data == nullptr, held.acl.length == 0);
-    return {held.bytes(), flags, after(result)};
-}
-
 struct read_acl_file : testing::Test {
+    using reading = std::tuple<std::string, unsigned, failure>; // the bytes, the flags, and the error
+    static reading given(const std::string &bytes, unsigned flags) { return {bytes, flags, no_error}; }
+    static reading read(const std::string &name, unsigned flags, const char *user = nullptr) {
+        buffer held;
+        held.acl = {7, &held}; // overwritten whatever comes
+        const int result = sec_read_acl_file(name.c_str(), user, nullptr, flags, &held.acl, &flags);
+        EXPECT_EQ(held.acl.data == nullptr, held.acl.length == 0);
+        return {held.bytes(), flags, after(result)};
+    }
     const temporary_folder folder;
     const std::string path = folder / "acl", cache_path = path + ".cacl";
 };
@@ -47,62 +44,120 @@ TEST_F(read_acl_file, reads_the_cache_when_it_is_current) {
     };
     for (const auto &[written, cached, age, mode, in, out, bytes] : rows) {
         fs::remove(cache_path);
-        write_file(path, written, 100, 0644);
+        write_file(path, written, 100);
         if (mode != 0) write_file(cache_path, cached, age, mode);
-        EXPECT_EQ(read_acl(path, in), given(bytes, out)) << written << age << ' ' << mode << ' ' << in;
+        EXPECT_EQ(read(path, in), given(bytes, out)) << written << age << ' ' << mode << ' ' << in;
         EXPECT_EQ(read_file(cache_path), cached) << written << age << ' ' << mode << ' ' << in;
     }
-    EXPECT_EQ(read_acl(path, convert), given(example, convert));
+    EXPECT_EQ(read(path, convert), given(example, convert));
     for (const uid_t uid : {1u, 0u}) {
         const bool may = chown(cache_path.c_str(), uid, 1 - uid) == 0; // the superuser only
-        EXPECT_EQ(read_acl(path, cache), may ? given(from_text, text) : given(foreign, 0));
+        EXPECT_EQ(read(path, cache), may ? given(from_text, text) : given(foreign, 0));
     }
-}
-
-TEST_F(read_acl_file, refreshes_a_cache_then_uses_it_and_leaves_no_other_file) {
+    // A cache that is out of date is replaced, and protected like the text.
+    fs::remove(cache_path);
     for (const unsigned mode : {0644u, 0600u}) {
         write_file(path, acl_text, 100, mode);
         write_file(cache_path, example, 200, mode);
-        EXPECT_EQ(read_acl(path, cache | convert), given(from_text, text | cache));
-        EXPECT_EQ(read_file(cache_path), from_text);
+        EXPECT_EQ(read(path, cache | convert), given(from_text, text | cache));
         EXPECT_EQ(fs::status(cache_path).permissions(), fs::perms(mode));
-        EXPECT_EQ(read_acl(path, cache | convert), given(from_text, convert));
+        EXPECT_EQ(read(path, cache | convert), given(from_text, convert));
     }
-    EXPECT_EQ(std::distance(fs::directory_iterator(folder.path()), fs::directory_iterator()), 2);
 }
 
 TEST_F(read_acl_file, reports_what_it_refuses) {
-    const std::string missing = folder / "missing";
-    EXPECT_EQ(read_acl(missing, 0xf2), refused(error_of(37, 122, {missing, std::to_string(ENOENT)}), 0xf2));
-    EXPECT_EQ(read_acl(folder.path(), 0), refused(error_of(37, 122, {folder.path(), "0"}), 0));
-    EXPECT_EQ(read_acl("acl", cache, ""), refused(error_of(4, 121), cache));
-    write_file(path, "o r\no r\n", 100, 0644);
-    EXPECT_EQ(read_acl(path, cache | convert), refused(error_of(43, 160, {"o"}), text | cache));
+    EXPECT_EQ(read(folder.path, 0xf2), reading("", 0xf2, error_of(37, 122, {folder.path, "0"})));
+    EXPECT_EQ(read("acl", cache, ""), reading("", cache, error_of(4, 121)));
+    write_file(path, "o r\no r\n");
+    EXPECT_EQ(read(path, cache | convert), reading("", text | cache, error_of(43, 160, {"o"})));
     EXPECT_FALSE(fs::exists(cache_path));
     unsigned flags = 9;
     sec_acl_buffer_t acl = {7, &flags};
-    const char *const name = "sec_read_acl_file";
-    EXPECT_EQ(after(sec_read_acl_file(nullptr, "", nullptr, 2, &acl, &flags)), bad_parameter(name, 1));
+    EXPECT_EQ(after(sec_read_acl_file(nullptr, "", nullptr, 2, &acl, &flags)), bad_parameter("sec_read_acl_file", 1));
     EXPECT_EQ(flags, 2u);
-    EXPECT_EQ(after(sec_read_acl_file("acl", "", nullptr, 4, nullptr, nullptr)), bad_parameter(name, 5));
+    EXPECT_EQ(after(sec_read_acl_file("", "", nullptr, 4, nullptr, nullptr)), bad_parameter("sec_read_acl_file", 5));
 }
 
 TEST_F(read_acl_file, of_a_user_must_be_that_users_alone) {
-    const passwd *user = getpwuid(geteuid());
-    if (user == nullptr || access(user->pw_dir, W_OK) != 0) GTEST_SKIP() << "no home directory to write to";
-    const std::string name = user->pw_name, base = ".qzacl-test-" + std::to_string(getpid());
-    const std::string file = user->pw_dir + "/"s + base;
-    const reading not_private = refused(error_of(36, 128, {file, name}), text);
-    for (const auto &[mode, other] : {std::pair(0644u, 0u), {0620u, 0u}, {0602u, 0u}, {0600u, 1u}}) {
-        write_file(file, acl_text, 100, mode);
-        const bool is_given = other != 0 && chown(file.c_str(), geteuid() + other, 0) == 0; // by root
-        const bool is_sound = (mode & 022) == 0 && !is_given;
-        EXPECT_EQ(read_acl(base, text, name.c_str()), is_sound ? given(from_text, text) : not_private);
-        EXPECT_EQ(read_acl(file, text), given(from_text, text)); // without a user nobody asks
+    const char *const name = getpwuid(geteuid())->pw_name;
+    const reading not_private = {"", text, error_of(36, 128, {path, name})};
+    faults::home = folder.path;
+    for (const auto &[mode, owner] : {std::pair(0644u, 0u), {0620u, 0u}, {0602u, 0u}, {0600u, 1u}}) {
+        write_file(path, acl_text, 100, mode);
+        const bool is_given = owner != 0 && chown(path.c_str(), owner, 0) == 0; // by root
+        EXPECT_EQ(read("acl", text, name), (mode & 022) != 0 || is_given ? not_private : given(from_text, text));
+        EXPECT_EQ(read(path, text), given(from_text, text)); // without a user nobody asks
     }
-    write_file(file, "", 100, 0666); // nothing that could be trusted
-    EXPECT_EQ(read_acl(base, 0, name.c_str()), given("", 0));
-    fs::remove(file);
+    write_file(path, "", 100, 0666); // nothing that could be trusted
+    EXPECT_EQ(read("acl", 0, name), given("", 0));
+    // The home directory may be a link, or missing.
+    fs::remove(path);
+    write_file(path, acl_text);
+    fs::create_directory_symlink(folder.path, folder / "link");
+    EXPECT_EQ(read((faults::home = folder / "link", "acl"), text, name), given(from_text, text));
+    faults::home = folder / "nowhere";
+    const failure missing = error_of(37, 122, {folder / "nowhere/acl", std::to_string(ENOENT)});
+    EXPECT_EQ(read("acl", text, name), reading("", text, missing));
 }
 
-} // namespace
+// The path that a name stands for, behind the user's id where there is a user; or the failure.
+failure path_of(const std::string &name, const char *user = nullptr) {
+    qz::path_buffer path;
+    std::uint32_t uid = 0;
+    const int result = sec__get_aclfname(name.c_str(), user, path, &uid);
+    const failure error = recorded_error();
+    EXPECT_EQ(result, error.code);
+    return result != 0 ? error : failure{0, 0, (user == nullptr ? "" : std::to_string(uid) + " ") + path.text};
+}
+
+TEST(file_name, stands_as_it_is_or_behind_the_working_directory) {
+    const temporary_folder folder;
+    std::string deep = folder.path;
+    while (deep.size() < 4090) { // the first part leaves whole hundreds to the others
+        deep += "/" + std::string(50 + (4090 - deep.size() - 51) % 100, 'd');
+        ASSERT_EQ(mkdir(deep.c_str(), 0700), 0);
+    }
+    const std::string gone = folder / "gone", x4094(4094, 'x'), x4095(4095, 'x');
+    const std::tuple<std::string, std::string, failure> rows[] = {
+        {"/", "acl", {0, 0, "/acl"}},
+        {folder.path, "/etc//./acl", {0, 0, "/etc//./acl"}},
+        {folder.path, "./sub/.//acl", {0, 0, folder / "./sub/.//acl"}},
+        {"/", "/" + x4095, {0, 0, "/" + x4095}},
+        {"/", "//" + x4095, error_of(105, 154, {"//" + x4095, std::to_string(ENAMETOOLONG)})},
+        {"/", x4094, {0, 0, "/" + x4094}},
+        {"/", x4095, error_of(105, 153, {"/", x4095})}, // the separator counts although none is added
+        {deep, "12345", {0, 0, deep + "/12345"}},
+        {deep, "123456", error_of(105, 153, {deep, "123456"})},
+        {gone, "acl", error_of(105, 152, {"getcwd()", std::to_string(ENOENT)})},
+        {gone, "/acl", {0, 0, "/acl"}},
+    };
+    for (const auto &[directory, name, path] : rows) {
+        mkdir(gone.c_str(), 0700);
+        ASSERT_EQ(chdir(directory.c_str()), 0);
+        rmdir(gone.c_str());
+        EXPECT_EQ(path_of(name), path);
+    }
+}
+
+TEST(file_name, lies_in_the_home_directory_of_a_user) {
+    const std::string h4090 = "/" + std::string(4089, 'h'), h9000(9000, 'h');
+    const failure unknown = error_of(15, 127, {"alice"});
+    // The name; what the database answers, and as whose home; the path or the failure.
+    const std::tuple<const char *, std::pair<int, const char *>, std::string, failure> rows[] = {
+        {"acl", {0, "alice"}, "/home/alice", {0, 0, "4242 /home/alice/acl"}},
+        {"..", {0, "alice"}, "/h/", {0, 0, "4242 /h/.."}},
+        {"12345", {0, "alice"}, h4090, {0, 0, "4242 " + h4090 + "/12345"}},
+        {"123456", {0, "alice"}, h4090, error_of(4, 151, {"123456", "alice"})},
+        {"", {0, "alice"}, h9000, error_of(4, 151, {"", "alice"})},
+        {"sub/acl", {EIO, nullptr}, "", error_of(4, 151, {"sub/acl", "alice"})},
+        {"acl", {}, "", unknown},
+        {"acl", {EIO, "alice"}, "/h", unknown},
+        {"acl", {0, "ALICE"}, "/h", unknown},
+        {"acl", {0, "alice2"}, "/h", unknown},
+    };
+    for (const auto &[name, answer, home, path] : rows) {
+        faults::answer = answer;
+        faults::home = home;
+        EXPECT_EQ(path_of(name, "alice"), path);
+    }
+}

@@ -1,5 +1,5 @@
-// What the tests of the ACL library share: errors, lists and buffers as values, compiled bytes written by hand, bytes
-// that end at an inaccessible page, captured output, folders that vanish, and the order of identities once more.
+// What the tests of the ACL library share: errors, lists and buffers as values, compiled bytes written by hand, folders
+// that vanish, and the order of identities once more.
 #ifndef QZ_TESTS_SUPPORT_H
 #define QZ_TESTS_SUPPORT_H
 
@@ -14,11 +14,9 @@
 #include <fstream>
 #include <gtest/gtest.h>
 #include <iterator>
-#include <memory>
 #include <random>
 #include <sstream>
 #include <string>
-#include <sys/mman.h>
 #include <vector>
 
 namespace support {
@@ -67,45 +65,12 @@ inline std::string shown(const void *pointer) {
     return text.str();
 }
 
-// A copy of bytes whose last one lies right before a page that nothing may touch.
-class guarded {
-public:
-    explicit guarded(std::string_view bytes) : size_(bytes.size()) {
-        const std::size_t page = (size_ | 4095) + 1;
-        void *memory = mmap(nullptr, page + 4096, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
-        char *const start = static_cast<char *>(memory);
-        mprotect(start + page, 4096, PROT_NONE);
-        bytes_ = {start + page - size_, [=](char *) { munmap(start, page + 4096); }};
-        bytes.copy(data(), size_);
-    }
-    char *data() const { return bytes_.get(); }
-    sec_acl_buffer_t acl() const { return {static_cast<std::int32_t>(size_), data()}; }
-    std::size_t size() const { return size_; }
-
-private:
-    std::size_t size_;
-    std::shared_ptr<char> bytes_;
-};
-
-// What a call writes to standard output and to standard error.
-using output = std::pair<std::string, std::string>;
-output output_of(const auto &call) {
-    testing::internal::CaptureStdout();
-    testing::internal::CaptureStderr();
-    call();
-    return {testing::internal::GetCapturedStdout(), testing::internal::GetCapturedStderr()};
-}
-
-class temporary_folder {
-public:
-    temporary_folder() { EXPECT_NE(mkdtemp(path_.data()), nullptr); }
+struct temporary_folder {
+    temporary_folder() = default;
     temporary_folder(const temporary_folder &) = delete;
-    ~temporary_folder() { std::filesystem::remove_all(path_); }
-    std::string operator/(std::string_view name) const { return path_ + "/" + std::string(name); }
-    const std::string &path() const { return path_; }
-
-private:
-    std::string path_ = std::filesystem::temp_directory_path() / ("qzacl-test-" + std::string(6, 'X'));
+    ~temporary_folder() { std::filesystem::remove_all(path); }
+    std::string operator/(const std::string &name) const { return path + "/" + name; }
+    const std::string path = mkdtemp((testing::TempDir() + "qzacl-test-" + std::string(6, 'X')).data());
 };
 
 inline void write_file(const std::string &path, const std::string &bytes, int age = 0, unsigned mode = 0644) {

@@ -1,12 +1,11 @@
 // A plain model of ACLs, written down once more: their bytes, what they list, and what an edit does to them, which is
 // to expand the sub-ACL of the entry's key, change it, and compile it again.
-#ifndef QZ_FUZZ_MODEL_H
-#define QZ_FUZZ_MODEL_H
+#ifndef QZ_TESTS_MODEL_H
+#define QZ_TESTS_MODEL_H
 #include "support.h"
 
-namespace fuzz {
+namespace support {
 
-using namespace support;
 using edit_function = int (*)(const sec_acle_t *, sec_acl_buffer_t *);
 // Identities and masks as they are stored: in any order, with repetitions.
 using items = std::vector<std::pair<std::string, std::uint32_t>>;
@@ -69,7 +68,7 @@ struct model {
         const bool deletes = how == sec_del_acle_from_acl;
         auto at = subacls.begin() + (find(acle.type, mechanism) - subacls.begin());
         items held = at == subacls.end() ? items() : at->expanded();
-        const auto old = fuzz::find(held, identity);
+        const auto old = support::find(held, identity);
         if (deletes && old == held.end())
             return error_of(at != subacls.end() && held.empty() ? 43 : 18, 105,
                             {std::to_string(acle.type), mechanism, identity});
@@ -96,5 +95,5 @@ inline std::vector<listed> list_of(const sec_acl_buffer_t &acl, int type = 0, co
     return taken(list);
 }
 
-} // namespace fuzz
+} // namespace support
 #endif
