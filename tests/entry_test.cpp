@@ -1,7 +1,6 @@
 // Permissions in both directions, and entries: making, displaying and releasing them, also in other code sets.
 #include "owned.h"
 #include "qzacl_acl/entry.h"
-#include "qzacl_acl/entry_parser.h"
 #include "qzacl_acl/permission.h"
 #include "support.h"
 
@@ -27,7 +26,7 @@ namespace {
 TEST(permissions, turn_letters_into_bits_and_back) {
     const sec_perm_template_t list[] = {
         {0x80000000, 'r', "", ""}, {1, '\xe9', "", ""}, {1, 'x', "", ""}, {2, 'r', "", ""}};
-    const sec_perm_set_t own = {4, list}, none = {0, nullptr};
+    const sec_perm_set_t own = {4, list};
     // After an error the result is what was found before it.
     const auto bits = [](const char *text, const sec_perm_set_t *set, unsigned wanted, const char *bad) {
         std::uint32_t mask = 0xffffffff;
@@ -35,7 +34,6 @@ TEST(permissions, turn_letters_into_bits_and_back) {
         EXPECT_EQ(mask, wanted) << text;
     };
     bits(nullptr, nullptr, 0, "");
-    bits("", &none, 0, "");
     bits("oasvdelqCxcwr", nullptr, 0x1fff, "");
     bits("xr\xe9r", &own, 0x80000001, "");
     bits("rR", nullptr, 1, "R");
@@ -45,22 +43,13 @@ TEST(permissions, turn_letters_into_bits_and_back) {
         EXPECT_EQ(after(sec_translate_bitmask(mask, set, text)), *bad == 0 ? no_error : error_of(36, 164, {bad}));
         EXPECT_STREQ(text, wanted);
     };
-    letters(0, &none, "", "");
+    letters(0, nullptr, "", "");
     letters(0x80000001, &own, "\xe9r", "");
     letters(0x80000000, nullptr, "", "80000000");
     letters(0xffffffff, nullptr, "rwcxCqledvsao", "00002000");
     letters(5, &own, "\xe9", "00000004");
     EXPECT_EQ(after(sec_translate_perms("", nullptr, nullptr)), bad_parameter("sec_translate_perms", 3, "0"));
     EXPECT_EQ(after(sec_translate_bitmask(1, nullptr, nullptr)), bad_parameter("sec_translate_mask", 3, "0"));
-    // The parser takes other templates, too.
-    buffer text(text_field("o rx\no w"));
-    auto *cursor = static_cast<char *>(text.acl.data);
-    auto left = static_cast<std::size_t>(text.acl.length);
-    std::uint32_t line = 1;
-    sec_acle_t acle;
-    EXPECT_EQ(sec__read_acle_from_text(&own, &cursor, &left, &line, &acle), 1);
-    EXPECT_EQ(acle.perm_mask, 0x80000001);
-    EXPECT_EQ(after(sec__read_acle_from_text(&own, &cursor, &left, &line, &acle)), error_of(36, 166, {"2", "w"}));
 }
 
 // What an entry made of these parameters holds, or the error.

@@ -71,6 +71,13 @@ TEST_F(read_acl_file, reports_what_it_refuses) {
     write_file(path, "o r\no r\n");
     EXPECT_EQ(read(path, cache | convert), reading("", text | cache, error_of(43, 160, {"o"})));
     EXPECT_FALSE(fs::exists(cache_path));
+    // Letters mean what the caller says.
+    const sec_perm_template_t templates[] = {{0x80000000, 'Z', "", ""}, {2, 'r', "", ""}, {4, 'r', "", ""}};
+    const sec_perm_set_t own = {3, templates};
+    buffer held;
+    write_file(path, "o rZ\n");
+    EXPECT_EQ(after(sec_read_acl_file(path.c_str(), nullptr, &own, text, &held.acl, nullptr)), no_error);
+    EXPECT_EQ(held.bytes(), one(packed_subacl(2, "", 1, packed_entry(0x80000002, ""))));
     unsigned flags = 9;
     sec_acl_buffer_t acl = {7, &flags};
     EXPECT_EQ(after(sec_read_acl_file(nullptr, "", nullptr, 2, &acl, &flags)), bad_parameter("sec_read_acl_file", 1));

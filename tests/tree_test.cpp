@@ -1,11 +1,8 @@
-// Trees, and their compiled form in both directions: against the model while allocations fail, with
-// many keys, and with a quarter of a million entries on a small stack. Whole texts are text_fuzz's.
+// Trees, and their compiled form in both directions, against the model while allocations fail. Whole texts are
+// text_fuzz's, a hundred thousand entries on a small stack command_test's.
 #include "faults.h"
 #include "model.h"
 #include "qzacl_acl/compile.h"
-
-#include <pthread.h>
-#include <thread>
 
 using namespace support;
 
@@ -121,38 +118,6 @@ TEST(trees, are_found_by_their_keys_however_many) {
     buffer none;
     EXPECT_EQ(sec__acltrees_to_acl(too_many, &none.acl), 6);
     EXPECT_EQ(none.bytes(), "");
-}
-
-// Half of them in order and the rest in none.
-TEST(tree, takes_many_entries_on_a_small_stack) {
-    constexpr int many = 250000; // so that the sanitizers get through, too
-    std::vector<std::string> names, sorted;
-    for (int index = 1; index <= many; ++index)
-        names.push_back((index % 2 == 0 ? "user" : "User") + std::to_string(many + index));
-    std::ranges::shuffle(std::span(names).subspan(many / 2), std::mt19937(3));
-    pthread_attr_t small;
-    pthread_attr_init(&small);
-    ASSERT_EQ(pthread_attr_setstacksize(&small, std::size_t{256} * 1024), 0);
-    ASSERT_EQ(pthread_setattr_default_np(&small), 0);
-    std::thread([&] {
-        for (const int type : {4, 8}) {
-            sec_acltree_t *root = nullptr;
-            for (const std::string &name : names) {
-                const sec_acle_t acle = entry(type, "kdz", name.c_str(), 1);
-                ASSERT_EQ(sec__add_acle_to_tree(1, &acle, &root), 0);
-            }
-            const qz::owned_acltree owner(root);
-            const std::string bytes = compiled(root);
-            EXPECT_TRUE(recompiled(bytes) == bytes);
-            sec_aclelist_t list = {};
-            EXPECT_EQ(sec__acltree_to_aclelist(root, &list), 0);
-            std::vector<std::string> found;
-            for (const listed &each : taken(list)) found.push_back(each.identity);
-            if (type == 4) std::ranges::sort(names, precedes);
-            EXPECT_TRUE(found == names);
-            if (type == 4) std::ranges::reverse(names); // for the chain
-        }
-    }).join();
 }
 
 } // namespace
