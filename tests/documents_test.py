@@ -28,7 +28,7 @@ SERVED = """set -e; export QZ_TRACE_LEVELS=_SEL:Errors=1,Info=1,API=8,Perf=1 QZ_
     service service.acl eve@example.org strangers
     chmod 600 service.acl.cacl; service service.acl root@head.cluster.example
     touch service.acl; service service.acl root@head.cluster.example
-    chmod 644 service.acl.cacl; echo >service.acl.cacl; touch -d '1 hour ago' service.acl
+    chmod 644 service.acl*; echo >service.acl.cacl; touch -d '1 hour ago' service.acl
     service service.acl root@head.cluster.example"""
 
 

@@ -27,7 +27,7 @@ VALUES = """S_OK 0 S_ADVISORY 1 S_BAD_PARAMETER 4 S_NO_MEMORY 6 S_UNKNOWN_USER 1
     ACLE_UNAUTHENTICATED 1 ACLE_ANYOTHER 2 ACLE_USER 4 ACLE_EXPANDED 8 ACLE_GROUP 16 ACLE_USE_ID_HANDLER 128
     ID_HANDLER_EXPANDED 1 ID_HANDLER_USER 2 READ_ACL_TEXT 1 READ_ACL_CACHE 2 READ_ACL_CONVERT 4"""
 FACTS = ["sizeof acl__default_perm_list == 13 * 84", "sizeof ((sec_acle_t *)0)->mechanism == 17",
-         "offsetof(cu_error_t, code) == 0", "offsetof(cu_error_t, message_id) == 4"]
+         "sizeof ((sec_group_ref_t *)0)->id == 8", "offsetof(cu_error_t, message_id) == 4"]
 for record, size, places in re.findall(r"(\w+) (\d+)([^;]*)", RECORDS):
     FACTS += [f"sizeof({record}) == {size}"]
     FACTS += [f"offsetof({record}, {name}) == {place}" for name, place in re.findall(r"(\w+) (\d+)", places)]
