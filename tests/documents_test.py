@@ -1,0 +1,115 @@
+"""Tries what README.md, docs/ and the manual tell: their commands, examples and recipes, and that nothing is left out.
+
+usage: documents_test.py BUILD-FOLDER [unittest arguments]; --write writes the outputs in the documents anew"""
+import json
+import os
+import re
+import shutil
+import subprocess
+import sys
+import tempfile
+import unittest
+from pathlib import Path
+
+BUILD, SOURCE, WRITE = Path(sys.argv.pop(1)).resolve(), Path(__file__).resolve().parent.parent, "--write" in sys.argv
+DOCS = {path: path.read_text() for path in (SOURCE / name for name in (
+    "README.md", "docs/recipes.md", "docs/tracing.md", "docs/man/qzaclfck.1", "docs/man/qzacl.5", "docs/man/qzcacl.5"))}
+RECIPES = dict(re.findall(r"<!-- recipe: (.*?) -->\n```\w*\n(.*?)```\n", "".join(DOCS.values()), re.S))
+# A command and what it prints, in Markdown and in a manual page; and how the command is written there.
+OUTPUT = re.compile(r"(<!-- output: (.*?) -->\n```\n)((?s:.*?))(?=```\n)")
+EXAMPLE = re.compile(r"(?m)^(\$ ((?:.*\\e\n)*.*\n))((?:.*\n)*?)(?=\$ |\.Ed)")
+WRITTEN = {"./dev run": "qzaclfck", "build/release/examples/": "", "\\-": "-", "\\(aq": "'", "\\e": "\\"}
+TIMES = re.compile(r"\d+:\d+:\d+|\d+(?= us)")  # which differ each time
+MARKUP = str.maketrans({"\\": "\\e", "-": "\\-", "'": "\\(aq"})
+# What docs/tracing.md takes as its example.
+SERVED = """set -e; export QZ_TRACE_LEVELS=_SEL:Errors=1,Info=1,API=8,Perf=1 QZ_TRACE_FILE=service.trace
+    cp -p examples/service.acl .; touch -d '2 hours ago' service.acl; service service.acl guest@login.cluster.example
+    touch -d '1 hour ago' service.acl.cacl; service service.acl mallory@login.cluster.example
+    service service.acl eve@example.org strangers
+    chmod 600 service.acl.cacl; service service.acl root@head.cluster.example
+    touch service.acl; service service.acl root@head.cluster.example
+    chmod 644 service.acl*; echo >service.acl.cacl; touch -d '1 hour ago' service.acl
+    service service.acl root@head.cluster.example"""
+
+
+class Documents(unittest.TestCase):
+    def setUp(self):
+        self.dir = Path(tempfile.mkdtemp()).resolve()
+        self.addCleanup(shutil.rmtree, self.dir)
+        shutil.copytree(SOURCE / "examples", self.dir / "examples", ignore=shutil.ignore_patterns("*.cacl"))
+        for name, text in RECIPES.items():
+            (self.dir / name).write_text(text)
+            (self.dir / name).chmod(0o755)
+
+    def run_in_shell(self, command, folder=".", **more):  # gives the status, and what is printed on either stream
+        environment = {"PATH": f"{BUILD}/bin:{BUILD}/examples:{self.dir}:{os.environ['PATH']}", "LC_ALL": "C",
+                       "HOME": str(self.dir), "LOCPATH": str(self.dir), **more}
+        done = subprocess.run(command, shell=True, env=environment, cwd=self.dir / folder, check=False, text=True,
+                              stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
+        return done.returncode, done.stdout.replace(str(self.dir), "/etc")
+
+    def test_outputs(self):
+        self.assertEqual(self.run_in_shell(SERVED)[0], 0)
+        for path, text in DOCS.items():
+            place, pattern, markup = (".", OUTPUT, {}) if path.suffix == ".md" else (path.stem, EXAMPLE, MARKUP)
+            (self.dir / place).mkdir(exist_ok=True)
+
+            def real(found, place=place, markup=markup):
+                command = found[2]
+                for written, meant in WRITTEN.items():
+                    command = command.replace(written, meant)
+                printed = self.run_in_shell(command, place)[1].translate(markup)
+                self.assertEqual(*[WRITE or TIMES.sub("", each) for each in (printed, found[3])], command)
+                return found[1] + printed
+            if path.name != "tracing.md" or shutil.which("jq"):
+                shown, count = pattern.subn(real, text)
+                self.assertTrue(count, path)
+                if WRITE:
+                    path.write_text(shown)
+
+    def test_recipes_tell_right_from_wrong(self):
+        for command in re.findall("(?:validate: |=/usr/bin/)(qzaclfck .*)(?:%s|/etc/)", "".join(RECIPES.values())):
+            self.assertEqual(self.run_in_shell(command + "examples/service.acl"), (0, ""))
+            self.assertEqual(self.run_in_shell(command + "examples/mistakes.acl")[0], 37)
+        self.assertTrue((self.dir / "examples/service.acl.cacl").exists())
+
+    @unittest.skipUnless(shutil.which("git"), "there is no git")
+    def test_commits(self):
+        self.run_in_shell("git init repo; mv pre-commit repo/.git/hooks")
+        for staged, present, expected in ("service", "mistakes", 0), ("mistakes", "service", 1):
+            change = f"cd repo && cp ../examples/{staged}.acl 'a b.acl' && git add . && cp ../examples/{present}.acl *"
+            commit = "git -c user.name=x -c user.email=x commit -m x"
+            self.assertEqual(self.run_in_shell(f"{change} && {commit}")[0], expected, staged)
+
+    @unittest.skipUnless(shutil.which("gencat") and os.path.exists("/usr/share/i18n/locales/de_DE"), "no German locale")
+    def test_places_of_mistakes_in_another_language(self):
+        subprocess.run(["localedef", "-i", "de_DE", "-f", "UTF-8", self.dir / "de_DE.UTF-8"], check=True)
+        catalogs = re.search("NLSPATH=(.*)", RECIPES["language"])[1].replace("/usr/local", str(BUILD))
+        matcher = json.loads(RECIPES["matcher"])["problemMatcher"][0]["pattern"][0]
+        places = re.findall(r"(?m)^examples/\S+: 3417-\d+", DOCS[SOURCE / "docs/recipes.md"])
+        _, shown = self.run_in_shell("aclcheck examples/*.acl", LC_ALL="de_DE.UTF-8", NLSPATH=catalogs)
+        found = [re.match(matcher["regexp"], line) for line in shown.splitlines()]
+        keys = [matcher[key] for key in ("file", "line", "code")]
+        self.assertEqual(["{}:{}: {}".format(*each.group(*keys)) for each in found], places)
+        self.assertIn("Der ACL-Eintrag in Zeile 5", found[0][matcher["message"]])
+
+    def test_table_of_trace_points(self):
+        calls = re.findall(r"trace_(exit|entry|release_exit|id|data|elapsed|arguments)\((\d+)", "".join(
+            path.read_text() for path in (SOURCE / "security").rglob("*.cpp")))
+        recorded = {int(number) + more for how, number in calls for more in range(1 + (how == "exit"))}
+        self.assertEqual(recorded, set(map(int, re.findall(r"\*\*(\d+)\*\*", DOCS[SOURCE / "docs/tracing.md"]))))
+
+    def test_manual_is_sound_and_has_every_function_and_option(self):
+        for name in "security/ACL/lib/libqzacl.map", "platform/libqz_cu/libqz_cu.map":
+            for function in re.findall(r"(\w+);\n", (SOURCE / name).read_text()):
+                page = BUILD / "share/man" / (BUILD / f"share/man/man3/{function}.3").read_text().split()[1]
+                self.assertRegex(page.read_text(), rf"(?m)^\.Nm {function}\b")
+        options = re.findall(r"(?m)^\.It Fl (\w)", DOCS[SOURCE / "docs/man/qzaclfck.1"])
+        self.assertEqual(set(options), set(re.findall(r"\s\[?-(\w)\b", self.run_in_shell("qzaclfck")[1])))
+        if shutil.which("mandoc"):  # without matters of style, such as blanks at the end of what was printed
+            checked = self.run_in_shell("mandoc -T lint -W warning $(grep -L '^[.]so ' man*/*)", BUILD / "share/man")
+            self.assertEqual(checked, (0, ""))
+
+
+if __name__ == "__main__":
+    unittest.main(argv=[argument for argument in sys.argv if argument != "--write"])
