@@ -118,7 +118,7 @@ OPTIONS = [  # arguments, status, standard error; the file "a" holds the line "n
     *[(f"-{letter} p -{letter} q", 4, message(146, f"-{letter}") + USAGE) for letter in "ftu"],
     ("-cvfa operand -- -x", 0, LINE_OF_A),
     ("-S -t p -f a", 0, ""), ("-t p -S -v -f a", 0, message(149) * 2 + LINE_OF_A),
-    ("-s -u no.such.user -f a", 15, message(150) + message(127, "no.such.user")),
+    ("-u no.such.user -f a", 15, message(127, "no.such.user")),
     ("-f missing%n%1$s\xff", 105, message(154, "{dir}/missing%n%1$s\xff", errno.ENOENT)),
 ]
 
@@ -193,7 +193,7 @@ class Command(CommandCase):
         found = []
         for megabytes in range(4, 64, 2):
             limits = ((resource.RLIMIT_STACK, 256 << 10), (resource.RLIMIT_AS, megabytes << 20))
-            code, errors = run(["-s", "-f", "a"], self.dir, child=lambda: [
+            code, errors = run(["-cs", "-f", "a"], self.dir, child=lambda: [
                 resource.setrlimit(kind, (limit, limit)) for kind, limit in limits])
             if code >= 0 and "error while loading" not in errors:
                 found.append((code, errors[:8]))
