@@ -6,11 +6,13 @@ import itertools
 import os
 import pathlib
 import pwd
+import random
 import re
 import resource
 import shutil
 import signal
 import socket
+import struct
 import subprocess
 import sys
 import tempfile
@@ -168,7 +170,7 @@ class Command(CommandCase):
                             [("a.cacl", content) for content in cache if "-s" in options])
 
     def test_locales(self):
-        """They say in which code set identities are shown, and nothing about letters and white space."""
+        """They say in which code set identities are shown and what ends a word, and nothing about letters."""
         self.write("a", "u m \xc3\xa9 r\ng \xff\nn r\n")
         for locale, shown in (("C", TEXTS[130]), ("C.UTF-8", entry("u", "r", "m", "\xc3\xa9"))):
             self.expect(["-v", "-f", "a"], 0, shown + TEXTS[130] + LINE_OF_A, environment={"LC_ALL": locale})
@@ -176,8 +178,16 @@ class Command(CommandCase):
         self.write("a", text.encode("utf-8"))
         told = run(["-c", "-f", "a"], self.dir)
         self.assertEqual(told[1].count("3417-157"), 1)  # the user, and neither of the groups
-        for locale in ("tr_TR.ISO-8859-9", "tr_TR.UTF-8"):
-            self.assertEqual(run(["-c", "-f", "a"], self.dir, self.locale(locale)), told)
+        for environment in self.locale("tr_TR.ISO-8859-9"), self.locale("tr_TR.UTF-8"), {"LC_ALL": "not.known"}:
+            self.assertEqual(run(["-c", "-f", "a"], self.dir, environment), told)
+        # More bytes than usual are white space: they end a token, but do not stand between two.
+        rules = pathlib.Path("/usr/share/i18n/locales/i18n_ctype").read_text("utf-8")
+        rules = rules.replace("\nspace /", "\nspace /\n<U00A0>;/")
+        pathlib.Path(self.root, "blanks").write_text(rules, "utf-8")
+        subprocess.run(["localedef", "-ci", "blanks", "-f", "ISO-8859-1", "./x"], cwd=self.root, capture_output=True)
+        self.write("a", "g a\xa0r\no \xa0r\n")
+        self.expect(["-cv", "-f", "a"], 0, entry("g", "r", "a") + message(159, 2),
+                    environment={"LC_ALL": "", "LC_CTYPE": "x", "LOCPATH": self.root})
 
     def test_entries_are_gathered_into_one_write(self):
         self.write("a", "n\no\ng a\n")
@@ -189,7 +199,13 @@ class Command(CommandCase):
     @unittest.skipIf(SANITIZED, "the sanitizers need much memory")
     def test_little_memory(self):
         """However little there is, the check succeeds or says that it was too little."""
-        self.write("a", "".join(f"u m {number:05} r\ne m {number:05}\n" for number in range(50000)))
+        names = [f"{number:05}" for number in range(50000)]
+        shuffled = names[:20000] + random.Random(1).sample(names[20000:], 30000)
+        self.write("a", "".join(f"u m {name} r\ne m {name}\n" for name in shuffled))
+        cache = b"\x85\1\2" + struct.pack("<H", 2) + b"".join(
+            struct.pack("<IBIB", 12 + 50000 * 13, kind, 50000, 2) + b"m\0" + b"".join(
+                struct.pack("<BIH", 1, mask, 6) + name.encode() + b"\0" for name in order)
+            for kind, mask, order in ((8, 0, shuffled), (4, 1, names)))
         found = []
         for megabytes in range(4, 64, 2):
             limits = ((resource.RLIMIT_STACK, 256 << 10), (resource.RLIMIT_AS, megabytes << 20))
@@ -199,7 +215,7 @@ class Command(CommandCase):
                 found.append((code, errors[:8]))
             self.assertEqual(os.path.exists(self.dir + "/a.cacl"), code == 0)
         self.assertEqual((found[0], found[-1], len(set(found))), ((6, "3417-102"), (0, ""), 2))
-        self.assertEqual(os.path.getsize(self.dir + "/a.cacl"), 5 + 2 * (12 + 50000 * 13))
+        self.assertTrue(pathlib.Path(self.dir, "a.cacl").read_bytes() == cache)
 
     def test_what_stands_in_the_way(self):
         for does, *told in [  # what its owner does before, and what "-s" then says to the owner
