@@ -3,6 +3,8 @@
 #ifndef QZ_TESTS_FAULTS_H
 #define QZ_TESTS_FAULTS_H
 
+#include "qz/cu.h"
+
 #include <cerrno>
 #include <cstring>
 #include <fcntl.h>
@@ -51,6 +53,18 @@ auto watched(const std::function<int(std::size_t)> &fault, const Call &call) {
     auto result = call();
     is_watching = false;
     return result;
+}
+
+// Lets each allocation of a step fail in turn until it gets what it wants: what failed for memory left all as it was.
+template <class Step>
+int patiently(Step step) {
+    for (std::size_t failing = 1;; ++failing) {
+        allocations = {0, failing};
+        const int result = step();
+        allocations = {};
+        if (result != 6) return result;
+        cu_set_no_error_1();
+    }
 }
 
 inline bool fails_now(std::size_t size) {

@@ -3,6 +3,7 @@
 #ifndef QZ_TESTS_MODEL_H
 #define QZ_TESTS_MODEL_H
 #include "support.h"
+#include <map>
 
 namespace support {
 
@@ -23,9 +24,10 @@ struct model_subacl {
     // Of equal ones the first spelling and the last mask; all but user-expanded ones are put in order.
     items expanded() const {
         items made;
+        std::map<std::string, std::size_t> places;
         for (const auto &[identity, mask] : stored) {
-            const auto at = find(made, identity);
-            (at == made.end() ? made.emplace_back(identity, 0) : *at).second = mask;
+            const auto [place, is_new] = places.emplace(folded(identity), made.size());
+            (is_new ? made.emplace_back(identity, 0) : made[place->second]).second = mask;
         }
         if (type != 8) std::ranges::sort(made, {}, key);
         return made;
