@@ -1,5 +1,5 @@
-// Texts of catalogs against the text that they stand for: a line with the default text, and then the offered one. Only
-// what takes the same arguments is used, and whatever the text, no argument is read that was not given.
+// Texts of catalogs against the text that they stand for: a line with the default text, and then the offered one, of up
+// to 300 bytes. Only what takes the same arguments is used, and no argument is read that was not given.
 #include "fuzz.h"
 #include "libqz_cu/message_text.h"
 #include <map>
@@ -33,18 +33,18 @@ std::string shown(const std::smatch &of, const auto &argument) {
 
 int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
     std::string_view from = fuzz::input(data, size);
-    const std::string by_default = fuzz::line(from).c_str(), offered = std::string(from).c_str();
-    std::map<unsigned, bool> strings; // what the default text takes, each by the first that takes it
+    const std::string by_default = fuzz::line(from).substr(0, 300).c_str(), offered(std::string(from, 0, 300).c_str());
+    std::map<int, bool> strings; // what the default text takes, each by the first that takes it
     for (const std::smatch &each : pieces(by_default))
         if (each[1].matched) strings.try_emplace(*each[1].first - '1', each[4] == "s");
     qz::cu::arguments given = {};
     qz::cu::find_arguments(by_default.c_str(), given);
     EXPECT_EQ(given.count, strings.empty() ? 0 : strings.rbegin()->first + 1);
-    for (unsigned i = 0; i < 9; ++i) {
-        EXPECT_EQ(given.is_string(i), strings[i]);
+    for (int i = 0; i < 9; ++i) {
+        EXPECT_EQ(given.is_string(static_cast<unsigned>(i)), strings[i]);
         // What is not given holds a number, so that it would be a wild address.
-        given.values[i].number = i % 2 == 0 ? -1234567 - static_cast<int>(i) : static_cast<int>('a' + i);
-        if (given.is_string(i)) given.values[i].text = i % 2 == 0 ? "" : "text";
+        given.values[i].number = i % 2 == 0 ? -1234567 - i : 'a' + i;
+        if (strings[i]) given.values[i].text = i % 2 == 0 ? "" : "text";
     }
     const std::vector<std::string> taken = sorted(offered);
     const bool is_sound = taken.size() <= 32 && (taken.empty() || taken[0] != "%");
@@ -52,7 +52,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
     for (const std::string &text : {by_default, offered}) {
         std::string wanted;
         for (const std::smatch &each : pieces(text)) {
-            const unsigned at = each[1].matched ? *each[1].first - '1' : 9;
+            const int at = each[1].matched ? *each[1].first - '1' : 9;
             const bool is_string = each[4] == "s", is_given = at < given.count && is_string == strings[at];
             wanted += !is_given   ? each.str().substr(each.str() == "%%")
                       : is_string ? shown(each, given.values[at].text)
