@@ -1,9 +1,10 @@
-// What the fuzzers share: taking an input apart, and a plain second reading of UTF-8.
+// What the fuzzers share: taking an input apart, and the conversions of the C library.
 #ifndef QZ_FUZZ_FUZZ_H
 #define QZ_FUZZ_FUZZ_H
 #include <algorithm>
 #include <cstring>
 #include <gtest/gtest.h>
+#include <iconv.h>
 #include <optional>
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size);
@@ -28,21 +29,16 @@ inline std::string line(std::string_view &from) {
     return taken;
 }
 
-// The characters of UTF-8, none for other bytes: what is read loosely must come out the same when it is written.
-inline std::optional<std::u32string> characters(std::string_view bytes) {
-    std::u32string all;
-    for (unsigned more = 0; !bytes.empty(); bytes.remove_prefix(more + 1)) {
-        const auto lead = static_cast<unsigned char>(bytes[0]);
-        more = lead < 0xc0 ? 0 : lead < 0xe0 ? 1 : lead < 0xf0 ? 2 : 3;
-        char32_t point = more == 0 ? lead : lead & (0x3fu >> more);
-        for (const char c : bytes.substr(1, more)) point = point << 6 | (c & 0x3f);
-        std::string again(1, static_cast<char>(more == 0 ? point : 0xff00u >> (more + 1) | point >> 6 * more));
-        for (unsigned i = more; i-- != 0;) again += static_cast<char>(0x80 | (point >> 6 * i & 0x3f));
-        const bool is_shortest = more == 0 ? point < 0x80 : point >= (more == 1 ? 0x80u : 1u << (5 * more + 1));
-        if (!bytes.starts_with(again) || !is_shortest || point > 0x10ffff || point >> 11 == 0x1b) return {};
-        all += point;
-    }
-    return all;
+// Bytes of one code set in another as the C library converts them, none when it cannot do so with all of them.
+inline std::optional<std::string> recoded(const char *to, const char *from, std::string bytes) {
+    const iconv_t converter = iconv_open(to, from);
+    std::string made(8 * bytes.size() + 16, '\0');
+    char *in = bytes.data(), *out = made.data();
+    std::size_t left = bytes.size(), room = made.size();
+    const bool is_whole = iconv(converter, &in, &left, &out, &room) == 0;
+    const bool is_ended = iconv(converter, nullptr, nullptr, &out, &room) == 0;
+    iconv_close(converter);
+    return is_whole && is_ended ? std::optional(made.substr(0, made.size() - room)) : std::nullopt;
 }
 
 } // namespace fuzz

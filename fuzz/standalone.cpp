@@ -26,11 +26,8 @@ int main(int, char **arguments) {
     for (const std::string &input : corpus)
         for (std::size_t at = 0; at < input.size(); ++at) {
             run(input.substr(0, at + 1));
-            for (const int change : {1, 2, 3, 4, 5, 7, 8, 16, 32, 64, 127, 128, 129, 254, 255}) {
-                std::string changed = input;
-                changed[at] = static_cast<char>(changed[at] + change);
-                run(changed);
-            }
+            for (const int change : {1, 2, 3, 4, 5, 7, 8, 16, 32, 64, 127, 128, 129, 254, 255})
+                run(std::string(input).replace(at, 1, 1, static_cast<char>(input[at] + change)));
         }
     std::mt19937 random(1);
     const auto below = [&](std::size_t limit) { return random() % limit; };
@@ -38,9 +35,7 @@ int main(int, char **arguments) {
         std::string made = corpus[below(corpus.size())];
         for (auto changes = 1 + below(6); changes != 0; --changes) {
             const std::string other = below(2) == 0 ? made : corpus[below(corpus.size())];
-            const std::string piece = other.substr(below(other.size() + 1), below(4) == 0 ? below(200) : below(8));
-            const std::string bytes(1 + below(3), "\0\1\x7f\x80\xff \n"[below(7)]);
-            made.replace(below(made.size() + 1), below(2) * below(6), below(3) == 0 ? bytes : piece);
+            made.replace(below(made.size() + 1), below(12), other, below(other.size() + 1), below(8));
         }
         run(made);
     }

@@ -1,48 +1,23 @@
-// The level setting against a plain second reading, and which names of components and texts pass as printable: a line
-// with the setting, one with the component, and the category.
+// The level setting against a regular expression, and which texts are printable: a line with the setting, and the text.
 #include "fuzz.h"
 #include "libqz_tr/levels.h"
 #include "libqz_tr/text.h"
-#include <sstream>
-
-namespace {
-
-using namespace fuzz;
-
-// The parts of a text that begin with the head, without it.
-std::vector<std::string> parts(const std::string &text, char end, const std::string &head) {
-    std::istringstream stream(text);
-    std::vector<std::string> all;
-    for (std::string part; std::getline(stream, part, end);)
-        if (part.starts_with(head)) all.push_back(part.substr(head.size()));
-    return all;
-}
-
-int level_of(const std::string &setting, const std::string &component, const std::string &category) {
-    int level = 0;
-    for (const std::string &part : parts(setting, ';', component + ":"))
-        for (const std::string &value : parts(part, ',', category + "=")) {
-            const bool is_number = !value.empty() && value.find_first_not_of("0123456789") == std::string::npos;
-            const std::string digits = value.substr(std::min(value.find_first_not_of('0'), value.size()));
-            if (is_number && digits.size() < 4 && std::atoi(digits.c_str()) < 256) level = std::atoi(digits.c_str());
-        }
-    return level;
-}
-
-} // namespace
+#include <regex>
 
 int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
-    std::string_view from = input(data, size);
-    const std::string setting = line(from), component = line(from), category(from);
-    for (const std::string &text : {setting, component, category}) {
-        const auto all = characters(text);
-        const auto is_control = [](char32_t c) { return c < 0x20 || (c >= 0x7f && c < 0xa0); };
-        EXPECT_EQ(qz::tr::is_printable(text), all.has_value() && std::ranges::none_of(*all, is_control));
-    }
-    EXPECT_EQ(qz::tr::configured_level(setting, "_SEL", "API"), level_of(setting, "_SEL", "API"));
-    // Names of neither hold the signs behind them.
-    if (component.find_first_of(":;") != std::string::npos || category.find_first_of("=,;") != std::string::npos)
-        return 0;
-    EXPECT_EQ(qz::tr::configured_level(setting, component, category), level_of(setting, component, category));
+    static const std::regex levels("(?:^|;)_SEL:(?:[^;]*,)?API=0*(25[0-5]|2[0-4]\\d|1?\\d?\\d)(?=[,;]|$)");
+    std::string_view from = fuzz::input(data, size);
+    const std::string setting = fuzz::line(from).substr(0, 500), text(from); // expressions go deep in long ones
+    int level = 0;
+    for (std::sregex_iterator at(setting.begin(), setting.end(), levels), end; at != end; ++at)
+        level = std::stoi(at->str(1)); // the last one holds
+    EXPECT_EQ(qz::tr::configured_level(setting, "_SEL", "API"), level);
+
+    const auto is_control = [](unsigned char byte, unsigned char next) {
+        return byte < 0x20 || byte == 0x7f || (byte == 0xc2 && next < 0xa0);
+    };
+    const char *const end = text.c_str() + text.size() + 1; // with a byte behind the last one
+    const bool has_controls = std::adjacent_find(text.c_str(), end, is_control) != end;
+    EXPECT_EQ(qz::tr::is_printable(text), fuzz::recoded("UTF-32LE", "UTF-8", text) && !has_controls);
     return 0;
 }

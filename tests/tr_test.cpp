@@ -15,8 +15,6 @@ namespace {
 using namespace std::string_literals;
 const std::vector<uint8_t> off = {0, 0, 0, 0}, on = {8, 0, 0, 255};
 
-extern "C" [[gnu::weak]] void __gcov_dump();
-
 struct Trace : testing::Test {
     ~Trace() override { std::filesystem::remove_all(folder); }
     void in_child(const auto &body) const {
@@ -24,10 +22,7 @@ struct Trace : testing::Test {
         setenv("QZ_TRACE_FILE", file.c_str(), 1);
         if (fork() == 0) {
             body();
-            const rlimit unlimited{RLIM_INFINITY, RLIM_INFINITY};
-            setrlimit(RLIMIT_FSIZE, &unlimited);
-            if (__gcov_dump != nullptr) __gcov_dump(); // which only exit does by itself
-            _exit(HasFailure());
+            std::exit(HasFailure());
         }
         int status = -1;
         EXPECT_TRUE(wait(&status) > 0 && status == 0) << status;
@@ -41,8 +36,7 @@ struct Trace : testing::Test {
         const std::regex head(R"(^."time":"\d{4}(-\d\d){2}T\d\d(:\d\d){2}\.\d{9}Z","pid":\d+,"tid":\d+,)");
         std::ifstream in(file);
         std::vector<std::string> all;
-        for (std::string line; std::getline(in, line);)
-            all.push_back(std::regex_replace(line, head, "{", std::regex_constants::format_first_only));
+        for (std::string line; std::getline(in, line);) all.push_back(std::regex_replace(line, head, "{"));
         return all;
     }
     const tr_category_t table[4] = {{0, "On", 0}, {1, "Off", 0}, {2, nullptr, 0}, {3, "Max", 0}};
@@ -65,16 +59,31 @@ TEST_F(Trace, LinesAreExactFromRegisteringUntilTheFileIsLost) {
         EXPECT_EQ(level, off);
         EXPECT_EQ(tr_record_id_1("C", 1), TR_NOT_REGISTERED);
         EXPECT_EQ(enlist(), on);
-        const rlim_t almost_full = std::filesystem::file_size(file) + 9;
-        const rlimit limit{almost_full, RLIM_INFINITY};
-        ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &limit), 0);
+        rlimit limit{std::filesystem::file_size(file) + 9, RLIM_INFINITY};
+        EXPECT_EQ(setrlimit(RLIMIT_FSIZE, &limit), 0);
         EXPECT_EQ(tr_record_id_1("C", 2), TR_FILE_ERROR);
+        limit.rlim_cur = RLIM_INFINITY;
+        EXPECT_EQ(setrlimit(RLIMIT_FSIZE, &limit), 0);
         closefrom(3); // as a daemon does, whose next file then takes the number
-        ASSERT_EQ(dup2(open((file + "2").c_str(), O_WRONLY | O_CREAT, 0600), 3), 3);
+        EXPECT_EQ(dup2(open((file + "2").c_str(), O_WRONLY | O_CREAT, 0600), 3), 3);
         EXPECT_EQ(tr_record_id_1("C", 3), TR_NO_FILE);
         EXPECT_EQ(lseek(3, 0, SEEK_END), 0);
     });
-    in_child([&] { tr_record_id_1("C", enlist()[0]); }); // appends
+    const auto append = [&] {
+        tm parts{};
+        std::string line;
+        const time_t before = time(nullptr);
+        EXPECT_EQ(tr_record_id_1("C", 9), TR_OK);
+        std::ifstream(file) >> line >> line >> line >> line;
+        const std::string ids = std::to_string(getpid()) + ",\"tid\":" + std::to_string(gettid());
+        EXPECT_THAT(line, testing::HasSubstr(",\"pid\":" + ids + ","));
+        strptime(line.c_str(), "{\"time\":\"%Y-%m-%dT%H:%M:%S.", &parts);
+        EXPECT_TRUE(before <= timegm(&parts) && timegm(&parts) <= time(nullptr)) << line;
+    };
+    in_child([&] {
+        tr_record_id_1("C", enlist()[0]); // must not settle the ids of what its process forks
+        in_child([&] { std::thread(append).join(); });
+    });
     EXPECT_EQ(std::filesystem::status(file).permissions(), std::filesystem::perms{0600});
     const auto all = lines();
     EXPECT_EQ(all.at(0), R"({"component":"q\"\\","id":2147483647,"items":[]})");
@@ -85,27 +94,28 @@ TEST_F(Trace, LinesAreExactFromRegisteringUntilTheFileIsLost) {
 
 // From threads at once, around the size that needs no allocation and far beyond, while components fill the table.
 TEST_F(Trace, LinesAreWhole) {
+    const std::string ids[] = {"1", "10", "100"}; // so that lines of every length come
     std::vector<std::string> texts, wanted;
-    for (size_t size = 1250; size < 1000000; size = size < 1350 ? size + 1 : size * 100) texts.emplace_back(size, '3');
+    for (size_t size = 1250; size < 1000000; size = size < 1350 ? size + 1 : size * 100) {
+        texts.emplace_back(size, '3');
+        const std::string size_told = std::to_string(size + 1), hex(2 * size, '3');
+        for (const std::string &id : ids)
+            wanted.push_back(R"({"component":"C","id":)" + id + R"(,"items":[{"len":)" + size_told + R"(,"hex":")" +
+                             hex + R"(00","text":")" + texts.back() + "\"}]}");
+    }
     in_child([&] {
         enlist();
-        std::vector<std::thread> threads;
-        for (const int id : {1, 10, 100}) // so that lines of every length come
-            threads.emplace_back([&, id] {
+        std::vector<std::jthread> threads;
+        for (const std::string &id : ids)
+            threads.emplace_back([&] {
                 for (const std::string &text : texts)
-                    EXPECT_EQ(tr_record_data_1("C", id, 1, text.c_str(), text.size() + 1), TR_OK);
+                    EXPECT_EQ(tr_record_data_1("C", std::stoi(id), 1, text.c_str(), text.size() + 1), TR_OK);
             });
         for (int i = 1; i < TR_COMPONENT_LIMIT; ++i) enlist(std::to_string(i).c_str());
         EXPECT_EQ(enlist("one too many", TR_NO_MEMORY), off);
-        for (auto &thread : threads) thread.join();
-        for (const size_t size : {size_t{SIZE_MAX}, size_t{TR_LINE_LIMIT} / 2})
+        for (const size_t size : {SIZE_MAX / 2 + 1, size_t{TR_LINE_LIMIT} / 2})
             EXPECT_EQ(tr_record_data_1("C", 3, 1, "", size), TR_TOO_LARGE);
     });
-    for (const std::string &text : texts)
-        for (const char *id : {"1", "10", "100"})
-            wanted.push_back(R"({"component":"C","id":)"s + id + R"(,"items":[{"len":)" +
-                             std::to_string(text.size() + 1) + R"(,"hex":")" + std::string(2 * text.size(), '3') +
-                             R"(00","text":")" + text + "\"}]}");
     EXPECT_THAT(lines(), testing::UnorderedElementsAreArray(wanted));
 }
 
@@ -115,53 +125,33 @@ TEST_F(Trace, OnlyRegularFilesAreWrittenTo) {
     ASSERT_EQ(symlink("target", link.c_str()) | mkfifo(fifo.c_str(), 0600), 0);
     for (const std::string &name : {longest, longest + "t", link, fifo, folder, "/dev/null"s, ""s}) {
         const bool is_used = name.starts_with(longest);
-        const int name_code = name == longest ? TR_OK : is_used ? TR_TOO_LARGE : TR_NO_FILE;
+        const int code = is_used ? TR_OK : TR_NO_FILE;
         SCOPED_TRACE(file = name);
         in_child([&] {
             EXPECT_GE(open(fifo.c_str(), O_RDWR), 0); // a reader, without whom it could not be opened
             char text[TR_FILENAME_SIZE] = "as it was";
+            uint32_t size = 1;
             errno = 4711;
             EXPECT_EQ(enlist(), is_used ? on : off);
-            EXPECT_EQ(tr_record_id_1("C", 1), is_used ? TR_OK : TR_NO_FILE);
-            EXPECT_EQ(tr_get_filename_1(text), name_code);
+            EXPECT_EQ(tr_record_id_1("C", 1), code);
+            EXPECT_EQ(tr_get_filename_1(text), name == longest + "t" ? TR_TOO_LARGE : code);
             EXPECT_EQ(errno, 4711);
             EXPECT_EQ(text, name == longest ? name : "as it was");
-            uint32_t size = 1;
             EXPECT_EQ(truncate(file.c_str(), name == longest ? 100 : off_t{1} << 33) == 0, is_used);
-            EXPECT_EQ(tr_get_size_1(&size), is_used ? TR_OK : TR_NO_FILE);
+            EXPECT_EQ(tr_get_size_1(&size), code);
             EXPECT_EQ(size, name == longest ? 100 : is_used ? UINT32_MAX : 0);
         });
     }
 }
 
 TEST_F(Trace, BadParametersAreRefused) {
-    for (const std::string &name : {""s, "a\n"s, "\xFF"s, std::string(64, 'n')})
+    for (const std::string &name : {""s, "a\n"s, std::string(64, 'n')})
         EXPECT_EQ(enlist(name.c_str(), TR_BAD_PARAMETER), std::vector<uint8_t>(4, 9));
     const auto bad = [](auto... c) { EXPECT_THAT((std::vector{c...}), testing::Each(TR_BAD_PARAMETER)); };
     bad(tr_register_component_1(nullptr, level.data(), table, 1), tr_register_component_1("C", nullptr, table, 1),
         tr_register_component_1("C", level.data(), nullptr, 1), tr_register_component_1("C", level.data(), table, -1),
         tr_unregister_component_1(nullptr), tr_record_id_1(nullptr, 1), tr_record_data_1("C", 1, -1),
         tr_get_size_1(nullptr), tr_get_filename_1(nullptr));
-}
-
-TEST_F(Trace, TimeAndIdsAreTheMakers) {
-    const auto record_in_thread = [&] {
-        const time_t before = time(nullptr);
-        tr_record_id_1("C", 2);
-        std::ifstream in(file);
-        std::string line;
-        std::getline(std::getline(in, line), line);
-        const std::string ids = std::to_string(getpid()) + ",\"tid\":" + std::to_string(gettid());
-        EXPECT_THAT(line, testing::HasSubstr(",\"pid\":" + ids + ","));
-        tm parts{};
-        strptime(line.c_str(), "{\"time\":\"%Y-%m-%dT%H:%M:%S.", &parts);
-        EXPECT_TRUE(before <= timegm(&parts) && timegm(&parts) <= time(nullptr)) << line;
-    };
-    in_child([&] {
-        enlist();
-        tr_record_id_1("C", 1); // must not settle the ids of what its process forks
-        in_child([&] { std::thread(record_in_thread).join(); });
-    });
 }
 
 } // namespace
