@@ -113,7 +113,7 @@ void use_everywhere(const std::string &bytes, const std::string &name) {
     const bool is_sound = bears(sec__check_acl_buffer(&acl)) && bytes.starts_with("\x85\1\2");
     sec_aclelist_t list = {};
     const bool is_listed = bears(sec_list_acl(&acl, &list));
-    const std::vector<listed> all = taken(list);
+    const arguments all = taken(list);
     for (const int type : {4, 8, 16, 1, 2}) {
         for (const char *by : {static_cast<const char *>(nullptr), "Unix", "m"}) {
             bears(sec_list_acl_by_type(&acl, type & 31, by, &list));

@@ -49,14 +49,6 @@ line_facts parse_plainly(const std::string &text, std::size_t at, std::uint32_t 
     return is_cut ? "131" + line : facts + " " + std::to_string(mask);
 }
 
-line_facts facts_of(const sec_acle_t &acle) {
-    if (acle.type == 0) return "-";
-    line_facts facts(1, "?no?u???e???????g"[acle.type]);
-    for (const char *name : {acle.mechanism, static_cast<const char *>(acle.identity)})
-        facts += name == nullptr || *name == '\0' ? "" : " "s + name;
-    return facts + " " + std::to_string(acle.perm_mask);
-}
-
 // Compiles a text beside the model, which in the end is as the bytes are.
 model compile(const std::string &text, buffer &out) {
     const buffer copy(text_field(text));
@@ -77,7 +69,7 @@ model compile(const std::string &text, buffer &out) {
             EXPECT_EQ(result, code);
             EXPECT_EQ(recorded_error(), error_of(code, std::stoi(facts[0]), {facts.begin() + 1, facts.end()}));
         } else {
-            EXPECT_EQ(facts_of(acle), wanted);
+            EXPECT_EQ(acle.type == 0 ? "-" : text_of(acle), wanted);
         }
         EXPECT_EQ(line, number + 1);
         if (result == 1 && acle.type != 0) {

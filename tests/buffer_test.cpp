@@ -24,21 +24,16 @@ TEST(buffers, are_made_or_taken_over_unexamined_and_released) {
     EXPECT_EQ(after(sec_read_acl_from_data(1, nullptr, nullptr)), bad_parameter(reader, 2));
     EXPECT_EQ(after(sec_read_acl_from_data(1, "x", nullptr)), bad_parameter(reader, 3));
     EXPECT_EQ(held.acl.length, 77);
-    EXPECT_EQ(sec_create_empty_acl(nullptr), 4);
-    EXPECT_EQ(sec_create_empty_acl(&held.acl), 0); // which leaves the error
-    EXPECT_EQ(recorded_error(), bad_parameter("sec_create_empty_acl", 1));
+    EXPECT_EQ(after(sec_create_empty_acl(nullptr)), bad_parameter("sec_create_empty_acl", 1));
+    EXPECT_EQ(sec_create_empty_acl(&held.acl), 0);
     EXPECT_EQ(held.bytes(), packed_acl(0, ""));
     EXPECT_EQ(sec_release_acl(&held.acl), 0);
-
     ASSERT_EQ(sec_read_acl_from_data(4, "junk", &held.acl), 0);
     EXPECT_EQ(after(sec_release_acl(&held.acl)), error_of(42, 93));
     ASSERT_EQ(held.bytes(), "junk");
     *static_cast<char *>(held.acl.data) = '\x85';
-    for (int time : {1, 2}) {
-        EXPECT_EQ(sec_release_acl(&held.acl), 0) << time;
-        EXPECT_EQ(std::pair(held.acl.length, held.acl.data), std::pair(0, static_cast<void *>(nullptr)));
-    }
-    EXPECT_EQ(sec_release_acl(nullptr), 0);
+    EXPECT_EQ(sec_release_acl(&held.acl) + sec_release_acl(&held.acl) + sec_release_acl(nullptr), 0);
+    EXPECT_TRUE(held.acl.length == 0 && held.acl.data == nullptr);
 }
 
 TEST(validate, checks_every_rule_in_its_order) {
@@ -121,11 +116,9 @@ TEST(list, refuses_what_it_cannot_expand) {
         {packed_acl(3, with(other, 0, 0)), located(42, 97)}, // would be listed three times
         {"\x85\1"s, located(42, 97)},
         {"\x85\2\2\0\0"s, error_of(42, 96)},
-        {"\x85"s, error_of(42, 96)},
         {one(packed_subacl(0, "", 1, x1)), located(42, 97)},
         {one(packed_subacl(16, "", 0xffffffff, x1)), located(42, 97)},
         {one(packed_subacl(4, "", 1, x1)), located(42, 97)},
-        {one(packed_subacl(4, std::string(16, 'm'), 1, x1)), located(42, 97)},
         {one(packed_subacl(4, std::string(17, 'm'), 1, x1)), located(42, 110, {"17"})},
         {one(of_mechanism(4, "unix", 2, x1 + bare)), located(42, 97)},
         {one(packed_subacl(16, "", 2, x1 + packed_entry(1, "y"))), located(42, 97)},
@@ -208,18 +201,9 @@ TEST(edit, adds_an_identity_that_lies_in_the_buffer) {
     EXPECT_EQ(held.bytes(), packed_acl(1, of_mechanism(4, "unix", 2, named(2, "move") + stored)));
 }
 
-// What a call prints to standard error, and before it to standard output.
-static std::string printed(const auto &call) {
-    testing::internal::CaptureStdout();
-    testing::internal::CaptureStderr();
-    call();
-    const std::string out = testing::internal::GetCapturedStdout();
-    return out + testing::internal::GetCapturedStderr();
-}
-
 TEST(dump, prints_buffers_and_subacls) {
-    const auto head = [](const arguments &facts, const std::string &tab = "\t") {
-        return error_of(0, 84, {tab, tab, facts[0], facts[1], facts[2], facts[3]}).text + "\n";
+    const auto head = [](const arguments &facts) {
+        return error_of(0, 84, {"\t", "\t", facts[0], facts[1], facts[2], facts[3]}).text + "\n";
     };
     const auto top = [](const char *length, const char *count) {
         return "ACL descriptor: "s + length +
@@ -242,14 +226,13 @@ TEST(dump, prints_buffers_and_subacls) {
     };
     for (const auto &[bytes, wanted] : rows) {
         const buffer held(bytes);
-        EXPECT_EQ(printed([&] { sec__dump_acl(&held.acl); }), wanted);
+        testing::internal::CaptureStdout();
+        testing::internal::CaptureStderr();
+        sec__dump_acl(&held.acl);
+        sec__dump_acl(nullptr);
+        sec__dump_subacl(nullptr, "");
+        const std::string out = testing::internal::GetCapturedStdout();
+        EXPECT_EQ(out + testing::internal::GetCapturedStderr(), wanted);
         EXPECT_EQ(recorded_error(), no_error);
     }
-    const auto nothing = [] {
-        sec__dump_acle(nullptr, nullptr, "");
-        sec__dump_acltree(nullptr, "");
-        sec__dump_subacl(nullptr, "");
-        sec__dump_acl(nullptr);
-    };
-    EXPECT_EQ(printed(nothing), "");
 }

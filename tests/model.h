@@ -53,13 +53,14 @@ struct model {
         return std::ranges::find_if(subacls,
                                     [&](const auto &of) { return of.type == type && same(of.mechanism, mechanism); });
     }
-    std::vector<listed> entries(int type, const char *mechanism) const {
-        std::vector<listed> all;
+    arguments entries(int type, const char *mechanism) const {
+        arguments all;
         for (const model_subacl &each : subacls) {
             const bool by_mechanism = has_mechanism(type) && mechanism != nullptr;
             if (type != 0 && (each.type != type || (by_mechanism && !same(each.mechanism, mechanism)))) continue;
             for (const auto &[identity, mask] : each.expanded())
-                all.push_back({each.type, each.mechanism, each.type < 4 ? "<none>" : identity, mask});
+                all.push_back(
+                    text_of(entry(each.type, each.mechanism, each.type < 4 ? nullptr : identity.c_str(), mask)));
             if (type != 0 && (by_mechanism || !has_mechanism(type))) break; // the first of the key
         }
         return all;
@@ -91,7 +92,7 @@ struct model {
 };
 
 // What listing a buffer gives, of one type and mechanism or (type 0) all of it.
-inline std::vector<listed> list_of(const sec_acl_buffer_t &acl, int type = 0, const char *mechanism = nullptr) {
+inline arguments list_of(const sec_acl_buffer_t &acl, int type = 0, const char *mechanism = nullptr) {
     sec_aclelist_t list = {};
     EXPECT_EQ(type == 0 ? sec_list_acl(&acl, &list) : sec_list_acl_by_type(&acl, type & 31, mechanism, &list), 0);
     return taken(list);

@@ -140,22 +140,17 @@ struct buffer {
     sec_acl_buffer_t acl = {};
 };
 
-struct listed {
-    int type;
-    std::string mechanism;
-    std::string identity; // "<none>" where there is none
-    std::uint32_t mask;
-    bool operator==(const listed &) const = default;
-};
+// An entry as a text: the letter of its type, its mechanism and identity where it has them, and its mask.
+inline std::string text_of(const sec_acle_t &acle) {
+    const std::string mechanism = acle.mechanism[0] == '\0' ? "" : " "s + acle.mechanism;
+    return "?no?u???e???????g"[acle.type] + mechanism + (acle.identity == nullptr ? "" : " "s + acle.identity) + " " +
+           std::to_string(acle.perm_mask);
+}
 
 // The entries of a list, which is released.
-inline std::vector<listed> taken(sec_aclelist_t &list) {
-    std::vector<listed> entries;
-    for (std::int32_t at = 0; at < list.count; ++at) {
-        const sec_acle_t &acle = *list.acles[at];
-        entries.push_back(
-            {acle.type, acle.mechanism, acle.identity == nullptr ? "<none>" : acle.identity, acle.perm_mask});
-    }
+inline arguments taken(sec_aclelist_t &list) {
+    arguments entries;
+    for (std::int32_t at = 0; at < list.count; ++at) entries.push_back(text_of(*list.acles[at]));
     sec_release_aclelist(&list);
     return entries;
 }
