@@ -119,7 +119,7 @@ failure path_of(const std::string &name, const char *user = nullptr) {
 
 TEST(file_name, stands_as_it_is_or_behind_the_working_directory) {
     const temporary_folder folder;
-    const std::string gone = folder / "gone", x4094(4094, 'x'), x4095(4095, 'x');
+    const std::string x4094(4094, 'x'), x4095(4095, 'x');
     const std::tuple<std::string, std::string, failure> rows[] = {
         {"/", "acl", {0, 0, "/acl"}},
         {folder.path, "/etc//./acl", {0, 0, "/etc//./acl"}},
@@ -128,13 +128,9 @@ TEST(file_name, stands_as_it_is_or_behind_the_working_directory) {
         {"/", "//" + x4095, error_of(105, 154, {"//" + x4095, std::to_string(ENAMETOOLONG)})},
         {"/", x4094, {0, 0, "/" + x4094}},
         {"/", x4095, error_of(105, 153, {"/", x4095})}, // the separator counts although none is added
-        {gone, "acl", error_of(105, 152, {"getcwd()", std::to_string(ENOENT)})},
-        {gone, "/acl", {0, 0, "/acl"}},
     };
     for (const auto &[directory, name, path] : rows) {
-        mkdir(gone.c_str(), 0700);
-        ASSERT_EQ(chdir(directory.c_str()), 0);
-        rmdir(gone.c_str());
+        fs::current_path(directory);
         EXPECT_EQ(path_of(name), path);
     }
 }
