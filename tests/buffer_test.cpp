@@ -224,15 +224,25 @@ TEST(dump, prints_buffers_and_subacls) {
         {packed_acl(2, packed_subacl(2, "", 2, bare + bare) + packed_subacl(2, "", 1, packed_entry(7, ""))),
          error_of(42, 98).text + top("46", "2") + head({"24", "2", "", "2"}) + any},
     };
-    for (const auto &[bytes, wanted] : rows) {
-        const buffer held(bytes);
+    const auto printed = [](const auto &call) {
         testing::internal::CaptureStdout();
         testing::internal::CaptureStderr();
-        sec__dump_acl(&held.acl);
-        sec__dump_acl(nullptr);
-        sec__dump_subacl(nullptr, "");
+        call();
         const std::string out = testing::internal::GetCapturedStdout();
-        EXPECT_EQ(out + testing::internal::GetCapturedStderr(), wanted);
+        return out + testing::internal::GetCapturedStderr();
+    };
+    for (const auto &[bytes, wanted] : rows) {
+        const buffer held(bytes);
+        EXPECT_EQ(printed([&] { sec__dump_acl(&held.acl); }), wanted);
         EXPECT_EQ(recorded_error(), no_error);
     }
+    const auto parts = [] {
+        sec__dump_acl(nullptr);
+        sec__dump_subacl(nullptr, "");
+        sec__dump_acltree(nullptr, "");
+        sec__dump_acle(nullptr, nullptr, "");
+        sec__dump_subacl(example.data() + 5, nullptr);
+    };
+    const std::string heading = error_of(0, 84, {"", "", "26", "4", "abcd", "1"}).text;
+    EXPECT_EQ(printed(parts), heading + "\n\ttype = u; mech = abcd; id = xyz; permission = rw\n");
 }

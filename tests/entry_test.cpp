@@ -102,6 +102,19 @@ std::string shown_for(const sec_acle_t &acle) {
     return error == no_error ? texts[0] + "/"s + texts[1] : texts[0] == texts[1] ? PrintToString(error) : "a text";
 }
 
+TEST(entries, are_shown_when_they_are_whole) {
+    const sec_acle_t good = entry(4, "kdz", "x", 1);
+    char *text = nullptr;
+    const std::string of = "sec_display_acle_id";
+    EXPECT_EQ(after(sec_display_acle_id(nullptr, nullptr, nullptr)), bad_parameter(of, 1));
+    EXPECT_EQ(after(sec_display_acle_id(&good, nullptr, &text)), bad_parameter(of, 2));
+    EXPECT_EQ(after(sec_display_acle_id(&good, &text, nullptr)), bad_parameter(of, 3));
+    EXPECT_EQ(shown_for(entry(3, "kdz", "x", 1)), PrintToString(error_of(43, 94, {"3"})));
+    for (const sec_acle_t &part : {entry(4, "", "x", 1), entry(8, "kdz", "", 1), entry(16, "kdz", nullptr, 1)})
+        EXPECT_EQ(shown_for(part), PrintToString(error_of(43, 95)));
+    sec_release_aclelist(nullptr);
+}
+
 // A process opens its converters once, so that each row has one of its own. These run before the other tests.
 TEST(entries_DeathTest, are_converted_between_the_code_set_and_utf8) {
     const std::string failed = PrintToString(error_of(26, 130)), no_set = PrintToString(error_of(26, 129));
@@ -122,7 +135,7 @@ TEST(entries_DeathTest, are_converted_between_the_code_set_and_utf8) {
             std::setlocale(LC_ALL, locale);
             EXPECT_EQ(made_of(4, mechanism, identity), made.empty() ? refused(3, shown(mechanism)) : made);
             EXPECT_EQ(shown_for(entry(4, mechanism, identity, 0)), display);
-            std::_Exit(HasFailure());
+            std::exit(HasFailure());
         }
         int status = -1;
         EXPECT_TRUE(wait(&status) > 0 && status == 0) << mechanism << " in " << locale;

@@ -52,7 +52,7 @@ TEST(evaluate, decides_by_exactly_one_entry) {
     const std::tuple<std::string, std::uint8_t, const char *, const char *, const char *, decision> rows[] = {
         {acl, 0x82, "unused", "unused", "unused", granted(256)},
         {acl, 0xe1, "shown", "unused", "unused", denied(225, "shown", "")},
-        {one(packed_subacl(1, "", 0, "")), 1, "m", nullptr, "i", denied(1, "m", "")},
+        {one(packed_subacl(1, "", 0, "")), 1, nullptr, nullptr, "i", denied(1, "", "")},
         {one(packed_subacl(1, "", 2, "")), 1, "m", nullptr, "i", {0, located(42, 109)}},
         {one(packed_subacl(1, "", 1, "")), 1, "m", nullptr, "i", {0, located(42, 97)}},
         {acl, 4, "none", "unix", "BOB", granted(2)},
@@ -72,6 +72,9 @@ TEST(evaluate, decides_by_exactly_one_entry) {
         EXPECT_EQ(single(bytes, type, mechanism, identity, stored_as), answer) << "type " << type;
     // Groups that are none, and none at all.
     EXPECT_EQ(groups(rich, std::vector<const char *>(65, nullptr)), denied(16, "", ""));
+    std::vector<const char *> many(200, "none");
+    many[150] = "Staff";
+    EXPECT_EQ(groups(rich, many), granted(0x12));
     EXPECT_EQ(groups(example, {"staff"}), denied(16, "", ""));
     EXPECT_EQ(groups(rich, {}), granted(0));
 }
@@ -87,8 +90,10 @@ TEST(evaluate, refuses_bytes_that_are_no_acl_of_this_host) {
         EXPECT_EQ(groups(bytes, {}), refused(error));
     }
     const buffer acl(rich);
+    const sec_acl_buffer_t negative = {-1, acl.acl.data};
     const sec_group_ref_t group = {1, "staff"};
     std::uint32_t mask = untouched;
+    EXPECT_EQ(after(sec__group_acles_perm(&negative, 0, nullptr, &mask)), error_of(42, 96));
     const char *const of_single = "sec__single_acle_perm", *const of_groups = "sec__group_acles_perm";
     EXPECT_EQ(after(sec__single_acle_perm(nullptr, 99, "", "", "", nullptr)), bad_parameter(of_single, 1));
     EXPECT_EQ(after(sec__single_acle_perm(&acl.acl, 99, "", "", "", nullptr)), bad_parameter(of_single, 5));

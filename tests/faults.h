@@ -84,7 +84,7 @@ inline void *counted(void *made) {
 
 #define QZ_WRAPPED(result, name, parameters)                                                                           \
     result __real_##name parameters;                                                                                   \
-    result __wrap_##name parameters
+    [[gnu::used]] inline result __wrap_##name parameters
 // A call that fails with -1, and one that may also fall short of what was asked for.
 #define QZ_WRAPPED_CALL(name, parameters, arguments)                                                                   \
     QZ_WRAPPED(int, name, parameters) { return faults::next(#name) > 0 ? -1 : __real_##name arguments; }
@@ -123,7 +123,7 @@ QZ_WRAPPED(int, open, (const char *path, int flags, mode_t mode)) {
     return faults::next("open") > 0 ? -1 : __real_open(path, flags, mode);
 }
 // What a fortified call without a mode becomes.
-int __wrap___open_2(const char *path, int flags) { return __wrap_open(path, flags, 0); }
+[[gnu::used]] inline int __wrap___open_2(const char *path, int flags) { return __wrap_open(path, flags, 0); }
 QZ_WRAPPED_CALL(fchown, (int fd, uid_t user, gid_t group), (fd, user, group))
 QZ_WRAPPED_CALL(fchmod, (int fd, mode_t mode), (fd, mode))
 QZ_WRAPPED_CALL(futimens, (int fd, const timespec *times), (fd, times))

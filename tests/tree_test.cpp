@@ -1,5 +1,6 @@
 // Trees of more entries than the fuzzers' texts have, through the fuzzer of texts; what names a tree; and its limit.
 #include "../fuzz/fuzz.h"
+#include "faults.h"
 #include "qzacl_acl/compile.h"
 #include "support.h"
 
@@ -22,22 +23,34 @@ TEST(tree, holds_what_a_text_says) {
     }
 }
 
-// The mechanism is spelled as in the entry that stands topmost in the binary search tree of the insertions.
+// The mechanism is spelled as in the entry that stands topmost in the binary search tree of the insertions, or in the
+// chain of expanded ones.
 TEST(tree, is_named_by_its_topmost_entry) {
-    sec_acltree_t *root = nullptr;
-    for (const auto &[mechanism, name] : {std::pair("Unix", "m"), {"uNix", "z"}, {"unIx", "c"}, {"uniX", "a"}}) {
-        const sec_acle_t acle = entry(4, mechanism, name, 1);
-        EXPECT_EQ(sec__add_acle_to_tree(1, &acle, &root), 0);
-    }
-    const qz::owned_acltree owner(root);
-    buffer refused;
-    EXPECT_EQ(sec__acltrees_to_acl(std::vector(65536, root), &refused.acl), 6);
-    EXPECT_EQ(refused.bytes(), "");
-    for (const auto &[spelled, next] : {std::pair("Unix", "m"), {"unIx", "c"}, {"uniX", "a"}, {"uNix", "z"}}) {
-        qz::loose_subacl out;
-        EXPECT_EQ(sec__acltree_to_subacl(root, out), 0);
-        EXPECT_EQ(std::memcmp(out.data.get() + 10, spelled, 5), 0) << spelled;
-        const sec_acle_t gone = entry(4, "unix", next, 1);
-        EXPECT_EQ(sec__del_acle_from_tree(&gone, root), 0);
+    const auto acle_of = [](int type, const char *name) {
+        std::string mechanism = "unix";
+        for (unsigned bit = 0; bit < 4; ++bit) mechanism[bit] ^= (*name >> bit & 1) == 0 ? 0 : 0x20;
+        return entry(type, mechanism, name, 1);
+    };
+    std::vector<std::tuple<int, std::string, std::string>> rows = {{4, "m f t c i p w", "m f c i t p w"}};
+    for (std::string chain = "d e f c b a g h"; !chain.empty();
+         chain.resize(std::max<std::size_t>(chain.size(), 2) - 2))
+        rows.emplace_back(8, chain, chain);
+    for (const auto &[type, inserted, topmost] : rows) {
+        sec_acltree_t *root = nullptr;
+        for (const std::string &name : words(inserted)) {
+            const sec_acle_t acle = acle_of(type, name.c_str());
+            EXPECT_EQ(faults::patiently([&] { return sec__add_acle_to_tree(1, &acle, &root); }), 0);
+        }
+        const qz::owned_acltree owner(root);
+        buffer refused;
+        EXPECT_EQ(sec__acltrees_to_acl(std::vector(65536, root), &refused.acl), 6);
+        EXPECT_EQ(refused.bytes(), "");
+        for (const std::string &name : words(topmost)) {
+            const sec_acle_t acle = acle_of(type, name.c_str());
+            qz::loose_subacl out;
+            EXPECT_EQ(sec__acltree_to_subacl(root, out), 0);
+            EXPECT_EQ(std::memcmp(out.data.get() + 10, acle.mechanism, 5), 0) << name;
+            EXPECT_EQ(sec__del_acle_from_tree(&acle, root), 0);
+        }
     }
 }
