@@ -89,6 +89,12 @@ class Trace(CommandCase):
                 subprocess.run(program, check=True, stdout=subprocess.DEVNULL, env=os.environ | self.traced(levels))
                 self.expect_records(expected)
 
+    def test_other_tests_pass_with_everything_traced(self):
+        """Whatever is handed to an operation, null pointers included, can be told."""
+        for name in "buffer", "entry", "evaluate", "read_acl":
+            subprocess.run([BUILD / f"tests/{name}_test"], check=True, stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL,
+                           env=os.environ | self.traced("API=8,Errors=8,Info=8,Perf=2"))
+
     def test_failures(self):
         def check(options, text, status, errors):
             self.write("a", text)
