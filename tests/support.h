@@ -66,11 +66,11 @@ inline std::string shown(const void *pointer) {
 }
 
 struct temporary_folder {
-    temporary_folder() = default;
+    temporary_folder() : path(mkdtemp((testing::TempDir() + "qzacl-test-" + std::string(6, 'X')).data())) {}
     temporary_folder(const temporary_folder &) = delete;
     ~temporary_folder() { std::filesystem::remove_all(path); }
     std::string operator/(const std::string &name) const { return path + "/" + name; }
-    const std::string path = mkdtemp((testing::TempDir() + "qzacl-test-" + std::string(6, 'X')).data());
+    const std::string path;
 };
 
 inline void write_file(const std::string &path, const std::string &bytes, int age = 0, unsigned mode = 0644) {
@@ -174,7 +174,6 @@ inline std::string folded(std::string text) {
     return text;
 }
 inline bool same(const std::string &a, const std::string &b) { return folded(a) == folded(b); }
-inline bool precedes(const std::string &a, const std::string &b) { return folded(a) < folded(b); }
 
 // The 31 bytes that the format is explained with.
 inline const std::string example = one(of_mechanism(4, "abcd", 1, named(3, "xyz")));
