@@ -14,7 +14,7 @@ TEST(tree, holds_what_a_text_says) {
         for (auto count = 1 + below(round % 20 == 7 ? 500 : 60); count != 0; --count) {
             // Of few letters, of all bytes, and behind a long prefix that they share.
             std::string name(round % 5 == 2 ? round % 60 : 0, 'z');
-            for (auto left = 1 + below(round % 5 == 1 ? 70 : 6); left != 0; --left)
+            for (auto left = 1 + below(round % 5 == 1 ? 150 : 6); left != 0; --left)
                 name += round % 5 == 1 ? static_cast<char>(33 + below(223)) : "aAbBzZ@[`{\x7f\x80\xff"[below(13)];
             const std::string mechanism = round % 3 == 1 ? std::to_string(below(500)) : "unix";
             text += std::array{"u " + mechanism, "e " + mechanism, "g"s}[below(3)] + " " + name + " rw\n";
