@@ -404,6 +404,17 @@ TEST_F(files, are_disturbed_between_any_two_steps) {
     std::cout << races << " races\n";
 }
 
+// What is edited while it is read must not be older than its cache.
+TEST_F(files, caches_are_as_old_as_what_they_are_made_from) {
+    fs::file_time_type read_at;
+    const auto wait = [&](std::size_t) {
+        if (faults::calls.back() == "read") read_at = fs::file_time_type::clock::now(), usleep(10000);
+        return 0;
+    };
+    EXPECT_EQ(watched(wait, [&] { return check(path); }).code, 0);
+    EXPECT_LE(fs::last_write_time(cache), read_at);
+}
+
 // When the disk is full and another file stands at the temporary name meanwhile, that is not removed.
 TEST_F(files, temporary_names_are_taken) {
     const auto take = [&](std::size_t) {
