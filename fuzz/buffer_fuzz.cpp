@@ -55,15 +55,19 @@ bool bears(int result) {
     return result == 0;
 }
 
+// The mask of a decision, which is 0 when it fails.
 std::uint32_t decided(const sec_acl_buffer_t &acl, int type, const char *by, const char *of, const std::string &name) {
     std::uint32_t mask = 0;
-    return bears(sec__single_acle_perm(&acl, static_cast<std::uint8_t>(type), by, of, name.c_str(), &mask)) ? mask : 0;
+    EXPECT_TRUE(bears(sec__single_acle_perm(&acl, static_cast<std::uint8_t>(type), by, of, name.c_str(), &mask)) ||
+                mask == 0);
+    return mask;
 }
 std::uint32_t decided(const sec_acl_buffer_t &acl, const std::vector<const char *> &names) {
     std::vector<sec_group_ref_t> groups;
     for (const char *name : names) groups.push_back({0, name});
     std::uint32_t mask = 0;
-    return bears(sec__group_acles_perm(&acl, static_cast<int>(groups.size()), groups.data(), &mask)) ? mask : 0;
+    EXPECT_TRUE(bears(sec__group_acles_perm(&acl, static_cast<int>(groups.size()), groups.data(), &mask)) || mask == 0);
+    return mask;
 }
 
 void expect_decisions(const sec_acl_buffer_t &acl, const model &held, const arguments &names) {

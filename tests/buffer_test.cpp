@@ -191,6 +191,21 @@ TEST(edit, holds_at_most_65534_bytes_of_identity_and_65535_subacls) {
     EXPECT_TRUE(held.bytes() == full.substr(0, full.size() - 25) + added);
 }
 
+// Nothing compares the last sub-ACL's length with where its entries end. An edit replaces the bytes that the
+// length names by all of the entries that it counts.
+TEST(edit, replaces_as_many_bytes_as_the_stored_length_says) {
+    const std::string a = named(1, "a"), c = named(3, "c"), stored = of_mechanism(4, "unix", 2, a + c) + "behind";
+    const std::string changed = of_mechanism(4, "unix", 3, a + named(2, "b") + c);
+    const sec_acle_t acle = entry(4, "unix", "b", 2);
+    for (std::size_t length = 0; length <= stored.size() + 2; ++length) {
+        const std::string last = number(length, 4) + stored.substr(4);
+        buffer held(packed_acl(2, other + last));
+        const bool is_inside = length <= stored.size();
+        EXPECT_EQ(after(sec_add_acle_to_acl(&acle, &held.acl)), is_inside ? no_error : located(42, 97)) << length;
+        EXPECT_EQ(held.bytes(), packed_acl(2, other + (is_inside ? changed + last.substr(length) : last)));
+    }
+}
+
 // A handler is shown identities where they stand, and may keep one to add it: the buffer moves while that is done.
 TEST(edit, adds_an_identity_that_lies_in_the_buffer) {
     const std::string stored = named(1, "of a long name that makes the buffer move");

@@ -85,6 +85,12 @@ class Catalog(CommandCase):
                 self.skipTest("the libraries are not where every user can reach them")
             self.assertEqual((done.stderr[:len(shown) + 4], os.path.exists(trace)), ("no: " + shown, owner == 0))
 
+    def test_source_is_the_table(self):
+        lines = SOURCE.replace("\\\n", "").splitlines()
+        for number, text in TEXTS.items():
+            escaped = text.replace("\\", "\\\\").replace("\n", "\\n").replace("\t", "\\t").replace('"', '\\"')
+            self.assertIn(f'{number} "{escaped}"', lines)
+
     def test_checker(self):
         broken = GERMAN
         for number, line, _ in BROKEN:

@@ -21,7 +21,7 @@ import unittest
 BUILD = pathlib.Path(sys.argv[1]).resolve()
 SANITIZED = "QZ_SANITIZE:STRING=\n" not in (BUILD / "CMakeCache.txt").read_text()
 IS_ROOT, NOBODY = os.geteuid() == 0, 65534
-ORDINARY = NOBODY if IS_ROOT else None  # whom root takes to be without its rights
+ORDINARY = NOBODY - 1 if IS_ROOT else None  # whom root takes to be without its rights
 # A copy of the command and its libraries that any user can reach, wherever the build folder lies.
 PLACE = tempfile.TemporaryDirectory()
 os.chmod(PLACE.name, 0o755)

@@ -74,6 +74,9 @@ TEST(evaluate, decides_by_exactly_one_entry) {
     };
     for (const auto &[bytes, type, mechanism, stored_as, identity, answer] : rows)
         EXPECT_EQ(single(bytes, type, mechanism, identity, stored_as), answer) << "type " << type;
+    const std::string cut_group = one(packed_subacl(16, "", 2, named(1, "a") + packed_entry(2, "m")));
+    EXPECT_EQ(groups(cut_group, {"a", "0"}), granted(1));
+    EXPECT_EQ(groups(cut_group, {"a", "m"}), decision(0, located(42, 97)));
     // Groups that are none, and none at all.
     EXPECT_EQ(groups(rich, std::vector<const char *>(65, nullptr)), denied(16, "", ""));
     std::vector<const char *> many(200, "none");

@@ -112,6 +112,8 @@ class Interface(unittest.TestCase):
             found = run("readelf", "-lWd", "--dyn-syms", BUILD / "lib" / name)
             for mark in marks[:count]:
                 self.assertRegex(found, mark, name)
+            if platform.machine() == "x86_64" and shutil.which("objdump"):
+                self.assertIn("endbr64", run("objdump", "-d", "--no-show-raw-insn", BUILD / "lib" / name))
         # What leaves no mark in a binary is read off the commands that made it.
         branches = "-fcf-protection=full " if platform.machine() == "x86_64" else ""
         flags = f"-fstack-clash-protection {branches}-ftrivial-auto-var-init=.*-D_FORTIFY_SOURCE=3"
