@@ -109,6 +109,7 @@ class Catalog(CommandCase):
             _, shown = run(["-c", "-f", str(TABLE.parents[2] / "examples/mistakes.acl")], self.root,
                            {**self.locale("de_DE." + code_set), "NLSPATH": places})
             self.assertIn("ist länger als die höchstens zuläss", shown.encode("latin-1").decode(code_set))
+            self.assertEqual(re.findall(r"(?m)^3417-\d+ (\w+):", shown), ["Fehler"] * 12)
 
 
 if __name__ == "__main__":

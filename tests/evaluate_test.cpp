@@ -70,6 +70,7 @@ TEST(evaluate, decides_by_exactly_one_entry) {
         {cut, 0x84, "exact", "unix", "m", {0, located(42, 97)}},
         {acl, 16, "unix", nullptr, "a", refused(error_of(4, 115, {"16"}))},
         {acl, 4, nullptr, "unix", "a", refused(error_of(4, 116))},
+        {acl, 8, "", "unix", "a", refused(error_of(4, 116))},
         {acl, 0x88, "unix", nullptr, "", refused(error_of(4, 117))},
     };
     for (const auto &[bytes, type, mechanism, stored_as, identity, answer] : rows)

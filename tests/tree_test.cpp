@@ -52,6 +52,7 @@ TEST(tree, is_named_by_its_topmost_entry) {
             EXPECT_EQ(sec__acltree_to_subacl(root, out), 0);
             EXPECT_EQ(std::memcmp(out.data.get() + 10, acle.mechanism, 5), 0) << name;
             EXPECT_EQ(sec__del_acle_from_tree(&acle, root), 0);
+            EXPECT_EQ(sec__del_acle_from_tree(&acle, root), 18);
         }
     }
 }
