@@ -226,6 +226,7 @@ TEST(dump, prints_buffers_and_subacls) {
     };
     const std::string any = head({"17", "2", "", "1"}) + "\t\ttype = o; permission = rwc\n";
     const std::pair<std::string, std::string> rows[] = {
+        {"", ""},
         {"\x84\1\2\0\0"s, "The ACL provided is not valid!\n\n"},
         {rich, top("182", "6") + head({"37", "16", "", "2"}) +
                    "\t\ttype = g; id = Admins; permission = rC\n\t\ttype = g; id = staff; permission = wC\n" +
