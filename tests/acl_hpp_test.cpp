@@ -4,7 +4,7 @@
 #include <qz/acl.hpp>
 
 static int allocations = 0;
-#ifndef QZ_SANITIZED
+#if !QZ_SANITIZED
 extern "C" void *__libc_malloc(size_t);
 extern "C" void *malloc(size_t size) noexcept { return ++allocations, __libc_malloc(size); }
 #endif

@@ -23,18 +23,15 @@ std::set<std::string> names_in(const std::string &path) {
     return names;
 }
 
-struct outcome { // of a read or a check: its code, message, and the buffer's bytes
-    int code = 0, message = 0;
-    std::string bytes = {}, text = {};
+struct outcome : failure { // of a read or a check, with the code that it gave and the buffer's bytes
+    std::string bytes = {};
     bool operator==(const outcome &) const = default;
-    friend std::ostream &operator<<(std::ostream &out, const outcome &of) {
-        return out << of.code << ':' << of.message << ", " << of.bytes.size() << " bytes";
-    }
 };
 
 outcome recorded(int code, const std::string &bytes = "") {
-    const failure error = recorded_error();
-    return {code, error.id, bytes, error.text};
+    outcome found{recorded_error(), bytes};
+    found.code = code;
+    return found;
 }
 outcome read_acl(const std::string &path, unsigned flags, const char *user = nullptr) {
     buffer held;
@@ -157,13 +154,12 @@ TEST_F(files, every_allocation_fails) {
             }
             EXPECT_EQ(now.code, 6);
             // What is printed needs memory, too: the command sets some aside, which does not help it here.
-            EXPECT_TRUE(now.message == 89 || printed.find("3417-102") != std::string::npos ||
-                        (and_on && now.message == 162))
+            EXPECT_TRUE(now.id == 89 || printed.find("3417-102") != std::string::npos || (and_on && now.id == 162))
                 << now.text;
             const auto is_named = [&](auto &name) { return now.text.find(name) != std::string::npos; };
             EXPECT_TRUE(row.name.find('_') == std::string::npos || std::ranges::any_of(words(row.name), is_named))
                 << now.text;
-            if (now.message == 89 && !and_on) {
+            if (now.id == 89 && !and_on) {
                 // A text is read with room for a NUL, and what is converted is told without the converter's room.
                 const auto tells = [&](std::size_t size) {
                     return std::regex_search(now.text, std::regex("\\b" + std::to_string(size) + " bytes"));
@@ -264,11 +260,11 @@ TEST_F(files, every_system_call_fails) {
                 SCOPED_TRACE(testing::Message() << calls[at] << " fails with " << fault);
                 const outcome now = run(at, fault);
                 const std::string told =
-                    now.code == 0 ? "ok " : std::to_string(now.code) + ":" + std::to_string(now.message) + " ";
+                    now.code == 0 ? "ok " : std::to_string(now.code) + ":" + std::to_string(now.id) + " ";
                 EXPECT_TRUE(result.empty() || result == told) << told;
                 result = told;
                 // These messages show the system's error, or that the file is another.
-                if (std::ranges::count(std::array{122, 124, 126, 139, 152, 154, 156}, now.message) != 0) {
+                if (std::ranges::count(std::array{122, 124, 126, 139, 152, 154, 156}, now.id) != 0) {
                     const int shown = is_second || calls[at] == "close" ? ENOSPC
                                       : calls[at] == "fstat"            ? ESTALE
                                                                         : std::max(fault, 0);
@@ -314,7 +310,7 @@ TEST_F(files, writers_are_killed_after_each_step) {
             EXPECT_EQ(read_acl(path, checked), from_text);
             EXPECT_LE(names_in(folder.path).size(), 3u);
             const bool is_blocked = stale.empty() && fs::exists(cache) && fs::file_size(cache) == 0;
-            EXPECT_EQ(watched({}, [&] { return check(path); }).message, !is_blocked ? 0 : is_root ? 136 : 137);
+            EXPECT_EQ(watched({}, [&] { return check(path); }).id, !is_blocked ? 0 : is_root ? 136 : 137);
             EXPECT_EQ(read_acl(path, checked), from_text);
             if (is_blocked) { // as an administrator would mend it
                 fs::remove(cache);
@@ -386,13 +382,11 @@ TEST_F(files, are_disturbed_between_any_two_steps) {
                                       [&] { return by_command ? check(path) : read_acl(path, checked | cached); });
         EXPECT_FALSE(fs::exists(folder / "nowhere"));
         // A temporary file gets another name then.
-        if (by_command && row.first.ends_with("is opened")) {
-            EXPECT_EQ(found.message, faults::opened == cache ? 138 : 0);
-        }
+        if (by_command && row.first.ends_with("is opened")) { EXPECT_EQ(found.id, faults::opened == cache ? 138 : 0); }
         // What is read is the text as it was, as it is now, or what somebody put in the place of the cache.
         const outcome now = read_acl(path, text_only);
         if (!by_command && row.first == "exchanged" && at < 4 && faults::calls.at(at) == "open") {
-            EXPECT_EQ(std::pair(found.code, found.message), std::pair(37, 124)); // not of that file
+            EXPECT_EQ(std::pair(found.code, found.id), std::pair(37, 124)); // not of that file
         }
         EXPECT_TRUE(by_command || found.code != 0 || found == from_text || found == now || found.bytes == rich)
             << found;
@@ -432,7 +426,7 @@ TEST_F(files, temporary_names_are_taken) {
         write_file(faults::opened, other_text);
         return ENOSPC;
     };
-    EXPECT_EQ(watched(take, [&] { return check(path); }).message, 139);
+    EXPECT_EQ(watched(take, [&] { return check(path); }).id, 139);
     EXPECT_EQ(read_file(faults::opened), other_text);
 }
 

@@ -1,9 +1,7 @@
 // Every public operation, as a service that uses all of the library would call it: once, so that trace_test can
 // read what that leaves, and from many threads at once.
 #include "support.h"
-#include <fcntl.h>
 #include <thread>
-#include <unistd.h>
 
 namespace {
 
