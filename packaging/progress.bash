@@ -1,0 +1,25 @@
+# Sourced by dev and packaging/build: runs what nobody wants to read about, and shows on a terminal how far it is.
+
+# shown_before: stands before each line that is shown, and says what is being done.
+
+# logged LOG COMMAND...: what it prints goes to the log and, as long as it is the latest line, to a terminal.
+logged() {
+    local log=$1
+    shift
+    if [[ -t 2 && ${TERM:-dumb} != dumb ]]; then
+        "$@" 2>&1 </dev/null | tee -- "$log" | show_latest
+    else
+        "$@" >"$log" 2>&1 </dev/null
+    fi
+}
+
+show_latest() {
+    local line width
+    width=$(stty size <&2 | cut -d' ' -f2)
+    ((width > 1)) || width=80
+    while IFS= read -r line; do
+        line=${shown_before-}$line
+        printf '\r\033[K%s' "${line:0:width-1}" >&2
+    done
+    printf '\r\033[K' >&2
+}
