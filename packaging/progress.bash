@@ -6,13 +6,16 @@
 logged() {
     local log=$1
     shift
-    if [[ -t 2 && ${TERM:-dumb} != dumb ]]; then
+    if is_shown; then
         "$@" 2>&1 </dev/null | tee -- "$log" | show_latest
     else
         "$@" >"$log" 2>&1 </dev/null
     fi
 }
 
+is_shown() { [[ -t 2 && ${TERM:-dumb} != dumb ]]; }
+
+# Shows each line of standard input in the place of the one before.
 show_latest() {
     local line width
     width=$(stty size <&2 | cut -d' ' -f2)

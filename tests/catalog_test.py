@@ -105,8 +105,10 @@ class Catalog(CommandCase):
 
     def test_german(self):
         for code_set in ("UTF-8", "ISO-8859-1"):
-            places = ":".join(f"{BUILD}/share/locale/%{part}/LC_MESSAGES/%N" for part in "Ll")  # as under /usr
-            _, shown = run(["-c", "-f", str(TABLE.parents[2] / "examples/mistakes.acl")], self.root,
+            catalogs = str(BUILD / "share/locale").replace("%", "%%")
+            places = ":".join(f"{catalogs}/%{part}/LC_MESSAGES/%N" for part in "Ll")  # as under /usr
+            shutil.copy(TABLE.parents[2] / "examples/mistakes.acl", self.dir)
+            _, shown = run(["-c", "-f", "mistakes.acl"], self.dir,
                            {**self.locale("de_DE." + code_set), "NLSPATH": places})
             self.assertIn("ist länger als die höchstens zuläss", shown.encode("latin-1").decode(code_set))
             self.assertEqual(re.findall(r"(?m)^3417-\d+ (\w+):", shown), ["Fehler"] * 12)

@@ -27,6 +27,7 @@ PLACE = tempfile.TemporaryDirectory()
 os.chmod(PLACE.name, 0o755)
 for part in ("bin", "lib"):
     shutil.copytree(BUILD / part, f"{PLACE.name}/{part}", symlinks=True)
+subprocess.run(["chmod", "-R", "a+rX", PLACE.name], check=True)  # as the mask of who built may not allow
 COMMAND = PLACE.name + "/bin/qzaclfck"
 # The texts of the message table by id; all text here is Latin-1, so that every byte survives.
 TABLE = pathlib.Path(__file__).resolve().parent.parent / "security" / "msg" / "qzseclib_msg.h"

@@ -156,6 +156,9 @@ class Interface(unittest.TestCase):
             answer = run(folder / program, folder / "service.acl", "carol@there", env={"LD_LIBRARY_PATH": libraries})
             self.assertIn("any other: rql", answer)
         self.assertIn("Syntax:", run(prefix / "bin/qzaclfck", "-h", env={}))
+        for document in prefix.rglob("*.md"):
+            for target in re.findall(r"\]\(([^):]*)\)", document.read_text()):
+                self.assertTrue((document.parent / target).exists(), (document, target))
 
     @unittest.skipIf(SANITIZED or CACHE["CMAKE_INSTALL_LIBDIR"] != "lib" or not shutil.which("pkg-config"),
                      "needs pkg-config, and a plain build that is no packager's")

@@ -53,9 +53,11 @@ public:
     /*
      * The value; moved out of a result that is about to go, so that a range-for over "*acl.list()" is sound.
      */
-    [[nodiscard]] T &operator*() &noexcept { return value_; }
-    [[nodiscard]] const T &operator*() const &noexcept { return value_; }
-    [[nodiscard]] T operator*() &&noexcept { return std::move(value_); }
+    // clang-format off: its versions disagree on the blank behind "&".
+    [[nodiscard]] T &operator*() & noexcept { return value_; }
+    [[nodiscard]] const T &operator*() const & noexcept { return value_; }
+    [[nodiscard]] T operator*() && noexcept { return std::move(value_); }
+    // clang-format on
     [[nodiscard]] T *operator->() noexcept { return &value_; }
     [[nodiscard]] const T *operator->() const noexcept { return &value_; }
 
