@@ -53,11 +53,12 @@ public:
     /*
      * The value; moved out of a result that is about to go, so that a range-for over "*acl.list()" is sound.
      */
-    // clang-format off: its versions disagree on the blank behind "&".
+    /* Laid out by hand, because versions of clang-format disagree on the blank behind "&". */
+    /* clang-format off */
     [[nodiscard]] T &operator*() & noexcept { return value_; }
     [[nodiscard]] const T &operator*() const & noexcept { return value_; }
     [[nodiscard]] T operator*() && noexcept { return std::move(value_); }
-    // clang-format on
+    /* clang-format on */
     [[nodiscard]] T *operator->() noexcept { return &value_; }
     [[nodiscard]] const T *operator->() const noexcept { return &value_; }
 
