@@ -18,7 +18,7 @@ inline bool has_mechanism(int type) { return type == 4 || type == 8; }
 struct model_subacl {
     int type;
     std::string mechanism;
-    items stored;
+    items stored = {};
     unsigned flaw = 0; // 1: a version nobody looks at; bytes behind 2: the mechanism, 3: the identities
 
     // Of equal ones the first spelling and the last mask; all but user-expanded ones are put in order.

@@ -26,7 +26,7 @@ using arguments = std::vector<std::string>;
 
 struct failure {
     int code = 0, id = 0;
-    std::string text;
+    std::string text = {};
     bool operator==(const failure &) const = default;
     friend std::ostream &operator<<(std::ostream &out, const failure &error) {
         return out << "code " << error.code << ", message " << error.id << ": " << error.text;
