@@ -106,7 +106,7 @@ class Trace(CommandCase):
         """A mechanism that fills its array is told without what stands behind it."""
         replaced = [record["items"][1] for record in self.records_of("tree:*leaves_up", "Info=1")]
         self.assertEqual([(item["len"], bytes.fromhex(item["hex"])) for item in replaced],
-                         [(17, b"sixteen-bytes-xxx")] * len(replaced))
+                         [(17, b"sixteen-bytes-xxx")] * 3)
 
     def test_entries_that_nobody_gets(self):
         """They are not told to be released."""
