@@ -38,11 +38,12 @@ model untidy(std::string_view &from) {
 // Bytes that nothing counts, and a last length that may take some of them or leave some of its own.
 void hide(model &made, std::string_view &from) {
     made.behind = model_subacl{2, "", {{"", ~0u}}}.bytes().substr(one_of("0123456789abcdefgh", from));
-    if (made.subacls.empty()) return;
+    const std::size_t left = one_of("=abcdefghijklmnopqrstuvwxyz", from);
+    if (made.subacls.empty() || left == 0) return;
     model_subacl &last = made.subacls.back();
-    const std::size_t taken = one_of("=abcdefghijklmnopqrstuvwxyz", from);
-    const std::size_t room = last.bytes().size() + made.behind.size();
-    last.excess = taken == 0 ? 0 : static_cast<int>(room - std::min(room, taken - 1) - last.bytes().size());
+    const std::size_t size = last.bytes().size(), whole = size + made.behind.size();
+    const std::size_t length = whole - std::min<std::size_t>(whole, left - 1);
+    if (length != size) last.wrong_length = length;
 }
 
 void expect_edit(edit_function edit, const sec_acle_t &acle, buffer &held, model &wanted) {

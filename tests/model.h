@@ -4,6 +4,7 @@
 #define QZ_TESTS_MODEL_H
 #include "support.h"
 #include <map>
+#include <optional>
 
 namespace support {
 
@@ -20,7 +21,7 @@ struct model_subacl {
     std::string mechanism;
     items stored = {};
     unsigned flaw = 0; // 1: a version nobody looks at; bytes behind 2: the mechanism, 3: the identities
-    int excess = 0;    // of the stored length over the true one
+    std::optional<std::size_t> wrong_length = {};
 
     // Of equal ones the first spelling and the last mask; all but user-expanded ones are put in order.
     items expanded() const {
@@ -40,7 +41,7 @@ struct model_subacl {
         if (flaw == 1 && !entries.empty()) entries[0] = 7;
         const std::string field = flaw == 2 ? (text_field(mechanism) + "m").substr(0, 17) : text_field(mechanism);
         const std::string sound = packed_subacl(type, has_mechanism(type) ? field : "", stored.size(), entries);
-        return number(sound.size() + excess, 4) + sound.substr(4);
+        return number(wrong_length.value_or(sound.size()), 4) + sound.substr(4);
     }
 };
 
@@ -84,12 +85,11 @@ struct model {
                                             : error_of(43, acle.type < 4 ? 160 : 161, {letter, identity});
         if (at == subacls.end()) {
             // A walk that follows the lengths must find it behind the entries of the last one.
-            if (!subacls.empty() && subacls.back().excess != 0) return located(42, 97);
+            if (!subacls.empty() && subacls.back().wrong_length) return located(42, 97);
             at = subacls.insert(at, {acle.type, ""});
-        } else if (at->excess != 0) {
+        } else if (at->wrong_length) {
             // What the length names goes, and what it does not stays out of force.
-            const std::string rest = at->bytes() + behind;
-            behind = rest.substr(rest.size() - behind.size() + at->excess);
+            behind = (at->bytes() + behind).substr(*at->wrong_length);
         }
         const std::string spelled = held.empty() ? mechanism : at->mechanism;
         if (deletes)
