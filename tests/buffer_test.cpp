@@ -141,6 +141,9 @@ TEST(list, refuses_what_it_cannot_expand) {
         EXPECT_EQ(after(sec_list_acl_by_type(&no_length, 4, bad, nullptr)), bad_parameter(of, 3, shown(bad)));
     EXPECT_EQ(after(sec_list_acl_by_type(&no_length, 16, "", nullptr)), bad_parameter(of, 4));
     EXPECT_EQ(after(sec_list_acl_by_type(&no_length, 1, "", &list)), error_of(42, 96));
+    const buffer cut("\x85\1\2\0"s);
+    for (const char *mechanism : {static_cast<const char *>(nullptr), "unix"})
+        EXPECT_EQ(after(sec_list_acl_by_type(&cut.acl, 4, mechanism, &list)), located(42, 97));
 }
 
 TEST(edit, reports_what_it_refuses_and_leaves_the_buffer_alone) {
@@ -203,6 +206,31 @@ TEST(edit, replaces_as_many_bytes_as_the_stored_length_says) {
         const bool is_inside = length <= stored.size();
         EXPECT_EQ(after(sec_add_acle_to_acl(&acle, &held.acl)), is_inside ? no_error : located(42, 97)) << length;
         EXPECT_EQ(held.bytes(), packed_acl(2, other + (is_inside ? changed + last.substr(length) : last)));
+    }
+}
+
+// Bytes behind the last counted sub-ACL are out of force, and stay so.
+TEST(edit, adds_a_sub_acl_where_the_counted_ones_end) {
+    const std::string everything = packed_subacl(2, "", 1, packed_entry(~0u, ""));
+    const std::string stored = of_mechanism(8, "krb5", 2, named(1, "a") + named(2, "b"));
+    const std::string added = of_mechanism(4, "unix", 1, named(3, "al"));
+    const sec_acle_t acle = entry(4, "unix", "al", 3);
+    buffer none_counted(packed_acl(0, everything));
+    EXPECT_EQ(after(sec_add_acle_to_acl(&acle, &none_counted.acl)), no_error);
+    EXPECT_EQ(none_counted.bytes(), packed_acl(1, added + everything));
+    // Where the last one ends must be sure.
+    for (std::size_t length = 0; length <= stored.size() + everything.size(); ++length) {
+        const std::string last = number(length, 4) + stored.substr(4);
+        buffer held(packed_acl(2, other + last + everything));
+        const bool is_sure = length == stored.size();
+        EXPECT_EQ(after(sec_add_acle_to_acl(&acle, &held.acl)), is_sure ? no_error : located(42, 97)) << length;
+        EXPECT_EQ(held.bytes(), is_sure ? packed_acl(3, other + last + added + everything)
+                                        : packed_acl(2, other + last + everything));
+    }
+    for (const std::string &bytes : {packed_acl(2, other), one(of_mechanism(8, "krb5", 3, named(1, "a")))}) {
+        buffer cut(bytes);
+        EXPECT_EQ(after(sec_add_acle_to_acl(&acle, &cut.acl)), located(42, 97));
+        EXPECT_EQ(cut.bytes(), bytes);
     }
 }
 

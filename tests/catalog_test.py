@@ -57,6 +57,8 @@ class Catalog(CommandCase):
             self.shows(*shown)
         self.compile('$set 1\n$quote "\n148 "Welche Datei?"\n654 "?"\n')  # a part of the texts, and one that is none
         self.shows([], 4, "Welche Datei?\n" + message(80))
+        self.compile('$set 1\n$quote "\n148 ""\n')  # which tells nobody anything
+        self.shows([], 4, message(148) + message(80))
         for text in ("nothing", "%1$d %2$s", "%1$s %2$d %n"):  # which are not the conversions of the text
             self.compile(changed(SOURCE, 154, f'154 "{text}"'))
             self.shows_defaults()

@@ -99,6 +99,7 @@ class Interface(unittest.TestCase):
         for library, header in HEADERS.items():
             dynamic = run("readelf", "-dW", BUILD / f"lib/{library}.so")
             self.assertEqual(re.findall(r"\(SONAME\).*\[(.*)\]", dynamic), [f"{library}.so.1"])
+            self.assertRegex(dynamic, "FLAGS_1.*NODELETE")  # ends of threads, and forks, call into it
             foreign = re.findall(r"\(NEEDED\).*\[((?!libqz|libc\.so\.|ld-linux).*)\]", dynamic)
             self.assertTrue(SANITIZED or not foreign, f"{library} needs {foreign}")
             symbols = run("nm", "-D", "--defined-only", BUILD / f"lib/{library}.so")

@@ -21,6 +21,13 @@ int descriptor = -1;
 dev_t device;
 ino_t inode;
 
+// A file that was there already may have been made by somebody who waits to read it or write into it, or be a second
+// name of a file that is not meant. A POSIX ACL shows in the bits of the group. One just made passes.
+bool is_of_caller_alone(const struct stat &status) {
+    return S_ISREG(status.st_mode) && status.st_uid == geteuid() && status.st_nlink == 1 &&
+           (status.st_mode & (S_IWGRP | S_IWOTH)) == 0;
+}
+
 void open_file() {
     const char *file = environment().file;
     if (file == nullptr)
@@ -37,7 +44,7 @@ void open_file() {
     if (opened < 0)
         return;
     struct stat status;
-    if (fstat(opened, &status) != 0 || !S_ISREG(status.st_mode)) {
+    if (fstat(opened, &status) != 0 || !is_of_caller_alone(status)) {
         close(opened);
         return;
     }

@@ -37,13 +37,14 @@ int convert(const char *function, cu_iconv_t handle, const char *in, const std::
     constexpr int facility_no_memory = 15;
     if (handle == nullptr)
         return qz::report(SEC_S_CODESET, qz::msg::conversion_unavailable);
+    constexpr int line = __LINE__ + 1; // of the call that may fail
     const int result = cu_iconv_str_1(handle, 0, in, in_length, out, out_length);
     switch (result) {
     case 0:
         return SEC_S_OK;
     case 17:
     case 20:
-        return qz::report(SEC_S_INTERNAL, qz::msg::internal_failure, qz::utils_source, __LINE__, result);
+        return qz::report(SEC_S_INTERNAL, qz::msg::internal_failure, qz::utils_source, line, result);
     case facility_no_memory:
         return qz::report_no_memory(function, *in_length);
     default:

@@ -21,7 +21,7 @@ inline constexpr char utils_source[] = "security/ACL/lib/qzacl_utils";
 // Records a message and returns its code.
 template <int Id, class... Args>
 int report(int code, msg::message<Id, Args...>, std::type_identity_t<Args>... args) {
-    cu_set_error_1(code, 0, msg::catalog_name, msg::catalog_set, Id, cu_mesgtbl_qzseclib_msg[Id], args...);
+    cu_set_error_1(code, 0, msg::catalog_name, msg::catalog_set, Id, msg::shown_text(Id), args...);
     return code;
 }
 

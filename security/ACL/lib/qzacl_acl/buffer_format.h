@@ -175,6 +175,21 @@ void pass_entries(entry_walk &walk, std::size_t readable, const Passes &passes) 
     walk.left = left;
 }
 
+// Steps over entries, whatever they hold. False where one reaches beyond the end.
+inline bool skip_entries(byte_reader &reader, std::uint32_t count) {
+    entry_walk walk{reader, count};
+    for (;;) {
+        pass_entries(walk, 0, [](std::uint8_t, byte_span) { return true; });
+        reader = walk.entries;
+        if (walk.left == 0)
+            return true;
+        entry passed;
+        if (!read(walk.entries, passed))
+            return false;
+        --walk.left;
+    }
+}
+
 // Steps through the sub-ACLs of a buffer in host order, from each to the next by its length field.
 class subacl_walk {
 public:
@@ -213,6 +228,30 @@ private:
     std::size_t left_ = 0;
     bool is_started_ = false;
 };
+
+// Finds where the sub-ACLs that a buffer counts end, and so where a further one goes: what may follow stays behind
+// it, where no count reaches. False where one reaches beyond the end of the buffer, and where the length of the last
+// does not lead to the end of its entries: a walk would look for the further one elsewhere.
+inline bool find_end(byte_span buffer, std::size_t &offset) {
+    byte_reader behind(buffer);
+    header head;
+    if (!read(behind, head))
+        return false;
+    subacl_walk walk(buffer);
+    for (unsigned left = head.subacl_count; left != 0; --left) {
+        if (walk.next() != subacl_walk::step::found)
+            return false;
+    }
+    if (head.subacl_count != 0) {
+        behind = byte_reader(walk.bytes());
+        subacl last;
+        if (!read(behind, last) || !skip_entries(behind, last.entry_count) ||
+            walk.bytes().size() - behind.left() != last.length)
+            return false;
+    }
+    offset = buffer.size() - behind.left();
+    return true;
+}
 
 inline void write_header(byte_writer &writer, std::uint16_t subacl_count) {
     writer.field(buffer_type);

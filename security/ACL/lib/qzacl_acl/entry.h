@@ -46,11 +46,6 @@ constexpr int type_letter(unsigned type) {
     }
 }
 
-struct release_acle {
-    void operator()(sec_acle_t *acle) const { sec_release_acle(acle); }
-};
-using owned_acle = std::unique_ptr<sec_acle_t, release_acle>;
-
 } // namespace qz
 
 // Records the trace points of releasing an entry, which may be null: also for entries that others hold memory

@@ -212,9 +212,38 @@ void sec_acltree::erase(sec_acle_t &acle) {
     acle.type = 0;
 }
 
+// In post-order. In the order of identities a node is done with when one comes that was inserted before it: all that
+// is below it stands between the two.
 void sec_acltree::trace_release() const {
-    for (const sec_acle_t *acle : std::span(entries_, count_))
-        sec__trace_release(acle->type == 0 ? nullptr : acle);
+    const auto trace = [this](std::uint32_t number) {
+        sec__trace_release(entries_[number]->type == 0 ? nullptr : entries_[number]);
+    };
+    std::span<sec_acle_t *const> nodes;
+    std::size_t refused = 0;
+    const auto memory = qz::allocate<std::uint32_t>(std::size_t{count_} * 2);
+    if (!is_sorted_by_identity() || memory == nullptr || !in_order(nodes, refused)) {
+        // A chain to the right; without memory this keeps each node behind those below it, too.
+        for (std::uint32_t number = count_; number != 0; --number)
+            trace(number - 1);
+        return;
+    }
+    const std::span numbers(memory.get(), count_);
+    std::uint32_t *const waiting = memory.get() + count_;
+    for (std::uint32_t number = 0; number < count_; ++number) {
+        const auto at = std::lower_bound(nodes.begin(), nodes.end(), entries_[number],
+                                         [](const sec_acle_t *a, const sec_acle_t *b) {
+                                             return qz::compare_identities(a->identity, b->identity) < 0;
+                                         });
+        numbers[static_cast<std::size_t>(at - nodes.begin())] = number;
+    }
+    std::uint32_t depth = 0;
+    for (const std::uint32_t number : numbers) {
+        while (depth != 0 && waiting[depth - 1] > number)
+            trace(waiting[--depth]);
+        waiting[depth++] = number;
+    }
+    while (depth != 0)
+        trace(waiting[--depth]);
 }
 
 bool sec_acltree::in_order(std::span<sec_acle_t *const> &nodes, std::size_t &refused) const {
@@ -421,7 +450,8 @@ void sec__trace_replacement(const sec_acle_t *acle) {
     default:
         break;
     }
-    qz::trace_data(113, qz::item(type), qz::item(qz::is_single_type(acle->type) ? "<none>" : acle->mechanism),
+    qz::trace_data(113, qz::item(type),
+                   qz::is_single_type(acle->type) ? qz::item("<none>") : qz::bounded_item(acle->mechanism),
                    qz::item(acle->type == SEC_ACLE_USER ? acle->identity : "<none>"));
 }
 
