@@ -17,12 +17,17 @@ is_shown() { [[ -t 2 && ${TERM:-dumb} != dumb ]]; }
 
 # Shows each line of standard input in the place of the one before.
 show_latest() {
-    local line width
+    local line
+    while IFS= read -r line; do
+        show_line "$line"
+    done
+    show_line
+}
+
+# show_line [LINE]: in the place of the one before.
+show_line() {
+    local width line=${1:+${shown_before-}$1}
     width=$(stty size <&2 | cut -d' ' -f2)
     ((width > 1)) || width=80
-    while IFS= read -r line; do
-        line=${shown_before-}$line
-        printf '\r\033[K%s' "${line:0:width-1}" >&2
-    done
-    printf '\r\033[K' >&2
+    printf '\r\033[K%s' "${line:0:width-1}" >&2
 }
