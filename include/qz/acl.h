@@ -67,10 +67,11 @@
  * out-parameters are the caller's business. Nothing here may be called from a signal handler.
  *
  * Forks. The child of a fork may call every operation, whatever other threads of its parent were doing: the
- * fork waits until none of them holds a lock of this library or of those beneath it. The child has the
- * handlers, and the recorded error of the thread that forked; a buffer that another thread was changing must
- * not be used. Locks of the C library are its own affair: it may need one to look up a username, and to
- * convert for the first time in a thread where the locale's code set is not UTF-8.
+ * fork waits until none of them holds a lock of this library or of those beneath it. So a signal handler
+ * must not call fork: it would wait for the thread that it interrupts. The child has the handlers, and the
+ * recorded error of the thread that forked; a buffer that another thread was changing must not be used.
+ * Locks of the C library are its own affair: it may need one to look up a username, and to convert for the
+ * first time in a thread where the locale's code set is not UTF-8.
  */
 #ifndef QZ_ACL_H
 #define QZ_ACL_H

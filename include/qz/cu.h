@@ -12,9 +12,9 @@
  * - What is handed out through a pointer to a pointer belongs to the caller, who releases it with the
  * operation (or the function of the C library) that the description names.
  * - The child of a fork may call every operation, whatever other threads of its parent were doing: the fork
- * waits until none of them holds a lock of this library. The child has the recorded error of the thread that
- * forked. A thread's first conversion with a handle of another code set than UTF-8 may need a lock of the C
- * library, which is that library's affair.
+ * waits until none of them holds a lock of this library, for which reason a signal handler must not call
+ * fork. The child has the recorded error of the thread that forked. A thread's first conversion with a
+ * handle of another code set than UTF-8 may need a lock of the C library, which is that library's affair.
  * - Every operation may be called from several threads at once. An object that one thread releases must not
  * be in use in another.
  * - No operation changes errno, prints, exits, or records an error about itself; only cu_set_error_1,

@@ -34,7 +34,8 @@
  *
  * THREADS. Every function may be called by any thread at any time; none may be called from a signal
  * handler. Recording takes no lock. The child of a fork may call every function, whatever threads of its
- * parent were doing: the fork waits until none of them holds a lock of this library. */
+ * parent were doing: the fork waits until none of them holds a lock of this library, for which reason a
+ * signal handler must not call fork. */
 #ifndef QZ_TR_H
 #define QZ_TR_H
 
