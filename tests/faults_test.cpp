@@ -407,6 +407,34 @@ TEST_F(files, are_disturbed_between_any_two_steps) {
     std::cout << races << " races\n";
 }
 
+// The threads of a service without standard streams print all the same.
+bool prints_into_no_file(const std::string &path) {
+    constexpr std::array streams = {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO};
+    for (const int stream : streams) close(stream);
+    const std::string longer_than_the_cache(1000, 'x');
+    bool is_taken = false;
+    const auto print = [&](std::size_t) {
+        for (const int stream : streams) {
+            const bool is_open =
+                write(stream, longer_than_the_cache.data(), longer_than_the_cache.size()) >= 0 || errno != EBADF;
+            is_taken |= is_open && faults::calls.back() != "close"; // by which a file leaves the number
+        }
+        return 0;
+    };
+    return faults::watched(print, [&] { return check(path); }).code == 0 && !is_taken;
+}
+
+TEST_F(files, have_no_descriptor_of_a_standard_stream) {
+    for (const std::string &stale : {""s, "old"s}) {
+        lay_out(stale);
+        const pid_t child = fork();
+        if (child == 0) _exit(prints_into_no_file(path) ? 0 : 1);
+        int status = 0;
+        EXPECT_TRUE(waitpid(child, &status, 0) == child && status == 0) << status;
+        EXPECT_EQ(read_file(cache), from_text.bytes);
+    }
+}
+
 // What is edited while it is read must not be older than its cache.
 TEST_F(files, caches_are_as_old_as_what_they_are_made_from) {
     fs::file_time_type read_at;

@@ -2,7 +2,7 @@
 // they compile to.
 #include "bulk_aclfile.h"
 
-#include "owned.h"
+#include "base/owned.h"
 #include "qzacl_acl/cache_file.h"
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/dump.h"

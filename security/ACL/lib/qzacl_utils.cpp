@@ -1,6 +1,7 @@
 // Conversion of strings between the locale's code set and UTF-8, and reading a whole file.
 #include "qzacl_utils.h"
 
+#include "base/open_file.h"
 #include "qzacl_trace.h"
 #include "report.h"
 
@@ -98,7 +99,7 @@ int read_file(const char *file_name, int fd, file_text &file) {
 namespace qz {
 
 descriptor open_vetted(const char *path, int access, const struct stat &vetted) {
-    descriptor file(open(path, access | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+    descriptor file = open_file(path, access | O_NONBLOCK);
     if (!file)
         return file;
     struct stat opened = {};

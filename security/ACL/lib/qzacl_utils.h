@@ -2,7 +2,7 @@
 #ifndef QZACL_UTILS_H
 #define QZACL_UTILS_H
 
-#include "owned.h"
+#include "base/owned.h"
 
 #include <cstddef>
 #include <sys/stat.h>

@@ -2,7 +2,7 @@
 // and cleared; nothing stays recorded behind it.
 #include "qzacl_acl/dump.h"
 
-#include "owned.h"
+#include "base/owned.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/entry.h"

@@ -1,7 +1,7 @@
 // Identity handlers: registering comparison functions for mechanisms, and looking one up.
 #include "qzacl_acl/id_handlers.h"
 
-#include "owned.h"
+#include "base/owned.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_init.h"
 #include "qzacl_trace.h"

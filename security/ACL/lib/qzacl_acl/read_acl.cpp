@@ -1,5 +1,5 @@
 // Reading an ACL file as a compiled buffer: from its cache when that is current, else from its text.
-#include "owned.h"
+#include "base/owned.h"
 #include "qzacl_acl/cache_file.h"
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/entry_parser.h"
