@@ -1,9 +1,11 @@
 // Reading an ACL file as a compiled buffer: from its cache when that is current, else from its text.
 #include "qzacl_acl/acl_text.h"
+#include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/cache_file.h"
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/file_name.h"
 #include "qzacl_acl/tree.h"
+#include "qzacl_acl/validate.h"
 #include "qzacl_trace.h"
 #include "qzacl_utils.h"
 #include "report.h"
@@ -22,6 +24,16 @@ constexpr qz::acl_file_use by_library = {
     .takes_empty_of_anybody = true,
     .is_traced = true,
 };
+
+// Brings the bytes of a cache into host order and checks them, also those that had to be converted.
+int convert_and_check(sec_acl_buffer_t &acl) {
+    const qz::byte_span bytes = qz::format::bytes_of(acl);
+    const bool is_foreign =
+        bytes.size() > qz::format::order_offset && bytes[qz::format::order_offset] != qz::format::host_order;
+    if (const int result = sec_convert_acl_to_host(1, &acl); result != SEC_S_OK || !is_foreign)
+        return result;
+    return sec__check_acl_buffer(&acl);
+}
 
 // One call's work: from the arguments to the buffer and the flags that the caller gets.
 class acl_file_reader {
@@ -95,7 +107,7 @@ bool acl_file_reader::read_cache(sec_acl_buffer_t &out) {
         return false;
     if (result == SEC_S_OK && (flags_ & SEC_READ_ACL_CONVERT) != 0) {
         sec_acl_buffer_t candidate = {static_cast<std::int32_t>(bytes.length), bytes.data.get()};
-        result = sec_convert_acl_to_host(1, &candidate);
+        result = convert_and_check(candidate);
     }
     if (result != SEC_S_OK) {
         cu_set_no_error_1();
