@@ -50,6 +50,9 @@
  * buffer, entry or set, which any number of threads may then use at once; "Threads: exclusive" that no other
  * thread may use what the non-const arguments point to during the call. Errors are per thread. Handlers and
  * out-parameters are the caller's business. Nothing here may be called from a signal handler.
+ *
+ * Cancellation. No operation is a point where a thread can be cancelled: one that opens a file, prints or
+ * holds a lock disables cancellation and puts its state back before it returns.
  */
 #ifndef QZ_ACL_H
 #define QZ_ACL_H

@@ -1,4 +1,5 @@
 // Reading an ACL file as a compiled buffer: from its cache when that is current, else from its text.
+#include "base/uncancelled.h"
 #include "qzacl_acl/acl_text.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/cache_file.h"
@@ -197,6 +198,7 @@ int acl_file_reader::read_once(const char *aclfname, sec_acl_buffer_t &out) {
 int sec_read_acl_file(const char *aclfname, const char *username, const sec_perm_set_t *set,
                       std::uint32_t flags, sec_acl_buffer_t *acl, std::uint32_t *out_flags) {
     constexpr const char *function = "sec_read_acl_file";
+    const qz::uncancelled until_all_is_closed;
     qz::trace_entry(9, [&] {
         qz::trace_data(11, qz::item(aclfname), qz::item(username), qz::number(set), qz::number(flags),
                        qz::number(acl));
