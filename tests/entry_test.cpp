@@ -1,5 +1,5 @@
 // Permissions in both directions, and entries: making, displaying and releasing them, also in other code sets.
-#include "owned.h"
+#include "base/owned.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/permission.h"
 #include "support.h"

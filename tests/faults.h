@@ -135,6 +135,10 @@ QZ_WRAPPED_CALL(fdatasync, (int fd), (fd))
 QZ_WRAPPED_CALL(rename, (const char *from, const char *to), (from, to))
 QZ_WRAPPED_CALL(unlink, (const char *path), (path))
 QZ_WRAPPED_TRANSFER(read, void *)
+// What a fortified call becomes.
+[[gnu::used]] inline ssize_t __wrap___read_chk(int fd, void *bytes, size_t size, size_t /*room*/) {
+    return __wrap_read(fd, bytes, size);
+}
 QZ_WRAPPED_TRANSFER(write, const void *)
 QZ_WRAPPED(int, close, (int fd)) { // which closes even as it fails
     const bool fails = faults::next("close") > 0;

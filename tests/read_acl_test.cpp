@@ -28,6 +28,8 @@ struct read_acl_file : testing::Test {
 TEST_F(read_acl_file, reads_the_cache_when_it_is_current) {
     const std::string cut = example.substr(0, 30);
     const std::string foreign = "\x85\1\1\0\1\0\0\0\x1a\4\0\0\0\1\5abcd\0\1\0\0\0\3\0\4xyz\0"s;
+    std::string unsound = foreign;
+    unsound[20] = 9; // the version of its entry
     // The text, 100 s old; what is cached, its age and mode; the flags before and after; what is read.
     const std::tuple<std::string, std::string, int, unsigned, unsigned, unsigned, std::string> rows[] = {
         {acl_text, "", 0, 0, convert | 0xf8, text | 0xf8, from_text}, // no file
@@ -40,6 +42,7 @@ TEST_F(read_acl_file, reads_the_cache_when_it_is_current) {
         {acl_text, cut, 0, 0644, convert | cache, text, from_text}, // newer, so left alone
         {"", example, 0, 0644, cache | convert, convert, ""},
         {"# nobody\n\n  \t\n", example, 0, 0644, text | cache, text, ""},
+        {acl_text, unsound, 0, 0644, convert, text, from_text}, // once it is converted
         {acl_text, foreign, 0, 0644, 0, 0, foreign},
     };
     for (const auto &[written, cached, age, mode, in, out, bytes] : rows) {

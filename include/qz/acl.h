@@ -72,6 +72,9 @@
  * recorded error of the thread that forked; a buffer that another thread was changing must not be used.
  * Locks of the C library are its own affair: it may need one to look up a username, and to convert for the
  * first time in a thread where the locale's code set is not UTF-8.
+ *
+ * Cancellation. No operation is a point where a thread can be cancelled: one that opens a file, prints or
+ * holds a lock disables cancellation and puts its state back before it returns.
  */
 #ifndef QZ_ACL_H
 #define QZ_ACL_H
@@ -346,6 +349,7 @@ QZ_ACL_API int sec_translate_bitmask(uint32_t mask, const sec_perm_set_t *set, c
  * The cache file is the ACL file's path with ".cacl" appended. It is used when it is not empty, newer than
  * the ACL file in whole seconds, and has the same owner, group and permission bits. Any trouble with it
  * leads to the text without an error; a cache file that cannot be written does not fail the call either.
+ * When the ACL file is replaced by rename before it is opened, the call starts over with the new file.
  * Without SEC_READ_ACL_CONVERT the cache file's bytes are handed out as they are, unchecked and in any order.
  *
  *   aclfname    a path, absolute or relative to the working directory; with username a bare file name
@@ -364,8 +368,8 @@ QZ_ACL_API int sec_translate_bitmask(uint32_t mask, const sec_perm_set_t *set, c
  *   4 (3417-165)    with username, aclfname holds a '/' or is too long for the home directory
  *   15 (3417-140)   the system does not know username
  *   36 (3417-141)   with username, the file is another's or others may write it
- *   37 (3417-135)   no such file, or not a regular one
- *   37 (3417-137)   the file cannot be opened, or was exchanged meanwhile (ESTALE)
+ *   37 (3417-135)   no such file, not a regular one, or one that was replaced at every try (ESTALE)
+ *   37 (3417-137)   the file cannot be opened
  *   37 (3417-139)   fewer bytes could be read than the file has
  *   105 (3417-166)  the working directory is unknown
  *   105 (3417-167)  the working directory and aclfname together exceed 4096 bytes

@@ -19,6 +19,8 @@
  * be in use in another.
  * - No operation changes errno, prints, exits, or records an error about itself; only cu_set_error_1,
  *   cu_set_no_error_1 and cu_pset_error_1 change the recorded error.
+ * - No operation is a point where a thread can be cancelled: those that open a file or hold a lock disable
+ *   cancellation and put its state back before they return.
  * - Nothing here may be called from a signal handler, except the string operations and the questions about
  * UTF-8.
  */

@@ -1,7 +1,8 @@
 // The cached form of an ACL file: the compiled buffer beside it, owned and protected like it.
 #include "qzacl_acl/cache_file.h"
 
-#include "owned.h"
+#include "base/open_file.h"
+#include "base/owned.h"
 #include "qzacl_trace.h"
 #include "qzacl_utils.h"
 #include "report.h"
@@ -93,8 +94,7 @@ qz::descriptor create_temporary(const char *aclfname, qz::path_buffer &name) {
             continue;
         if (errno != ENOENT)
             return {};
-        qz::descriptor file(
-            open(name.text, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC | O_NOCTTY, 0));
+        qz::descriptor file = qz::open_file(name.text, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW);
         // Somebody may have taken the name since, or a link that leads nowhere stands under it.
         if (file || errno != EEXIST)
             return file;
@@ -209,10 +209,9 @@ int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, int 
             return SEC_S_ADVISORY;
     }
 
-    made_file placeholder(
-        cache_name.text,
-        is_new ? qz::descriptor(open(cache_name.text, O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC | O_NOCTTY, 0))
-               : qz::open_vetted(cache_name.text, O_WRONLY, cache_status));
+    made_file placeholder(cache_name.text, is_new
+                                               ? qz::open_file(cache_name.text, O_WRONLY | O_CREAT | O_EXCL)
+                                               : qz::open_vetted(cache_name.text, O_WRONLY, cache_status));
     if (!placeholder)
         return cannot_open(cache_name.text);
     if (!is_new)

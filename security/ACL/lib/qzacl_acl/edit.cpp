@@ -4,7 +4,7 @@
 // The plain way expands that sub-ACL into a tree, changes the tree and compiles it again. Where the stored
 // entries already are what compiling such a tree gives, well-formed and in ascending order, the bytes of the
 // one entry are changed in place instead: the result is the same, without a second copy of the sub-ACL.
-#include "owned.h"
+#include "base/owned.h"
 #include "qzacl_acl/buffer.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/compile.h"

@@ -1,7 +1,7 @@
 // Creating, displaying and releasing entries and lists of entries.
 #include "qzacl_acl/entry.h"
 
-#include "owned.h"
+#include "base/owned.h"
 #include "qzacl_trace.h"
 #include "qzacl_utils.h"
 #include "report.h"

@@ -1,7 +1,7 @@
 // Where an ACL file is: the full path for a name, and the user whose home directory holds it.
 #include "qzacl_acl/file_name.h"
 
-#include "owned.h"
+#include "base/owned.h"
 #include "report.h"
 
 #include <cerrno>

@@ -11,7 +11,7 @@
 #ifndef QZACL_TREE_H
 #define QZACL_TREE_H
 
-#include "owned.h"
+#include "base/owned.h"
 #include "qz/acl.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/identity_order.h"
