@@ -68,7 +68,7 @@ int read_file(const char *file_name, int fd, file_text &file) {
         return not_found(file_name, errno);
     // The size of one file must not cut the text of another that was exchanged for it after the open.
     struct stat opened = {};
-    if (fstat(fd, &opened) != 0 || opened.st_dev != status.st_dev || opened.st_ino != status.st_ino)
+    if (fstat(fd, &opened) != 0 || !qz::same_file(opened, status))
         return not_found(file_name, ESTALE);
     const auto size = static_cast<std::size_t>(status.st_size);
     if (size == 0)
@@ -102,8 +102,7 @@ descriptor open_vetted(const char *path, int access, const struct stat &vetted) 
     if (!file)
         return file;
     struct stat opened = {};
-    if (fstat(file.get(), &opened) != 0 || opened.st_dev != vetted.st_dev || opened.st_ino != vetted.st_ino ||
-        !S_ISREG(opened.st_mode)) {
+    if (fstat(file.get(), &opened) != 0 || !same_file(opened, vetted) || !S_ISREG(opened.st_mode)) {
         file.close();
         errno = ESTALE;
     }

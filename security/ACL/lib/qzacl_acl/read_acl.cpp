@@ -1,6 +1,7 @@
 // Reading an ACL file as a compiled buffer: from its cache when that is current, else from its text.
 #include "owned.h"
 #include "qzacl_acl/cache_file.h"
+#include "qzacl_acl/cache_vetting.h"
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/entry_parser.h"
 #include "qzacl_acl/file_name.h"
@@ -14,8 +15,6 @@
 #include <sys/stat.h>
 
 namespace {
-
-constexpr mode_t permission_bits = 07777;
 
 // One call's work: from the arguments to the buffer and the flags that the caller gets.
 class acl_file_reader {
@@ -32,7 +31,6 @@ public:
 
 private:
     int vet(const char *aclfname);
-    bool cache_is_current();
     bool read_cache(sec_acl_buffer_t &out);
     int open_and_read(const qz::vetted_file &file, qz::file_bytes &bytes) const;
     int read_text(sec_acl_buffer_t &out);
@@ -64,36 +62,6 @@ int acl_file_reader::vet(const char *aclfname) {
     return SEC_S_OK;
 }
 
-// True when the cache may be read instead of the text: there, later than the text, owned and protected alike.
-bool acl_file_reader::cache_is_current() {
-    const bool is_traced = qz::traces(qz::trace_category::info);
-    if (!qz::make_cache_name(acl_.path.text, cache_.path))
-        return false;
-    if (is_traced)
-        qz::trace_data(117, qz::item(cache_.path.text));
-    if (stat(cache_.path.text, &cache_.status) != 0) {
-        const int error = errno;
-        if (is_traced)
-            qz::trace_data(118, qz::item(cache_.path.text), qz::number(error));
-        return false;
-    }
-    if (cache_.status.st_size == 0 || cache_.status.st_mtime <= acl_.status.st_mtime) {
-        if (is_traced)
-            qz::trace_data(119, qz::item(cache_.path.text));
-        return false;
-    }
-    if (cache_.status.st_uid != acl_.status.st_uid || cache_.status.st_gid != acl_.status.st_gid ||
-        (cache_.status.st_mode & permission_bits) != (acl_.status.st_mode & permission_bits)) {
-        if (is_traced)
-            qz::trace_data(120, qz::item(acl_.path.text), qz::number(acl_.status.st_uid),
-                           qz::number(acl_.status.st_gid), qz::number(cache_.status.st_uid),
-                           qz::number(cache_.status.st_gid), qz::number(acl_.status.st_mode),
-                           qz::number(cache_.status.st_mode));
-        return false;
-    }
-    return true;
-}
-
 int acl_file_reader::open_and_read(const qz::vetted_file &file, qz::file_bytes &bytes) const {
     const char *path = file.path.text;
     if (qz::traces(qz::trace_category::info))
@@ -108,6 +76,8 @@ int acl_file_reader::open_and_read(const qz::vetted_file &file, qz::file_bytes &
     }
     if (perf_level_ == 2)
         qz::trace_elapsed(4, start, qz::item(path));
+    if (&file == &cache_ && !qz::cache_has_entries_of_text(acl_, cache_, opened.get()))
+        return SEC_S_ADVISORY;
     const int result = qz::lock_and_read(path, opened, bytes);
     opened.close();
     if (perf_level_ == 1)
@@ -193,7 +163,7 @@ int acl_file_reader::read(const char *aclfname, sec_acl_buffer_t &out) {
         flags_ &= ~std::uint32_t{SEC_READ_ACL_CACHE};
         return SEC_S_OK;
     }
-    if (!reads_text() && !cache_is_current())
+    if (!reads_text() && !qz::cache_is_current(acl_, cache_))
         flags_ |= SEC_READ_ACL_TEXT;
     if (perf_level_ == 1)
         qz::trace_elapsed(1, start_, qz::item(reads_text() ? acl_.path.text : cache_.path.text));
