@@ -4,6 +4,7 @@
 #include "bulk_aclfile.h"
 #include "faults.h"
 #include "support.h"
+#include <csignal>
 #include <regex>
 #include <set>
 #include <sys/wait.h>
@@ -339,6 +340,31 @@ TEST_F(files, writers_are_killed_after_each_step) {
                 EXPECT_EQ(check(path).code, 0);
             }
         }
+}
+
+TEST_F(files, writers_that_are_ended_by_a_signal_leave_nothing) {
+    constexpr int signals[] = {SIGINT, SIGTERM, SIGHUP, SIGALRM};
+    for (const std::string &stale : {""s, "old"s}) {
+        bool is_ended = true;
+        for (std::size_t at = 0; is_ended; ++at) {
+            SCOPED_TRACE(testing::Message() << "ended before step " << at);
+            const int signal = signals[at % std::size(signals)];
+            lay_out(stale);
+            const pid_t child = fork();
+            if (child == 0) {
+                faults::watched([&](std::size_t index) { return index == at ? raise(signal) : 0; },
+                                [&] { return check(path); });
+                _exit(0);
+            }
+            int status = 0;
+            ASSERT_EQ(waitpid(child, &status, 0), child);
+            is_ended = WIFSIGNALED(status);
+            EXPECT_EQ(is_ended ? WTERMSIG(status) : signal, signal);
+            const std::string left = read_file(cache);
+            EXPECT_TRUE(left == stale || left == from_text.bytes) << left;
+            EXPECT_EQ(names_in(folder.path).size(), left.empty() ? 1u : 2u);
+        }
+    }
 }
 
 TEST_F(files, torn_caches_are_not_believed) {
