@@ -60,6 +60,29 @@ def run(arguments, cwd, environment=(), child=None, user=None):
     return done.returncode, printed.decode("latin-1")
 
 
+ENTRIES, INHERITED = "system.posix_acl_access", "system.posix_acl_default"
+WRITER = NOBODY - 2  # a user whom an entry lets write
+
+
+def posix_acl(group):
+    """Entries that let the owner and one user write, and the group do what is said."""
+    no_id = 0xffffffff
+    entries = ((1, 6, no_id), (2, 6, WRITER), (4, group, no_id), (0x10, 6, no_id), (0x20, 4, no_id))
+    return struct.pack("<I", 2) + b"".join(struct.pack("<HHI", *entry) for entry in entries)
+
+
+def entries_of(path):
+    try:
+        return os.getxattr(path, ENTRIES)
+    except OSError as error:
+        return os.strerror(error.errno)
+
+
+def may_write(path, user, group):
+    done = subprocess.run(["test", "-w", path], user=user, group=group, extra_groups=[], check=False)
+    return done.returncode == 0
+
+
 def snapshot(directory):
     """What tells of changes to anything in a directory, by name."""
     return {item.name: (info.st_mode, info.st_uid, info.st_gid, info.st_ino, info.st_size, info.st_mtime_ns)
@@ -239,6 +262,39 @@ class Command(CommandCase):
             self.write("a", A_TEXT, mode, ORDINARY)
             self.expect(["-s", "-f", "a"], 0, "", [("a.cacl", A_CACHE)], child=lambda: os.umask(0o077))
             self.assertEqual(*[(info.st_uid, info.st_gid, info.st_mode) for info in map(os.stat, os.scandir(self.dir))])
+
+    def test_cache_has_the_entries_of_the_file_and_no_others(self):
+        """Nobody can write the cache who cannot write the file, whatever new files in the folder inherit."""
+        for entries, inherited in itertools.product((None, posix_acl(group=4)), (None, posix_acl(group=6))):
+            with self.subTest(entries=entries, inherited=inherited):
+                self.fresh()
+                path = self.write("a", A_TEXT, owner=ORDINARY)
+                try:
+                    if entries:
+                        os.setxattr(path, ENTRIES, entries)
+                    if inherited:
+                        os.setxattr(self.dir, INHERITED, inherited)
+                except OSError:
+                    self.skipTest("the file system has no POSIX ACLs")
+                self.expect(["-s", "-f", "a"], 0, "", [("a.cacl", A_CACHE)])
+                self.assertEqual(entries_of(path + ".cacl"), entries_of(path))
+                self.assertEqual(os.stat(path + ".cacl").st_mode, os.stat(path).st_mode)
+                if IS_ROOT:
+                    self.assertFalse(may_write(path + ".cacl", NOBODY, ORDINARY))
+                    self.assertEqual(may_write(path + ".cacl", WRITER, WRITER), entries is not None)
+
+    def test_cache_with_other_entries_is_not_replaced(self):
+        path = self.write("a", A_TEXT, 0o664)
+        self.write("a.cacl", "old", 0o664)
+        try:
+            os.setxattr(path, ENTRIES, posix_acl(group=4))
+        except OSError:
+            self.skipTest("the file system has no POSIX ACLs")
+        self.expect(["-s", "-f", "a"], 37, message(137, "{dir}/a"))
+        os.setxattr(path + ".cacl", ENTRIES, posix_acl(group=6))
+        self.expect(["-s", "-f", "a"], 37, message(137, "{dir}/a"))
+        os.setxattr(path + ".cacl", ENTRIES, posix_acl(group=4))
+        self.expect(["-s", "-f", "a"], 0, "", [("a.cacl", A_CACHE)])
 
     def test_full_disk(self):
         self.write("a", A_TEXT)

@@ -13,6 +13,7 @@
 #include <pwd.h>
 #include <string>
 #include <sys/stat.h>
+#include <sys/xattr.h>
 #include <unistd.h>
 #include <vector>
 
@@ -134,6 +135,15 @@ QZ_WRAPPED_CALL(futimens, (int fd, const timespec *times), (fd, times))
 QZ_WRAPPED_CALL(fdatasync, (int fd), (fd))
 QZ_WRAPPED_CALL(rename, (const char *from, const char *to), (from, to))
 QZ_WRAPPED_CALL(unlink, (const char *path), (path))
+QZ_WRAPPED_CALL(fsetxattr, (int fd, const char *name, const void *value, size_t size, int flags),
+                (fd, name, value, size, flags))
+QZ_WRAPPED_CALL(fremovexattr, (int fd, const char *name), (fd, name))
+QZ_WRAPPED(ssize_t, getxattr, (const char *path, const char *name, void *value, size_t size)) {
+    return faults::next("getxattr") > 0 ? -1 : __real_getxattr(path, name, value, size);
+}
+QZ_WRAPPED(ssize_t, fgetxattr, (int fd, const char *name, void *value, size_t size)) {
+    return faults::next("fgetxattr") > 0 ? -1 : __real_fgetxattr(fd, name, value, size);
+}
 QZ_WRAPPED_TRANSFER(read, void *)
 // What a fortified call becomes.
 [[gnu::used]] inline ssize_t __wrap___read_chk(int fd, void *bytes, size_t size, size_t /*room*/) {

@@ -68,6 +68,36 @@ TEST_F(read_acl_file, reads_the_cache_when_it_is_current) {
     }
 }
 
+TEST_F(read_acl_file, reads_the_cache_when_its_entries_are_those_of_the_text) {
+    constexpr unsigned none = 8; // for user 1, else the permissions
+    struct row {
+        const char *name;
+        unsigned of_text, of_cache;
+        unsigned mode;
+        bool is_believed;
+    };
+    const row rows[] = {
+        {"neither has entries", none, none, 0664, true},
+        {"both have the same", 6, 6, 0664, true},
+        {"the group may write the cache", 6, none, 0664, false},
+        {"the group may read the cache", 4, none, 0644, false},
+        {"user 1 may write the cache", none, 6, 0664, false},
+        {"user 1 may write the cache, not only read it", 4, 6, 0664, false},
+    };
+    for (const auto &[name, of_text, of_cache, mode, is_believed] : rows) {
+        SCOPED_TRACE(name);
+        const unsigned mask = mode >> 3 & 7;
+        write_file(path, acl_text, 100, mode);
+        write_file(cache_path, example, 0, mode);
+        if (of_text != none && !give_entries(path, of_text, mask)) GTEST_SKIP() << "the file system has no POSIX ACLs";
+        if (of_cache != none) { ASSERT_TRUE(give_entries(cache_path, of_cache, mask)); }
+        EXPECT_EQ(read(path, convert), is_believed ? given(example, convert) : given(from_text, text));
+        EXPECT_EQ(read(path, cache | convert), is_believed ? given(example, convert) : given(from_text, text));
+        fs::remove(path);
+        fs::remove(cache_path);
+    }
+}
+
 TEST_F(read_acl_file, reports_what_it_refuses) {
     EXPECT_EQ(read(folder.path, 0xf2), reading("", 0xf2, error_of(37, 122, {folder.path, "0"})));
     EXPECT_EQ(read("acl", cache, ""), reading("", cache, error_of(4, 121)));

@@ -17,6 +17,7 @@
 #include <random>
 #include <sstream>
 #include <string>
+#include <sys/xattr.h>
 #include <vector>
 
 namespace support {
@@ -78,6 +79,18 @@ inline void write_file(const std::string &path, const std::string &bytes, int ag
     std::ofstream(path, std::ios::binary) << bytes;
     last_write_time(path, file_time_type::clock::now() - std::chrono::seconds(age));
     permissions(path, perms(mode));
+}
+// Gives a file the entries of a POSIX ACL: one for user 1, a group that may read, and a mask, which the group bits of
+// the mode then show. False where the file system has none.
+inline bool give_entries(const std::string &path, unsigned user_bits, unsigned mask) {
+    const std::string no_id(4, '\xff');
+    const std::string user_1 = "\2\0"s + static_cast<char>(user_bits) + "\0\1\0\0\0"s;
+    const std::string owner = "\1\0\6\0"s + no_id;
+    const std::string group = "\4\0\4\0"s + no_id;
+    const std::string others = "\x20\0\4\0"s + no_id;
+    const std::string limit = "\x10\0"s + static_cast<char>(mask) + "\0"s + no_id;
+    const std::string all = "\2\0\0\0"s + owner + user_1 + group + limit + others;
+    return setxattr(path.c_str(), "system.posix_acl_access", all.data(), all.size(), 0) == 0;
 }
 inline std::string read_file(const std::string &path) {
     std::ifstream file(path, std::ios::binary);

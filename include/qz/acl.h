@@ -347,9 +347,10 @@ QZ_ACL_API int sec_translate_bitmask(uint32_t mask, const sec_perm_set_t *set, c
  * Reads an ACL file, from its cache file when that is current, else from its text. Clears.
  *
  * The cache file is the ACL file's path with ".cacl" appended. It is used when it is not empty, newer than
- * the ACL file in whole seconds, and has the same owner, group and permission bits. Any trouble with it
- * leads to the text without an error; a cache file that cannot be written does not fail the call either.
- * When the ACL file is replaced by rename before it is opened, the call starts over with the new file.
+ * the ACL file in whole seconds, and has the same owner, group, permission bits and POSIX access control
+ * entries. Any trouble with it leads to the text without an error; a cache file that cannot be written does
+ * not fail the call either. When the ACL file is replaced by rename before it is opened, the call starts
+ * over with the new file.
  * Without SEC_READ_ACL_CONVERT the cache file's bytes are handed out as they are, unchecked and in any order.
  *
  *   aclfname    a path, absolute or relative to the working directory; with username a bare file name

@@ -11,6 +11,8 @@
 #include "qzacl_acl/tree.h"
 #include "report.h"
 
+#include <csignal>
+
 namespace {
 
 // Given back when there is none left to say so.
@@ -75,6 +77,23 @@ int read_entries(qz::acl_text &text, unsigned flags, sec_acltree_array &trees, b
     }
 }
 
+// Holds back every signal that can be, so that one that ends the command neither leaves half a cache nor the
+// temporary file; it does its work at the end of the scope. The library leaves the signals of a service alone.
+class held_signals {
+public:
+    held_signals() {
+        sigset_t all;
+        sigfillset(&all);
+        sigprocmask(SIG_BLOCK, &all, &before_);
+    }
+    held_signals(const held_signals &) = delete;
+    held_signals &operator=(const held_signals &) = delete;
+    ~held_signals() { sigprocmask(SIG_SETMASK, &before_, nullptr); }
+
+private:
+    sigset_t before_ = {};
+};
+
 int compile_and_cache(const qz::vetted_file &file, const sec_acltree_array &trees,
                       const qz::text_origin &origin) {
     constexpr int even_when_current = 1;
@@ -82,6 +101,7 @@ int compile_and_cache(const qz::vetted_file &file, const sec_acltree_array &tree
     if (const int result = sec__acltrees_to_acl(trees.trees(), &buffer); result != SEC_S_OK)
         return result;
     const qz::owned<void> buffer_owner(buffer.data);
+    const held_signals until_cache_is_whole;
     return sec__cache_aclbuffer(file.path.text, &buffer, even_when_current, origin);
 }
 

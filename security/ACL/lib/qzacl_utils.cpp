@@ -55,7 +55,7 @@ int convert(const char *function, cu_iconv_t handle, const char *in, const std::
 
 // Whether the file is the one that was vetted by its name, and still owned and protected as it was then.
 bool is_as_vetted(const struct stat &opened, const struct stat &vetted) {
-    return opened.st_dev == vetted.st_dev && opened.st_ino == vetted.st_ino && S_ISREG(opened.st_mode) &&
+    return qz::same_file(opened, vetted) && S_ISREG(opened.st_mode) &&
            opened.st_mode == vetted.st_mode && opened.st_uid == vetted.st_uid &&
            opened.st_gid == vetted.st_gid;
 }

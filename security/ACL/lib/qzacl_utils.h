@@ -9,6 +9,11 @@
 
 namespace qz {
 
+// True when both tell of one file, whatever its names are.
+inline bool same_file(const struct stat &one, const struct stat &other) {
+    return one.st_dev == other.st_dev && one.st_ino == other.st_ino;
+}
+
 // Opens a file that was vetted by its name, so that whoever exchanges it in between gains nothing: the
 // descriptor must show the same regular file, owned and protected as before. Returns an empty descriptor with
 // errno set, to ESTALE for another file. A file that turned into a FIFO or a terminal neither blocks nor becomes the controlling one.

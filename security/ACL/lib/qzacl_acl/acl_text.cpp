@@ -25,7 +25,11 @@ int vet_acl_file(const char *aclfname, const char *username, const acl_file_use 
     return SEC_S_OK;
 }
 
-int read_vetted_file(const vetted_file &file, const acl_file_use &use, file_bytes &bytes) {
+namespace {
+
+// Opens a vetted file, or the cache of a vetted text, and reads it whole.
+int open_and_read(const vetted_file &file, const vetted_file *text_of_cache, const acl_file_use &use,
+                  file_bytes &bytes) {
     const char *path = file.path.text;
     const bool traces_steps = use.is_traced && traces(trace_category::info);
     const unsigned perf_level = use.is_traced ? trace_level(trace_category::perf) : 0;
@@ -42,6 +46,8 @@ int read_vetted_file(const vetted_file &file, const acl_file_use &use, file_byte
     }
     if (perf_level == 2)
         trace_elapsed(4, start, item(path));
+    if (text_of_cache != nullptr && !cache_has_entries_of_text(*text_of_cache, file, opened.get()))
+        return SEC_S_ADVISORY;
     const int result = lock_and_read(path, opened, file.status, bytes);
     opened.close();
     if (perf_level == 1)
@@ -49,9 +55,16 @@ int read_vetted_file(const vetted_file &file, const acl_file_use &use, file_byte
     return result;
 }
 
+} // namespace
+
+int read_cache_of(const vetted_file &text, const vetted_file &cache, const acl_file_use &use,
+                  file_bytes &bytes) {
+    return open_and_read(cache, &text, use, bytes);
+}
+
 int acl_text::open(const vetted_file &file, const acl_file_use &use) {
     origin_.emplace(file.status);
-    if (const int result = read_vetted_file(file, use, bytes_); result != SEC_S_OK)
+    if (const int result = open_and_read(file, nullptr, use, bytes_); result != SEC_S_OK)
         return result;
     cursor_ = bytes_.data.get();
     remaining_ = bytes_.length + 1;

@@ -28,9 +28,10 @@ struct acl_file_use {
 // Returns SEC_S_OK, a code of sec__get_aclfname, or one of the use.
 int vet_acl_file(const char *aclfname, const char *username, const acl_file_use &use, vetted_file &file);
 
-// Opens a vetted file, or the cache of one, and reads it whole. Returns SEC_S_OK, SEC_S_FILE_ERROR or
-// SEC_S_NO_MEMORY.
-int read_vetted_file(const vetted_file &file, const acl_file_use &use, file_bytes &bytes);
+// Opens the current cache of a vetted text and reads it whole. Returns SEC_S_OK, SEC_S_FILE_ERROR or
+// SEC_S_NO_MEMORY; or SEC_S_ADVISORY, without an error, when its POSIX ACL has other entries than the text's.
+int read_cache_of(const vetted_file &text, const vetted_file &cache, const acl_file_use &use,
+                  file_bytes &bytes);
 
 // What a line of the text holds.
 enum class acl_line {
@@ -60,7 +61,7 @@ public:
         }
     }
 
-    // Reads the file, and stands before its first line. Returns what read_vetted_file does.
+    // Reads the file, and stands before its first line. Returns SEC_S_OK, SEC_S_FILE_ERROR or SEC_S_NO_MEMORY.
     int open(const vetted_file &file, const acl_file_use &use);
 
     // Reads the next line into the entry, whose identity points into the text. A bad line does not keep those

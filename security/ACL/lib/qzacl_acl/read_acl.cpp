@@ -3,6 +3,7 @@
 #include "qzacl_acl/acl_text.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/cache_file.h"
+#include "qzacl_acl/cache_vetting.h"
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/file_name.h"
 #include "qzacl_acl/tree.h"
@@ -11,12 +12,7 @@
 #include "qzacl_utils.h"
 #include "report.h"
 
-#include <cerrno>
-#include <sys/stat.h>
-
 namespace {
-
-constexpr mode_t permission_bits = 07777;
 
 constexpr qz::acl_file_use by_library = {
     .not_found = {SEC_S_FILE_ERROR, qz::msg::bad_file_name},
@@ -53,7 +49,6 @@ public:
 
 private:
     int read_once(const char *aclfname, sec_acl_buffer_t &out);
-    bool cache_is_current();
     bool read_cache(sec_acl_buffer_t &out);
     int read_text(sec_acl_buffer_t &out);
     int parse(sec_acl_buffer_t &out);
@@ -70,40 +65,10 @@ private:
     qz::vetted_file cache_;
 };
 
-// True when the cache may be read instead of the text: there, later than the text, owned and protected alike.
-bool acl_file_reader::cache_is_current() {
-    const bool is_traced = qz::traces(qz::trace_category::info);
-    if (!qz::make_cache_name(acl_.path.text, cache_.path))
-        return false;
-    if (is_traced)
-        qz::trace_data(117, qz::item(cache_.path.text));
-    if (stat(cache_.path.text, &cache_.status) != 0) {
-        const int error = errno;
-        if (is_traced)
-            qz::trace_data(118, qz::item(cache_.path.text), qz::number(error));
-        return false;
-    }
-    if (cache_.status.st_size == 0 || cache_.status.st_mtime <= acl_.status.st_mtime) {
-        if (is_traced)
-            qz::trace_data(119, qz::item(cache_.path.text));
-        return false;
-    }
-    if (cache_.status.st_uid != acl_.status.st_uid || cache_.status.st_gid != acl_.status.st_gid ||
-        (cache_.status.st_mode & permission_bits) != (acl_.status.st_mode & permission_bits)) {
-        if (is_traced)
-            qz::trace_data(120, qz::item(acl_.path.text), qz::number(acl_.status.st_uid),
-                           qz::number(acl_.status.st_gid), qz::number(cache_.status.st_uid),
-                           qz::number(cache_.status.st_gid), qz::number(acl_.status.st_mode),
-                           qz::number(cache_.status.st_mode));
-        return false;
-    }
-    return true;
-}
-
 // Takes the buffer from the cache. False, with nothing recorded, when anything about it is wrong.
 bool acl_file_reader::read_cache(sec_acl_buffer_t &out) {
     qz::file_bytes bytes;
-    int result = qz::read_vetted_file(cache_, by_library, bytes);
+    int result = qz::read_cache_of(acl_, cache_, by_library, bytes);
     if (result == SEC_S_OK && (bytes.length == 0 || bytes.length > INT32_MAX))
         return false;
     if (result == SEC_S_OK && (flags_ & SEC_READ_ACL_CONVERT) != 0) {
@@ -179,7 +144,7 @@ int acl_file_reader::read_once(const char *aclfname, sec_acl_buffer_t &out) {
         flags_ &= ~std::uint32_t{SEC_READ_ACL_CACHE};
         return SEC_S_OK;
     }
-    if (!reads_text() && !cache_is_current())
+    if (!reads_text() && !qz::cache_is_current(acl_, cache_))
         flags_ |= SEC_READ_ACL_TEXT;
     if (perf_level_ == 1)
         qz::trace_elapsed(1, start_, qz::item(reads_text() ? acl_.path.text : cache_.path.text));
