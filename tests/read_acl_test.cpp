@@ -27,7 +27,6 @@ struct read_acl_file : testing::Test {
 
 TEST_F(read_acl_file, reads_the_cache_when_it_is_current) {
     const std::string cut = example.substr(0, 30);
-    const std::string foreign = "\x85\1\1\0\1\0\0\0\x1a\4\0\0\0\1\5abcd\0\1\0\0\0\3\0\4xyz\0"s;
     // The text, 100 s old; what is cached, its age and mode; the flags before and after; what is read.
     const std::tuple<std::string, std::string, int, unsigned, unsigned, unsigned, std::string> rows[] = {
         {acl_text, "", 0, 0, convert | 0xf8, text | 0xf8, from_text}, // no file
