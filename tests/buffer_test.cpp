@@ -74,7 +74,8 @@ TEST(validate, checks_every_rule_in_its_order) {
         {"two faults", one(of_mechanism(4, "m", 2, with(xyz, 0, 0) + endless)), located(43, 112, {"0"})},
         // After a faulty entry the walk stands at that entry, where no further sub-ACL starts.
         {"a faulty entry before a sub-ACL", packed_acl(2, with(other, 10, 2) + other), structural},
-        {"one where a sub-ACL starts", packed_acl(2, headless + other), located(43, 112, {"17"})},
+        {"one where a sub-ACL starts", packed_acl(2, headless + other),
+         located(43, 112, {is_low_byte_first ? "17" : "0"})}, // the first byte of its length
     };
     for (const auto &[name, bytes, error] : rows) {
         buffer held(bytes);

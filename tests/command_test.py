@@ -109,12 +109,14 @@ class CommandCase(unittest.TestCase):
 
 USAGE = message(80)
 LINE_OF_A = entry("n", "r")
-UNKNOWN_X = f"{COMMAND}: invalid option -- 'x'\n"
+# The C library musl says it in other words, and knows no locales but "C" and such in UTF-8.
+IS_MUSL = b"/ld-musl-" in pathlib.Path(COMMAND).read_bytes()
+UNKNOWN_X = f"{COMMAND}: " + ("unrecognized option: x\n" if IS_MUSL else "invalid option -- 'x'\n")
+LACKS_ARGUMENT = f"{COMMAND}: option requires an argument" + (": %s\n" if IS_MUSL else " -- '%s'\n")
 OPTIONS = [  # arguments, status, standard error; the file "a" holds the line "n r"
     ("-c -s -v -t p", 4, message(148) + USAGE),
     ("-c -s -S -v -t p -u q -f a -h", 0, message(81)),
-    *[(f"-{letter}", 4, f"{COMMAND}: option requires an argument -- '{letter}'\n" + message(147) + USAGE)
-      for letter in "ftu"],
+    *[(f"-{letter}", 4, LACKS_ARGUMENT % letter + message(147) + USAGE) for letter in "ftu"],
     ("-x -h", 0, UNKNOWN_X + message(147)), ("-h -x", 4, UNKNOWN_X + message(147) + USAGE),
     *[(f"-{letter} -f a -{letter}", 4, message(146, f"-{letter}") + USAGE) for letter in "chsSv"],
     *[(f"-{letter} p -{letter} q", 4, message(146, f"-{letter}") + USAGE) for letter in "ftu"],
@@ -182,6 +184,8 @@ class Command(CommandCase):
         self.assertEqual(told[1].count("3417-157"), 1)  # the user, and neither of the groups
         for environment in self.locale("tr_TR.ISO-8859-9"), self.locale("tr_TR.UTF-8"), {"LC_ALL": "not.known"}:
             self.assertEqual(run(["-c", "-f", "a"], self.dir, environment), told)
+        if IS_MUSL:
+            return
         # More bytes than usual are white space: they end a token, but do not stand between two.
         rules = pathlib.Path("/usr/share/i18n/locales/i18n_ctype").read_text("utf-8")
         rules = rules.replace("\nspace /", "\nspace /\n<U00A0>;/")
