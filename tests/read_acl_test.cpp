@@ -64,6 +64,30 @@ TEST_F(read_acl_file, reads_the_cache_when_it_is_current) {
     }
 }
 
+TEST_F(read_acl_file, knows_times_after_2038) {
+    constexpr time_t later = 4000000000;
+    write_file(path, acl_text);
+    write_file(cache_path, example);
+    const auto stamp = [](const std::string &name, time_t seconds) {
+        const timespec times[2] = {{seconds, 0}, {seconds, 0}};
+        return utimensat(AT_FDCWD, name.c_str(), times, 0);
+    };
+    ASSERT_EQ(stamp(path, later) | stamp(cache_path, later + 1), 0);
+    EXPECT_EQ(read(path, 0), given(example, 0));
+    ASSERT_EQ(stamp(cache_path, later), 0);
+    EXPECT_EQ(read(path, 0), given(from_text, text));
+}
+
+// A file of 4 GiB is none without bytes, and one of a byte less does not go into a block of none.
+TEST_F(read_acl_file, larger_than_memory_can_be_does_not_fit) {
+    if (sizeof(size_t) > 4) GTEST_SKIP() << "any file may fit";
+    for (const off_t size : {off_t{1} << 32, (off_t{1} << 32) - 1}) {
+        write_file(path, "");
+        ASSERT_EQ(truncate(path.c_str(), size), 0);
+        EXPECT_EQ(read(path, text), reading("", text, error_of(6, 89, {"sec_read_acl_file", "2147483647"})));
+    }
+}
+
 TEST_F(read_acl_file, reports_what_it_refuses) {
     EXPECT_EQ(read(folder.path, 0xf2), reading("", 0xf2, error_of(37, 122, {folder.path, "0"})));
     EXPECT_EQ(read("acl", cache, ""), reading("", cache, error_of(4, 121)));
