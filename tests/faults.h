@@ -87,12 +87,26 @@ inline void *counted(void *made) {
 
 } // namespace faults
 
+// Of the names that a call has for the linker, with large files and late times or without, a C library may lack some;
+// the code under test uses one of them.
 #define QZ_WRAPPED(result, name, parameters)                                                                           \
-    result __real_##name parameters;                                                                                   \
+    [[gnu::weak]] result __real_##name parameters;                                                                     \
     [[gnu::used]] inline result __wrap_##name parameters
 // A call that fails with -1, and one that may also fall short of what was asked for.
-#define QZ_WRAPPED_CALL(name, parameters, arguments)                                                                   \
-    QZ_WRAPPED(int, name, parameters) { return faults::next(#name) > 0 ? -1 : __real_##name arguments; }
+#define QZ_WRAPPED_AS(called, name, parameters, arguments)                                                             \
+    QZ_WRAPPED(int, name, parameters) { return faults::next(called) > 0 ? -1 : __real_##name arguments; }
+#define QZ_WRAPPED_CALL(name, parameters, arguments) QZ_WRAPPED_AS(#name, name, parameters, arguments)
+#define QZ_WRAPPED_STATUS(name, parameters, arguments)                                                                 \
+    QZ_WRAPPED_AS(#name, name, parameters, arguments)                                                                  \
+    QZ_WRAPPED_AS(#name, name##64, parameters, arguments)                                                              \
+    QZ_WRAPPED_AS(#name, __##name##64_time64, parameters, arguments)
+// Opening, and what a fortified call without a mode becomes.
+#define QZ_WRAPPED_OPEN(name, fortified)                                                                               \
+    QZ_WRAPPED(int, name, (const char *path, int flags, mode_t mode)) {                                                \
+        if (faults::is_watching) faults::opened = path;                                                                \
+        return faults::next("open") > 0 ? -1 : __real_##name(path, flags, mode);                                       \
+    }                                                                                                                  \
+    [[gnu::used]] inline int __wrap_##fortified(const char *path, int flags) { return __wrap_##name(path, flags, 0); }
 #define QZ_WRAPPED_TRANSFER(name, memory)                                                                              \
     QZ_WRAPPED(ssize_t, name, (int fd, memory bytes, size_t size)) {                                                   \
         const int fault = faults::next(#name);                                                                         \
@@ -120,18 +134,15 @@ QZ_WRAPPED(void, free, (void *memory)) {
     __real_free(memory);
 }
 
-QZ_WRAPPED_CALL(stat, (const char *path, struct stat *out), (path, out))
-QZ_WRAPPED_CALL(lstat, (const char *path, struct stat *out), (path, out))
-QZ_WRAPPED_CALL(fstat, (int fd, struct stat *out), (fd, out))
-QZ_WRAPPED(int, open, (const char *path, int flags, mode_t mode)) {
-    if (faults::is_watching) faults::opened = path;
-    return faults::next("open") > 0 ? -1 : __real_open(path, flags, mode);
-}
-// What a fortified call without a mode becomes.
-[[gnu::used]] inline int __wrap___open_2(const char *path, int flags) { return __wrap_open(path, flags, 0); }
+QZ_WRAPPED_STATUS(stat, (const char *path, struct stat *out), (path, out))
+QZ_WRAPPED_STATUS(lstat, (const char *path, struct stat *out), (path, out))
+QZ_WRAPPED_STATUS(fstat, (int fd, struct stat *out), (fd, out))
+QZ_WRAPPED_OPEN(open, __open_2)
+QZ_WRAPPED_OPEN(open64, __open64_2)
 QZ_WRAPPED_CALL(fchown, (int fd, uid_t user, gid_t group), (fd, user, group))
 QZ_WRAPPED_CALL(fchmod, (int fd, mode_t mode), (fd, mode))
 QZ_WRAPPED_CALL(futimens, (int fd, const timespec *times), (fd, times))
+QZ_WRAPPED_AS("futimens", __futimens64, (int fd, const timespec *times), (fd, times))
 QZ_WRAPPED_CALL(fdatasync, (int fd), (fd))
 QZ_WRAPPED_CALL(rename, (const char *from, const char *to), (from, to))
 QZ_WRAPPED_CALL(unlink, (const char *path), (path))

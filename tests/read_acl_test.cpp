@@ -27,7 +27,6 @@ struct read_acl_file : testing::Test {
 
 TEST_F(read_acl_file, reads_the_cache_when_it_is_current) {
     const std::string cut = example.substr(0, 30);
-    const std::string foreign = "\x85\1\1\0\1\0\0\0\x1a\4\0\0\0\1\5abcd\0\1\0\0\0\3\0\4xyz\0"s;
     std::string unsound = foreign;
     unsound[20] = 9; // the version of its entry
     // The text, 100 s old; what is cached, its age and mode; the flags before and after; what is read.
@@ -95,6 +94,30 @@ TEST_F(read_acl_file, reads_the_cache_when_its_entries_are_those_of_the_text) {
         EXPECT_EQ(read(path, cache | convert), is_believed ? given(example, convert) : given(from_text, text));
         fs::remove(path);
         fs::remove(cache_path);
+    }
+}
+
+TEST_F(read_acl_file, knows_times_after_2038) {
+    constexpr time_t later = 4000000000;
+    write_file(path, acl_text);
+    write_file(cache_path, example);
+    const auto stamp = [](const std::string &name, time_t seconds) {
+        const timespec times[2] = {{seconds, 0}, {seconds, 0}};
+        return utimensat(AT_FDCWD, name.c_str(), times, 0);
+    };
+    ASSERT_EQ(stamp(path, later) | stamp(cache_path, later + 1), 0);
+    EXPECT_EQ(read(path, 0), given(example, 0));
+    ASSERT_EQ(stamp(cache_path, later), 0);
+    EXPECT_EQ(read(path, 0), given(from_text, text));
+}
+
+// A file of 4 GiB is none without bytes, and one of a byte less does not go into a block of none.
+TEST_F(read_acl_file, larger_than_memory_can_be_does_not_fit) {
+    if (sizeof(size_t) > 4) GTEST_SKIP() << "any file may fit";
+    for (const off_t size : {off_t{1} << 32, (off_t{1} << 32) - 1}) {
+        write_file(path, "");
+        ASSERT_EQ(truncate(path.c_str(), size), 0);
+        EXPECT_EQ(read(path, text), reading("", text, error_of(6, 89, {"sec_read_acl_file", "2147483647"})));
     }
 }
 

@@ -42,8 +42,10 @@
  * as they are.
  *
  * Byte order. A buffer's numbers are in the order of the host that wrote it, which byte 2 of the buffer
- * tells: 2 is host order. sec_convert_acl_to_host brings a buffer into host order; every other operation
- * takes host order only, and those that change or evaluate a buffer refuse any other (3417-115).
+ * tells: 2 for the low byte first (x86, most ARM), 1 for the high byte first (s390x). A host takes any other
+ * value than its own for the other order. sec_convert_acl_to_host brings a buffer into host order; every
+ * other operation takes host order only, and those that change or evaluate a buffer refuse any other
+ * (3417-115).
  *
  * Trust. A descriptor's length must be the true number of bytes behind data. Whatever those bytes are, no
  * operation reads or writes outside them, runs without end, or allocates more than they can fill. Bytes from

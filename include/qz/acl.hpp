@@ -485,7 +485,8 @@ public:
      */
     [[nodiscard]] int to_host(bool check = true) noexcept {
         const std::string_view held = bytes();
-        const bool converts = held.size() > 2 && held[2] != '\2';
+        constexpr char host_order = __BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__ ? 2 : 1;
+        const bool converts = held.size() > 2 && held[2] != host_order;
         const int code = sec_convert_acl_to_host(check ? 1 : 0, &buffer_);
         return code == SEC_S_OK && check && converts ? sec_convert_acl_to_host(1, &buffer_) : code;
     }

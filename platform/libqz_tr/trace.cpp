@@ -117,8 +117,8 @@ int tr_get_size_1(uint32_t *size) {
     if (size == nullptr)
         return TR_BAD_PARAMETER;
     const undisturbed_caller undisturbed;
-    const off_t bytes = trace_file::size();
-    *size = static_cast<uint32_t>(std::clamp<off_t>(bytes, 0, UINT32_MAX));
+    const std::int64_t bytes = trace_file::size();
+    *size = static_cast<uint32_t>(std::clamp<std::int64_t>(bytes, 0, UINT32_MAX));
     return bytes >= 0 ? TR_OK : TR_NO_FILE;
 }
 

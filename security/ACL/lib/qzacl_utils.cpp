@@ -5,10 +5,13 @@
 #include "qzacl_trace.h"
 #include "report.h"
 
+#include <algorithm>
 #include <cerrno>
+#include <cstdint>
 #include <cstdio>
 #include <fcntl.h>
 #include <langinfo.h>
+#include <limits>
 
 namespace {
 
@@ -74,9 +77,11 @@ int read_file(const char *file_name, int fd, const struct stat &vetted, qz::file
         file.is_replaced = true;
         return not_found(file_name, ESTALE);
     }
-    const auto size = static_cast<std::size_t>(status.st_size);
-    if (size == 0)
+    if (status.st_size == 0)
         return SEC_S_OK;
+    // On a 32-bit machine a file may be larger than memory can be, and its size wrap to that of a small one.
+    const auto size = static_cast<std::size_t>(std::min<std::uintmax_t>(
+        static_cast<std::uintmax_t>(status.st_size), std::numeric_limits<std::ptrdiff_t>::max()));
     auto text = qz::allocate<char>(size + 1);
     if (text == nullptr) {
         if (qz::traces(qz::trace_category::info))

@@ -52,7 +52,7 @@ constexpr int shown_size(Size size) {
         return size;
 }
 
-inline int report_no_memory(const char *function, std::size_t bytes) {
+inline int report_no_memory(const char *function, std::uint64_t bytes) {
     return report(SEC_S_NO_MEMORY, msg::no_memory, function, shown_size(bytes));
 }
 

@@ -3,7 +3,8 @@
 //
 //   Header             0  1  buffer type, 0x85
 //                      1  1  version, 1
-//                      2  1  byte order: 2 when all fields are in host order, anything else when not
+//                      2  1  byte order of all fields: 2 low byte first, 1 high byte first; a host takes
+//                            whatever is not its own for the other
 //                      3  2  number of sub-ACLs
 //
 //   Sub-ACL            0  4  its length: this header, the mechanism and the entries
@@ -18,7 +19,7 @@
 //                      7     identity
 //
 // Records follow each other without padding. One user entry, mechanism abcd, identity xyz, mask 3, takes
-// 31 bytes:
+// 31 bytes, on a host that puts the low byte first:
 //
 //   85 01 02 01 00 | 1a 00 00 00  04  01 00 00 00  05  61 62 63 64 00 | 01  03 00 00 00  04 00  78 79 7a 00
 #ifndef QZACL_BUFFER_FORMAT_H
@@ -28,6 +29,7 @@
 #include "qz/acl.h"
 
 #include <algorithm>
+#include <bit>
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
@@ -37,7 +39,7 @@ namespace qz::format {
 
 inline constexpr std::uint8_t buffer_type = 0x85;
 inline constexpr std::uint8_t buffer_version = 1;
-inline constexpr std::uint8_t host_order = 2;
+inline constexpr std::uint8_t host_order = std::endian::native == std::endian::little ? 2 : 1;
 inline constexpr std::uint8_t entry_version = 1;
 
 inline constexpr std::size_t header_size = 5;

@@ -1,6 +1,8 @@
 // Identities laid out for quick comparison, and sorting them.
 #include "qzacl_acl/identity_order.h"
 
+#include "libqz_cu/wide_product.h"
+
 #include <algorithm>
 #include <array>
 #include <bit>
@@ -24,9 +26,8 @@ constexpr std::uint64_t in_byte_order(std::uint64_t word) {
 }
 
 std::uint64_t mix(std::uint64_t a, std::uint64_t b) {
-    __extension__ using wide = unsigned __int128;
-    const wide product = static_cast<wide>(a) * b;
-    return static_cast<std::uint64_t>(product) ^ static_cast<std::uint64_t>(product >> 64);
+    const wide_number product = wide_product(a, b);
+    return product.high ^ product.low;
 }
 
 // The length of the folded prefix that all identities share.
@@ -81,7 +82,9 @@ void sort_keyed(std::span<keyed_acle> elements, std::span<keyed_acle> scratch, u
         std::sort(elements.begin(), elements.end(), sorts_before{});
         return;
     }
-    const auto digit = [shift](const keyed_acle &element) { return (element.key >> (56 - shift)) & 0xff; };
+    const auto digit = [shift](const keyed_acle &element) {
+        return static_cast<std::size_t>((element.key >> (56 - shift)) & 0xff);
+    };
     std::array<std::uint32_t, 257> starts{};
     for (const keyed_acle &element : elements)
         ++starts[digit(element) + 1];
