@@ -229,8 +229,8 @@ def _main(path, user, *groups):
         for entry in acl:
             print(entry)
         # The closest answer wins: the user, the user's domain, the groups, anybody.
-        for by, ask in (("user", lambda: acl.user("unix", user)), ("domain", lambda: acl.expanded("unix", user)),
-                        ("groups", lambda: acl.groups(groups)), ("any other", acl.any_other)):
+        for by, ask in (("user", lambda: acl.user("unix", user)), ("expanded", lambda: acl.expanded("unix", user)),
+                        ("group", lambda: acl.groups(groups)), ("any other", acl.any_other)):
             if (mask := ask()) is not None:
                 print(f"granted by {by}: {to_letters(mask) or 'nothing'}")
                 return
