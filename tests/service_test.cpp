@@ -29,6 +29,7 @@ qz::acl acl_of(const std::string &lines) {
     return std::move(*read);
 }
 
+// Borrows the names.
 std::vector<sec_group_ref_t> references(const arguments &names) {
     std::vector<sec_group_ref_t> made;
     for (const std::string &name : names) made.push_back({0, name.c_str()});
@@ -83,7 +84,8 @@ TEST(service, grants_what_the_cases_say) {
 
 TEST(service, explains_itself) {
     const qz::acl acl = acl_of("u unix Al@h.x r\ne unix .y w\ne unix .X w\ng Ops x\ng all w\no\n");
-    const auto groups = references({"ops", "none", "ALL"});
+    const arguments names = {"ops", "none", "ALL"};
+    const auto groups = references(names);
     const requester al = requester::user("UNIX", "al@H.x").in_groups(groups);
     EXPECT_EQ(explanation(acl, al, "rw", order::closest), "user: u unix Al@h.x r (decides)\n"
                                                           "expanded: e unix .X w\n"
@@ -153,7 +155,7 @@ public:
         return made;
     }
     qz::acl acl() {
-        qz::acl made = std::move(*qz::acl::create_empty());
+        qz::acl made = *qz::acl::create_empty();
         for (auto left = random_() % 24; left != 0; --left) {
             const std::uint8_t type = static_cast<std::uint8_t>(1u << random_() % 5);
             const std::string name = type == 16  ? any_of({"ops", "audit", "staff"})

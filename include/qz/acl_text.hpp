@@ -33,8 +33,7 @@ public:
 
     text &append(std::string_view more) noexcept {
         if (reserve(size_ + more.size() + 1)) {
-            std::memcpy(bytes_.get() + size_, more.data(), more.size());
-            size_ += more.size();
+            size_ += more.copy(bytes_.get() + size_, more.size());
             bytes_.get()[size_] = '\0';
         }
         return *this;
