@@ -60,12 +60,12 @@ static int decide(const sec_acl_buffer_t *acl, const char *user, const sec_group
     if (result == SEC_S_BAD_ACLE) {
         result = sec__single_acle_perm(acl, SEC_ACLE_EXPANDED, mechanism, NULL, user, &mask);
         if (result == SEC_S_OK)
-            return granted("domain", mask);
+            return granted("expanded", mask);
     }
     if (result == SEC_S_BAD_ACLE && count > 0) {
         result = sec__group_acles_perm(acl, count, groups, &mask);
         if (result == SEC_S_OK)
-            return granted("groups", mask);
+            return granted("group", mask);
     }
     if (result == SEC_S_BAD_ACLE) {
         result = sec__single_acle_perm(acl, SEC_ACLE_ANYOTHER, mechanism, NULL, NULL, &mask);
