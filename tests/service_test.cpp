@@ -157,7 +157,7 @@ public:
     qz::acl acl() {
         qz::acl made = *qz::acl::create_empty();
         for (auto left = random_() % 24; left != 0; --left) {
-            const std::uint8_t type = static_cast<std::uint8_t>(1u << random_() % 5);
+            const auto type = static_cast<std::uint8_t>(1u << random_() % 5);
             const std::string name = type == 16  ? any_of({"ops", "audit", "staff"})
                                      : type == 8 ? any_of({".x", "h.x", "k.y", ".Y", "al@h.x", "X"})
                                                  : identity();
