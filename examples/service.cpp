@@ -1,8 +1,9 @@
-// The service of service.c in C++, which service.hpp makes shorter: it decides by the same rules and says the same.
+// The service of service.c in C++, which service.hpp makes shorter: the same rules, the same output.
 //
 // usage: service_cpp ACL-FILE USER@HOST [GROUP...]
 #include <qz/service.hpp>
 
+#include <clocale>
 #include <cstdio>
 #include <vector>
 
@@ -10,13 +11,13 @@ namespace {
 
 constexpr char mechanism[] = "unix";
 
-// Says why the last operation failed.
+// Prints why the last operation failed.
 int failed(const char *what) {
     std::fprintf(stderr, "%s: %s", what, qz::error::current().text().data());
     return 1;
 }
 
-// The closest answer wins: what is said about the user, the user's domain, the groups, anybody.
+// The most specific match decides: the user, else the user's domain, else the groups together, else any other.
 int decide(const qz::acl &acl, const char *user, const std::vector<sec_group_ref_t> &groups) {
     const auto answer = qz::decide(acl, qz::requester::user(mechanism, user).in_groups(groups), 0);
     const auto letters = qz::to_letters(answer->granted());
@@ -30,7 +31,7 @@ int decide(const qz::acl &acl, const char *user, const std::vector<sec_group_ref
     return 0;
 }
 
-// Grants a user without an entry of its own reading, asks again, and takes it back; the file does not change.
+// Adds an entry for a user who has none, asks again, and deletes it. Only the ACL in memory changes.
 int edit(qz::acl &acl, const char *user) {
     const auto entry = qz::acl_entry::create(SEC_ACLE_USER, *qz::to_mask("r"), mechanism, user);
     const int added = entry ? acl.add_new(*entry) : entry.code();
@@ -50,6 +51,7 @@ int edit(qz::acl &acl, const char *user) {
 } // namespace
 
 int main(int argc, char **argv) {
+    std::setlocale(LC_ALL, ""); // before the library first converts a name or fetches a message
     if (argc < 3) {
         std::fputs("usage: service_cpp ACL-FILE USER@HOST [GROUP...]\n", stderr);
         return 2;
@@ -63,8 +65,10 @@ int main(int argc, char **argv) {
     auto acl = qz::acl::read_file(argv[1], nullptr, nullptr, flags, &flags);
     if (!acl)
         return failed(argv[1]);
-    std::printf("read from %s, %zu bytes%s\n", (flags & SEC_READ_ACL_TEXT) != 0 ? "the text" : "the cache",
-                acl->bytes().size(), (flags & SEC_READ_ACL_CACHE) != 0 ? ", cached" : "");
+    // An empty file has no cache and sets no flag.
+    const char *source = acl->bytes().empty() || (flags & SEC_READ_ACL_TEXT) != 0 ? "text" : "cache";
+    std::printf("read from the %s, %zu bytes%s\n", source, acl->bytes().size(),
+                (flags & SEC_READ_ACL_CACHE) != 0 ? ", cached" : "");
     const int status = decide(*acl, argv[2], groups);
     return status == 0 ? edit(*acl, argv[2]) : status;
 }

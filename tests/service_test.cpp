@@ -16,11 +16,12 @@ using qz::who;
 
 const std::string folder_of_examples = QZ_SOURCE "/examples/";
 const std::string service_text = read_file(folder_of_examples + "service.acl");
+int is_alias(const char *requested, const char *entry) { return requested == "root"s && entry == "admin"s ? 0 : 1; }
 [[maybe_unused]] const int registered[] = {
     sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "unix", qz::domain_handler),
     sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "hba2", qz::domain_handler),
     sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "krb5", qz::exact_handler),
-    sec__register_id_handler(SEC_ID_HANDLER_USER, "krb5", qz::exact_handler),
+    sec__register_id_handler(SEC_ID_HANDLER_USER, "krb5", is_alias),
 };
 
 qz::acl acl_of(const std::string &lines) {
@@ -157,7 +158,7 @@ public:
     qz::acl acl() {
         qz::acl made = *qz::acl::create_empty();
         for (auto left = random_() % 24; left != 0; --left) {
-            const std::uint8_t type = static_cast<std::uint8_t>(1u << random_() % 5);
+            const auto type = static_cast<std::uint8_t>(1u << random_() % 5);
             const std::string name = type == 16  ? any_of({"ops", "audit", "staff"})
                                      : type == 8 ? any_of({".x", "h.x", "k.y", ".Y", "al@h.x", "X"})
                                                  : identity();
@@ -217,6 +218,15 @@ TEST(service, handlers_know_hosts) {
         EXPECT_EQ(qz::domain_handler(requested, held) == 0, by_domain) << requested << " " << held;
         EXPECT_EQ(qz::exact_handler(requested, held) == 0, by_name) << requested << " " << held;
     }
+}
+
+TEST(service, finds_the_entry_that_a_handler_of_users_accepts) {
+    const qz::acl acl = acl_of("u krb5 admin rw\nu krb5 Root x\n");
+    const requester root = requester::user("krb5", "root");
+    EXPECT_EQ(qz::decide(acl, root, 1)->begin()->entry.identity, "Root");
+    const auto through = qz::decide(acl, root.through_handler(), 1);
+    EXPECT_EQ(through->begin()->entry.identity, "admin");
+    EXPECT_EQ(through->granted(), 3u);
 }
 
 TEST(service, what_cannot_be_asked_grants_nothing) {

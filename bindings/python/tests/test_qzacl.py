@@ -211,6 +211,20 @@ def test_a_live_acl_keeps_the_last_good_one(tmp_path):
         live.snapshot().close()
 
 
+def test_a_live_acl_reads_again_what_is_exchanged_meanwhile(tmp_path, monkeypatch):
+    path = tmp_path / "live.acl"
+    path.write_text("o r\n")
+
+    def exchange(*arguments, **named):
+        monkeypatch.undo()
+        path.write_text("o rw\n")
+        raise qzacl.Error(37)
+
+    live = qzacl.LiveAcl(path)
+    monkeypatch.setattr("qzacl._live.Acl.read", exchange)
+    assert live.refresh() and live.snapshot().any_other() == 3
+
+
 def test_a_live_acl_reads_foreign_caches_only_when_told(tmp_path):
     path, cache = tmp_path / "live.acl", tmp_path / "live.acl.cacl"
     path.write_text("o r\n")
