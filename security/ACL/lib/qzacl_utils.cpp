@@ -58,9 +58,8 @@ int convert(const char *function, cu_iconv_t handle, const char *in, const std::
 
 // Whether the file is the one that was vetted by its name, and still owned and protected as it was then.
 bool is_as_vetted(const struct stat &opened, const struct stat &vetted) {
-    return qz::same_file(opened, vetted) && S_ISREG(opened.st_mode) &&
-           opened.st_mode == vetted.st_mode && opened.st_uid == vetted.st_uid &&
-           opened.st_gid == vetted.st_gid;
+    return qz::same_file(opened, vetted) && S_ISREG(opened.st_mode) && opened.st_mode == vetted.st_mode &&
+           opened.st_uid == vetted.st_uid && opened.st_gid == vetted.st_gid;
 }
 
 int not_found(const char *file_name, int error) {

@@ -28,6 +28,13 @@ bool is_unchanged(const char *path, const struct stat &examined) {
     return qz::same_file(now, examined) && has_same_owner(now, examined) && now.st_mode == examined.st_mode;
 }
 
+// True when the text says what was read, or is so late that a cache of what was read is not believed: who copies an
+// old file over it may keep its number, and gives it the old time.
+bool is_text_of(const struct stat &status, const qz::text_origin &origin) {
+    return qz::same_file(status, origin.file) && S_ISREG(status.st_mode) &&
+           (status.st_mtime == origin.file.st_mtime || status.st_mtime >= origin.time.tv_sec);
+}
+
 int owner_differs(const char *aclfname, const char *cache_name, const struct stat &text,
                   const struct stat &cache) {
     if (qz::traces(qz::trace_category::errors))
@@ -101,7 +108,7 @@ bool cache_has_entries_of_text(const vetted_file &text, const vetted_file &cache
 int text_protection::examine(const char *aclfname, const text_origin &origin) {
     if (stat(aclfname, &status) != 0)
         return query_failed(aclfname, "stat()", aclfname, errno);
-    if (!same_file(status, origin.file) || !S_ISREG(status.st_mode))
+    if (!is_text_of(status, origin))
         return query_failed(aclfname, "stat()", aclfname, ESTALE);
     if (!entries.read(aclfname))
         return query_failed(aclfname, "getxattr()", aclfname, errno);
