@@ -220,6 +220,9 @@ TEST(service, stays_within_bytes_that_are_no_acl) {
         EXPECT_TRUE(answer || (answer->size() == 0 && answer->granted() == 0));
         EXPECT_TRUE(answer->explain() || answer->explain().code() == SEC_S_BAD_PERMISSION);
         EXPECT_EQ(qz::same(*acl, *acl).code() == SEC_S_OK, acl->list().code() == SEC_S_OK);
+        // Further than any decision looks.
+        const auto never = [](const qz::entry_fields &entry) { return entry.identity == "nobody"; };
+        EXPECT_EQ(qz::detail::find_entry(acl->bytes(), SEC_ACLE_USER, "unix", never).type, 0);
     }
 }
 
