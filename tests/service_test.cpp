@@ -145,7 +145,8 @@ class generator {
 public:
     explicit generator(unsigned seed) : random_(seed) {}
 
-    std::string any_of(const arguments &words) { return words[random_() % words.size()]; }
+    std::size_t below(std::size_t limit) { return random_() % limit; }
+    std::string any_of(const arguments &words) { return words[below(words.size())]; }
     std::string mechanism() { return any_of({"unix", "hba2", "krb5", "none"}); }
     std::string identity() {
         return any_of({"al", "Al", "bob", "carol"}) + any_of({"", "@"}) + any_of({"h.x", "H.x", "k.y", "x"});
@@ -202,6 +203,26 @@ TEST(service, decides_as_the_questions_of_the_c_interface_do) {
             EXPECT_EQ(qz::granted(acl, whom, taken).permissions(), mask);
             expect_entries_of(acl, *answer);
         }
+    }
+}
+
+TEST(service, stays_within_bytes_that_are_no_acl) {
+    generator random(7);
+    for (int round = 0; round < 3000; ++round) {
+        std::string bytes(random.acl().bytes());
+        for (auto left = random.below(4); left != 0; --left)
+            bytes[random.below(bytes.size())] = static_cast<char>(random.below(256));
+        bytes.resize(bytes.size() - random.below(2));
+        const auto acl = qz::acl::from_bytes(bytes.data(), bytes.size());
+        const arguments names = random.groups();
+        const auto groups = references(names);
+        const auto answer = qz::decide(*acl, requester::user("unix", "al@h.x").in_groups(groups), 1);
+        EXPECT_TRUE(answer || (answer->size() == 0 && answer->granted() == 0));
+        EXPECT_TRUE(answer->explain() || answer->explain().code() == SEC_S_BAD_PERMISSION);
+        EXPECT_EQ(qz::same(*acl, *acl).code() == SEC_S_OK, acl->list().code() == SEC_S_OK);
+        // Further than any decision looks.
+        const auto never = [](const qz::entry_fields &entry) { return entry.identity == "nobody"; };
+        EXPECT_EQ(qz::detail::find_entry(acl->bytes(), SEC_ACLE_USER, "unix", never).type, 0);
     }
 }
 

@@ -176,8 +176,8 @@ inline int append_entry(text &line, const entry_fields &entry, const sec_perm_se
 
 /*
  * An identity as sec_create_acle stores that of a user, but for the code set: with the mechanism "unix" or
- * "hba2", in any letter case, an IPv6 address behind the first '@' in its one form. What sec_create_acle would
- * refuse stays as it is.
+ * "hba2", in any letter case, an IPv6 address behind the first '@' in its one form. What sec_create_acle
+ * would refuse stays as it is.
  *
  *   mechanism, identity   UTF-8; null gives identity
  *   kept                  holds the result where it is not identity itself; failed() when memory ran out
@@ -229,8 +229,8 @@ inline int append_line(text &lines, entry_view entry, const sec_perm_set_t *set)
 } // namespace detail
 
 /*
- * Writes an ACL as the text of an ACL file: sub-ACLs from last to first and their entries in stored order, which
- * compiles to the same bytes again.
+ * Writes an ACL as the text of an ACL file: sub-ACLs from last to first and their entries in stored order,
+ * which compiles to the same bytes again.
  *
  *   set   null: acl__default_perm_set
  *

@@ -95,8 +95,8 @@ struct party_answer {
 };
 
 /*
- * A decision: all answers, which of them decide, and what is granted. Movable. Its texts are good as long as the
- * ACL does not change and the requester's texts live; an answer from a snapshot keeps that itself.
+ * A decision: all answers, which of them decide, and what is granted. Movable. Its texts are good as long as
+ * the ACL does not change and the requester's texts live; an answer from a snapshot keeps that itself.
  */
 class answer {
 public:
@@ -130,8 +130,8 @@ public:
      *   wanted rw: no             (unless nothing was wanted)
      *
      *   write   called as write(std::string_view line) for each, which ends with a line feed
-     *   place   called as place(const party_answer &) for each entry; returns a text, "FILE:LINE" for example;
-     *           when it is empty, ": " is left out, too
+     *   place   called as place(const party_answer &) for each entry; returns a text, "FILE:LINE" for
+     *           example; when it is empty, ": " is left out, too
      *   set     null: acl__default_perm_set
      *
      * Codes: those of to_letters, before anything is written; 6.

@@ -175,16 +175,16 @@ private:
 
 /*
  * Decides what a requester may do, and tells every answer with its entry. Which user-expanded entry a handler
- * accepted is found by asking it again about one after the other; should it then accept none, the entry has no
- * identity.
+ * accepted is found by asking it again about one after the other; should it then accept none, the entry has
+ * no identity.
  *
  *   acl      may be without bytes, as that of a file without entries: nothing is granted
  *   wanted   permissions, of which answer::allowed tells whether all are granted; 0: nothing is wanted, and
  *            nothing allowed
  *   taken    the order in which answers are taken
  *
- * Codes: those of sec__single_acle_perm and sec__group_acles_perm, but for 43; 6. That there is no entry is an
- * answer. After a failure the answer grants nothing.
+ * Codes: those of sec__single_acle_perm and sec__group_acles_perm, but for 43; 6. That there is no entry is
+ * an answer. After a failure the answer grants nothing.
  */
 inline result<answer> decide(const acl &acl, const requester &whom, std::uint32_t wanted,
                              order taken = order::closest) noexcept {

@@ -79,9 +79,9 @@ struct file_stamp {
     }
 
     /*
-     * Whether every change from now on gives another stamp. The system takes the time of a change from its coarse
-     * clock, which ticks at least every 10 ms; a time of whole seconds may come from a file system that keeps
-     * no more, and those of some have two.
+     * Whether every change from now on gives another stamp. The system takes the time of a change from its
+     * coarse clock, which ticks at least every 10 ms; a time of whole seconds may come from a file system
+     * that keeps no more, and those of some have two.
      */
     [[nodiscard]] bool is_settled(const timespec &now) const noexcept {
         constexpr long long second = 1000000000, tick = second / 50;
@@ -97,8 +97,8 @@ struct file_stamp {
 } // namespace detail
 
 /*
- * An ACL file as it is now: any number of threads take the snapshot and decide by it, while refresh, in one of them
- * or in several, reads the file anew when it has changed.
+ * An ACL file as it is now: any number of threads take the snapshot and decide by it, while refresh, in one
+ * of them or in several, reads the file anew when it has changed.
  */
 class live_acl {
 public:
@@ -112,7 +112,7 @@ public:
     explicit live_acl(const char *path, const sec_perm_set_t *set = nullptr) noexcept
         : live_acl(path, set, SEC_READ_ACL_TEXT) {}
 
-    /* Follows a file whose cache may be read as well, because everybody reads it with the default permissions. */
+    /* Follows a file whose cache may be read, too, because everybody reads it with the default permissions. */
     live_acl(const char *path, default_permissions_t) noexcept
         : live_acl(path, nullptr, SEC_READ_ACL_CONVERT) {}
 
@@ -120,12 +120,12 @@ public:
     live_acl &operator=(const live_acl &) = delete;
 
     /*
-     * Reads the file if its device, number, size or one of its times is another than at the last reading, or if it
-     * had changed so shortly before that a further change might show the same times. What was read becomes the
-     * snapshot unless it is the same bytes. Clears the recorded error.
+     * Reads the file if its device, number, size or one of its times is another than at the last reading, or
+     * if it had changed so shortly before that a further change might show the same times. What was read
+     * becomes the snapshot unless it is the same bytes. Clears the recorded error.
      *
-     * The value tells whether there is a new snapshot. After a failure the last good one stays, the recorded error
-     * says what is wrong, and the next refresh tries again.
+     * The value tells whether there is a new snapshot. After a failure the last good one stays, the recorded
+     * error says what is wrong, and the next refresh tries again.
      *
      * Codes: those of sec_read_acl_file; 6.
      * Threads: shared; several at once wait for each other.

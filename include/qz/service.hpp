@@ -1,14 +1,14 @@
 /*
- * What every service does with an ACL, for C++17 and later, over <qz/acl.hpp>: reading it anew when its file changes,
- * deciding in an agreed order and saying why, and handlers for hosts.
+ * What every service does with an ACL, for C++17 and later, over <qz/acl.hpp>: reading it anew when its file
+ * changes, deciding in an agreed order and saying why, and handlers for hosts.
  *
- *   qz::live_acl acl("/etc/jobs.acl");                                         // its text: see live_acl
+ *   qz::live_acl acl("/etc/jobs.acl"); // its text: see live_acl
  *   sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "unix", qz::domain_handler);
  *
- *   if (!acl.refresh())                                                        // before each request, or by a timer
- *       log(qz::error::current().text());                                      // the last good one stays
- *   const auto answer = qz::decide(acl.snapshot(), qz::requester::user("unix", "alice@head").in_groups(groups),
- *                                  wanted);
+ *   if (!acl.refresh()) // before each request, or by a timer; the last good one stays
+ *       log(qz::error::current().text());
+ *   const auto alice = qz::requester::user("unix", "alice@head.example").in_groups(groups);
+ *   const auto answer = qz::decide(acl.snapshot(), alice, wanted);
  *   if (!answer || !answer->allowed())
  *       deny(answer->explain()->view());
  *
@@ -20,9 +20,9 @@
  *   <qz/acl_text.hpp>   to_text, from_text, same, stored_identity, append_entry; text
  *
  * Everything keeps the rules of <qz/acl.hpp> and <qz/acl.h>: codes, recorded errors, owners, threads; neither
- * exceptions nor RTTI are needed, and nothing throws. "Not recorded" stands at a failure that these headers find
- * themselves, as it holds for their 6: the code is all, and no error is recorded then. Const operations and
- * functions are "Threads: shared".
+ * exceptions nor RTTI are needed, and nothing throws. "Not recorded" stands at a failure that these headers
+ * find themselves, as it holds for their 6: the code is all, and no error is recorded then. Const operations
+ * and functions are "Threads: shared".
  */
 #ifndef QZ_SERVICE_HPP
 #define QZ_SERVICE_HPP

@@ -1,6 +1,6 @@
 /*
- * Finds the entry behind an answer in the bytes of a compiled ACL, in place: the part of <qz/service.hpp> that
- * knows these bytes. Nothing here is for callers.
+ * Finds the entry behind an answer in the bytes of a compiled ACL, in place: the part of <qz/service.hpp>
+ * that knows these bytes. Nothing here is for callers.
  */
 #ifndef QZ_STORED_ENTRY_HPP
 #define QZ_STORED_ENTRY_HPP
