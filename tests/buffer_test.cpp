@@ -92,7 +92,7 @@ TEST(validate, checks_every_rule_in_its_order) {
 TEST(validate, converts_the_other_byte_order) {
     EXPECT_EQ(one(of_mechanism(4, "abcd", 1, xyz)), example);
     // What is not the sign of this host's order is the other one; what is wrong then is not looked for by this call.
-    for (const auto &[offset, value] : {std::pair(2u, 255), {9u, 99}, {20u, 9}}) {
+    for (const auto &[offset, value] : {std::pair(2u, 255u), {9u, 99u}, {20u, 9u}}) {
         buffer held(with(foreign, offset, value) + "behind");
         EXPECT_EQ(after(sec_convert_acl_to_host(1, &held.acl)), no_error);
         EXPECT_EQ(held.bytes(), offset == 2 ? example + "behind" : with(example, offset, value) + "behind");
