@@ -64,7 +64,7 @@ int read_entries(qz::file_bytes &contents, unsigned flags, sec_acltree_array &tr
     char *cursor = contents.data.get();
     std::size_t remaining = contents.length + 1;
     std::uint32_t line = 1;
-    sec_acle_t entry = {};
+    qz::parsed_acle entry;
     for (;;) {
         int result = sec__read_acle_from_text(&acl__default_perm_set, &cursor, &remaining, &line, &entry);
         if (result == SEC_S_OK)
@@ -73,9 +73,11 @@ int read_entries(qz::file_bytes &contents, unsigned flags, sec_acltree_array &tr
         if (result == line_consumed) {
             if (entry.type == 0)
                 continue;
-            if ((flags & ACLFCK_OPT_VERBOSE) != 0)
-                sec__dump_acle(&entry, nullptr, "");
-            result = sec__add_acle_to_trees(&entry, trees);
+            if ((flags & ACLFCK_OPT_VERBOSE) != 0) {
+                const sec_acle_t shown = qz::record_of(entry);
+                sec__dump_acle(&shown, nullptr, "");
+            }
+            result = sec__add_acle_to_trees(qz::view_of(entry), trees);
             if (result == SEC_S_OK)
                 continue;
             may_go_on = goes_on && result == SEC_S_BAD_ACLE;

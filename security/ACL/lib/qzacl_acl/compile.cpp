@@ -54,9 +54,8 @@ void write(qz::byte_writer &writer, const measured_subacl &subacl) {
 bool has_entries(const sec_acltree_t *root) { return root != nullptr && root->held_count() != 0; }
 
 // The parts of an expanded entry that all entries of a sub-ACL share.
-int common_part(const format::subacl &head, sec_acle_t &acle) {
-    acle = {};
-    acle.type = head.type;
+int common_part(const format::subacl &head, qz::acle_view &acle) {
+    acle = {.type = head.type};
     if (!qz::is_acle_type(head.type))
         return qz::report_corrupt(__LINE__);
     if (!qz::has_mechanism(head.type))
@@ -68,13 +67,13 @@ int common_part(const format::subacl &head, sec_acle_t &acle) {
                           qz::acl_source, __LINE__);
     if (mechanism == nullptr)
         return qz::report_corrupt(__LINE__);
-    std::memcpy(acle.mechanism, mechanism, length);
+    acle.mechanism = {mechanism, length};
     return SEC_S_OK;
 }
 
 int expand(qz::byte_reader reader, const format::subacl &head, sec_acltree_t **root) {
     const bool is_traced = qz::traces(qz::trace_category::api);
-    sec_acle_t acle = {};
+    qz::acle_view acle;
     if (const int result = common_part(head, acle); result != SEC_S_OK)
         return result;
     for (std::uint32_t left = head.entry_count; left != 0; --left) {
@@ -86,13 +85,12 @@ int expand(qz::byte_reader reader, const format::subacl &head, sec_acltree_t **r
             const char *identity = format::string_in(entry.identity);
             if (identity == nullptr)
                 return qz::report_corrupt(__LINE__);
-            // The tree copies the identity; nothing writes through this pointer.
-            acle.identity = const_cast<char *>(identity);
+            acle.identity = identity;
         }
-        if (const int result = sec__add_acle_to_tree(0, &acle, root); result != SEC_S_OK)
+        if (const int result = sec__add_acle_to_tree(0, acle, root); result != SEC_S_OK)
             return result;
         if (is_traced)
-            sec__trace_release(&acle);
+            sec__trace_release(&acle, acle);
     }
     return SEC_S_OK;
 }

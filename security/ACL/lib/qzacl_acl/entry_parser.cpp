@@ -13,6 +13,7 @@
 #include "qzacl_trace.h"
 #include "report.h"
 
+#include <algorithm>
 #include <cctype>
 #include <cstring>
 
@@ -116,7 +117,7 @@ private:
 };
 
 // Fills the entry from the tokens of a line; a line without any leaves its type 0.
-int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, sec_acle_t &entry) {
+int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, qz::parsed_acle &entry) {
     token type;
     if (!tokens.next(type))
         return SEC_S_OK;
@@ -133,13 +134,13 @@ int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, sec_acle
         for (std::size_t index = 0; index < mechanism.length; ++index)
             mechanism.text[index] =
                 static_cast<char>(qz::fold(static_cast<unsigned char>(mechanism.text[index])));
-        std::memcpy(entry.mechanism, mechanism.text, mechanism.length);
+        entry.mechanism = {mechanism.text, mechanism.length};
     }
     if (qz::has_identity(entry.type)) {
         token identity;
         if (!tokens.next(identity))
             return qz::report(SEC_S_BAD_ACL, qz::msg::tokens_missing, line);
-        entry.identity = identity.text;
+        entry.identity = {identity.text, identity.length};
     }
 
     token permissions;
@@ -160,8 +161,27 @@ int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, sec_acle
 
 } // namespace
 
+namespace qz {
+
+acle_view view_of(const parsed_acle &entry) {
+    acle_view view = {entry.perm_mask, entry.type};
+    if (!entry.mechanism.empty())
+        view.mechanism = {entry.mechanism.data(), entry.mechanism.size()};
+    if (entry.identity.data() != nullptr)
+        view.identity = {entry.identity.data(), entry.identity.size()};
+    return view;
+}
+
+sec_acle_t record_of(const parsed_acle &entry) {
+    sec_acle_t record = {entry.perm_mask, {}, entry.type, entry.identity.data()};
+    std::copy(entry.mechanism.begin(), entry.mechanism.end(), record.mechanism);
+    return record;
+}
+
+} // namespace qz
+
 int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size_t *remaining,
-                             std::uint32_t *line, sec_acle_t *entry) {
+                             std::uint32_t *line, qz::parsed_acle *entry) {
     constexpr int line_consumed = 1;
     *entry = {};
     char *begin = *cursor;
@@ -192,4 +212,12 @@ int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size
     *remaining -= length;
     ++*line;
     return result == SEC_S_OK ? line_consumed : result;
+}
+
+int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size_t *remaining,
+                             std::uint32_t *line, sec_acle_t *entry) {
+    qz::parsed_acle parsed;
+    const int result = sec__read_acle_from_text(set, cursor, remaining, line, &parsed);
+    *entry = qz::record_of(parsed);
+    return result;
 }

@@ -139,19 +139,20 @@ int acl_file_reader::parse_lines(qz::file_bytes &text, sec_acltree_array &trees)
     const bool traces_lines = qz::trace_level(qz::trace_category::info) > every_entry;
     char *cursor = text.data.get();
     std::size_t remaining = text.length + 1;
-    sec_acle_t entry = {};
+    qz::parsed_acle entry;
     for (;;) {
         const int result = sec__read_acle_from_text(set_, &cursor, &remaining, &line_, &entry);
         if (result != line_consumed)
             return result;
         if (traces_lines) {
             const std::uint32_t type = entry.type;
-            qz::trace_data(114, qz::number(line_), qz::number(type), qz::item(entry.mechanism),
-                           qz::item(entry.identity), qz::number(entry.perm_mask));
+            const qz::acle_view shown = qz::view_of(entry);
+            qz::trace_data(114, qz::number(line_), qz::number(type), qz::item(shown.mechanism),
+                           qz::item(shown.identity), qz::number(entry.perm_mask));
         }
         if (entry.type == 0)
             continue;
-        if (const int added = sec__add_acle_to_trees(&entry, trees); added != SEC_S_OK)
+        if (const int added = sec__add_acle_to_trees(qz::view_of(entry), trees); added != SEC_S_OK)
             return added;
     }
 }

@@ -1,6 +1,7 @@
 // Trees: the entries of one key, collected in the order in which they are compiled.
 #include "qzacl_acl/tree.h"
 
+#include "qzacl_acl/acle_report.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_trace.h"
 #include "report.h"
@@ -45,9 +46,6 @@ std::size_t node_size(std::size_t identity_length) {
     return sizeof(sec_acle_t) + qz::identity_words(identity_length) * sizeof(std::uint64_t);
 }
 
-// Single entries have no identity of their own; an empty one keeps their handling alike.
-const char *identity_of(const sec_acle_t &acle) { return acle.identity == nullptr ? "" : acle.identity; }
-
 std::uint32_t is_overlong(std::size_t identity_length) {
     return identity_length > qz::format::identity_max ? 1 : 0;
 }
@@ -58,9 +56,8 @@ std::size_t packed_size_of(std::uint8_t type, std::size_t identity_length) {
 
 } // namespace
 
-sec_acle_t *sec_acltree::copy_to_room(const sec_acle_t &acle, std::size_t identity_length,
-                                      std::size_t &size) {
-    size = node_size(identity_length);
+sec_acle_t *sec_acltree::copy_to_room(const qz::acle_view &acle, std::size_t &size) {
+    size = node_size(acle.identity.size());
     unsigned char *memory = arena_.room(size);
     if (memory == nullptr) {
         refused_ = arena_.refused();
@@ -68,9 +65,9 @@ sec_acle_t *sec_acltree::copy_to_room(const sec_acle_t &acle, std::size_t identi
     }
     char *identity = reinterpret_cast<char *>(memory + sizeof(sec_acle_t));
     std::memset(memory + size - sizeof(std::uint64_t), 0, sizeof(std::uint64_t));
-    std::memcpy(identity, identity_of(acle), identity_length);
-    auto *copy = new (memory) sec_acle_t(acle);
-    copy->identity = identity;
+    std::memcpy(identity, acle.identity.data(), acle.identity.size());
+    auto *copy = new (memory) sec_acle_t{acle.perm_mask, {}, acle.type, identity};
+    std::memcpy(copy->mechanism, acle.mechanism.data(), acle.mechanism.size());
     return copy;
 }
 
@@ -144,14 +141,14 @@ bool sec_acltree::grow_entries() {
     return true;
 }
 
-sec_acltree::outcome sec_acltree::insert(const sec_acle_t &acle, sec_acle_t *&held) {
+sec_acltree::outcome sec_acltree::insert(const qz::acle_view &acle, sec_acle_t *&held) {
     if (qz::is_single_type(type_) && count_ != 0) {
         held = entries_[0];
         return outcome::duplicate;
     }
-    const std::size_t length = std::strlen(identity_of(acle));
+    const std::size_t length = acle.identity.size();
     std::size_t size = 0;
-    sec_acle_t *copy = copy_to_room(acle, length, size);
+    sec_acle_t *copy = copy_to_room(acle, size);
     if (copy == nullptr || !grow_entries())
         return outcome::no_memory;
 
@@ -271,24 +268,24 @@ sec_acltree_array::~sec_acltree_array() {
 
 namespace {
 
-bool is_of_key(const sec_acltree_t *tree, const sec_acle_t &acle) {
+bool is_of_key(const sec_acltree_t *tree, const qz::acle_view &acle) {
     return tree != nullptr && tree->type() == acle.type &&
            (!qz::has_mechanism(acle.type) ||
-            cu_strcasecmp_posix_1(tree->root().mechanism, acle.mechanism) == 0);
+            cu_strcasecmp_posix_1(tree->root().mechanism, acle.mechanism.data()) == 0);
 }
 
-std::uint32_t hash_of_key(const sec_acle_t &acle, const qz::identity_hash_key &key) {
+std::uint32_t hash_of_key(const qz::acle_view &acle, const qz::identity_hash_key &key) {
     // The mechanism in whole words, padded with NULs and the type behind its own.
     char padded[24] = {};
     if (qz::has_mechanism(acle.type))
-        std::memcpy(padded, acle.mechanism, strnlen(acle.mechanism, qz::mechanism_max));
+        std::memcpy(padded, acle.mechanism.data(), acle.mechanism.size());
     padded[sizeof padded - 1] = static_cast<char>(acle.type);
     return qz::hash_identity(padded, sizeof padded - 1, key);
 }
 
 } // namespace
 
-sec_acltree_t **sec_acltree_array::find(const sec_acle_t &acle) {
+sec_acltree_t **sec_acltree_array::find(const qz::acle_view &acle) {
     if (count_ == 0)
         return nullptr;
     const auto tree = [this](std::int32_t number) { return &trees_[static_cast<std::size_t>(number)]; };
@@ -312,7 +309,7 @@ sec_acltree_t **sec_acltree_array::find(const sec_acle_t &acle) {
 bool sec_acltree_array::index_last(std::size_t &refused) {
     constexpr std::uint32_t first_size = 16;
     const auto enter = [this](std::uint32_t *index, std::uint32_t size, std::uint32_t number) {
-        std::uint32_t at = hash_of_key(trees_[number]->root(), hash_key_);
+        std::uint32_t at = hash_of_key(qz::view_of(trees_[number]->root()), hash_key_);
         while (index[at & (size - 1)] != 0)
             ++at;
         index[at & (size - 1)] = number + 1;
@@ -340,9 +337,9 @@ bool sec_acltree_array::index_last(std::size_t &refused) {
     return true;
 }
 
-int sec__add_acle_to_trees(const sec_acle_t *acle, sec_acltree_array &array) {
+int sec__add_acle_to_trees(const qz::acle_view &acle, sec_acltree_array &array) {
     constexpr const char *function = "sec__add_acle_to_trees";
-    if (sec_acltree_t **slot = array.find(*acle); slot != nullptr)
+    if (sec_acltree_t **slot = array.find(acle); slot != nullptr)
         return sec__add_acle_to_tree(1, acle, slot);
 
     const std::size_t count = static_cast<std::size_t>(array.count_) + 1;
@@ -362,23 +359,27 @@ int sec__add_acle_to_trees(const sec_acle_t *acle, sec_acltree_array &array) {
     return SEC_S_OK;
 }
 
-int sec__add_acle_to_tree(int report_duplicates, const sec_acle_t *acle, sec_acltree_t **slot) {
+int sec__add_acle_to_trees(const sec_acle_t *acle, sec_acltree_array &array) {
+    return sec__add_acle_to_trees(qz::view_of(*acle), array);
+}
+
+int sec__add_acle_to_tree(int report_duplicates, const qz::acle_view &acle, sec_acltree_t **slot) {
     constexpr const char *function = "sec__add_acle_to_tree";
     const bool is_new = *slot == nullptr;
     if (is_new) {
         void *memory = std::malloc(sizeof(sec_acltree_t));
         if (memory == nullptr)
             return qz::report_no_memory(function, sizeof(sec_acltree_t));
-        *slot = new (memory) sec_acltree_t(acle->type);
+        *slot = new (memory) sec_acltree_t(acle.type);
     }
     sec_acle_t *held = nullptr;
-    switch ((*slot)->insert(*acle, held)) {
+    switch ((*slot)->insert(acle, held)) {
     case sec_acltree::outcome::inserted:
         return SEC_S_OK;
     case sec_acltree::outcome::duplicate:
         if (report_duplicates != 0)
             return sec__report_duplicate(acle);
-        held->perm_mask = acle->perm_mask;
+        held->perm_mask = acle.perm_mask;
         sec__trace_replacement(acle);
         return SEC_S_OK;
     case sec_acltree::outcome::no_memory:
@@ -392,43 +393,8 @@ int sec__add_acle_to_tree(int report_duplicates, const sec_acle_t *acle, sec_acl
     return qz::report_no_memory(function, refused);
 }
 
-int sec__report_duplicate(const sec_acle_t *acle) {
-    const int letter = qz::type_letter(acle->type);
-    if (qz::is_single_type(acle->type))
-        return qz::report(SEC_S_BAD_ACLE, qz::msg::duplicate_single_acle, letter);
-    if (acle->type == SEC_ACLE_GROUP)
-        return qz::report(SEC_S_BAD_ACLE, qz::msg::duplicate_group, letter, acle->identity);
-    return qz::report(SEC_S_BAD_ACLE, qz::msg::duplicate_acle, letter, acle->mechanism, acle->identity);
-}
-
-void sec__trace_replacement(const sec_acle_t *acle) {
-    if (!qz::traces(qz::trace_category::info))
-        return;
-    const char *type = "group";
-    switch (acle->type) {
-    case SEC_ACLE_UNAUTHENTICATED:
-        type = "unauthenticated";
-        break;
-    case SEC_ACLE_ANYOTHER:
-        type = "anyother";
-        break;
-    case SEC_ACLE_USER:
-        type = "user";
-        break;
-    case SEC_ACLE_EXPANDED:
-        type = "user-expanded";
-        break;
-    default:
-        break;
-    }
-    qz::trace_data(113, qz::item(type), qz::item(qz::is_single_type(acle->type) ? "<none>" : acle->mechanism),
-                   qz::item(acle->type == SEC_ACLE_USER ? acle->identity : "<none>"));
-}
-
-int sec__acle_not_found(int code, const sec_acle_t *acle) {
-    return qz::report(code, qz::msg::acle_not_found, acle->type,
-                      qz::has_mechanism(acle->type) ? acle->mechanism : "",
-                      qz::has_identity(acle->type) ? acle->identity : "");
+int sec__add_acle_to_tree(int report_duplicates, const sec_acle_t *acle, sec_acltree_t **slot) {
+    return sec__add_acle_to_tree(report_duplicates, qz::view_of(*acle), slot);
 }
 
 int sec__del_acle_from_tree(const sec_acle_t *acle, sec_acltree_t *root) {
@@ -442,7 +408,7 @@ int sec__del_acle_from_tree(const sec_acle_t *acle, sec_acltree_t *root) {
         held = root->find(acle->identity);
     }
     if (held == nullptr)
-        return sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, acle);
+        return sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, qz::view_of(*acle));
     sec__trace_release(held);
     root->erase(*held);
     return SEC_S_OK;

@@ -71,7 +71,7 @@ public:
     const sec_acle_t *first_held() const;
 
     // Inserts a copy. For a duplicate nothing changes and `held` is the entry that is there.
-    outcome insert(const sec_acle_t &acle, sec_acle_t *&held);
+    outcome insert(const qz::acle_view &acle, sec_acle_t *&held);
     // The held entry whose identity equals the given one in any letter case, or null.
     sec_acle_t *find(const char *identity) const;
     // Takes the entry out; its node stays, so that the order of the others does not change.
@@ -99,7 +99,7 @@ private:
     };
 
     bool is_sorted_by_identity() const { return type_ != SEC_ACLE_EXPANDED && !is_ascending_; }
-    sec_acle_t *copy_to_room(const sec_acle_t &acle, std::size_t identity_length, std::size_t &size);
+    sec_acle_t *copy_to_room(const qz::acle_view &acle, std::size_t &size);
     sec_acle_t *find_equal(const sec_acle_t &acle, std::size_t identity_length, std::uint32_t hash) const;
     bool grow_entries();
     void place(slot entry);
@@ -141,9 +141,9 @@ public:
     std::span<sec_acltree_t *const> trees() const { return {trees_.get(), static_cast<std::size_t>(count_)}; }
 
 private:
-    friend int sec__add_acle_to_trees(const sec_acle_t *acle, sec_acltree_array &array);
+    friend int sec__add_acle_to_trees(const qz::acle_view &acle, sec_acltree_array &array);
 
-    sec_acltree_t **find(const sec_acle_t &acle);
+    sec_acltree_t **find(const qz::acle_view &acle);
     bool index_last(std::size_t &refused);
 
     qz::owned<sec_acltree_t *[]> trees_;
@@ -159,11 +159,13 @@ private:
 
 // Inserts a copy of the entry into the tree of its key, which is appended when there is none. Returns
 // SEC_S_OK, SEC_S_BAD_ACLE for a duplicate or SEC_S_NO_MEMORY.
+int sec__add_acle_to_trees(const qz::acle_view &acle, sec_acltree_array &array);
 int sec__add_acle_to_trees(const sec_acle_t *acle, sec_acltree_array &array);
 
 // Inserts a copy of the entry into the tree in `*slot`, made when that is null. An entry with the same
 // identity is reported when `report_duplicates` is not 0, else it takes the new permission mask. Results as
 // above.
+int sec__add_acle_to_tree(int report_duplicates, const qz::acle_view &acle, sec_acltree_t **slot);
 int sec__add_acle_to_tree(int report_duplicates, const sec_acle_t *acle, sec_acltree_t **slot);
 
 // Deletes the entry with the same identity from a tree of the same key. Returns SEC_S_OK or
@@ -181,11 +183,5 @@ struct free_acltree {
 using owned_acltree = std::unique_ptr<sec_acltree_t, free_acltree>;
 
 } // namespace qz
-
-// What trees and packed sub-ACLs report alike: that no entry matches the given one, with the code to return;
-// that it duplicates one; that a duplicate replaced the mask of the entry that was there.
-int sec__acle_not_found(int code, const sec_acle_t *acle);
-int sec__report_duplicate(const sec_acle_t *acle);
-void sec__trace_replacement(const sec_acle_t *acle);
 
 #endif
