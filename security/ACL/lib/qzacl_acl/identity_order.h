@@ -73,14 +73,14 @@ inline std::uint64_t hash_word(std::uint64_t state, std::uint64_t word, const id
     return static_cast<std::uint64_t>(product) ^ static_cast<std::uint64_t>(product >> 64);
 }
 
-inline std::uint64_t hash_identity(const char *identity, const identity_hash_key &key) {
-    std::uint64_t state = key.second;
-    for (;; identity += identity_word_size) {
-        const std::uint64_t word = ordered_word(identity);
-        state = hash_word(state, word, key);
-        if (ends_within(word))
-            return hash_word(state, key.second, key);
+// `first` is the identity's first word.
+inline std::uint64_t hash_identity(const char *identity, std::uint64_t first, const identity_hash_key &key) {
+    std::uint64_t state = hash_word(key.second, first, key);
+    for (std::uint64_t word = first; !ends_within(word); state = hash_word(state, word, key)) {
+        identity += identity_word_size;
+        word = ordered_word(identity);
     }
+    return hash_word(state, key.second, key);
 }
 
 } // namespace qz

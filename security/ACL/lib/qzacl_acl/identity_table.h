@@ -30,7 +30,9 @@ public:
     // How many entries it has room for.
     std::uint64_t room() const { return tags_ == nullptr ? 0 : group_count() * group_size / 8 * 7; }
 
-    std::uint64_t hash(const char *identity) const { return hash_identity(identity, key_); }
+    std::uint64_t hash(const char *identity, std::uint64_t first_word) const {
+        return hash_identity(identity, first_word, key_);
+    }
 
     // The number among those with the given hash that `is_wanted` says yes to, or none.
     template <class Wanted>

@@ -43,7 +43,7 @@ bool sec_acltree::fill_table(std::uint32_t place, std::size_t &refused) {
     if (!table_.reset(identities_.expected_count(entries_.count(), place), refused))
         return false;
     for (std::uint32_t number = 0; number < entries.size(); ++number)
-        table_.enter(table_.hash(identity(entries[number])), number);
+        table_.enter(table_.hash(identity(entries[number]), entries[number].key), number);
     return true;
 }
 
@@ -77,7 +77,7 @@ sec_acltree::insertion sec_acltree::insert(const qz::acle_view &acle) {
     if (!is_ascending_) {
         if (count >= few && table_.room() <= count && !fill_table(place, refused))
             return {outcome::no_memory, nullptr, refused};
-        const std::uint64_t hash = table_.room() == 0 ? 0 : table_.hash(identity);
+        const std::uint64_t hash = table_.room() == 0 ? 0 : table_.hash(identity, wanted.key);
         if (qz::small_entry *held = find_equal(wanted, hash); held != nullptr)
             return {outcome::duplicate, held, 0};
         if (table_.room() != 0)

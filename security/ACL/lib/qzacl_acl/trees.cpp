@@ -18,8 +18,9 @@ bool is_of_key(const sec_acltree_t &tree, const qz::acle_view &acle) {
     if (!qz::has_mechanism(acle.type))
         return true;
     const std::string_view held = tree.mechanism();
-    return held.size() == acle.mechanism.size() &&
-           qz::fold_compare(held.data(), acle.mechanism.data(), held.size()) == 0;
+    return held == acle.mechanism || // as texts spell it
+           (held.size() == acle.mechanism.size() &&
+            qz::fold_compare(held.data(), acle.mechanism.data(), held.size()) == 0);
 }
 
 std::uint32_t hash_of_key(const qz::acle_view &acle, const qz::identity_hash_key &key) {
