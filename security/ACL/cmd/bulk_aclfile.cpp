@@ -61,23 +61,28 @@ void warn_of_skipped_cache(unsigned flags) {
 int read_entries(qz::file_bytes &contents, unsigned flags, sec_acltree_array &trees, bool &is_clean) {
     constexpr int line_consumed = 1;
     const bool goes_on = (flags & ACLFCK_OPT_CONTINUE) != 0;
+    const bool is_verbose = (flags & ACLFCK_OPT_VERBOSE) != 0;
+    const bool may_wait = !goes_on && !is_verbose;
     char *cursor = contents.data.get();
     std::size_t remaining = contents.length + 1;
     std::uint32_t line = 1;
     qz::parsed_acle entry;
     for (;;) {
         int result = sec__read_acle_from_text(&acl__default_perm_set, &cursor, &remaining, &line, &entry);
+        if (result != line_consumed)
+            result = trees.settle(result);
         if (result == SEC_S_OK)
             return SEC_S_OK;
         bool may_go_on = goes_on;
         if (result == line_consumed) {
             if (entry.type == 0)
                 continue;
-            if ((flags & ACLFCK_OPT_VERBOSE) != 0) {
+            if (is_verbose) {
                 const sec_acle_t shown = qz::record_of(entry);
                 sec__dump_acle(&shown, nullptr, "");
             }
-            result = sec__add_acle_to_trees(qz::view_of(entry), trees);
+            const qz::acle_view acle = qz::view_of(entry);
+            result = may_wait ? trees.add_soon(acle) : trees.add(acle);
             if (result == SEC_S_OK)
                 continue;
             may_go_on = goes_on && result == SEC_S_BAD_ACLE;

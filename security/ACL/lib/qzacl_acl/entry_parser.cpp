@@ -178,15 +178,6 @@ int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, qz::pars
 
 namespace qz {
 
-acle_view view_of(const parsed_acle &entry) {
-    acle_view view = {entry.perm_mask, entry.type};
-    if (!entry.mechanism.empty())
-        view.mechanism = {entry.mechanism.data(), entry.mechanism.size()};
-    if (entry.identity.data() != nullptr)
-        view.identity = {entry.identity.data(), entry.identity.size()};
-    return view;
-}
-
 sec_acle_t record_of(const parsed_acle &entry) {
     sec_acle_t record = {entry.perm_mask, {}, entry.type, entry.identity.data()};
     std::copy(entry.mechanism.begin(), entry.mechanism.end(), record.mechanism);

@@ -8,6 +8,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <span>
+#include <string_view>
 
 namespace qz {
 
@@ -23,7 +24,12 @@ struct parsed_acle {
     std::span<char> identity;
 };
 
-acle_view view_of(const parsed_acle &entry);
+inline acle_view view_of(const parsed_acle &entry) {
+    const auto text = [](std::span<char> token) {
+        return token.data() == nullptr ? std::string_view("") : std::string_view(token.data(), token.size());
+    };
+    return {entry.perm_mask, entry.type, text(entry.mechanism), text(entry.identity)};
+}
 // A record that borrows the identity.
 sec_acle_t record_of(const parsed_acle &entry);
 

@@ -5,28 +5,30 @@ namespace qz {
 
 bool identity_table::reset(std::uint32_t count, std::size_t &refused) {
     unsigned bits = 0;
-    while ((group_size << bits) / 8 * 7 < count)
+    while (room_of(bits) < count)
         ++bits;
-    const std::size_t size = (group_size << bits) * (sizeof(unsigned char) + sizeof(std::uint32_t));
-    owned<unsigned char[]> tags(static_cast<unsigned char *>(std::calloc(size, 1)));
-    if (tags == nullptr) {
+    std::size_t size = (sizeof(group) << bits) + alignof(group);
+    owned<void> memory(std::calloc(size, 1));
+    if (memory == nullptr) {
         refused = size;
         return false;
     }
-    tags_ = std::move(tags);
+    void *aligned = memory.get();
+    groups_ = static_cast<group *>(std::align(alignof(group), sizeof(group) << bits, aligned, size));
+    memory_ = std::move(memory);
     group_bits_ = bits;
     key_ = make_identity_hash_key();
     return true;
 }
 
 void identity_table::enter(std::uint64_t hash, std::uint32_t number) {
-    for (std::size_t group = first_group(hash);; group = next_group(group)) {
-        const unsigned slots = slots_with(group, free_slot);
+    for (std::size_t at = first_group(hash);; at = next_group(at)) {
+        const unsigned slots = groups_[at].slots_with(free_slot);
         if (slots == 0)
             continue;
-        const auto slot = static_cast<unsigned>(std::countr_zero(slots));
-        tags_[group * group_size + slot] = tag_of(hash);
-        std::memcpy(place_of_number(group, slot), &number, sizeof number);
+        const int slot = std::countr_zero(slots);
+        groups_[at].tags[slot] = tag_of(hash);
+        groups_[at].numbers[slot] = number;
         return;
     }
 }

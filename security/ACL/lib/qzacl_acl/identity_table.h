@@ -1,7 +1,8 @@
 // The numbers of entries by the hashes of their identities.
 //
-// Sixteen slots make a group, of which each slot has a tag of one byte and a number. The tags of a group, a part of the
-// hashes, are tested at once, so that a look-up that finds nothing hardly ever has to look at an entry.
+// Twelve slots make a group, which fills a line of the processor's cache. Each slot has a tag of one byte, a part of the
+// hash, and a number. The tags of a group are tested at once, so that a look-up that finds nothing hardly ever has to
+// look at an entry.
 #ifndef QZACL_IDENTITY_TABLE_H
 #define QZACL_IDENTITY_TABLE_H
 
@@ -11,7 +12,6 @@
 #include <bit>
 #include <cstddef>
 #include <cstdint>
-#include <cstring>
 
 #ifdef __SSE2__
 #include <emmintrin.h>
@@ -27,23 +27,28 @@ public:
     // lacking; then the table is as before.
     bool reset(std::uint32_t count, std::size_t &refused);
     void release() { *this = {}; }
-    // How many entries it has room for.
-    std::uint64_t room() const { return tags_ == nullptr ? 0 : group_count() * group_size / 8 * 7; }
+    // How many entries it has room for; 0 without a table.
+    std::uint64_t room() const { return groups_ == nullptr ? 0 : room_of(group_bits_); }
 
+    // `first_word` is the identity's first ordered word.
     std::uint64_t hash(const char *identity, std::uint64_t first_word) const {
         return hash_identity(identity, first_word, key_);
     }
 
-    // The number among those with the given hash that `is_wanted` says yes to, or none.
+    // What a look-up of the hash looks at first. There is a table.
+    const void *first_look(std::uint64_t hash) const { return &groups_[first_group(hash)]; }
+
+    // The number among those with the given hash that `is_wanted` says yes to, or none. There is a table.
     template <class Wanted>
     std::uint32_t find(std::uint64_t hash, const Wanted &is_wanted) const {
-        for (std::size_t group = first_group(hash);; group = next_group(group)) {
-            for (unsigned slots = slots_with(group, tag_of(hash)); slots != 0; slots &= slots - 1) {
-                const std::uint32_t number = number_at(group, static_cast<unsigned>(std::countr_zero(slots)));
+        for (std::size_t at = first_group(hash);; at = next_group(at)) {
+            const group &here = groups_[at];
+            for (unsigned slots = here.slots_with(tag_of(hash)); slots != 0; slots &= slots - 1) {
+                const std::uint32_t number = here.numbers[std::countr_zero(slots)];
                 if (is_wanted(number))
                     return number;
             }
-            if (slots_with(group, free_slot) != 0)
+            if (here.slots_with(free_slot) != 0)
                 return none;
         }
     }
@@ -52,44 +57,47 @@ public:
     void enter(std::uint64_t hash, std::uint32_t number);
 
 private:
-    static constexpr std::size_t group_size = 16;
+    static constexpr unsigned slot_count = 12;
     static constexpr unsigned char free_slot = 0;
 
-    std::size_t group_count() const { return std::size_t{1} << group_bits_; }
+    struct alignas(64) group {
+        unsigned char tags[16]; // of which the last ones are not used
+        std::uint32_t numbers[slot_count];
+
+        // The slots that have the tag, as bits.
+        unsigned slots_with(unsigned char tag) const {
+            constexpr unsigned used = (1u << slot_count) - 1;
+#ifdef __SSE2__
+            const __m128i held = _mm_load_si128(reinterpret_cast<const __m128i *>(tags));
+            const __m128i equal = _mm_cmpeq_epi8(held, _mm_set1_epi8(static_cast<char>(tag)));
+            return static_cast<unsigned>(_mm_movemask_epi8(equal)) & used;
+#else
+            unsigned slots = 0;
+            for (unsigned slot = 0; slot < slot_count; ++slot)
+                slots |= static_cast<unsigned>(tags[slot] == tag) << slot;
+            return slots & used;
+#endif
+        }
+    };
+    static_assert(sizeof(group) == 64);
+
+    // One slot of eight stays free.
+    static constexpr std::uint64_t room_of(unsigned group_bits) {
+        return (std::uint64_t{slot_count} << group_bits) / 8 * 7;
+    }
+
     // The high bits of a hash choose the group, the low ones the tag.
-    std::size_t first_group(std::uint64_t hash) const { return (hash >> 1) >> (63 - group_bits_); }
-    std::size_t next_group(std::size_t group) const { return (group + 1) & (group_count() - 1); }
+    std::size_t first_group(std::uint64_t hash) const {
+        return static_cast<std::size_t>((hash >> 1) >> (63 - group_bits_));
+    }
+    std::size_t next_group(std::size_t at) const { return (at + 1) & ((std::size_t{1} << group_bits_) - 1); }
     static unsigned char tag_of(std::uint64_t hash) {
         const auto tag = static_cast<unsigned char>(hash);
         return tag == free_slot ? 1 : tag;
     }
 
-    // The slots of a group that have the tag, as bits.
-    unsigned slots_with(std::size_t group, unsigned char tag) const {
-        const unsigned char *const tags = tags_.get() + group * group_size;
-#ifdef __SSE2__
-        const __m128i held = _mm_load_si128(reinterpret_cast<const __m128i *>(tags));
-        return static_cast<unsigned>(
-            _mm_movemask_epi8(_mm_cmpeq_epi8(held, _mm_set1_epi8(static_cast<char>(tag)))));
-#else
-        unsigned slots = 0;
-        for (unsigned slot = 0; slot < group_size; ++slot)
-            slots |= static_cast<unsigned>(tags[slot] == tag) << slot;
-        return slots;
-#endif
-    }
-
-    // The numbers stand behind all tags.
-    unsigned char *place_of_number(std::size_t group, unsigned slot) const {
-        return tags_.get() + group_count() * group_size + (group * group_size + slot) * sizeof(std::uint32_t);
-    }
-    std::uint32_t number_at(std::size_t group, unsigned slot) const {
-        std::uint32_t number = 0;
-        std::memcpy(&number, place_of_number(group, slot), sizeof number);
-        return number;
-    }
-
-    owned<unsigned char[]> tags_;
+    owned<void> memory_;
+    group *groups_ = nullptr; // in the memory, aligned
     unsigned group_bits_ = 0;
     identity_hash_key key_;
 };

@@ -137,13 +137,14 @@ int acl_file_reader::parse_lines(qz::file_bytes &text, sec_acltree_array &trees)
     constexpr int line_consumed = 1;
     constexpr unsigned every_entry = 7; // the Info level above which each line is traced
     const bool traces_lines = qz::trace_level(qz::trace_category::info) > every_entry;
+    const bool may_wait = !traces_lines && perf_level_ != 1; // traces show the line of the failure
     char *cursor = text.data.get();
     std::size_t remaining = text.length + 1;
     qz::parsed_acle entry;
     for (;;) {
         const int result = sec__read_acle_from_text(set_, &cursor, &remaining, &line_, &entry);
         if (result != line_consumed)
-            return result;
+            return trees.settle(result);
         if (traces_lines) {
             const std::uint32_t type = entry.type;
             const qz::acle_view shown = qz::view_of(entry);
@@ -152,7 +153,8 @@ int acl_file_reader::parse_lines(qz::file_bytes &text, sec_acltree_array &trees)
         }
         if (entry.type == 0)
             continue;
-        if (const int added = sec__add_acle_to_trees(qz::view_of(entry), trees); added != SEC_S_OK)
+        const qz::acle_view acle = qz::view_of(entry);
+        if (const int added = may_wait ? trees.add_soon(acle) : trees.add(acle); added != SEC_S_OK)
             return added;
     }
 }

@@ -40,6 +40,11 @@ public:
 
     // For a duplicate nothing changes.
     insertion insert(const qz::acle_view &acle);
+    // What the insertion of an entry of the text will look at first; null when there is no saying.
+    const void *first_look(const qz::acle_view &acle) const {
+        const char *const text = acle.identity.data();
+        return table_.room() == 0 ? nullptr : table_.first_look(table_.hash(text, qz::ordered_word(text)));
+    }
     // The held entry whose identity equals the given one in any letter case, or null.
     qz::small_entry *find(const char *identity);
     // Takes the entry out; its node stays, so that the order of the others does not change.

@@ -121,6 +121,32 @@ int sec_acltree_array::add(const qz::acle_view &acle) {
     return qz::add_to_tree(true, acle, *last_found_);
 }
 
+int sec_acltree_array::add_soon(const qz::acle_view &acle) {
+    constexpr int for_writing = 1;
+    int result = SEC_S_OK;
+    qz::acle_view &oldest = waiting_[first_waiting_];
+    if (waiting_count_ == waiting_max)
+        result = add(oldest);
+    else
+        ++waiting_count_;
+    // Most entries are of the key that the one before them is of.
+    if (last_found_ != nullptr && is_of_key(*last_found_, acle))
+        __builtin_prefetch(last_found_->first_look(acle), for_writing);
+    oldest = acle;
+    first_waiting_ = (first_waiting_ + 1) % waiting_max;
+    return result;
+}
+
+int sec_acltree_array::settle(int result) {
+    const std::uint32_t count = std::exchange(waiting_count_, 0);
+    for (std::uint32_t left = count; left != 0; --left) {
+        const int added = add(waiting_[(first_waiting_ + waiting_max - left) % waiting_max]);
+        if (added != SEC_S_OK)
+            return added;
+    }
+    return result;
+}
+
 int sec__add_acle_to_trees(const qz::acle_view &acle, sec_acltree_array &array) { return array.add(acle); }
 
 int sec__add_acle_to_trees(const sec_acle_t *acle, sec_acltree_array &array) {

@@ -28,11 +28,19 @@ public:
     // What sec__add_acle_to_trees does.
     int add(const qz::acle_view &acle);
 
+    // The same for entries of a text of which the first failure ends all: some wait, while the memory that their
+    // insertion looks at is fetched. The result may be that of an entry that waited.
+    int add_soon(const qz::acle_view &acle);
+    // Inserts what waits. Returns the failure of one of these, else `result`, which came after them.
+    int settle(int result);
+
 private:
     struct slot {
         std::uint32_t hash;
         std::uint32_t number; // of the tree plus one; 0 in a free slot
     };
+
+    static constexpr std::uint32_t waiting_max = 16;
 
     sec_acltree_t *find(const qz::acle_view &acle, std::uint32_t hash);
     int append(const qz::acle_view &acle, std::uint32_t hash);
@@ -49,6 +57,9 @@ private:
     std::uint32_t index_size_ = 0;
     qz::identity_hash_key hash_key_ = qz::make_identity_hash_key();
     qz::arena memory_; // of the trees themselves
+    qz::acle_view waiting_[waiting_max];
+    std::uint32_t first_waiting_ = 0;
+    std::uint32_t waiting_count_ = 0;
 };
 
 // Inserts the entry into the tree of its key, which is appended when there is none. Returns SEC_S_OK, SEC_S_BAD_ACLE
