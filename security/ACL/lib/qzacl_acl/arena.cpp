@@ -9,7 +9,7 @@ namespace qz {
 namespace {
 
 std::size_t aligned(std::size_t size) {
-    constexpr std::size_t alignment = alignof(std::max_align_t);
+    constexpr std::size_t alignment = alignof(std::uint64_t);
     return (size + alignment - 1) / alignment * alignment;
 }
 

@@ -3,6 +3,7 @@
 #define QZACL_ARENA_H
 
 #include <cstddef>
+#include <cstdint>
 
 namespace qz {
 
@@ -13,7 +14,7 @@ public:
     arena &operator=(const arena &) = delete;
     ~arena();
 
-    // Room for `size` bytes, aligned as by malloc, or null; only keep() takes it.
+    // Room for `size` bytes, aligned for numbers of eight bytes, or null; only keep() takes it.
     unsigned char *room(std::size_t size);
     void keep(std::size_t size);
 
@@ -21,7 +22,7 @@ public:
     std::size_t refused() const { return refused_; }
 
 private:
-    struct alignas(std::max_align_t) chunk {
+    struct alignas(std::uint64_t) chunk {
         chunk *previous;
     };
 

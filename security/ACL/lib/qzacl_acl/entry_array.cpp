@@ -4,13 +4,16 @@
 namespace qz {
 
 bool entry_array::reserve(std::uint32_t capacity, std::size_t &refused) {
-    if (!reallocate(more_, capacity)) {
-        refused = capacity * sizeof(small_entry);
+    const std::size_t size = capacity * sizeof(small_entry);
+    void *const old = entries_ == &first_ ? nullptr : entries_;
+    auto *grown = static_cast<small_entry *>(std::realloc(old, size));
+    if (grown == nullptr) {
+        refused = size;
         return false;
     }
-    if (entries_ == &first_)
-        more_[0] = first_;
-    entries_ = more_.get();
+    if (old == nullptr)
+        *grown = first_;
+    entries_ = grown;
     capacity_ = capacity;
     return true;
 }

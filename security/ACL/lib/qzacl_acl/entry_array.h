@@ -3,11 +3,11 @@
 #ifndef QZACL_ENTRY_ARRAY_H
 #define QZACL_ENTRY_ARRAY_H
 
-#include "owned.h"
 #include "qzacl_acl/entry_sort.h"
 
 #include <cstddef>
 #include <cstdint>
+#include <cstdlib>
 #include <span>
 
 namespace qz {
@@ -17,6 +17,10 @@ public:
     entry_array() = default;
     entry_array(const entry_array &) = delete;
     entry_array &operator=(const entry_array &) = delete;
+    ~entry_array() {
+        if (entries_ != &first_)
+            std::free(entries_);
+    }
 
     std::uint32_t count() const { return count_; }
     bool is_full() const { return count_ == capacity_; }
@@ -30,8 +34,7 @@ public:
 
 private:
     small_entry first_ = {};
-    small_entry *entries_ = &first_;
-    owned<small_entry[]> more_;
+    small_entry *entries_ = &first_; // or memory of their own
     std::uint32_t count_ = 0;
     std::uint32_t capacity_ = 1;
 };

@@ -33,9 +33,9 @@ identity_store::~identity_store() {
 
 bool identity_store::place(const acle_view &acle, std::uint32_t &place, std::size_t &refused) {
     if (is_in_text()) {
-        if (mechanism_ == nullptr) {
-            mechanism_ = acle.mechanism.data();
-            mechanism_length_ = static_cast<std::uint32_t>(acle.mechanism.size());
+        if (mechanism_length_ == 0 && has_mechanism(acle.type)) {
+            mechanism_ = static_cast<std::uint32_t>(acle.mechanism.data() - base_);
+            mechanism_length_ = static_cast<std::uint8_t>(acle.mechanism.size());
         }
         place = static_cast<std::uint32_t>(acle.identity.data() - base_);
         return true;
@@ -76,7 +76,13 @@ void identity_store::keep(std::uint32_t place, std::size_t identity_length) {
 }
 
 std::string_view identity_store::mechanism(std::uint32_t place) const {
-    return is_in_text() ? std::string_view{mechanism_, mechanism_length_} : identity(place) - mechanism_size;
+    return is_in_text() ? first_mechanism() : identity(place) - mechanism_size;
+}
+
+std::string_view identity_store::first_mechanism() const {
+    if (!is_in_text())
+        return base_; // which starts with it
+    return mechanism_length_ == 0 ? "" : std::string_view{identity(mechanism_), mechanism_length_};
 }
 
 std::uint32_t identity_store::expected_count(std::uint32_t count, std::uint32_t place) const {

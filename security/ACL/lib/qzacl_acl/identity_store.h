@@ -34,6 +34,8 @@ public:
     char *identity(std::uint32_t place) const { return base_ + std::size_t{place} * unit_; }
     // The mechanism that came with it; of a text that of the first entry, as the parser spells all alike.
     std::string_view mechanism(std::uint32_t place) const;
+    // The mechanism that came with the first identity.
+    std::string_view first_mechanism() const;
 
     bool is_in_text() const { return unit_ == 1; }
     // How many entries to make room for when `count` were placed so far, the next one at `place`: at least one,
@@ -45,11 +47,11 @@ private:
     bool grow(std::uint64_t units, std::size_t &refused);
 
     char *base_ = nullptr;
-    std::uint32_t used_ = 0; // units of own memory
-    std::uint32_t size_ = 0; // of the memory or the text
-    std::uint32_t unit_;     // the bytes from one place to the next
-    std::uint32_t mechanism_length_ = 0;
-    const char *mechanism_ = nullptr; // in the text
+    std::uint32_t used_ = 0;      // units of own memory
+    std::uint32_t size_ = 0;      // of the memory or the text
+    std::uint32_t mechanism_ = 0; // the place of the first one in the text
+    std::uint8_t mechanism_length_ = 0;
+    std::uint8_t unit_; // the bytes from one place to the next
 };
 
 } // namespace qz

@@ -23,26 +23,31 @@ class identity_table {
 public:
     static constexpr std::uint32_t none = UINT32_MAX;
 
+    identity_table() = default;
+    identity_table(const identity_table &) = delete;
+    identity_table &operator=(const identity_table &) = delete;
+    ~identity_table() { release(); }
+
     // Makes an empty table with room for `count` entries. False, the bytes asked for in `refused`, when memory is
     // lacking; then the table is as before.
     bool reset(std::uint32_t count, std::size_t &refused);
-    void release() { *this = {}; }
+    void release();
     // How many entries it has room for; 0 without a table.
-    std::uint64_t room() const { return groups_ == nullptr ? 0 : room_of(group_bits_); }
+    std::uint64_t room() const { return head_ == nullptr ? 0 : room_of(head_->group_bits); }
 
-    // `first_word` is the identity's first ordered word.
+    // `first_word` is the identity's first ordered word. There is a table.
     std::uint64_t hash(const char *identity, std::uint64_t first_word) const {
-        return hash_identity(identity, first_word, key_);
+        return hash_identity(identity, first_word, head_->key);
     }
 
     // What a look-up of the hash looks at first. There is a table.
-    const void *first_look(std::uint64_t hash) const { return &groups_[first_group(hash)]; }
+    const void *first_look(std::uint64_t hash) const { return &groups()[first_group(hash)]; }
 
     // The number among those with the given hash that `is_wanted` says yes to, or none. There is a table.
     template <class Wanted>
     std::uint32_t find(std::uint64_t hash, const Wanted &is_wanted) const {
         for (std::size_t at = first_group(hash);; at = next_group(at)) {
-            const group &here = groups_[at];
+            const group &here = groups()[at];
             for (unsigned slots = here.slots_with(tag_of(hash)); slots != 0; slots &= slots - 1) {
                 const std::uint32_t number = here.numbers[std::countr_zero(slots)];
                 if (is_wanted(number))
@@ -88,18 +93,25 @@ private:
 
     // The high bits of a hash choose the group, the low ones the tag.
     std::size_t first_group(std::uint64_t hash) const {
-        return static_cast<std::size_t>((hash >> 1) >> (63 - group_bits_));
+        return static_cast<std::size_t>((hash >> 1) >> (63 - head_->group_bits));
     }
-    std::size_t next_group(std::size_t at) const { return (at + 1) & ((std::size_t{1} << group_bits_) - 1); }
+    std::size_t next_group(std::size_t at) const {
+        return (at + 1) & ((std::size_t{1} << head_->group_bits) - 1);
+    }
     static unsigned char tag_of(std::uint64_t hash) {
         const auto tag = static_cast<unsigned char>(hash);
         return tag == free_slot ? 1 : tag;
     }
 
-    owned<void> memory_;
-    group *groups_ = nullptr; // in the memory, aligned
-    unsigned group_bits_ = 0;
-    identity_hash_key key_;
+    // Stands before the groups, so that a tree without a table, as most of many are, spends one pointer on it.
+    struct alignas(group) head {
+        owned<void> memory; // of the head and the groups
+        identity_hash_key key;
+        unsigned group_bits;
+    };
+    group *groups() const { return reinterpret_cast<group *>(head_ + 1); }
+
+    head *head_ = nullptr;
 };
 
 } // namespace qz

@@ -83,8 +83,6 @@ sec_acltree::insertion sec_acltree::insert(const qz::acle_view &acle) {
         if (table_.room() != 0)
             table_.enter(hash, count);
     }
-    if (count == 0)
-        first_place_ = place;
     identities_.keep(place, acle.identity.size());
     count_entry(acle.identity.size(), 1);
     return {outcome::inserted,
@@ -121,17 +119,16 @@ void sec_acltree::put_in_order() const {
     if (is_ascending_ || type_ == SEC_ACLE_EXPANDED)
         return;
     table_.release();
-    key_prefix_ = qz::sort_by_identity(entries_.all(), identities_);
+    has_whole_keys_ = qz::sort_by_identity(entries_.all(), identities_) == 0;
     is_ascending_ = true;
 }
 
-// Sorting may have left the keys without what all identities share.
 void sec_acltree::restore_keys() {
-    if (key_prefix_ == 0)
+    if (has_whole_keys_)
         return;
     for (qz::small_entry &entry : entries_.all())
         entry.key = qz::ordered_word(identity(entry));
-    key_prefix_ = 0;
+    has_whole_keys_ = true;
 }
 
 std::span<const qz::small_entry> sec_acltree::in_order() const {

@@ -36,7 +36,7 @@ public:
 
     std::uint8_t type() const { return type_; }
     // The mechanism of the key, as the entry that was inserted first spells it.
-    std::string_view mechanism() const { return identities_.mechanism(first_place_); }
+    std::string_view mechanism() const { return identities_.first_mechanism(); }
 
     // For a duplicate nothing changes.
     insertion insert(const qz::acle_view &acle);
@@ -87,15 +87,14 @@ private:
     // The order of the entries is no part of what a tree is, so that sorting changes none.
     mutable qz::entry_array entries_;
     mutable qz::identity_table table_;
-    mutable std::size_t key_prefix_ = 0; // the bytes of the identities that stand before those in the keys
-    // While every entry sorts behind the one before it, no entry is in the table.
-    mutable bool is_ascending_ = true;
     qz::identity_store identities_;
-    std::uint8_t type_;
-    std::uint32_t first_place_ = 0;
+    std::uint64_t packed_size_ = 0;
     std::uint32_t held_count_ = 0;
     std::uint32_t overlong_count_ = 0;
-    std::uint64_t packed_size_ = 0;
+    mutable bool has_whole_keys_ = true; // until sorting leaves out of the keys what all identities share
+    // While every entry sorts behind the one before it, no entry is in the table.
+    mutable bool is_ascending_ = true;
+    std::uint8_t type_;
 };
 
 // Inserts the entry into the tree in `*slot`, made when that is null; the tree copies what it keeps. An entry with

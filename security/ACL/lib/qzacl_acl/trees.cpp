@@ -64,7 +64,7 @@ void sec_acltree_array::enter(slot entry) {
     index_[at & (index_size_ - 1)] = entry;
 }
 
-// Makes sure of places for one more tree; half of the index stays free.
+// Makes sure of places for one more tree; a quarter of the index stays free.
 bool sec_acltree_array::prepare(std::size_t &refused) {
     if (count_ == capacity_) {
         const std::uint32_t capacity = std::max(capacity_ * 2, std::uint32_t{8});
@@ -74,9 +74,9 @@ bool sec_acltree_array::prepare(std::size_t &refused) {
         }
         capacity_ = capacity;
     }
-    if ((count_ + 1) * 2 <= index_size_)
+    if (count_ < index_size_ / 4 * 3)
         return true;
-    const std::uint32_t size = std::max(index_size_ * 2, std::uint32_t{16});
+    const std::uint32_t size = std::max(index_size_ * 4, std::uint32_t{16});
     qz::owned<slot[]> grown(static_cast<slot *>(std::calloc(size, sizeof(slot))));
     if (grown == nullptr) {
         refused = size * sizeof(slot);
