@@ -110,7 +110,20 @@ int sec_acltree_array::append(const qz::acle_view &acle, std::uint32_t hash) {
     return SEC_S_OK;
 }
 
+// Places in a text are found by subtraction, which must not be done with what is elsewhere.
+bool sec_acltree_array::may_borrow(const qz::acle_view &acle) const {
+    const auto is_in_text = [this](std::string_view piece) {
+        const auto start = reinterpret_cast<std::uintptr_t>(piece.data());
+        return start - reinterpret_cast<std::uintptr_t>(text_.data()) < text_.size();
+    };
+    return text_.empty() || !qz::has_identity(acle.type) ||
+           (is_in_text(acle.identity) && (!qz::has_mechanism(acle.type) || is_in_text(acle.mechanism)));
+}
+
 int sec_acltree_array::add(const qz::acle_view &acle) {
+    if (!may_borrow(acle))
+        return qz::report(SEC_S_INTERNAL, qz::msg::internal_failure, qz::acl_source, __LINE__,
+                          SEC_S_INTERNAL);
     if (last_found_ == nullptr || !is_of_key(*last_found_, acle)) {
         const std::uint32_t hash = hash_of_key(acle, hash_key_);
         sec_acltree_t *found = find(acle, hash);

@@ -17,7 +17,8 @@
 class sec_acltree_array {
 public:
     // For entries that are all parsed from the text, its NUL included, with as many readable bytes behind it as
-    // identity_order.h asks for; it outlives the trees. With an empty text the trees copy what they keep.
+    // identity_order.h asks for; it outlives the trees. An entry from elsewhere is refused as an internal failure.
+    // With an empty text the trees copy what they keep.
     explicit sec_acltree_array(std::span<char> text = {}) : text_(text) {}
     sec_acltree_array(const sec_acltree_array &) = delete;
     sec_acltree_array &operator=(const sec_acltree_array &) = delete;
@@ -39,6 +40,8 @@ private:
         std::uint32_t hash;
         std::uint32_t number; // of the tree plus one; 0 in a free slot
     };
+
+    bool may_borrow(const qz::acle_view &acle) const;
 
     static constexpr std::uint32_t waiting_max = 16;
 
