@@ -38,7 +38,7 @@ public:
     std::string_view first_mechanism() const;
 
     bool is_in_text() const { return unit_ == 1; }
-    // How many entries to make room for when `count` were placed so far, the next one at `place`: at least one,
+    // How many entries to make room for when `count` were placed so far, the next one at `place`: more than that,
     // and of a text as many as there will be if the rest of it is like the part that was read.
     std::uint32_t expected_count(std::uint32_t count, std::uint32_t place) const;
 

@@ -20,6 +20,13 @@ std::size_t packed_size_of(std::uint8_t type, std::size_t identity_length) {
     return qz::format::entry_fixed_size + (qz::has_identity(type) ? identity_length + 1 : 0);
 }
 
+// Grows something for the entries that are expected, or where there is no memory for so many for a fair number.
+template <class Grow>
+bool grow_for(std::uint32_t expected, std::uint32_t count, const Grow &grow) {
+    const std::uint32_t fair = std::max(count * 2, few);
+    return grow(expected) || (expected > fair && grow(fair));
+}
+
 } // namespace
 
 bool sec_acltree::is_equal(const qz::small_entry &held, const candidate &wanted) const {
@@ -40,7 +47,8 @@ bool sec_acltree::sorts_last(const candidate &wanted) const {
 // Puts all entries into a new table with room for those that are expected.
 bool sec_acltree::fill_table(std::uint32_t place, std::size_t &refused) {
     const auto entries = std::as_const(entries_).all();
-    if (!table_.reset(identities_.expected_count(entries_.count(), place), refused))
+    const auto reset = [&](std::uint32_t room) { return table_.reset(room, refused); };
+    if (!grow_for(identities_.expected_count(entries_.count(), place), entries_.count(), reset))
         return false;
     for (std::uint32_t number = 0; number < entries.size(); ++number)
         table_.enter(table_.hash(identity(entries[number]), entries[number].key), number);
@@ -66,8 +74,9 @@ sec_acltree::insertion sec_acltree::insert(const qz::acle_view &acle) {
     restore_keys();
     std::uint32_t place = 0;
     std::size_t refused = 0;
+    const auto reserve = [&](std::uint32_t room) { return entries_.reserve(room, refused); };
     if (!identities_.place(acle, place, refused) ||
-        (entries_.is_full() && !entries_.reserve(identities_.expected_count(count, place), refused)))
+        (entries_.is_full() && !grow_for(identities_.expected_count(count, place), count, reserve)))
         return {outcome::no_memory, nullptr, refused};
 
     const char *const identity = identities_.identity(place);
@@ -116,9 +125,11 @@ void sec_acltree::erase(qz::small_entry &entry) {
 }
 
 void sec_acltree::put_in_order() const {
-    if (is_ascending_ || type_ == SEC_ACLE_EXPANDED)
+    if (is_ascending_)
         return;
-    table_.release();
+    table_.release(); // its numbers are those of another order, and what follows can use the memory
+    if (type_ == SEC_ACLE_EXPANDED)
+        return;
     has_whole_keys_ = qz::sort_by_identity(entries_.all(), identities_) == 0;
     is_ascending_ = true;
 }
