@@ -48,13 +48,15 @@ constexpr int type_letter(unsigned type) {
     }
 }
 
+inline constexpr char no_text[] = "";
+
 // An entry that is borrowed. A NUL, which the lengths do not count, ends the identity always and the mechanism
 // in entries of the types that have one.
 struct acle_view {
     std::uint32_t perm_mask = 0;
     std::uint8_t type = 0;
-    std::string_view mechanism = "";
-    std::string_view identity = "";
+    std::string_view mechanism = no_text;
+    std::string_view identity = no_text;
 };
 
 // The view of a record, whose identity may be null.
@@ -62,7 +64,7 @@ inline acle_view view_of(const sec_acle_t &acle) {
     return {acle.perm_mask,
             acle.type,
             {acle.mechanism, strnlen(acle.mechanism, mechanism_max)},
-            acle.identity == nullptr ? "" : acle.identity};
+            acle.identity == nullptr ? no_text : acle.identity};
 }
 
 struct release_acle {

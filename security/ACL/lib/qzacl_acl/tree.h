@@ -45,8 +45,8 @@ public:
         const char *const text = acle.identity.data();
         return table_.room() == 0 ? nullptr : table_.first_look(table_.hash(text, qz::ordered_word(text)));
     }
-    // The held entry whose identity equals the given one in any letter case, or null.
-    qz::small_entry *find(const char *identity);
+    // The held entry whose identity equals the wanted one in any letter case, or null.
+    qz::small_entry *find(const char *wanted);
     // Takes the entry out; its node stays, so that the order of the others does not change.
     void erase(qz::small_entry &entry);
 

@@ -25,15 +25,14 @@ void in_post_order(std::span<small_entry> in_order, const Release &release) {
     // The nodes whose right subtrees are not finished, each on the right of the one before it. They stand in the part
     // of the array that has been passed.
     std::size_t unfinished = 0;
-    const auto finish = [&] { release(std::as_const(in_order[--unfinished])); };
     for (std::size_t index = 0; index < in_order.size(); ++index) {
         const small_entry entry = in_order[index];
         while (unfinished != 0 && in_order[unfinished - 1].place > entry.place)
-            finish();
+            release(std::as_const(in_order[--unfinished]));
         in_order[unfinished++] = entry;
     }
     while (unfinished != 0)
-        finish();
+        release(std::as_const(in_order[--unfinished]));
 }
 
 } // namespace qz
