@@ -111,3 +111,30 @@ TEST(tree, copies_what_it_cannot_point_to) {
         EXPECT_EQ(sec__add_acle_to_trees(&elsewhere, trees), told == 0 ? SEC_S_OK : SEC_S_INTERNAL);
     }
 }
+
+// Compiling sorts the entries and leaves out of their keys what all share; a tree that grows on knows them all the same.
+TEST(tree, takes_more_entries_after_it_was_compiled) {
+    for (const int count : {3, 40}) {
+        sec_acltree_t *root = nullptr;
+        const auto add = [&](const std::string &name) {
+            const sec_acle_t acle = entry(SEC_ACLE_GROUP, "", name.c_str(), 1);
+            return sec__add_acle_to_tree(1, &acle, &root);
+        };
+        const auto name_of = [](int number) { return "common-" + std::to_string(1000 + number); };
+        for (int number = count; number != 0; --number) EXPECT_EQ(add(name_of(number)), SEC_S_OK);
+        const qz::owned_acltree owner(root);
+        qz::loose_subacl first;
+        EXPECT_EQ(sec__acltree_to_subacl(root, first), SEC_S_OK);
+
+        EXPECT_EQ(add("common-0"), SEC_S_OK);
+        std::string entries = named(1, "common-0");
+        for (int number = 1; number <= count; ++number) {
+            EXPECT_EQ(add(name_of(number)), SEC_S_BAD_ACLE) << number;
+            entries += named(1, name_of(number));
+        }
+        qz::loose_subacl second;
+        EXPECT_EQ(sec__acltree_to_subacl(root, second), SEC_S_OK);
+        const std::string found(reinterpret_cast<const char *>(second.data.get()), second.length);
+        EXPECT_EQ(found, packed_subacl(SEC_ACLE_GROUP, "", static_cast<unsigned>(count) + 1, entries));
+    }
+}
