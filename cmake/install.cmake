@@ -8,9 +8,18 @@ install(FILES completions/qzaclfck.bash DESTINATION ${CMAKE_INSTALL_DATADIR}/bas
 install(FILES completions/_qzaclfck DESTINATION ${CMAKE_INSTALL_DATADIR}/zsh/${QZ_ZSH_COMPLETIONS} COMPONENT command)
 install(FILES completions/qzaclfck.fish DESTINATION ${CMAKE_INSTALL_DATADIR}/fish/vendor_completions.d
   COMPONENT command)
-install(FILES README.md CHANGELOG.md DESTINATION ${CMAKE_INSTALL_DOCDIR} COMPONENT command)
-install(DIRECTORY docs DESTINATION ${CMAKE_INSTALL_DOCDIR} COMPONENT development FILES_MATCHING PATTERN *.md
-  PATTERN man EXCLUDE)
+# The documents, without links among each other: what a link leads to may be compressed there, in another package, or
+# not installed at all. Its text is the name of the file.
+file(GLOB documents RELATIVE ${PROJECT_SOURCE_DIR} CONFIGURE_DEPENDS docs/*.md)
+foreach(document IN ITEMS README.md CHANGELOG.md SECURITY.md LISTS documents)
+  set_property(DIRECTORY APPEND PROPERTY CMAKE_CONFIGURE_DEPENDS ${document})
+  file(READ ${document} text)
+  string(REGEX REPLACE "\\[([^]]*)\\]\\([^):]*\\)" "\\1" text "${text}")
+  file(WRITE ${PROJECT_BINARY_DIR}/share/doc/${document} "${text}")
+endforeach()
+install(FILES ${PROJECT_BINARY_DIR}/share/doc/README.md ${PROJECT_BINARY_DIR}/share/doc/CHANGELOG.md
+  ${PROJECT_BINARY_DIR}/share/doc/SECURITY.md DESTINATION ${CMAKE_INSTALL_DOCDIR} COMPONENT command)
+install(DIRECTORY ${PROJECT_BINARY_DIR}/share/doc/docs DESTINATION ${CMAKE_INSTALL_DOCDIR} COMPONENT development)
 install(DIRECTORY examples DESTINATION ${CMAKE_INSTALL_DOCDIR} COMPONENT development
   PATTERN CMakeLists.txt EXCLUDE PATTERN *.cacl EXCLUDE PATTERN __pycache__ EXCLUDE)
 # The texts for translators.

@@ -39,7 +39,8 @@ function(qz_shared_library name)
   if(arg_REQUIRES)
     set_target_properties(${name} PROPERTIES INSTALL_RPATH $ORIGIN)
   endif()
-  # Never unloaded: threads that live on release what these libraries recorded for them when they end.
+  # Never unloaded: threads that live on release what these libraries recorded for them when they end, and every
+  # fork holds their locks.
   target_link_options(${name} PRIVATE
     -Wl,--version-script=${CMAKE_CURRENT_SOURCE_DIR}/${arg_MAP} -Wl,-z,nodelete)
   if(NOT QZ_SANITIZE)

@@ -35,6 +35,17 @@ model untidy(std::string_view &from) {
     return made;
 }
 
+// Bytes that nothing counts, and a last length that may take some of them or leave some of its own.
+void hide(model &made, std::string_view &from) {
+    made.behind = model_subacl{2, "", {{"", ~0u}}}.bytes().substr(one_of("0123456789abcdefgh", from));
+    const std::size_t left = one_of("=abcdefghijklmnopqrstuvwxyz", from);
+    if (made.subacls.empty() || left == 0) return;
+    model_subacl &last = made.subacls.back();
+    const std::size_t size = last.bytes().size(), whole = size + made.behind.size();
+    const std::size_t length = whole - std::min<std::size_t>(whole, left - 1);
+    if (length != size) last.wrong_length = length;
+}
+
 void expect_edit(edit_function edit, const sec_acle_t &acle, buffer &held, model &wanted) {
     EXPECT_EQ(after(edit(&acle, &held.acl)), wanted.edit(edit, acle));
     EXPECT_EQ(held.bytes(), wanted.bytes());
@@ -44,8 +55,10 @@ void expect_edit(edit_function edit, const sec_acle_t &acle, buffer &held, model
 
 int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
     std::string_view from = input(data, size);
-    const bool is_untidy = one_of("nu", from) == 1;
+    const unsigned kind = one_of("nuh", from);
+    const bool is_untidy = kind != 0;
     model wanted = is_untidy ? untidy(from) : model();
+    if (kind == 2) hide(wanted, from);
     buffer held(is_untidy ? wanted.bytes() : ""); // the first addition makes one
     for (std::uint32_t step = 1; !from.empty() && step < 200; ++step) {
         const edit_function edits[] = {sec_add_acle_to_acl, sec_add_acle_to_acl2, sec_del_acle_from_acl};

@@ -20,7 +20,8 @@ TEST(AclHpp, MovesDecidesAndFails) {
     EXPECT_EQ(allocations, before);
     EXPECT_TRUE(found.grants(4) && !found.grants(6) && denied.no_entry() && acl.groups(groups).failed());
     EXPECT_EQ(qz::acl::from_bytes("none", 4)->to_host(), SEC_S_BAD_ACL);
-    const char swapped[] = "\x85\1\1\0\1\0\0\0\x0a\x7f\0\0\0\0"; // a sub-ACL of unknown type
-    EXPECT_EQ(qz::acl::from_bytes(swapped, sizeof swapped)->to_host(), SEC_S_BAD_ACL);
+    // A sub-ACL of unknown type, in either byte order.
+    for (const auto &bytes : {"\x85\1\1\0\1\0\0\0\x0a\x7f\0\0\0\0", "\x85\1\2\1\0\x0a\0\0\0\x7f\0\0\0\0"})
+        EXPECT_EQ(qz::acl::from_bytes(bytes, 15)->to_host(), SEC_S_BAD_ACL);
     EXPECT_EQ(qz::error::current().text().substr(0, 8), "3417-120"); // its owner being gone
 }

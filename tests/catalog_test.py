@@ -57,6 +57,8 @@ class Catalog(CommandCase):
             self.shows(*shown)
         self.compile('$set 1\n$quote "\n148 "Welche Datei?"\n654 "?"\n')  # a part of the texts, and one that is none
         self.shows([], 4, "Welche Datei?\n" + message(80))
+        self.compile('$set 1\n$quote "\n148 ""\n')  # which tells nobody anything
+        self.shows([], 4, message(148) + message(80))
         for text in ("nothing", "%1$d %2$s", "%1$s %2$d %n"):  # which are not the conversions of the text
             self.compile(changed(SOURCE, 154, f'154 "{text}"'))
             self.shows_defaults()
@@ -105,8 +107,10 @@ class Catalog(CommandCase):
 
     def test_german(self):
         for code_set in ("UTF-8", "ISO-8859-1"):
-            places = ":".join(f"{BUILD}/share/locale/%{part}/LC_MESSAGES/%N" for part in "Ll")  # as under /usr
-            _, shown = run(["-c", "-f", str(TABLE.parents[2] / "examples/mistakes.acl")], self.root,
+            catalogs = str(BUILD / "share/locale").replace("%", "%%")
+            places = ":".join(f"{catalogs}/%{part}/LC_MESSAGES/%N" for part in "Ll")  # as under /usr
+            shutil.copy(TABLE.parents[2] / "examples/mistakes.acl", self.dir)
+            _, shown = run(["-c", "-f", "mistakes.acl"], self.dir,
                            {**self.locale("de_DE." + code_set), "NLSPATH": places})
             self.assertIn("ist länger als die höchstens zuläss", shown.encode("latin-1").decode(code_set))
             self.assertEqual(re.findall(r"(?m)^3417-\d+ (\w+):", shown), ["Fehler"] * 12)

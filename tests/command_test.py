@@ -27,6 +27,7 @@ PLACE = tempfile.TemporaryDirectory()
 os.chmod(PLACE.name, 0o755)
 for part in ("bin", "lib"):
     shutil.copytree(BUILD / part, f"{PLACE.name}/{part}", symlinks=True)
+subprocess.run(["chmod", "-R", "a+rX", PLACE.name], check=True)  # as the mask of who built may not allow
 COMMAND = PLACE.name + "/bin/qzaclfck"
 # The texts of the message table by id; all text here is Latin-1, so that every byte survives.
 TABLE = pathlib.Path(__file__).resolve().parent.parent / "security" / "msg" / "qzseclib_msg.h"
@@ -57,6 +58,29 @@ def run(arguments, cwd, environment=(), child=None, user=None):
                           capture_output=True, check=False, timeout=300, **rights)  # in case that it hangs
     printed = b"on standard output: " + done.stdout if done.stdout else done.stderr
     return done.returncode, printed.decode("latin-1")
+
+
+ENTRIES, INHERITED = "system.posix_acl_access", "system.posix_acl_default"
+WRITER = NOBODY - 2  # a user whom an entry lets write
+
+
+def posix_acl(group):
+    """Entries that let the owner and one user write, and the group do what is said."""
+    no_id = 0xffffffff
+    entries = ((1, 6, no_id), (2, 6, WRITER), (4, group, no_id), (0x10, 6, no_id), (0x20, 4, no_id))
+    return struct.pack("<I", 2) + b"".join(struct.pack("<HHI", *entry) for entry in entries)
+
+
+def entries_of(path):
+    try:
+        return os.getxattr(path, ENTRIES)
+    except OSError as error:
+        return os.strerror(error.errno)
+
+
+def may_write(path, user, group):
+    done = subprocess.run(["test", "-w", path], user=user, group=group, extra_groups=[], check=False)
+    return done.returncode == 0
 
 
 def snapshot(directory):
@@ -109,16 +133,19 @@ class CommandCase(unittest.TestCase):
 
 USAGE = message(80)
 LINE_OF_A = entry("n", "r")
-UNKNOWN_X = f"{COMMAND}: invalid option -- 'x'\n"
+# The C library musl says it in other words, and knows no locales but "C" and such in UTF-8.
+IS_MUSL = b"/ld-musl-" in pathlib.Path(COMMAND).read_bytes()
+UNKNOWN_X = f"{COMMAND}: " + ("unrecognized option: x\n" if IS_MUSL else "invalid option -- 'x'\n")
+LACKS_ARGUMENT = f"{COMMAND}: option requires an argument" + (": %s\n" if IS_MUSL else " -- '%s'\n")
 OPTIONS = [  # arguments, status, standard error; the file "a" holds the line "n r"
     ("-c -s -v -t p", 4, message(148) + USAGE),
     ("-c -s -S -v -t p -u q -f a -h", 0, message(81)),
-    *[(f"-{letter}", 4, f"{COMMAND}: option requires an argument -- '{letter}'\n" + message(147) + USAGE)
-      for letter in "ftu"],
+    *[(f"-{letter}", 4, LACKS_ARGUMENT % letter + message(147) + USAGE) for letter in "ftu"],
     ("-x -h", 0, UNKNOWN_X + message(147)), ("-h -x", 4, UNKNOWN_X + message(147) + USAGE),
     *[(f"-{letter} -f a -{letter}", 4, message(146, f"-{letter}") + USAGE) for letter in "chsSv"],
     *[(f"-{letter} p -{letter} q", 4, message(146, f"-{letter}") + USAGE) for letter in "ftu"],
     ("-cvfa operand -- -x", 0, LINE_OF_A),
+    ("operand - -cvfa", 0, LINE_OF_A),
     ("-S -t p -f a", 0, ""), ("-t p -S -v -f a", 0, message(149) * 2 + LINE_OF_A),
     ("-u no.such.user -f a", 15, message(127, "no.such.user")),
     ("-f missing%n%1$s\xff", 105, message(154, "{dir}/missing%n%1$s\xff", errno.ENOENT)),
@@ -149,8 +176,9 @@ class Command(CommandCase):
     def test_options(self):
         self.write("a", "n r\n")
         for arguments, status, errors in OPTIONS:
-            with self.subTest(arguments):
-                self.expect(arguments.split(" "), status, errors)
+            for strict in ({}, {"POSIXLY_CORRECT": "1"}):  # when the C library looks for no options behind operands
+                with self.subTest(arguments, **strict):
+                    self.expect(arguments.split(" "), status, errors, environment=strict)
 
     def test_lines(self):
         """The facts of a text give what is printed with each of the eight choices of options."""
@@ -180,6 +208,8 @@ class Command(CommandCase):
         self.assertEqual(told[1].count("3417-157"), 1)  # the user, and neither of the groups
         for environment in self.locale("tr_TR.ISO-8859-9"), self.locale("tr_TR.UTF-8"), {"LC_ALL": "not.known"}:
             self.assertEqual(run(["-c", "-f", "a"], self.dir, environment), told)
+        if IS_MUSL:
+            return
         # More bytes than usual are white space: they end a token, but do not stand between two.
         rules = pathlib.Path("/usr/share/i18n/locales/i18n_ctype").read_text("utf-8")
         rules = rules.replace("\nspace /", "\nspace /\n<U00A0>;/")
@@ -202,9 +232,10 @@ class Command(CommandCase):
         names = [f"{number:05}" for number in range(50000)]
         shuffled = names[:20000] + random.Random(1).sample(names[20000:], 30000)
         self.write("a", "".join(f"u m {name} r\ne m {name}\n" for name in shuffled))
-        cache = b"\x85\1\2" + struct.pack("<H", 2) + b"".join(
-            struct.pack("<IBIB", 12 + 50000 * 13, kind, 50000, 2) + b"m\0" + b"".join(
-                struct.pack("<BIH", 1, mask, 6) + name.encode() + b"\0" for name in order)
+        mark = b"\2" if sys.byteorder == "little" else b"\1"
+        cache = b"\x85\1" + mark + struct.pack("=H", 2) + b"".join(
+            struct.pack("=IBIB", 12 + 50000 * 13, kind, 50000, 2) + b"m\0" + b"".join(
+                struct.pack("=BIH", 1, mask, 6) + name.encode() + b"\0" for name in order)
             for kind, mask, order in ((8, 0, shuffled), (4, 1, names)))
         found = []
         for megabytes in range(4, 64, 2):
@@ -238,6 +269,39 @@ class Command(CommandCase):
             self.write("a", A_TEXT, mode, ORDINARY)
             self.expect(["-s", "-f", "a"], 0, "", [("a.cacl", A_CACHE)], child=lambda: os.umask(0o077))
             self.assertEqual(*[(info.st_uid, info.st_gid, info.st_mode) for info in map(os.stat, os.scandir(self.dir))])
+
+    def test_cache_has_the_entries_of_the_file_and_no_others(self):
+        """Nobody can write the cache who cannot write the file, whatever new files in the folder inherit."""
+        for entries, inherited in itertools.product((None, posix_acl(group=4)), (None, posix_acl(group=6))):
+            with self.subTest(entries=entries, inherited=inherited):
+                self.fresh()
+                path = self.write("a", A_TEXT, owner=ORDINARY)
+                try:
+                    if entries:
+                        os.setxattr(path, ENTRIES, entries)
+                    if inherited:
+                        os.setxattr(self.dir, INHERITED, inherited)
+                except OSError:
+                    self.skipTest("the file system has no POSIX ACLs")
+                self.expect(["-s", "-f", "a"], 0, "", [("a.cacl", A_CACHE)])
+                self.assertEqual(entries_of(path + ".cacl"), entries_of(path))
+                self.assertEqual(os.stat(path + ".cacl").st_mode, os.stat(path).st_mode)
+                if IS_ROOT:
+                    self.assertFalse(may_write(path + ".cacl", NOBODY, ORDINARY))
+                    self.assertEqual(may_write(path + ".cacl", WRITER, WRITER), entries is not None)
+
+    def test_cache_with_other_entries_is_not_replaced(self):
+        path = self.write("a", A_TEXT, 0o664)
+        self.write("a.cacl", "old", 0o664)
+        try:
+            os.setxattr(path, ENTRIES, posix_acl(group=4))
+        except OSError:
+            self.skipTest("the file system has no POSIX ACLs")
+        self.expect(["-s", "-f", "a"], 37, message(137, "{dir}/a"))
+        os.setxattr(path + ".cacl", ENTRIES, posix_acl(group=6))
+        self.expect(["-s", "-f", "a"], 37, message(137, "{dir}/a"))
+        os.setxattr(path + ".cacl", ENTRIES, posix_acl(group=4))
+        self.expect(["-s", "-f", "a"], 0, "", [("a.cacl", A_CACHE)])
 
     def test_full_disk(self):
         self.write("a", A_TEXT)

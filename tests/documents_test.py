@@ -37,6 +37,7 @@ class Documents(unittest.TestCase):
         self.dir = Path(tempfile.mkdtemp()).resolve()
         self.addCleanup(shutil.rmtree, self.dir)
         shutil.copytree(SOURCE / "examples", self.dir / "examples", ignore=shutil.ignore_patterns("*.cacl"))
+        subprocess.run(["chmod", "-R", "u=rwX,go=rX", self.dir / "examples"], check=True)
         for name, text in RECIPES.items():
             (self.dir / name).write_text(text)
             (self.dir / name).chmod(0o755)
@@ -84,7 +85,7 @@ class Documents(unittest.TestCase):
     @unittest.skipUnless(shutil.which("gencat") and os.path.exists("/usr/share/i18n/locales/de_DE"), "no German locale")
     def test_places_of_mistakes_in_another_language(self):
         subprocess.run(["localedef", "-i", "de_DE", "-f", "UTF-8", self.dir / "de_DE.UTF-8"], check=True)
-        catalogs = re.search("NLSPATH=(.*)", RECIPES["language"])[1].replace("/usr/local", str(BUILD))
+        catalogs = re.search("NLSPATH=(.*)", RECIPES["language"])[1].replace("/usr/local", str(BUILD).replace("%", "%%"))
         matcher = json.loads(RECIPES["matcher"])["problemMatcher"][0]["pattern"][0]
         places = re.findall(r"(?m)^examples/\S+: 3417-\d+", DOCS[SOURCE / "docs/recipes.md"])
         _, shown = self.run_in_shell("aclcheck examples/*.acl", LC_ALL="de_DE.UTF-8", NLSPATH=catalogs)

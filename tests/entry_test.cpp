@@ -1,5 +1,5 @@
 // Permissions in both directions, and entries: making, displaying and releasing them, also in other code sets.
-#include "owned.h"
+#include "base/owned.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/permission.h"
 #include "support.h"
@@ -21,7 +21,21 @@ extern "C" char *nl_langinfo(nl_item item) noexcept {
     return item == CODESET && claimed_code_set != nullptr ? const_cast<char *>(claimed_code_set) : real(item);
 }
 
+// What the conversion of code sets answers; 0: what it really does.
+static int claimed_result = 0;
+
+extern "C" int cu_iconv_str_1(cu_iconv_t handle, std::uint32_t options, const char *in, const std::size_t *in_length,
+                              char **out, std::size_t *out_length) {
+    static const auto real = reinterpret_cast<decltype(&cu_iconv_str_1)>(dlsym(RTLD_NEXT, "cu_iconv_str_1"));
+    return claimed_result != 0 ? claimed_result : real(handle, options, in, in_length, out, out_length);
+}
+
 namespace {
+
+TEST(messages, have_a_text_whatever_their_id) {
+    for (const int id : {-1, 1, qz::msg::table_size}) EXPECT_EQ(qz::msg::shown_text(id), cu_badid_qzseclib_msg);
+    EXPECT_EQ(qz::msg::shown_text(88), qz::msg::default_text(88));
+}
 
 TEST(permissions, turn_letters_into_bits_and_back) {
     const sec_perm_template_t list[] = {
@@ -56,7 +70,7 @@ TEST(permissions, turn_letters_into_bits_and_back) {
 std::string made_of(std::uint8_t type, const char *mechanism, const char *identity) {
     auto *made = reinterpret_cast<sec_acle_t *>(0x10);
     const failure error = after(sec_create_acle(type, 1u << 31, mechanism, identity, &made));
-    const qz::owned_acle owner(made);
+    const std::unique_ptr<sec_acle_t, void (*)(sec_acle_t *)> owner(made, sec_release_acle);
     if (made == nullptr) return PrintToString(error);
     EXPECT_EQ(std::tuple(error, made->type, made->perm_mask), std::tuple(no_error, type, 1u << 31));
     return made->mechanism + "/"s + (made->identity == nullptr ? "none" : made->identity);
@@ -90,6 +104,19 @@ TEST(entries, are_made_from_sound_parameters) {
     };
     for (const auto &[type, mechanism, identity, made] : rows) EXPECT_EQ(made_of(type, mechanism, identity), made);
     EXPECT_EQ(after(sec_create_acle(1, 0, "", "", nullptr)), bad_parameter("sec_create_acle", 5, "0"));
+}
+
+// An internal failure names the line of the call that failed.
+TEST(entries, tell_where_a_conversion_failed) {
+    std::ifstream file(QZ_SOURCES "/security/ACL/lib/qzacl_utils.cpp");
+    std::string line;
+    int number = 1;
+    while (std::getline(file, line) && line.find("cu_iconv_str_1(") == std::string::npos) ++number;
+    sec_acle_t *made = nullptr;
+    claimed_result = 17;
+    const failure error = after(sec_create_acle(16, 0, nullptr, "staff", &made));
+    claimed_result = 0;
+    EXPECT_EQ(error, error_of(23, 91, {"security/ACL/lib/qzacl_utils", std::to_string(number), "17"}));
 }
 
 // The two texts of an entry, or the error.

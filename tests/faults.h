@@ -13,6 +13,7 @@
 #include <pwd.h>
 #include <string>
 #include <sys/stat.h>
+#include <sys/xattr.h>
 #include <unistd.h>
 #include <vector>
 
@@ -86,12 +87,26 @@ inline void *counted(void *made) {
 
 } // namespace faults
 
+// Of the names that a call has for the linker, with large files and late times or without, a C library may lack some;
+// the code under test uses one of them.
 #define QZ_WRAPPED(result, name, parameters)                                                                           \
-    result __real_##name parameters;                                                                                   \
+    [[gnu::weak]] result __real_##name parameters;                                                                     \
     [[gnu::used]] inline result __wrap_##name parameters
 // A call that fails with -1, and one that may also fall short of what was asked for.
-#define QZ_WRAPPED_CALL(name, parameters, arguments)                                                                   \
-    QZ_WRAPPED(int, name, parameters) { return faults::next(#name) > 0 ? -1 : __real_##name arguments; }
+#define QZ_WRAPPED_AS(called, name, parameters, arguments)                                                             \
+    QZ_WRAPPED(int, name, parameters) { return faults::next(called) > 0 ? -1 : __real_##name arguments; }
+#define QZ_WRAPPED_CALL(name, parameters, arguments) QZ_WRAPPED_AS(#name, name, parameters, arguments)
+#define QZ_WRAPPED_STATUS(name, parameters, arguments)                                                                 \
+    QZ_WRAPPED_AS(#name, name, parameters, arguments)                                                                  \
+    QZ_WRAPPED_AS(#name, name##64, parameters, arguments)                                                              \
+    QZ_WRAPPED_AS(#name, __##name##64_time64, parameters, arguments)
+// Opening, and what a fortified call without a mode becomes.
+#define QZ_WRAPPED_OPEN(name, fortified)                                                                               \
+    QZ_WRAPPED(int, name, (const char *path, int flags, mode_t mode)) {                                                \
+        if (faults::is_watching) faults::opened = path;                                                                \
+        return faults::next("open") > 0 ? -1 : __real_##name(path, flags, mode);                                       \
+    }                                                                                                                  \
+    [[gnu::used]] inline int __wrap_##fortified(const char *path, int flags) { return __wrap_##name(path, flags, 0); }
 #define QZ_WRAPPED_TRANSFER(name, memory)                                                                              \
     QZ_WRAPPED(ssize_t, name, (int fd, memory bytes, size_t size)) {                                                   \
         const int fault = faults::next(#name);                                                                         \
@@ -119,22 +134,32 @@ QZ_WRAPPED(void, free, (void *memory)) {
     __real_free(memory);
 }
 
-QZ_WRAPPED_CALL(stat, (const char *path, struct stat *out), (path, out))
-QZ_WRAPPED_CALL(lstat, (const char *path, struct stat *out), (path, out))
-QZ_WRAPPED_CALL(fstat, (int fd, struct stat *out), (fd, out))
-QZ_WRAPPED(int, open, (const char *path, int flags, mode_t mode)) {
-    if (faults::is_watching) faults::opened = path;
-    return faults::next("open") > 0 ? -1 : __real_open(path, flags, mode);
-}
-// What a fortified call without a mode becomes.
-[[gnu::used]] inline int __wrap___open_2(const char *path, int flags) { return __wrap_open(path, flags, 0); }
+QZ_WRAPPED_STATUS(stat, (const char *path, struct stat *out), (path, out))
+QZ_WRAPPED_STATUS(lstat, (const char *path, struct stat *out), (path, out))
+QZ_WRAPPED_STATUS(fstat, (int fd, struct stat *out), (fd, out))
+QZ_WRAPPED_OPEN(open, __open_2)
+QZ_WRAPPED_OPEN(open64, __open64_2)
 QZ_WRAPPED_CALL(fchown, (int fd, uid_t user, gid_t group), (fd, user, group))
 QZ_WRAPPED_CALL(fchmod, (int fd, mode_t mode), (fd, mode))
 QZ_WRAPPED_CALL(futimens, (int fd, const timespec *times), (fd, times))
+QZ_WRAPPED_AS("futimens", __futimens64, (int fd, const timespec *times), (fd, times))
 QZ_WRAPPED_CALL(fdatasync, (int fd), (fd))
 QZ_WRAPPED_CALL(rename, (const char *from, const char *to), (from, to))
 QZ_WRAPPED_CALL(unlink, (const char *path), (path))
+QZ_WRAPPED_CALL(fsetxattr, (int fd, const char *name, const void *value, size_t size, int flags),
+                (fd, name, value, size, flags))
+QZ_WRAPPED_CALL(fremovexattr, (int fd, const char *name), (fd, name))
+QZ_WRAPPED(ssize_t, getxattr, (const char *path, const char *name, void *value, size_t size)) {
+    return faults::next("getxattr") > 0 ? -1 : __real_getxattr(path, name, value, size);
+}
+QZ_WRAPPED(ssize_t, fgetxattr, (int fd, const char *name, void *value, size_t size)) {
+    return faults::next("fgetxattr") > 0 ? -1 : __real_fgetxattr(fd, name, value, size);
+}
 QZ_WRAPPED_TRANSFER(read, void *)
+// What a fortified call becomes.
+[[gnu::used]] inline ssize_t __wrap___read_chk(int fd, void *bytes, size_t size, size_t /*room*/) {
+    return __wrap_read(fd, bytes, size);
+}
 QZ_WRAPPED_TRANSFER(write, const void *)
 QZ_WRAPPED(int, close, (int fd)) { // which closes even as it fails
     const bool fails = faults::next("close") > 0;

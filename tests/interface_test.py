@@ -35,26 +35,21 @@ FACTS += [f"SEC_{name} == {value}" for name, value in re.findall(r"(\w+) (\d+)",
 
 CONSUMER = """cmake_minimum_required(VERSION 3.25)\nproject(consumer C)\nfind_package(qzacl 1.0 REQUIRED)
 add_executable(service service.c)\ntarget_link_libraries(service qzacl::qzacl)\n"""
-SERVICE, SCRIPT = (SOURCE / "examples/service.acl").read_text(), SOURCE / "examples/python/qzacl.py"
+SERVICE, SCRIPT = (SOURCE / "examples/service.acl").read_text(), SOURCE / "examples/python/service.py"
 SERVICES, PYTHON = (BUILD / "examples/service", BUILD / "examples/service_cpp"), (sys.executable, "-B")
 CASES = [  # an ACL, its size when it is compiled, who asks, and the answer of the example services
     (SERVICE, 478, "alice@head.cluster.example operators", "granted by user: rwxCqle"),
     (SERVICE, 478, "MALLORY@login.cluster.example operators", "granted by user: nothing"),
-    (SERVICE, 478, "carol@login.cluster.example operators", "granted by domain: rql"),
-    (SERVICE, 478, "carol@there.example operators AUDITORS staff", "granted by groups: rwxCqlev"),
+    (SERVICE, 478, "carol@login.cluster.example operators", "granted by expanded: rql"),
+    (SERVICE, 478, "carol@there.example operators AUDITORS staff", "granted by group: rwxCqlev"),
     (SERVICE, 478, "carol@there.example staff", "granted by any other: rql"),
     ("n r\n", 22, "carol@there", "nothing is granted"), ("# nobody\n", 0, "carol@there", "nothing is granted")]
 ADDED, KEPT = "granted by user: r\ndeleted again\n", "has an entry of its own, which stays\n"
-ENVIRONMENT = {**os.environ, "QZ_LIBRARY_DIR": str(BUILD / "lib"), "PYTHONPATH": str(SCRIPT.parent)}
+ENVIRONMENT = {**os.environ, "QZ_LIBRARY_DIR": str(BUILD / "lib"), "PYTHONPATH": str(SOURCE / "bindings/python")}
 if "address" in SANITIZED:  # its runtime must come first; what Python never frees is no leak of ours
     asked = CACHE["CMAKE_CXX_COMPILER"], f"-print-file-name=libclang_rt.asan-{platform.machine()}.so"
     ENVIRONMENT |= {"LD_PRELOAD": subprocess.check_output(asked, text=True).strip(), "ASAN_OPTIONS": "detect_leaks=0"}
 LOADABLE = not SANITIZED or os.path.exists(ENVIRONMENT.get("LD_PRELOAD", ""))
-HANDLING = """import qzacl
-qzacl.register_expanded("unix", lambda requested, entry: {}["key"])
-with qzacl.Acl.read("service.acl") as acl: print(acl.expanded("unix", "carol@a.example"))
-try: acl.read("missing")
-except qzacl.Error as error: print(error.code, error.message_id > 0, error.text[:8], list(acl), flush=True)"""
 BASH = '. "$0"; COMP_WORDS=($1); COMP_CWORD=$((${#COMP_WORDS[@]} - 1)); _qzaclfck; printf "%s\\n" "${COMPREPLY[@]}"'
 COMPLETIONS = {"qzaclfck.bash": ("bash", "--norc", "-c", BASH),
                "qzaclfck.fish": ("fish", "--no-config", "-c", "source $argv[1]; complete -C $argv[2]")}
@@ -85,8 +80,10 @@ class Interface(unittest.TestCase):
     def test_every_header_compiles_alone_and_strictly(self):
         for compiler in filter(shutil.which, ("gcc", "clang", "g++", "clang++")):
             cxx = ["-xc++", "-fno-exceptions", "-fno-rtti"] if "++" in compiler else []
-            headers = [*HEADERS.values(), "acl.hpp"] if cxx else HEADERS.values()
+            headers = (path.name for path in (SOURCE / "include/qz").glob("*.h*" if cxx else "*.h"))
             for standard, header in itertools.product(("c++17", "c++20") if cxx else ("c99",), headers):
+                if standard == "c++20" and header not in ("acl.hpp", "service.hpp"):
+                    continue  # the parts of service.hpp are in it
                 command = compiler, f"-std={standard}", *(cxx or ["-xc"]), *STRICT
                 self.assertEqual(run(*command, input=f"#include <qz/{header}>\nint unused;\n"), "")
 
@@ -99,6 +96,7 @@ class Interface(unittest.TestCase):
         for library, header in HEADERS.items():
             dynamic = run("readelf", "-dW", BUILD / f"lib/{library}.so")
             self.assertEqual(re.findall(r"\(SONAME\).*\[(.*)\]", dynamic), [f"{library}.so.1"])
+            self.assertRegex(dynamic, "FLAGS_1.*NODELETE")  # ends of threads, and forks, call into it
             foreign = re.findall(r"\(NEEDED\).*\[((?!libqz|libc\.so\.|ld-linux).*)\]", dynamic)
             self.assertTrue(SANITIZED or not foreign, f"{library} needs {foreign}")
             symbols = run("nm", "-D", "--defined-only", BUILD / f"lib/{library}.so")
@@ -130,19 +128,22 @@ class Interface(unittest.TestCase):
                 shown = run(program, "service.acl", *requester.split(), cwd=self.dir)
                 self.assertEqual(shown, f"read from the {source}\n{answer}\n{end}", program)
             if LOADABLE:
-                entries = run(COMMAND, "-vf", "service.acl", cwd=self.dir).split("\n")
                 shown = run(*PYTHON, SCRIPT, "service.acl", *requester.split(), cwd=self.dir, env=ENVIRONMENT)
-                self.assertEqual(sorted(shown.splitlines()), sorted(filter(None, [*entries, answer])))
+                self.assertEqual(shown.splitlines()[-1], answer)
         self.write("o r\nx r\n")
         for program in SERVICES:
             told = run(program, "service.acl", "carol@there", status=1, cwd=self.dir)
             self.assertRegex(told, r"^service\.acl: 3417-179 (?s:.*)Orvex Guide\.\n$")
 
-    @unittest.skipUnless(LOADABLE, f"Python has no runtime for the sanitizers {SANITIZED}")
-    def test_failures_in_python(self):
-        self.write("e unix .example r\n")
-        shown = run(*PYTHON, "-c", HANDLING, cwd=self.dir, env=ENVIRONMENT).splitlines()
-        self.assertEqual((shown[:2], shown[-1]), (["None", "37 True 3417-135 []"], "KeyError: 'key'"))
+    def test_example_services_answer_the_cases(self):
+        self.write(SERVICE)
+        lines = (SOURCE / "examples/service.cases").read_text().splitlines()
+        for mechanism, user, *groups, wanted, expected in filter(None, (line.partition("#")[0].split() for line in lines)):
+            if mechanism == "unix" and "@" in user:  # whom they can ask about
+                for program in SERVICES:
+                    shown = run(program, "service.acl", user, *(group[1:] for group in groups), cwd=self.dir)
+                    granted = re.search(r"granted by [a-z ]+: (\w+)", shown)[1].replace("nothing", "")
+                    self.assertEqual("yes" if set(wanted) <= set(granted) else "no", expected, (user, groups, shown))
 
     def consume(self, prefix, libraries, folder):
         shutil.copytree(SOURCE / "examples", folder, ignore=shutil.ignore_patterns("*.cacl"))
@@ -156,6 +157,9 @@ class Interface(unittest.TestCase):
             answer = run(folder / program, folder / "service.acl", "carol@there", env={"LD_LIBRARY_PATH": libraries})
             self.assertIn("any other: rql", answer)
         self.assertIn("Syntax:", run(prefix / "bin/qzaclfck", "-h", env={}))
+        for document in prefix.rglob("*.md"):
+            for target in re.findall(r"\]\(([^):]*)\)", document.read_text()):
+                self.assertTrue((document.parent / target).exists(), (document, target))
 
     @unittest.skipIf(SANITIZED or CACHE["CMAKE_INSTALL_LIBDIR"] != "lib" or not shutil.which("pkg-config"),
                      "needs pkg-config, and a plain build that is no packager's")

@@ -8,7 +8,7 @@ import sys
 from pathlib import Path
 
 ROOT = Path(sys.argv[1] if sys.argv[1:] else Path(__file__).resolve().parents[1])
-FILES = {path.relative_to(ROOT).as_posix() for folder in ("security", "platform", "include")
+FILES = {path.relative_to(ROOT).as_posix() for folder in ("security", "platform", "base", "include")
          for path in (ROOT / folder).rglob("*.*") if path.suffix in (".c", ".cpp", ".h", ".hpp")}
 # Rows of folders, and for those in LIB of files without their endings.
 ROWS = re.findall(r"^ {2,6}((?:[\w/]+  )*[\w/]+)(?:   |$)", (ROOT / "CONTRIBUTING.md").read_text(), re.M)
@@ -27,7 +27,7 @@ for source in sorted(FILES):
         found.append(f"{source}: is in no layer")
     for number, line in enumerate((ROOT / source).read_text().splitlines(), 1):
         name = match[1] if (match := INCLUDE.match(line)) else ""
-        folders = (source.rsplit("/", 1)[0] + "/", LIB, "security/", "platform/", "include/")
+        folders = (source.rsplit("/", 1)[0] + "/", LIB, "security/", "platform/", "include/", "")
         target = next((folder + name for folder in folders if folder + name in FILES), source)
         if (rank_of(target) > rank_of(source) or target.endswith(".hpp") > source.endswith(".hpp") or "../" in name
                 or source.startswith("platform/") and target == "include/qz/acl.h"):

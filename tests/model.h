@@ -4,6 +4,7 @@
 #define QZ_TESTS_MODEL_H
 #include "support.h"
 #include <map>
+#include <optional>
 
 namespace support {
 
@@ -20,6 +21,7 @@ struct model_subacl {
     std::string mechanism;
     items stored = {};
     unsigned flaw = 0; // 1: a version nobody looks at; bytes behind 2: the mechanism, 3: the identities
+    std::optional<std::size_t> wrong_length = {};
 
     // Of equal ones the first spelling and the last mask; all but user-expanded ones are put in order.
     items expanded() const {
@@ -38,16 +40,18 @@ struct model_subacl {
             entries += packed_entry(mask, type < 4 ? "" : text_field(identity) + (flaw == 3 ? "more" : ""));
         if (flaw == 1 && !entries.empty()) entries[0] = 7;
         const std::string field = flaw == 2 ? (text_field(mechanism) + "m").substr(0, 17) : text_field(mechanism);
-        return packed_subacl(type, has_mechanism(type) ? field : "", stored.size(), entries);
+        const std::string sound = packed_subacl(type, has_mechanism(type) ? field : "", stored.size(), entries);
+        return number(wrong_length.value_or(sound.size()), 4) + sound.substr(4);
     }
 };
 
 struct model {
     std::vector<model_subacl> subacls;
+    std::string behind = {}; // bytes that nothing counts
     std::string bytes() const {
         std::string all;
         for (const model_subacl &each : subacls) all += each.bytes();
-        return packed_acl(subacls.size(), all);
+        return packed_acl(subacls.size(), all + behind);
     }
     auto find(int type, const std::string &mechanism) const {
         return std::ranges::find_if(subacls,
@@ -79,7 +83,14 @@ struct model {
         if (old != held.end() && how == sec_add_acle_to_acl2)
             return has_mechanism(acle.type) ? error_of(43, 144, {letter, mechanism, identity})
                                             : error_of(43, acle.type < 4 ? 160 : 161, {letter, identity});
-        if (at == subacls.end()) at = subacls.insert(at, {acle.type, ""});
+        if (at == subacls.end()) {
+            // A walk that follows the lengths must find it behind the entries of the last one.
+            if (!subacls.empty() && subacls.back().wrong_length) return located(42, 97);
+            at = subacls.insert(at, {acle.type, ""});
+        } else if (at->wrong_length) {
+            // What the length names goes, and what it does not stays out of force.
+            behind = (at->bytes() + behind).substr(*at->wrong_length);
+        }
         const std::string spelled = held.empty() ? mechanism : at->mechanism;
         if (deletes)
             held.erase(old);

@@ -27,7 +27,8 @@ struct read_acl_file : testing::Test {
 
 TEST_F(read_acl_file, reads_the_cache_when_it_is_current) {
     const std::string cut = example.substr(0, 30);
-    const std::string foreign = "\x85\1\1\0\1\0\0\0\x1a\4\0\0\0\1\5abcd\0\1\0\0\0\3\0\4xyz\0"s;
+    std::string unsound = foreign;
+    unsound[20] = 9; // the version of its entry
     // The text, 100 s old; what is cached, its age and mode; the flags before and after; what is read.
     const std::tuple<std::string, std::string, int, unsigned, unsigned, unsigned, std::string> rows[] = {
         {acl_text, "", 0, 0, convert | 0xf8, text | 0xf8, from_text}, // no file
@@ -40,6 +41,7 @@ TEST_F(read_acl_file, reads_the_cache_when_it_is_current) {
         {acl_text, cut, 0, 0644, convert | cache, text, from_text}, // newer, so left alone
         {"", example, 0, 0644, cache | convert, convert, ""},
         {"# nobody\n\n  \t\n", example, 0, 0644, text | cache, text, ""},
+        {acl_text, unsound, 0, 0644, convert, text, from_text}, // once it is converted
         {acl_text, foreign, 0, 0644, 0, 0, foreign},
     };
     for (const auto &[written, cached, age, mode, in, out, bytes] : rows) {
@@ -62,6 +64,60 @@ TEST_F(read_acl_file, reads_the_cache_when_it_is_current) {
         EXPECT_EQ(read(path, cache | convert), given(from_text, text | cache));
         EXPECT_EQ(fs::status(cache_path).permissions(), fs::perms(mode));
         EXPECT_EQ(read(path, cache | convert), given(from_text, convert));
+    }
+}
+
+TEST_F(read_acl_file, reads_the_cache_when_its_entries_are_those_of_the_text) {
+    constexpr unsigned none = 8; // for user 1, else the permissions
+    struct row {
+        const char *name;
+        unsigned of_text, of_cache;
+        unsigned mode;
+        bool is_believed;
+    };
+    const row rows[] = {
+        {"neither has entries", none, none, 0664, true},
+        {"both have the same", 6, 6, 0664, true},
+        {"the group may write the cache", 6, none, 0664, false},
+        {"the group may read the cache", 4, none, 0644, false},
+        {"user 1 may write the cache", none, 6, 0664, false},
+        {"user 1 may write the cache, not only read it", 4, 6, 0664, false},
+    };
+    for (const auto &[name, of_text, of_cache, mode, is_believed] : rows) {
+        SCOPED_TRACE(name);
+        const unsigned mask = mode >> 3 & 7;
+        write_file(path, acl_text, 100, mode);
+        write_file(cache_path, example, 0, mode);
+        if (of_text != none && !give_entries(path, of_text, mask)) GTEST_SKIP() << "the file system has no POSIX ACLs";
+        if (of_cache != none) { ASSERT_TRUE(give_entries(cache_path, of_cache, mask)); }
+        EXPECT_EQ(read(path, convert), is_believed ? given(example, convert) : given(from_text, text));
+        EXPECT_EQ(read(path, cache | convert), is_believed ? given(example, convert) : given(from_text, text));
+        fs::remove(path);
+        fs::remove(cache_path);
+    }
+}
+
+TEST_F(read_acl_file, knows_times_after_2038) {
+    constexpr time_t later = 4000000000;
+    write_file(path, acl_text);
+    write_file(cache_path, example);
+    const auto stamp = [](const std::string &name, time_t seconds) {
+        const timespec times[2] = {{seconds, 0}, {seconds, 0}};
+        return utimensat(AT_FDCWD, name.c_str(), times, 0);
+    };
+    ASSERT_EQ(stamp(path, later) | stamp(cache_path, later + 1), 0);
+    EXPECT_EQ(read(path, 0), given(example, 0));
+    ASSERT_EQ(stamp(cache_path, later), 0);
+    EXPECT_EQ(read(path, 0), given(from_text, text));
+}
+
+// A file of 4 GiB is none without bytes, and one of a byte less does not go into a block of none.
+TEST_F(read_acl_file, larger_than_memory_can_be_does_not_fit) {
+    if (sizeof(size_t) > 4) GTEST_SKIP() << "any file may fit";
+    for (const off_t size : {off_t{1} << 32, (off_t{1} << 32) - 1}) {
+        write_file(path, "");
+        ASSERT_EQ(truncate(path.c_str(), size), 0);
+        EXPECT_EQ(read(path, text), reading("", text, error_of(6, 89, {"sec_read_acl_file", "2147483647"})));
     }
 }
 

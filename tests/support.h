@@ -8,6 +8,7 @@
 #include "qz/cu.h"
 
 #include <algorithm>
+#include <bit>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
@@ -17,6 +18,7 @@
 #include <random>
 #include <sstream>
 #include <string>
+#include <sys/xattr.h>
 #include <vector>
 
 namespace support {
@@ -79,6 +81,18 @@ inline void write_file(const std::string &path, const std::string &bytes, int ag
     last_write_time(path, file_time_type::clock::now() - std::chrono::seconds(age));
     permissions(path, perms(mode));
 }
+// Gives a file the entries of a POSIX ACL: one for user 1, a group that may read, and a mask, which the group bits of
+// the mode then show. False where the file system has none.
+inline bool give_entries(const std::string &path, unsigned user_bits, unsigned mask) {
+    const std::string no_id(4, '\xff');
+    const std::string user_1 = "\2\0"s + static_cast<char>(user_bits) + "\0\1\0\0\0"s;
+    const std::string owner = "\1\0\6\0"s + no_id;
+    const std::string group = "\4\0\4\0"s + no_id;
+    const std::string others = "\x20\0\4\0"s + no_id;
+    const std::string limit = "\x10\0"s + static_cast<char>(mask) + "\0"s + no_id;
+    const std::string all = "\2\0\0\0"s + owner + user_1 + group + limit + others;
+    return setxattr(path.c_str(), "system.posix_acl_access", all.data(), all.size(), 0) == 0;
+}
 inline std::string read_file(const std::string &path) {
     std::ifstream file(path, std::ios::binary);
     return {std::istreambuf_iterator<char>(file), {}};
@@ -91,9 +105,14 @@ inline sec_acle_t entry(int type, std::string_view mechanism, const char *identi
     return made;
 }
 
-// Parts of a compiled buffer. Numbers stand low byte first; strings are given with their NUL.
+// Parts of a compiled buffer. Numbers stand as this host has them; strings are given with their NUL.
+inline constexpr bool is_low_byte_first = std::endian::native == std::endian::little;
+inline constexpr char this_order = is_low_byte_first ? 2 : 1, other_order = is_low_byte_first ? 1 : 2;
 inline std::string number(std::uint64_t value, std::size_t width) {
-    return width == 0 ? "" : static_cast<char>(value & 0xff) + number(value >> 8, width - 1);
+    std::string bytes;
+    for (; bytes.size() < width; value >>= 8)
+        bytes.insert(is_low_byte_first ? bytes.end() : bytes.begin(), static_cast<char>(value & 0xff));
+    return bytes;
 }
 inline std::string packed_entry(std::uint32_t mask, std::string_view identity) {
     return "\1"s + number(mask, 4) + number(identity.size(), 2) + std::string(identity);
@@ -104,7 +123,7 @@ inline std::string packed_subacl(int type, std::string_view mechanism, std::uint
            static_cast<char>(mechanism.size()) + std::string(mechanism) + entries;
 }
 inline std::string packed_acl(std::uint64_t count, const std::string &subacls) {
-    return "\x85\1\2"s + number(count, 2) + subacls;
+    return "\x85\1"s + this_order + number(count, 2) + subacls;
 }
 
 inline const std::string source = "security/ACL/lib/qzacl_acl";
@@ -175,8 +194,11 @@ inline std::string folded(std::string text) {
 }
 inline bool same(const std::string &a, const std::string &b) { return folded(a) == folded(b); }
 
-// The 31 bytes that the format is explained with.
-inline const std::string example = one(of_mechanism(4, "abcd", 1, named(3, "xyz")));
+// The 31 bytes that the format is explained with, as hosts of either order write them.
+inline const std::string low_byte_first = "\x85\1\2\1\0\x1a\0\0\0\4\1\0\0\0\5abcd\0\1\3\0\0\0\4\0xyz\0"s,
+                         high_byte_first = "\x85\1\1\0\1\0\0\0\x1a\4\0\0\0\1\5abcd\0\1\0\0\0\3\0\4xyz\0"s,
+                         example = is_low_byte_first ? low_byte_first : high_byte_first,
+                         foreign = is_low_byte_first ? high_byte_first : low_byte_first;
 
 // One sub-ACL of every type, and a second mechanism; user and group entries in order.
 inline const std::string rich = packed_acl(

@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <gmock/gmock.h>
 #include <regex>
 #include <sys/resource.h>
@@ -144,6 +145,29 @@ TEST_F(Trace, OnlyRegularFilesAreWrittenTo) {
             EXPECT_EQ(tr_get_size_1(&size), code);
             EXPECT_EQ(size, name == longest ? 100 : is_used ? UINT32_MAX : 0);
         });
+    }
+}
+
+TEST_F(Trace, FilesOfOthersAreNotWrittenTo) {
+    const std::tuple<const char *, bool, std::function<int()>> rows[] = {
+        {"as it was made", true, [] { return 0; }},
+        {"readable", true, [&] { return chmod(file.c_str(), 0644); }},
+        {"writable by its group, or by whom an ACL names", false, [&] { return chmod(file.c_str(), 0620); }},
+        {"writable by others", false, [&] { return chmod(file.c_str(), 0602); }},
+        {"with a second name", false, [&] { return link(file.c_str(), (file + "2").c_str()); }},
+        {"of somebody else", false, [&] { return chown(file.c_str(), 1, 1); }},
+    };
+    for (const auto &[how, is_used, change] : rows) {
+        SCOPED_TRACE(how);
+        std::filesystem::remove(file);
+        std::ofstream(file) << "before\n";
+        std::filesystem::permissions(file, std::filesystem::perms{0600});
+        if (change() != 0) continue; // only root gives files away
+        in_child([&, is_used = is_used] {
+            EXPECT_EQ(enlist(), is_used ? on : off);
+            EXPECT_EQ(tr_record_id_1("C", 1), is_used ? TR_OK : TR_NO_FILE);
+        });
+        EXPECT_EQ(lines().size(), is_used ? 2u : 1u);
     }
 }
 

@@ -89,6 +89,32 @@ class Trace(CommandCase):
                 subprocess.run(program, check=True, stdout=subprocess.DEVNULL, env=os.environ | self.traced(levels))
                 self.expect_records(expected)
 
+    def records_of(self, test, levels):
+        self.fresh()
+        name, _, cases = test.partition(":")
+        subprocess.run([BUILD / f"tests/{name}_test", "--gtest_filter=" + cases], check=True, stdout=subprocess.DEVNULL,
+                       env=os.environ | self.traced(levels))
+        return [json.loads(line) for line in pathlib.Path(self.dir + ".trace").read_text("utf-8").splitlines()]
+
+    def test_released_trees(self):
+        """Below each node the left side goes first, then the right one, then the node."""
+        released = [record["items"][4]["text"] for record in self.records_of("tree:*leaves_up", "API=8")
+                    if record["id"] == 47]
+        self.assertEqual(released, [*"cifpwtm", *"cba", *"tfm"])
+
+    def test_replaced_entries(self):
+        """A mechanism that fills its array is told without what stands behind it."""
+        replaced = [record["items"][1] for record in self.records_of("tree:*leaves_up", "Info=1")]
+        self.assertEqual([(item["len"], bytes.fromhex(item["hex"])) for item in replaced],
+                         [(17, b"sixteen-bytes-xxx")] * 3)
+
+    def test_entries_that_nobody_gets(self):
+        """They are not told to be released."""
+        records = self.records_of("entry:*DeathTest.*", "API=1")
+        numbers = [record["id"] for record in records if record["id"] in (40, 43, 45)]
+        self.assertEqual(numbers.count(40), 8)
+        self.assertNotIn((40, 45), zip(numbers, numbers[1:]))
+
     def test_other_tests_pass_with_everything_traced(self):
         """Whatever is handed to an operation, null pointers included, can be told."""
         for name in "buffer", "entry", "evaluate", "read_acl":

@@ -138,3 +138,19 @@ TEST(tree, takes_more_entries_after_it_was_compiled) {
         EXPECT_EQ(found, packed_subacl(SEC_ACLE_GROUP, "", static_cast<unsigned>(count) + 1, entries));
     }
 }
+
+// Whose order trace_test reads.
+TEST(tree, is_released_from_its_leaves_up) {
+    for (const auto &[type, inserted] : {std::pair(16, "m f t c i p w"), {16, "a b c"}, {8, "m f t"}}) {
+        sec_acltree_t *root = nullptr;
+        for (const std::string &name : words(inserted)) {
+            const sec_acle_t acle = entry(type, "sixteen-bytes-xx", name.c_str(), 1);
+            EXPECT_EQ(sec__add_acle_to_tree(1, &acle, &root), 0);
+        }
+        const std::string first(inserted, 1);
+        sec_acle_t again = entry(type, "sixteen-bytes-xx", first.c_str(), 2);
+        again.mechanism[16] = 'x'; // in place of the NUL, as a caller may fill the array
+        EXPECT_EQ(sec__add_acle_to_tree(0, &again, &root), 0);
+        sec__free_acltree(root);
+    }
+}

@@ -27,6 +27,11 @@
  *   - the entries of a list: sec_release_aclelist
  *   - texts from sec_display_acle_id: free
  * Arguments are copied where they are kept; nothing that is handed out points into an argument.
+ * An operation that allocates nothing takes memory in three cases all the same, and none of them can fail it:
+ *   - the first operation of a process reads the configuration of tracing
+ *   - a trace record of more than 4096 bytes is made
+ *   - a failure with texts of more than 510 bytes together is recorded, such as the denial of a very long
+ *     identity; without memory the texts are cut
  *
  * Out-parameters. What they held is overwritten, not released. After a failure they hold nothing (null, or
  * zeros) unless the description says otherwise.
@@ -37,8 +42,10 @@
  * as they are.
  *
  * Byte order. A buffer's numbers are in the order of the host that wrote it, which byte 2 of the buffer
- * tells: 2 is host order. sec_convert_acl_to_host brings a buffer into host order; every other operation
- * takes host order only, and those that change or evaluate a buffer refuse any other (3417-115).
+ * tells: 2 for the low byte first (x86, most ARM), 1 for the high byte first (s390x). A host takes any other
+ * value than its own for the other order. sec_convert_acl_to_host brings a buffer into host order; every
+ * other operation takes host order only, and those that change or evaluate a buffer refuse any other
+ * (3417-115).
  *
  * Trust. A descriptor's length must be the true number of bytes behind data. Whatever those bytes are, no
  * operation reads or writes outside them, runs without end, or allocates more than they can fill. Bytes from
@@ -46,10 +53,30 @@
  * bytes that it would have refused, they fail with 42 (3417-110) where something would extend past the end,
  * the search for a sub-ACL that reaches the end finds none, and what they answer otherwise is unspecified.
  *
+ * Order. What this library writes has one sub-ACL for each key, that is for each type or each type and
+ * mechanism, with user and group entries in ascending order and each identity once. Other bytes may pass the
+ * check:
+ *   - Of two sub-ACLs of one key, decisions and edits use the first, and so does a listing by that key. The
+ *     other shows where more is listed, and comes into force when the first goes with its last entry.
+ *   - A decision walks user and group entries up to the first that does not sort before the wanted one, and
+ *     so finds none that stands out of order behind that. Listings show all in ascending order; an edit of
+ *     their sub-ACL stores them so, and then all of them are in force.
+ *   - Bytes behind the last sub-ACL that the header counts are never in force.
+ *
  * Threads. Every operation may run in any thread at any time. "Threads: shared" says that it only reads the
  * buffer, entry or set, which any number of threads may then use at once; "Threads: exclusive" that no other
  * thread may use what the non-const arguments point to during the call. Errors are per thread. Handlers and
  * out-parameters are the caller's business. Nothing here may be called from a signal handler.
+ *
+ * Forks. The child of a fork may call every operation, whatever other threads of its parent were doing: the
+ * fork waits until none of them holds a lock of this library or of those beneath it. So a signal handler
+ * must not call fork: it would wait for the thread that it interrupts. The child has the handlers, and the
+ * recorded error of the thread that forked; a buffer that another thread was changing must not be used.
+ * Locks of the C library are its own affair: it may need one to look up a username, and to convert for the
+ * first time in a thread where the locale's code set is not UTF-8.
+ *
+ * Cancellation. No operation is a point where a thread can be cancelled: one that opens a file, prints or
+ * holds a lock disables cancellation and puts its state back before it returns.
  */
 #ifndef QZ_ACL_H
 #define QZ_ACL_H
@@ -149,6 +176,9 @@ typedef struct sec_group_ref {
  *
  * It runs with no lock held, may call this library, and must itself be safe to run in several threads. An
  * error that it records is dropped when its result is not 0; with 0 it should leave none.
+ *
+ * It must not edit, convert or release the buffer that is being evaluated: the evaluation would go on in
+ * memory that is no longer the buffer's. Changes wait until the evaluation has returned.
  */
 typedef int (*sec_id_compare_fn)(const char *requested, const char *entry);
 
@@ -319,8 +349,10 @@ QZ_ACL_API int sec_translate_bitmask(uint32_t mask, const sec_perm_set_t *set, c
  * Reads an ACL file, from its cache file when that is current, else from its text. Clears.
  *
  * The cache file is the ACL file's path with ".cacl" appended. It is used when it is not empty, newer than
- * the ACL file in whole seconds, and has the same owner, group and permission bits. Any trouble with it
- * leads to the text without an error; a cache file that cannot be written does not fail the call either.
+ * the ACL file in whole seconds, and has the same owner, group, permission bits and POSIX access control
+ * entries. Any trouble with it leads to the text without an error; a cache file that cannot be written does
+ * not fail the call either. When the ACL file is replaced by rename before it is opened, the call starts
+ * over with the new file.
  * Without SEC_READ_ACL_CONVERT the cache file's bytes are handed out as they are, unchecked and in any order.
  *
  *   aclfname    a path, absolute or relative to the working directory; with username a bare file name
@@ -328,8 +360,9 @@ QZ_ACL_API int sec_translate_bitmask(uint32_t mask, const sec_perm_set_t *set, c
  *               one who may write it
  *   set         the permissions of the text; null: acl__default_perm_set
  *   flags       SEC_READ_ACL_...; other bits are handed back unchanged
- *   acl         out: the buffer, owned by the caller; zeros for a file without entries and after a failure.
- *               Listing and editing take such an ACL, evaluation refuses it (3417-109).
+ *   acl         out: the buffer, owned by the caller; zeros after a failure, and for a file without entries
+ *               (empty, or blank and comment lines alone), of which no cache file is made. Such an ACL lists
+ *               as empty and takes entries; evaluation refuses it (42, 3417-109), so that it grants nothing.
  *   out_flags   out, may be null: the flags as they came to hold, written after failures too
  *
  * Codes: 0; 6
@@ -338,8 +371,8 @@ QZ_ACL_API int sec_translate_bitmask(uint32_t mask, const sec_perm_set_t *set, c
  *   4 (3417-165)    with username, aclfname holds a '/' or is too long for the home directory
  *   15 (3417-140)   the system does not know username
  *   36 (3417-141)   with username, the file is another's or others may write it
- *   37 (3417-135)   no such file, or not a regular one
- *   37 (3417-137)   the file cannot be opened, or was exchanged meanwhile (ESTALE)
+ *   37 (3417-135)   no such file, not a regular one, or one that was replaced at every try (ESTALE)
+ *   37 (3417-137)   the file cannot be opened
  *   37 (3417-139)   fewer bytes could be read than the file has
  *   105 (3417-166)  the working directory is unknown
  *   105 (3417-167)  the working directory and aclfname together exceed 4096 bytes
@@ -374,7 +407,8 @@ QZ_ACL_API int sec_read_acl_file(const char *aclfname, const char *username, con
  * Codes: 0; 6
  *   4 (3417-101)    an argument is null
  *   42 (3417-109)   not an ACL of version 1, or data without length
- *   42 (3417-110)   a part extends past the end, a string does not end in its field, or a type is unknown
+ *   42 (3417-110)   the header is cut short, a part extends past the end, a string does not end in its field,
+ *                   or a type is unknown
  *   42 (3417-111)   a sub-ACL of type 1 or 2 with more than one entry
  *   42 (3417-123)   a mechanism longer than 16 bytes
  * Threads: shared for acl, exclusive for list.
@@ -400,7 +434,8 @@ QZ_ACL_API int sec_list_acl_by_type(const sec_acl_buffer_t *acl, uint8_t type, c
 
 /*
  * Adds an entry, or gives the one that is there (same type, mechanism and identity) the new permissions,
- * keeping its spelling. A new type or mechanism comes behind the others. Clears.
+ * keeping its spelling. A new type or mechanism comes behind the others, and before any bytes that the header
+ * does not count. Clears.
  *
  *   acle   the entry: types 4 and 8 with a mechanism, types 4, 8 and 16 with an identity; copied
  *   acl    the buffer; without bytes (data null) it is made. Bytes as before after every failure.
@@ -412,7 +447,8 @@ QZ_ACL_API int sec_list_acl_by_type(const sec_acl_buffer_t *acl, uint8_t type, c
  *   42 (3417-113)   the buffer is not an ACL
  *   42 (3417-114)   the buffer's version is not 1
  *   42 (3417-115)   the buffer is not in host byte order
- *   42 (3417-110, 3417-111, 3417-123)   as for sec_list_acl, of the header or the entry's sub-ACL
+ *   42 (3417-110, 3417-111, 3417-123)   as for sec_list_acl, of the header or the entry's sub-ACL; 3417-110
+ *                   also where a new sub-ACL would follow a last one whose length disagrees with its entries
  *   43 (3417-116)   the entry's type is unknown
  *   43 (3417-117)   the entry lacks mechanism or identity, or its identity exceeds 65534 bytes
  * Threads: shared for acle, exclusive for acl.

@@ -3,9 +3,10 @@
  *
  * Everything here is inline, needs neither exceptions nor RTTI, and links to libqzacl and libqz_cu alone. It
  * adds owners that release what the C interface hands out, and keeps its rules: codes, recorded errors, code
- * sets, trust and threads are those that stand at the top of <qz/acl.h> and at the C function that a
- * description names. "Codes: those of F" includes its messages. What takes no owner is called as in C:
- * sec__register_id_handler, and the flags, types and codes SEC_... .
+ * sets, trust, order, threads and forks are those that stand at the top of <qz/acl.h> and at the C function
+ * that a description names. "Codes: those of F" includes its messages. What takes no owner is called as in C:
+ * sec__register_id_handler, and the flags, types and codes SEC_... . A handler must not change, assign to or
+ * destroy the acl that is being asked.
  *
  * Texts that go in are pointers to NUL-terminated strings, as the C functions need them; texts that come out
  * are views whose data() ends with a NUL.
@@ -53,9 +54,12 @@ public:
     /*
      * The value; moved out of a result that is about to go, so that a range-for over "*acl.list()" is sound.
      */
-    [[nodiscard]] T &operator*() &noexcept { return value_; }
-    [[nodiscard]] const T &operator*() const &noexcept { return value_; }
-    [[nodiscard]] T operator*() &&noexcept { return std::move(value_); }
+    /* Laid out by hand, because versions of clang-format disagree on the blank behind "&". */
+    /* clang-format off */
+    [[nodiscard]] T &operator*() & noexcept { return value_; }
+    [[nodiscard]] const T &operator*() const & noexcept { return value_; }
+    [[nodiscard]] T operator*() && noexcept { return std::move(value_); }
+    /* clang-format on */
     [[nodiscard]] T *operator->() noexcept { return &value_; }
     [[nodiscard]] const T *operator->() const noexcept { return &value_; }
 
@@ -481,7 +485,8 @@ public:
      */
     [[nodiscard]] int to_host(bool check = true) noexcept {
         const std::string_view held = bytes();
-        const bool converts = held.size() > 2 && held[2] != '\2';
+        constexpr char host_order = __BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__ ? 2 : 1;
+        const bool converts = held.size() > 2 && held[2] != host_order;
         const int code = sec_convert_acl_to_host(check ? 1 : 0, &buffer_);
         return code == SEC_S_OK && check && converts ? sec_convert_acl_to_host(1, &buffer_) : code;
     }
@@ -517,7 +522,11 @@ public:
         return {code, acl_entries(entries)};
     }
 
-    /* Tells what is granted to a party. Allocates nothing. Codes: those of sec__single_acle_perm. */
+    /*
+     * Tells what is granted to a party. Allocates nothing, as <qz/acl.h> puts it under "Memory".
+     *
+     * Codes: those of sec__single_acle_perm.
+     */
     decision single(party whom) const noexcept {
         std::uint32_t mask = 0;
         const int code = sec__single_acle_perm(&buffer_, whom.type_, whom.mechanism_, whom.subacl_mechanism_,

@@ -11,10 +11,16 @@
  * - On failure nothing that an out-parameter points to is changed, unless the operation says what it becomes.
  * - What is handed out through a pointer to a pointer belongs to the caller, who releases it with the
  * operation (or the function of the C library) that the description names.
+ * - The child of a fork may call every operation, whatever other threads of its parent were doing: the fork
+ * waits until none of them holds a lock of this library, for which reason a signal handler must not call
+ * fork. The child has the recorded error of the thread that forked. A thread's first conversion with a
+ * handle of another code set than UTF-8 may need a lock of the C library, which is that library's affair.
  * - Every operation may be called from several threads at once. An object that one thread releases must not
  * be in use in another.
  * - No operation changes errno, prints, exits, or records an error about itself; only cu_set_error_1,
  *   cu_set_no_error_1 and cu_pset_error_1 change the recorded error.
+ * - No operation is a point where a thread can be cancelled: those that open a file or hold a lock disable
+ *   cancellation and put its state back before they return.
  * - Nothing here may be called from a signal handler, except the string operations and the questions about
  * UTF-8.
  */
@@ -115,8 +121,8 @@ QZ_CU_API int cu_get_error_1(cu_error_t **error);
  * text, with the arguments put in.
  *
  * A catalog is opened once in a process, by the locale (LC_MESSAGES) in force when the first text of it is
- * fetched. Its texts are not trusted: one is used only when it holds exactly the conversions of the default
- * text, in any order, and no other percent sign than "%%"; otherwise the default text stands for that
+ * fetched. Its texts are not trusted: one is used only when it is not empty and holds exactly the conversions of
+ * the default text, in any order, and no other percent sign than "%%"; otherwise the default text stands for that
  * message. A process that fetches texts of more than eight catalogs gets the default texts of the further
  * ones.
  *

@@ -12,8 +12,11 @@
  *   Names are compared byte by byte, blanks included. What is not named is 0; of two settings for the
  *   same category the later holds; a part that cannot be read is skipped and the rest holds.
  * - QZ_TRACE_FILE: the file that records are appended to. It is opened when it is first needed and stays
- *   open. It is created with mode 0600 when missing; a symbolic link, or anything but a regular file, is
- *   refused.
+ *   open. It is created with mode 0600 when missing. One that is there is used only when it is a regular
+ *   file of the process's effective user, has no second name (hard link), and neither its group nor others
+ *   may write it, by an ACL either; a symbolic link is refused. Its folder is best one in which nobody but
+ *   that user may make files, such as the service's own: elsewhere anybody can keep the file from being
+ *   made, by making one first.
  *
  * Without a usable file every level stays 0, so that a component that tests its levels never records.
  *
@@ -29,8 +32,10 @@
  * NAMES. A component is named by a NUL-terminated string of 1 to 63 bytes of printable UTF-8. It is
  * copied: no function keeps a pointer to a name, category table or item of the caller.
  *
- * THREADS. Every function may be called by any thread at any time, also in the child of a fork; none may
- * be called from a signal handler. Recording takes no lock. */
+ * THREADS. Every function may be called by any thread at any time; none may be called from a signal
+ * handler. Recording takes no lock. The child of a fork may call every function, whatever threads of its
+ * parent were doing: the fork waits until none of them holds a lock of this library, for which reason a
+ * signal handler must not call fork. */
 #ifndef QZ_TR_H
 #define QZ_TR_H
 

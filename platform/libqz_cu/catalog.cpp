@@ -2,6 +2,8 @@
 // texts lie in them.
 #include "libqz_cu/catalog.h"
 
+#include "base/uncancelled.h"
+
 #include <cstddef>
 #include <cstring>
 #include <nl_types.h>
@@ -44,6 +46,7 @@ nl_catd find_or_open(const char *name) {
 } // namespace
 
 const char *catalog_text(const char *catalog, int set, int message_id) {
+    const uncancelled until_unlocked;
     lock();
     const nl_catd descriptor = find_or_open(catalog);
     unlock();

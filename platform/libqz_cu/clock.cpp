@@ -1,4 +1,5 @@
 // The clock: a counter of nanoseconds, which the kernel lets us read without a system call, as a time.
+#include "libqz_cu/wide_product.h"
 #include "qz/cu.h"
 
 #include <cstdint>
@@ -6,9 +7,23 @@
 
 namespace {
 
-__extension__ using uint128 = unsigned __int128;
-
 constexpr std::uint64_t second = 1000000000;
+
+// Turns a number into its quotient, a bit at a time, and returns the remainder.
+std::uint64_t divide(qz::wide_number &number, std::uint64_t divisor) {
+    std::uint64_t rest = 0;
+    for (unsigned bit = 0; bit < 128; ++bit) {
+        const bool overflows = rest >> 63 != 0;
+        rest = rest << 1 | number.high >> 63;
+        number.high = number.high << 1 | number.low >> 63;
+        number.low <<= 1;
+        if (overflows || rest >= divisor) {
+            rest -= divisor;
+            number.low |= 1;
+        }
+    }
+    return rest;
+}
 
 } // namespace
 
@@ -33,11 +48,20 @@ int cu_get_procspeed_1(cu_timeinfo_t *timeinfo) {
 int cu_cvt_time_1(uint64_t counter, const cu_timeinfo_t *timeinfo, cu_time_t *time) {
     if (timeinfo == nullptr || time == nullptr || timeinfo->opaque[1] == 0)
         return CU_BAD_PARAMETER;
-    const uint128 nanoseconds = uint128{counter} * timeinfo->opaque[0] / timeinfo->opaque[1];
-    const uint128 seconds = nanoseconds / second;
+    std::uint64_t seconds = 0;
+    std::uint64_t nanoseconds = 0;
+    if (!__builtin_mul_overflow(counter, timeinfo->opaque[0], &nanoseconds)) {
+        nanoseconds /= timeinfo->opaque[1];
+        seconds = nanoseconds / second;
+        nanoseconds %= second;
+    } else {
+        qz::wide_number time_passed = qz::wide_product(counter, timeinfo->opaque[0]);
+        divide(time_passed, timeinfo->opaque[1]);
+        nanoseconds = divide(time_passed, second);
+        seconds = time_passed.high != 0 ? UINT64_MAX : time_passed.low;
+    }
     if (seconds > INT64_MAX)
         return CU_BAD_PARAMETER;
-    time->seconds = static_cast<std::int64_t>(seconds);
-    time->nanoseconds = static_cast<std::int64_t>(nanoseconds % second);
+    *time = {static_cast<std::int64_t>(seconds), static_cast<std::int64_t>(nanoseconds)};
     return CU_OK;
 }

@@ -1,5 +1,6 @@
 // Code-set conversion over the system's iconv. A handle is only ever read; what a conversion changes, the
 // system's converter with its shift state, each thread has of its own for each handle.
+#include "base/uncancelled.h"
 #include "libqz_cu/kept_errno.h"
 #include "libqz_cu/posix_fold.h"
 #include "qz/cu.h"
@@ -145,6 +146,7 @@ int converter_of(const cu_iconv &handle, iconv_t &converter) {
     converter = pthread_getspecific(handle.converters);
     if (converter != nullptr)
         return CU_OK;
+    const qz::uncancelled until_it_has_an_owner;
     converter = handle.from_utf8 ? iconv_open(handle.codeset, "UTF-8") : iconv_open("UTF-8", handle.codeset);
     if (converter == no_converter)
         return errno == ENOMEM   ? CU_ICONV_NO_MEMORY
@@ -226,6 +228,7 @@ int cu_iconv_open_1(const char *codeset, uint32_t flags, cu_iconv_t *handle) {
         (flags & ~(CU_ICONV_FROM_UTF8 | CU_ICONV_UTF8_UNMODIFIED | CU_ICONV_BMP_ONLY)) != 0)
         return CU_BAD_PARAMETER;
     const kept_errno kept;
+    const qz::uncancelled until_all_is_closed;
     const std::size_t length = std::strlen(codeset);
     owned_block block;
     if (!block.resize(sizeof(cu_iconv) + length))

@@ -132,7 +132,9 @@ const char *text_of(const recorded_error &error) {
     if (error.catalog == nullptr)
         return by_default;
     const char *offered = catalog_text(error.catalog, error.set, error.head.message_id);
-    return offered != nullptr && has_conversions_of(offered, by_default) ? offered : by_default;
+    // An empty text, which a translation may have left behind, tells nobody anything.
+    return offered != nullptr && *offered != '\0' && has_conversions_of(offered, by_default) ? offered
+                                                                                             : by_default;
 }
 
 } // namespace

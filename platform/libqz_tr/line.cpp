@@ -6,7 +6,6 @@
 
 #include <algorithm>
 #include <array>
-#include <charconv>
 #include <chrono>
 
 namespace qz::tr {
@@ -41,8 +40,13 @@ void trace_line::put_escaped(std::string_view text) {
 
 void trace_line::put_number(long long value) {
     std::array<char, 24> digits;
-    const auto last = std::to_chars(digits.data(), digits.data() + digits.size(), value).ptr;
-    put({digits.data(), static_cast<std::size_t>(last - digits.data())});
+    std::size_t first = digits.size();
+    const auto bits = static_cast<unsigned long long>(value);
+    for (auto left = value < 0 ? 0 - bits : bits; left != 0 || first == digits.size(); left /= 10)
+        digits[--first] = static_cast<char>('0' + left % 10);
+    if (value < 0)
+        digits[--first] = '-';
+    put({digits.data() + first, digits.size() - first});
 }
 
 void trace_line::put_digits(long long value, std::size_t width) {

@@ -64,9 +64,7 @@ component_place *find_or_name(std::string_view name) {
 }
 
 // The component reads its levels in any thread without a lock.
-void set(std::uint8_t &level, std::uint8_t value) {
-    std::atomic_ref(level).store(value, std::memory_order_relaxed);
-}
+void set(std::uint8_t &level, std::uint8_t value) { __atomic_store_n(&level, value, __ATOMIC_RELAXED); }
 
 void clear(std::span<std::uint8_t> levels) {
     for (std::uint8_t &level : levels)

@@ -1,6 +1,7 @@
 // The public operations: they check arguments and keep the caller's thread undisturbed.
 #include "qz/tr.h"
 
+#include "base/uncancelled.h"
 #include "libqz_tr/line.h"
 #include "libqz_tr/registry.h"
 #include "libqz_tr/trace_file.h"
@@ -12,7 +13,6 @@
 #include <cstdlib>
 #include <cstring>
 #include <memory>
-#include <pthread.h>
 #include <unistd.h>
 
 namespace {
@@ -25,17 +25,14 @@ namespace trace_file = qz::tr::trace_file;
 // become a point where their thread can be cancelled.
 class undisturbed_caller {
 public:
-    undisturbed_caller() { pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, &cancel_state_); }
-    ~undisturbed_caller() {
-        pthread_setcancelstate(cancel_state_, nullptr);
-        errno = errno_;
-    }
+    undisturbed_caller() = default;
+    ~undisturbed_caller() { errno = errno_; }
     undisturbed_caller(const undisturbed_caller &) = delete;
     undisturbed_caller &operator=(const undisturbed_caller &) = delete;
 
 private:
     int errno_ = errno;
-    int cancel_state_ = PTHREAD_CANCEL_ENABLE;
+    qz::uncancelled uncancelled_;
 };
 
 struct free_memory {
@@ -120,8 +117,8 @@ int tr_get_size_1(uint32_t *size) {
     if (size == nullptr)
         return TR_BAD_PARAMETER;
     const undisturbed_caller undisturbed;
-    const off_t bytes = trace_file::size();
-    *size = static_cast<uint32_t>(std::clamp<off_t>(bytes, 0, UINT32_MAX));
+    const std::int64_t bytes = trace_file::size();
+    *size = static_cast<uint32_t>(std::clamp<std::int64_t>(bytes, 0, UINT32_MAX));
     return bytes >= 0 ? TR_OK : TR_NO_FILE;
 }
 

@@ -2,6 +2,7 @@
 // place, and writes to it such that nothing which befalls the file reaches the traced program.
 #include "libqz_tr/trace_file.h"
 
+#include "base/open_file.h"
 #include "libqz_tr/environment.h"
 #include "qz/tr.h"
 
@@ -21,34 +22,31 @@ int descriptor = -1;
 dev_t device;
 ino_t inode;
 
-void open_file() {
+// A file that was there already may have been made by somebody who waits to read it or write into it, or be a second
+// name of a file that is not meant. A POSIX ACL shows in the bits of the group. One just made passes.
+bool is_of_caller_alone(const struct stat &status) {
+    return S_ISREG(status.st_mode) && status.st_uid == geteuid() && status.st_nlink == 1 &&
+           (status.st_mode & (S_IWGRP | S_IWOTH)) == 0;
+}
+
+void open_trace_file() {
     const char *file = environment().file;
     if (file == nullptr)
         return;
     // O_NONBLOCK keeps a FIFO without a reader from stopping the program before it can be seen to be one.
-    int opened = open(file, O_WRONLY | O_APPEND | O_CREAT | O_NOFOLLOW | O_CLOEXEC | O_NOCTTY | O_NONBLOCK,
-                      S_IRUSR | S_IWUSR);
-    if (opened >= 0 && opened <= STDERR_FILENO) {
-        // A program that runs without a standard stream must not print into the trace file.
-        const int higher = fcntl(opened, F_DUPFD_CLOEXEC, STDERR_FILENO + 1);
-        close(opened);
-        opened = higher;
-    }
-    if (opened < 0)
-        return;
+    qz::descriptor opened =
+        open_file(file, O_WRONLY | O_APPEND | O_CREAT | O_NOFOLLOW | O_NONBLOCK, S_IRUSR | S_IWUSR);
     struct stat status;
-    if (fstat(opened, &status) != 0 || !S_ISREG(status.st_mode)) {
-        close(opened);
+    if (!opened || fstat(opened.get(), &status) != 0 || !is_of_caller_alone(status))
         return;
-    }
     device = status.st_dev;
     inode = status.st_ino;
-    descriptor = opened;
+    descriptor = opened.release();
 }
 
 // A daemon may close every descriptor it finds, and the number of ours may then name another file.
 bool is_ours(struct stat &status) {
-    pthread_once(&once, open_file);
+    pthread_once(&once, open_trace_file);
     return descriptor >= 0 && fstat(descriptor, &status) == 0 && status.st_dev == device &&
            status.st_ino == inode;
 }

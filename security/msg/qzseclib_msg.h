@@ -588,8 +588,19 @@ static_assert(text_count == 79);
 // The message table that the error facility is given default texts from; null where no text is raised.
 extern const std::array<const char *, qz::msg::table_size> cu_mesgtbl_qzseclib_msg;
 
-// What is shown for a message id outside the table. The ids of this library are checked when it is compiled,
-// so none of its messages comes to this; other users of the table may.
+// What is shown for a message id outside the table or without a text. The ids of this library are checked when it is
+// compiled, so none of its messages comes to this; other users of the table may.
 extern const char cu_badid_qzseclib_msg[];
+
+namespace qz::msg {
+
+// The default text of any id.
+inline const char *shown_text(int id) {
+    const char *text =
+        id >= 0 && id < table_size ? cu_mesgtbl_qzseclib_msg[static_cast<std::size_t>(id)] : nullptr;
+    return text == nullptr ? cu_badid_qzseclib_msg : text;
+}
+
+} // namespace qz::msg
 
 #endif

@@ -2,44 +2,37 @@
 // they compile to.
 #include "bulk_aclfile.h"
 
-#include "owned.h"
+#include "base/owned.h"
+#include "qzacl_acl/acl_text.h"
 #include "qzacl_acl/cache_file.h"
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/dump.h"
-#include "qzacl_acl/entry_parser.h"
 #include "qzacl_acl/file_name.h"
 #include "qzacl_acl/trees.h"
-#include "qzacl_utils.h"
 #include "report.h"
 
-#include <cerrno>
-#include <fcntl.h>
-#include <sys/stat.h>
+#include <csignal>
 
 namespace {
 
 // Given back when there is none left to say so.
 qz::owned<void> spare_memory;
 
-int aclfck__get_aclfile(const char *aclfname, const char *username, qz::vetted_file &file) {
-    std::uint32_t user_id = 0;
-    if (const int result = sec__get_aclfname(aclfname, username, file.path, &user_id); result != SEC_S_OK)
-        return result;
-    errno = 0;
-    if (stat(file.path.text, &file.status) != 0 || !S_ISREG(file.status.st_mode))
-        return qz::report(SEC_S_BAD_FILENAME, qz::msg::bad_acl_file_name, file.path.text, errno);
-    if (username == nullptr)
-        return SEC_S_OK;
-    if (file.status.st_uid == user_id && (file.status.st_mode & (S_IWGRP | S_IWOTH)) == 0)
-        return SEC_S_OK;
-    return qz::report(SEC_S_BAD_PERMISSION, qz::msg::acl_file_not_private, file.path.text, username);
-}
+constexpr qz::acl_file_use by_command = {
+    .not_found = {SEC_S_BAD_FILENAME, qz::msg::bad_acl_file_name},
+    .not_private = {SEC_S_BAD_PERMISSION, qz::msg::acl_file_not_private},
+    .cannot_open = {SEC_S_FILE_ERROR, qz::msg::cannot_open_acl_file},
+    .takes_empty_of_anybody = false,
+    .is_traced = false,
+};
 
-int read_contents(const qz::vetted_file &file, qz::file_bytes &contents) {
-    const qz::descriptor opened = qz::open_vetted(file.path.text, O_RDONLY, file.status);
-    if (!opened)
-        return qz::report(SEC_S_FILE_ERROR, qz::msg::cannot_open_acl_file, file.path.text, errno);
-    return qz::lock_and_read(file.path.text, opened, contents);
+// Finds and vets the file, and opens its text.
+int aclfck__get_aclfile(const char *aclfname, const char *username, qz::vetted_file &file,
+                        qz::acl_text &text) {
+    return text.open_again_while_replaced([&] {
+        const int result = qz::vet_acl_file(aclfname, username, by_command, file);
+        return result != SEC_S_OK ? result : text.open(file, by_command);
+    });
 }
 
 // Prints the current error and passes its code on.
@@ -58,41 +51,55 @@ void warn_of_skipped_cache(unsigned flags) {
 
 // Collects the entries of every line. Returns the failure that ends the check; failures that are passed over
 // clear `is_clean` instead.
-int read_entries(qz::file_bytes &contents, unsigned flags, sec_acltree_array &trees, bool &is_clean) {
-    constexpr int line_consumed = 1;
+int read_entries(qz::acl_text &text, unsigned flags, sec_acltree_array &trees, bool &is_clean) {
     const bool goes_on = (flags & ACLFCK_OPT_CONTINUE) != 0;
     const bool is_verbose = (flags & ACLFCK_OPT_VERBOSE) != 0;
     const bool may_wait = !goes_on && !is_verbose;
-    char *cursor = contents.data.get();
-    std::size_t remaining = contents.length + 1;
-    std::uint32_t line = 1;
     qz::parsed_acle entry;
     for (;;) {
-        int result = sec__read_acle_from_text(&acl__default_perm_set, &cursor, &remaining, &line, &entry);
-        if (result != line_consumed)
-            result = trees.settle(result);
-        if (result == SEC_S_OK)
-            return SEC_S_OK;
+        const qz::acl_line line = text.next(entry);
+        if (line == qz::acl_line::none)
+            continue;
+        int result = SEC_S_OK;
         bool may_go_on = goes_on;
-        if (result == line_consumed) {
-            if (entry.type == 0)
-                continue;
+        if (line == qz::acl_line::entry) {
             if (is_verbose) {
                 const sec_acle_t shown = qz::record_of(entry);
                 sec__dump_acle(&shown, nullptr, "");
             }
             const qz::acle_view acle = qz::view_of(entry);
             result = may_wait ? trees.add_soon(acle) : trees.add(acle);
-            if (result == SEC_S_OK)
-                continue;
             may_go_on = goes_on && result == SEC_S_BAD_ACLE;
+        } else {
+            result = trees.settle(line == qz::acl_line::bad ? text.failure() : SEC_S_OK);
         }
+        if (result == SEC_S_OK && line == qz::acl_line::end)
+            return SEC_S_OK;
+        if (result == SEC_S_OK)
+            continue;
         aclfck__print_error();
         if (!may_go_on)
             return result;
         is_clean = false;
     }
 }
+
+// Holds back every signal that can be, so that one that ends the command neither leaves half a cache nor the
+// temporary file; it does its work at the end of the scope. The library leaves the signals of a service alone.
+class held_signals {
+public:
+    held_signals() {
+        sigset_t all;
+        sigfillset(&all);
+        sigprocmask(SIG_BLOCK, &all, &before_);
+    }
+    held_signals(const held_signals &) = delete;
+    held_signals &operator=(const held_signals &) = delete;
+    ~held_signals() { sigprocmask(SIG_SETMASK, &before_, nullptr); }
+
+private:
+    sigset_t before_ = {};
+};
 
 int compile_and_cache(const qz::vetted_file &file, const sec_acltree_array &trees,
                       const qz::text_origin &origin) {
@@ -101,6 +108,7 @@ int compile_and_cache(const qz::vetted_file &file, const sec_acltree_array &tree
     if (const int result = sec__acltrees_to_acl(trees.trees(), &buffer); result != SEC_S_OK)
         return result;
     const qz::owned<void> buffer_owner(buffer.data);
+    const held_signals until_cache_is_whole;
     return sec__cache_aclbuffer(file.path.text, &buffer, even_when_current, origin);
 }
 
@@ -108,13 +116,10 @@ int compile_and_cache(const qz::vetted_file &file, const sec_acltree_array &tree
 
 int aclfck__bulk_aclfile(const char *aclfname, const char *username, unsigned flags) {
     qz::vetted_file file;
-    if (const int result = aclfck__get_aclfile(aclfname, username, file); result != SEC_S_OK)
+    qz::acl_text text(&acl__default_perm_set);
+    if (const int result = aclfck__get_aclfile(aclfname, username, file, text); result != SEC_S_OK)
         return printed(result);
-    const qz::text_origin origin(file.status);
-    qz::file_bytes contents;
-    if (const int result = read_contents(file, contents); result != SEC_S_OK)
-        return printed(result);
-    if (contents.length == 0) {
+    if (text.is_empty()) {
         if ((flags & ACLFCK_OPT_VERBOSE) != 0) {
             qz::report(SEC_S_ADVISORY, qz::msg::acl_file_empty, file.path.text);
             aclfck__print_error();
@@ -122,16 +127,16 @@ int aclfck__bulk_aclfile(const char *aclfname, const char *username, unsigned fl
         return SEC_S_OK;
     }
 
-    sec_acltree_array trees(contents.all());
+    sec_acltree_array trees(text.all());
     bool is_clean = true;
-    if (const int result = read_entries(contents, flags, trees, is_clean); result != SEC_S_OK) {
+    if (const int result = read_entries(text, flags, trees, is_clean); result != SEC_S_OK) {
         warn_of_skipped_cache(flags);
         return result;
     }
     if (!is_clean)
         warn_of_skipped_cache(flags);
     else if ((flags & ACLFCK_OPT_COMPILE) != 0)
-        return printed(compile_and_cache(file, trees, origin));
+        return printed(compile_and_cache(file, trees, text.origin()));
     return SEC_S_OK;
 }
 

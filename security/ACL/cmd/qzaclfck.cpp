@@ -47,13 +47,27 @@ void set_name(option_state &state, char *&name, const char *option) {
         state.fail(qz::report_no_memory("main", std::strlen(optarg) + 1));
 }
 
+// The next option, also behind operands, where not every C library looks for more: the '-' has it hand operands out.
+constexpr int operand = 1;
+int next_option(int argc, char *argv[]) {
+    for (;;) {
+        const int option = getopt(argc, argv, "-cf:hsSt:u:v");
+        // Before a lone "-" some stop all the same.
+        if (option != -1 || optind >= argc || std::strcmp(argv[optind], "-") != 0)
+            return option;
+        ++optind;
+    }
+}
+
 option_state read_options(int argc, char *argv[]) {
     option_state state;
     opterr = 1;
     for (;;) {
-        switch (getopt(argc, argv, "cf:hsSt:u:v")) {
+        switch (next_option(argc, argv)) {
         case -1:
             return state;
+        case operand:
+            break;
         case 'c':
             set_flag(state, ACLFCK_OPT_CONTINUE, "-c");
             break;

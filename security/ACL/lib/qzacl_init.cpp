@@ -8,3 +8,18 @@ void acl__state_init() {
     acl__state = {};
     pthread_mutex_init(&acl__state.lock, nullptr);
 }
+
+namespace {
+
+// Makes the state first, so that no thread is about to while the process forks.
+void lock() {
+    pthread_once(&acl__init_once_block, acl__state_init);
+    pthread_mutex_lock(&acl__state.lock);
+}
+void unlock() { pthread_mutex_unlock(&acl__state.lock); }
+
+// A child forked while another thread looks up a handler would otherwise wait for ever for a thread that it does
+// not have.
+[[gnu::constructor]] void keep_free_over_fork() { pthread_atfork(lock, unlock, unlock); }
+
+} // namespace

@@ -15,6 +15,15 @@ constexpr tr_category_t acl__trace_categories[qz::trace_category_count] = {
 // The levels of the Perf category at which registration leaves a record of it.
 bool perf_level_is_recorded(unsigned level) { return (level >= 1 && level <= 4) || level == 7 || level == 8; }
 
+// The facility is asked before the first time is recorded; the record carries the level alone, as the file's own
+// size and name are no news to whoever reads it.
+void ask_about_trace_file() {
+    std::uint32_t size = 0;
+    char name[TR_FILENAME_SIZE] = {};
+    static_cast<void>(tr_get_size_1(&size));
+    static_cast<void>(tr_get_filename_1(name));
+}
+
 } // namespace
 
 int acl__trace_register_component() {
@@ -31,9 +40,10 @@ int acl__trace_register_component() {
 
     const std::uint32_t level = __atomic_load_n(
         &acl__trace_detail_levels[static_cast<std::size_t>(qz::trace_category::perf)], __ATOMIC_RELAXED);
-    // The record carries the level alone; the trace file's own name and size are no news to whoever reads it.
-    if (perf_level_is_recorded(level))
+    if (perf_level_is_recorded(level)) {
+        ask_about_trace_file();
         qz::trace_data(0, qz::number(level));
+    }
     __atomic_store_n(&acl__trace_is_registered, true, __ATOMIC_RELEASE);
     return result;
 }

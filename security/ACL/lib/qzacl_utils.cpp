@@ -1,14 +1,18 @@
 // Conversion of strings between the locale's code set and UTF-8, and reading a whole file.
 #include "qzacl_utils.h"
 
+#include "base/open_file.h"
 #include "qzacl_trace.h"
 #include "report.h"
 
+#include <algorithm>
 #include <cerrno>
+#include <cstdint>
 #include <cstdio>
 #include <cstring>
 #include <fcntl.h>
 #include <langinfo.h>
+#include <limits>
 
 namespace {
 
@@ -38,13 +42,14 @@ int convert(const char *function, cu_iconv_t handle, const char *in, const std::
     constexpr int facility_no_memory = 15;
     if (handle == nullptr)
         return qz::report(SEC_S_CODESET, qz::msg::conversion_unavailable);
+    constexpr int line = __LINE__ + 1; // of the call that may fail
     const int result = cu_iconv_str_1(handle, 0, in, in_length, out, out_length);
     switch (result) {
     case 0:
         return SEC_S_OK;
     case 17:
     case 20:
-        return qz::report(SEC_S_INTERNAL, qz::msg::internal_failure, qz::utils_source, __LINE__, result);
+        return qz::report(SEC_S_INTERNAL, qz::msg::internal_failure, qz::utils_source, line, result);
     case facility_no_memory:
         return qz::report_no_memory(function, *in_length);
     default:
@@ -52,10 +57,11 @@ int convert(const char *function, cu_iconv_t handle, const char *in, const std::
     }
 }
 
-struct file_text {
-    qz::owned<char[]> text;
-    std::size_t length = 0;
-};
+// Whether the file is the one that was vetted by its name, and still owned and protected as it was then.
+bool is_as_vetted(const struct stat &opened, const struct stat &vetted) {
+    return qz::same_file(opened, vetted) && S_ISREG(opened.st_mode) && opened.st_mode == vetted.st_mode &&
+           opened.st_uid == vetted.st_uid && opened.st_gid == vetted.st_gid;
+}
 
 int not_found(const char *file_name, int error) {
     if (qz::traces(qz::trace_category::info))
@@ -63,25 +69,27 @@ int not_found(const char *file_name, int error) {
     return qz::report(SEC_S_FILE_ERROR, qz::msg::bad_file_name, file_name, error);
 }
 
-int read_file(const char *file_name, int fd, file_text &file) {
+int read_file(const char *file_name, int fd, const struct stat &vetted, qz::file_bytes &file) {
     struct stat status = {};
-    if (stat(file_name, &status) != 0)
+    if (fstat(fd, &status) != 0)
         return not_found(file_name, errno);
-    // The size of one file must not cut the text of another that was exchanged for it after the open.
-    struct stat opened = {};
-    if (fstat(fd, &opened) != 0 || opened.st_dev != status.st_dev || opened.st_ino != status.st_ino)
+    if (!is_as_vetted(status, vetted)) {
+        file.is_replaced = true;
         return not_found(file_name, ESTALE);
-    const auto size = static_cast<std::size_t>(status.st_size);
-    if (size == 0)
+    }
+    if (status.st_size == 0)
         return SEC_S_OK;
-    file.text = qz::allocate<char>(size + qz::text_padding);
-    if (file.text == nullptr) {
+    // On a 32-bit machine a file may be larger than memory can be, and its size wrap to that of a small one.
+    const auto size = static_cast<std::size_t>(std::min<std::uintmax_t>(
+        static_cast<std::uintmax_t>(status.st_size), std::numeric_limits<std::ptrdiff_t>::max()));
+    auto text = qz::allocate<char>(size + qz::text_padding);
+    if (text == nullptr) {
         if (qz::traces(qz::trace_category::info))
             qz::trace_data(125, qz::item(file_name), qz::number(size));
         return qz::report_no_memory("sec_read_acl_file", size);
     }
     errno = 0;
-    const ssize_t count = read(fd, file.text.get(), size);
+    const ssize_t count = read(fd, text.get(), size);
     if (count != status.st_size) {
         const int error = errno;
         if (qz::traces(qz::trace_category::info))
@@ -89,7 +97,8 @@ int read_file(const char *file_name, int fd, file_text &file) {
         return qz::report(SEC_S_FILE_ERROR, qz::msg::short_read, qz::shown_size(count), qz::shown_size(size),
                           error);
     }
-    std::memset(file.text.get() + size, '\0', qz::text_padding);
+    std::memset(text.get() + size, '\0', qz::text_padding);
+    file.data = std::move(text);
     file.length = size;
     return SEC_S_OK;
 }
@@ -99,12 +108,11 @@ int read_file(const char *file_name, int fd, file_text &file) {
 namespace qz {
 
 descriptor open_vetted(const char *path, int access, const struct stat &vetted) {
-    descriptor file(open(path, access | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+    descriptor file = open_file(path, access | O_NONBLOCK);
     if (!file)
         return file;
     struct stat opened = {};
-    if (fstat(file.get(), &opened) != 0 || opened.st_dev != vetted.st_dev || opened.st_ino != vetted.st_ino ||
-        !S_ISREG(opened.st_mode)) {
+    if (fstat(file.get(), &opened) != 0 || !is_as_vetted(opened, vetted)) {
         file.close();
         errno = ESTALE;
     }
@@ -126,13 +134,11 @@ int acl__convert_from_utf8(const char *in, const std::size_t *in_length, char **
 
 int acl__lock_acl_file(const char * /*file_name*/, int /*fd*/, int /*mode*/) { return 0; }
 
-int acl__read_acl_file(const char *file_name, int fd, char **text, std::size_t *length) {
+int acl__read_acl_file(const char *file_name, int fd, const struct stat &vetted, qz::file_bytes &bytes) {
     const bool is_timed = qz::trace_level(qz::trace_category::perf) == 2;
     const std::uint64_t start = is_timed ? qz::read_counter() : 0;
-    file_text file;
-    const int result = read_file(file_name, fd, file);
-    *length = result == SEC_S_OK ? file.length : 0;
-    *text = result == SEC_S_OK ? file.text.release() : nullptr;
+    bytes = {};
+    const int result = read_file(file_name, fd, vetted, bytes);
     if (is_timed)
         qz::trace_elapsed(6, start);
     return result;
@@ -140,14 +146,11 @@ int acl__read_acl_file(const char *file_name, int fd, char **text, std::size_t *
 
 namespace qz {
 
-int lock_and_read(const char *path, const descriptor &file, file_bytes &bytes) {
+int lock_and_read(const char *path, const descriptor &file, const struct stat &vetted, file_bytes &bytes) {
     constexpr int for_reading = 1;
     if (const int result = acl__lock_acl_file(path, file.get(), for_reading); result != 0)
         return result;
-    char *data = nullptr;
-    const int result = acl__read_acl_file(path, file.get(), &data, &bytes.length);
-    bytes.data.reset(data);
-    return result;
+    return acl__read_acl_file(path, file.get(), vetted, bytes);
 }
 
 } // namespace qz

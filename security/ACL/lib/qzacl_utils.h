@@ -2,7 +2,7 @@
 #ifndef QZACL_UTILS_H
 #define QZACL_UTILS_H
 
-#include "owned.h"
+#include "base/owned.h"
 
 #include <cstddef>
 #include <span>
@@ -10,9 +10,14 @@
 
 namespace qz {
 
+// True when both tell of one file, whatever its names are.
+inline bool same_file(const struct stat &one, const struct stat &other) {
+    return one.st_dev == other.st_dev && one.st_ino == other.st_ino;
+}
+
 // Opens a file that was vetted by its name, so that whoever exchanges it in between gains nothing: the
-// descriptor must show the same regular file. Returns an empty descriptor with errno set, to ESTALE for
-// another file. A file that turned into a FIFO or a terminal neither blocks nor becomes the controlling one.
+// descriptor must show the same regular file, owned and protected as before. Returns an empty descriptor with
+// errno set, to ESTALE for another file. A file that turned into a FIFO or a terminal neither blocks nor becomes the controlling one.
 descriptor open_vetted(const char *path, int access, const struct stat &vetted);
 
 // How many bytes a text that was read has behind its end, a NUL and others: sixteen may be read from each of its
@@ -21,15 +26,16 @@ inline constexpr std::size_t text_padding = 16;
 
 // The bytes of a file, and a NUL behind them; none of an empty file.
 struct file_bytes {
-    owned<char> data;
+    owned<char[]> data;
     std::size_t length = 0;
+    bool is_replaced = false; // nothing was read, because what was opened is not the file that was vetted
 
     // With the NUL.
     std::span<char> all() const { return {data.get(), data == nullptr ? 0 : length + 1}; }
 };
 
 // Asks the lock hook and reads the whole file. Returns SEC_S_OK, the hook's result, or that of the read.
-int lock_and_read(const char *path, const descriptor &file, file_bytes &bytes);
+int lock_and_read(const char *path, const descriptor &file, const struct stat &vetted, file_bytes &bytes);
 
 } // namespace qz
 
@@ -44,8 +50,9 @@ int acl__convert_from_utf8(const char *in, const std::size_t *in_length, char **
 int acl__lock_acl_file(const char *file_name, int fd, int mode);
 
 // Reads the whole file into a new block of its size and a NUL, with one read. An empty file gives a null
-// block and length 0. On failure records an error, returns SEC_S_FILE_ERROR or SEC_S_NO_MEMORY, and hands out
-// nothing.
-int acl__read_acl_file(const char *file_name, int fd, char **text, std::size_t *length);
+// block and length 0. The descriptor must show the regular file that was vetted, owned and protected as before;
+// for any other the error number of the failure is ESTALE. On failure records an error, returns SEC_S_FILE_ERROR or
+// SEC_S_NO_MEMORY, and hands out no bytes.
+int acl__read_acl_file(const char *file_name, int fd, const struct stat &vetted, qz::file_bytes &bytes);
 
 #endif

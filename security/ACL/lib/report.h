@@ -21,8 +21,25 @@ inline constexpr char utils_source[] = "security/ACL/lib/qzacl_utils";
 // Records a message and returns its code.
 template <int Id, class... Args>
 int report(int code, msg::message<Id, Args...>, std::type_identity_t<Args>... args) {
-    cu_set_error_1(code, 0, msg::catalog_name, msg::catalog_set, Id, cu_mesgtbl_qzseclib_msg[Id], args...);
+    cu_set_error_1(code, 0, msg::catalog_name, msg::catalog_set, Id, msg::shown_text(Id), args...);
     return code;
+}
+
+// A code and its message, where those of several users of one function differ but take the same arguments.
+template <class... Args>
+struct failure_kind {
+    template <int Id>
+    constexpr failure_kind(int its_code, msg::message<Id, Args...>) : code(its_code), id(Id) {}
+
+    int code;
+    int id;
+};
+
+template <class... Args>
+int report(const failure_kind<Args...> &kind, std::type_identity_t<Args>... args) {
+    cu_set_error_1(kind.code, 0, msg::catalog_name, msg::catalog_set, kind.id,
+                   cu_mesgtbl_qzseclib_msg[kind.id], args...);
+    return kind.code;
 }
 
 // A size as a message shows it: the conversions take an int, and a size beyond it is shown as the largest.
@@ -35,7 +52,7 @@ constexpr int shown_size(Size size) {
         return size;
 }
 
-inline int report_no_memory(const char *function, std::size_t bytes) {
+inline int report_no_memory(const char *function, std::uint64_t bytes) {
     return report(SEC_S_NO_MEMORY, msg::no_memory, function, shown_size(bytes));
 }
 

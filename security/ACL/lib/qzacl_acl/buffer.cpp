@@ -1,8 +1,8 @@
 // Whole compiled buffers: making, taking over, releasing, and finding one sub-ACL in them.
 #include "qzacl_acl/buffer.h"
 
+#include "base/owned.h"
 #include "libqz_cu/posix_fold.h"
-#include "owned.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_trace.h"

@@ -3,7 +3,8 @@
 //
 //   Header             0  1  buffer type, 0x85
 //                      1  1  version, 1
-//                      2  1  byte order: 2 when all fields are in host order, anything else when not
+//                      2  1  byte order of all fields: 2 low byte first, 1 high byte first; a host takes
+//                            whatever is not its own for the other
 //                      3  2  number of sub-ACLs
 //
 //   Sub-ACL            0  4  its length: this header, the mechanism and the entries
@@ -18,7 +19,7 @@
 //                      7     identity
 //
 // Records follow each other without padding. One user entry, mechanism abcd, identity xyz, mask 3, takes
-// 31 bytes:
+// 31 bytes, on a host that puts the low byte first:
 //
 //   85 01 02 01 00 | 1a 00 00 00  04  01 00 00 00  05  61 62 63 64 00 | 01  03 00 00 00  04 00  78 79 7a 00
 #ifndef QZACL_BUFFER_FORMAT_H
@@ -28,6 +29,7 @@
 #include "qz/acl.h"
 
 #include <algorithm>
+#include <bit>
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
@@ -38,7 +40,7 @@ namespace qz::format {
 
 inline constexpr std::uint8_t buffer_type = 0x85;
 inline constexpr std::uint8_t buffer_version = 1;
-inline constexpr std::uint8_t host_order = 2;
+inline constexpr std::uint8_t host_order = std::endian::native == std::endian::little ? 2 : 1;
 inline constexpr std::uint8_t entry_version = 1;
 
 inline constexpr std::size_t header_size = 5;
@@ -185,6 +187,21 @@ void pass_entries(entry_walk &walk, std::size_t readable, const Passes &passes) 
     walk.left = left;
 }
 
+// Steps over entries, whatever they hold. False where one reaches beyond the end.
+inline bool skip_entries(byte_reader &reader, std::uint32_t count) {
+    entry_walk walk{reader, count};
+    for (;;) {
+        pass_entries(walk, 0, [](std::uint8_t, byte_span) { return true; });
+        reader = walk.entries;
+        if (walk.left == 0)
+            return true;
+        entry passed;
+        if (!read(walk.entries, passed))
+            return false;
+        --walk.left;
+    }
+}
+
 // Steps through the sub-ACLs of a buffer in host order, from each to the next by its length field.
 class subacl_walk {
 public:
@@ -223,6 +240,30 @@ private:
     std::size_t left_ = 0;
     bool is_started_ = false;
 };
+
+// Finds where the sub-ACLs that a buffer counts end, and so where a further one goes: what may follow stays behind
+// it, where no count reaches. False where one reaches beyond the end of the buffer, and where the length of the last
+// does not lead to the end of its entries: a walk would look for the further one elsewhere.
+inline bool find_end(byte_span buffer, std::size_t &offset) {
+    byte_reader behind(buffer);
+    header head;
+    if (!read(behind, head))
+        return false;
+    subacl_walk walk(buffer);
+    for (unsigned left = head.subacl_count; left != 0; --left) {
+        if (walk.next() != subacl_walk::step::found)
+            return false;
+    }
+    if (head.subacl_count != 0) {
+        behind = byte_reader(walk.bytes());
+        subacl last;
+        if (!read(behind, last) || !skip_entries(behind, last.entry_count) ||
+            walk.bytes().size() - behind.left() != last.length)
+            return false;
+    }
+    offset = buffer.size() - behind.left();
+    return true;
+}
 
 inline void write_header(byte_writer &writer, std::uint16_t subacl_count) {
     writer.field(buffer_type);

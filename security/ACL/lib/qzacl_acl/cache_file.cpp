@@ -1,7 +1,9 @@
 // The cached form of an ACL file: the compiled buffer beside it, owned and protected like it.
 #include "qzacl_acl/cache_file.h"
 
-#include "owned.h"
+#include "base/open_file.h"
+#include "base/owned.h"
+#include "qzacl_acl/posix_acl.h"
 #include "qzacl_trace.h"
 #include "qzacl_utils.h"
 #include "report.h"
@@ -17,8 +19,6 @@
 
 namespace {
 
-constexpr mode_t permission_bits = 07777;
-
 // A file under a name that this call made. It is removed at the end of the scope unless it was kept, and only
 // while the name still leads to the file that is held open.
 class made_file {
@@ -30,7 +30,7 @@ public:
         struct stat held = {};
         struct stat named = {};
         if (!is_kept_ && file_ && fstat(file_.get(), &held) == 0 && lstat(name_, &named) == 0 &&
-            held.st_dev == named.st_dev && held.st_ino == named.st_ino)
+            qz::same_file(held, named))
             unlink(name_);
     }
 
@@ -44,34 +44,13 @@ private:
     bool is_kept_ = false;
 };
 
-int query_failed(const char *queried, const char *aclfname, int error) {
-    if (qz::traces(qz::trace_category::errors))
-        qz::trace_data(109, qz::item(queried), qz::item("stat()"), qz::number(error));
-    return qz::report(SEC_S_FILE_ERROR, qz::msg::bad_file_name, aclfname, error);
-}
-
 int cannot_open(const char *name) {
     return qz::report(SEC_S_FILE_ERROR, qz::msg::cannot_open_for_writing, name);
 }
 
-// A cache that exists must be owned and protected like its ACL file; one that is not is the owner's to mend.
-int check_existing(const char *aclfname, const char *cache_name, const struct stat &acl_status,
-                   const struct stat &cache_status) {
-    if (cache_status.st_uid != acl_status.st_uid || cache_status.st_gid != acl_status.st_gid) {
-        if (qz::traces(qz::trace_category::errors))
-            qz::trace_data(111, qz::item(cache_name), qz::number(cache_status.st_uid),
-                           qz::number(cache_status.st_gid), qz::number(acl_status.st_uid),
-                           qz::number(acl_status.st_gid));
-        return qz::report(SEC_S_FILE_ERROR, qz::msg::cache_owner_differs, aclfname);
-    }
-    if (cache_status.st_mode != acl_status.st_mode) {
-        const std::uint32_t cache_bits = cache_status.st_mode & permission_bits;
-        const std::uint32_t acl_bits = acl_status.st_mode & permission_bits;
-        if (qz::traces(qz::trace_category::errors))
-            qz::trace_data(111, qz::item(cache_name), qz::number(cache_bits), qz::number(acl_bits));
-        return qz::report(SEC_S_FILE_ERROR, qz::msg::cache_mode_differs, aclfname);
-    }
-    return SEC_S_OK;
+int cannot_protect(const char *cache_name, const struct stat &text) {
+    const auto bits = static_cast<int>(text.st_mode & qz::permission_bits);
+    return qz::report(SEC_S_FILE_ERROR, qz::msg::cannot_set_mode, cache_name, bits);
 }
 
 // Creates the temporary file under the ACL file's name, a '.', and groups of four digits, one more for each
@@ -93,8 +72,7 @@ qz::descriptor create_temporary(const char *aclfname, qz::path_buffer &name) {
             continue;
         if (errno != ENOENT)
             return {};
-        qz::descriptor file(
-            open(name.text, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC | O_NOCTTY, 0));
+        qz::descriptor file = qz::open_file(name.text, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW);
         // Somebody may have taken the name since, or a link that leads nowhere stands under it.
         if (file || errno != EEXIST)
             return file;
@@ -125,111 +103,150 @@ ssize_t write_once(int fd, const sec_acl_buffer_t &acl) {
     return count;
 }
 
-// Writes the buffer, stamps the file, and has its bytes on disk before the file gets its final name.
-int write_buffer(int fd, const sec_acl_buffer_t &acl, const timespec &text_time) {
-    const timespec times[2] = {text_time, text_time};
-    const ssize_t count = write_once(fd, acl);
-    if (count == acl.length && futimens(fd, times) == 0 && fdatasync(fd) == 0)
-        return SEC_S_OK;
+int cannot_write(ssize_t count, const sec_acl_buffer_t &acl) {
     return qz::report(SEC_S_FILE_ERROR, qz::msg::short_write, static_cast<int>(count), acl.length, errno);
 }
 
-int fill_and_rename(int fd, const char *temporary_name, const char *cache_name, const sec_acl_buffer_t &acl,
-                    const struct stat &acl_status, const timespec &text_time) {
-    if (const int result = write_buffer(fd, acl, text_time); result != SEC_S_OK)
-        return result;
-    if (fchown(fd, acl_status.st_uid, acl_status.st_gid) != 0) {
-        char user_id[16];
-        std::snprintf(user_id, sizeof user_id, "%u", static_cast<unsigned>(acl_status.st_uid));
-        return qz::report(SEC_S_FILE_ERROR, qz::msg::cannot_set_owner, cache_name, user_id,
-                          static_cast<int>(acl_status.st_gid));
+// Writes one cache, step by step. Each step returns SEC_S_OK, or what the operation ends with.
+class cache_writer {
+public:
+    cache_writer(const char *aclfname, const qz::text_origin &origin)
+        : aclfname_(aclfname), origin_(origin) {}
+
+    int name_cache();
+    int examine_text() { return text_.examine(aclfname_, origin_); }
+    int examine_cache(bool even_when_current);
+    int replace(const sec_acl_buffer_t &acl);
+
+private:
+    qz::descriptor open_cache() const;
+    int vet_opened_cache(int fd) const;
+    int write_and_rename(const sec_acl_buffer_t &acl);
+    int fill(int fd, const sec_acl_buffer_t &acl) const;
+    int protect(int fd) const;
+
+    const char *aclfname_;
+    const qz::text_origin &origin_;
+    qz::path_buffer cache_name_;
+    qz::path_buffer temporary_name_;
+    qz::text_protection text_;
+    struct stat cache_ = {};
+    bool is_new_ = false;
+};
+
+int cache_writer::name_cache() {
+    const std::size_t length = std::strlen(aclfname_);
+    if (length < qz::uncached_path_length && qz::make_cache_name(aclfname_, cache_name_))
+        return SEC_S_OK;
+    const int shown_length = qz::shown_size(length);
+    if (qz::traces(qz::trace_category::errors))
+        qz::trace_data(108, qz::item(aclfname_), qz::number(shown_length));
+    return qz::report(SEC_S_FILE_ERROR, qz::msg::name_too_long_for_cache, aclfname_);
+}
+
+int cache_writer::examine_cache(bool even_when_current) {
+    is_new_ = stat(cache_name_.text, &cache_) != 0;
+    if (is_new_) {
+        if (errno != ENOENT)
+            return qz::query_failed(cache_name_.text, "stat()", aclfname_, errno);
+        if (qz::traces(qz::trace_category::info))
+            qz::trace_data(110, qz::item(cache_name_.text));
+        return SEC_S_OK;
     }
-    const mode_t bits = acl_status.st_mode & permission_bits;
-    if (fchmod(fd, bits) != 0)
-        return qz::report(SEC_S_FILE_ERROR, qz::msg::cannot_set_mode, cache_name, static_cast<int>(bits));
-    if (rename(temporary_name, cache_name) != 0)
-        return qz::report(SEC_S_FILE_ERROR, qz::msg::cannot_rename_cache, temporary_name, cache_name);
+    if (const int result = text_.vet_cache(aclfname_, cache_name_.text, cache_); result != SEC_S_OK)
+        return result;
+    if (!even_when_current && text_.status.st_mtime < cache_.st_mtime)
+        return SEC_S_ADVISORY;
+    return SEC_S_OK;
+}
+
+qz::descriptor cache_writer::open_cache() const {
+    if (!is_new_)
+        return qz::open_vetted(cache_name_.text, O_WRONLY, cache_);
+    return qz::open_file(cache_name_.text, O_WRONLY | O_CREAT | O_EXCL);
+}
+
+// Of a cache that is new, the empty file that holds its name until it is complete.
+int cache_writer::vet_opened_cache(int fd) const {
+    if (is_new_)
+        return qz::remove_posix_acl(fd) ? SEC_S_OK : cannot_protect(cache_name_.text, text_.status);
+    return text_.vet_opened_cache(aclfname_, cache_name_.text, fd);
+}
+
+int cache_writer::replace(const sec_acl_buffer_t &acl) {
+    constexpr int lock_for_replacing = 2;
+    made_file placeholder(cache_name_.text, open_cache());
+    if (!placeholder)
+        return cannot_open(cache_name_.text);
+    if (!is_new_)
+        placeholder.keep();
+    int result = vet_opened_cache(placeholder.fd());
+    if (result == SEC_S_OK)
+        result = acl__lock_acl_file(cache_name_.text, placeholder.fd(), lock_for_replacing);
+    if (result == SEC_S_OK)
+        result = write_and_rename(acl);
+    if (result == SEC_S_OK)
+        placeholder.keep();
+    return result;
+}
+
+int cache_writer::write_and_rename(const sec_acl_buffer_t &acl) {
+    made_file temporary(temporary_name_.text, create_temporary(aclfname_, temporary_name_));
+    if (!temporary)
+        return cannot_open(temporary_name_.text);
+    if (const int result = fill(temporary.fd(), acl); result != SEC_S_OK)
+        return result;
+    if (rename(temporary_name_.text, cache_name_.text) != 0)
+        return qz::report(SEC_S_FILE_ERROR, qz::msg::cannot_rename_cache, temporary_name_.text,
+                          cache_name_.text);
+    temporary.keep();
+    return SEC_S_OK;
+}
+
+// Has the bytes on disk before the file gets its final name; that takes long, so all that may fail comes before.
+int cache_writer::fill(int fd, const sec_acl_buffer_t &acl) const {
+    const timespec times[2] = {origin_.time, origin_.time};
+    const ssize_t count = write_once(fd, acl);
+    if (count != acl.length || futimens(fd, times) != 0)
+        return cannot_write(count, acl);
+    if (const int result = protect(fd); result != SEC_S_OK)
+        return result;
+    return fdatasync(fd) == 0 ? SEC_S_OK : cannot_write(count, acl);
+}
+
+// Nobody but its owner may ever write the file who could not write the text: it has no rights at all while the
+// entries inherited from the folder go and while it changes hands. The mode comes last, since giving a file away
+// clears bits of it; its group bits are those of the entries' mask already.
+int cache_writer::protect(int fd) const {
+    if (!qz::remove_posix_acl(fd))
+        return cannot_protect(cache_name_.text, text_.status);
+    if (fchown(fd, text_.status.st_uid, text_.status.st_gid) != 0) {
+        char user_id[16];
+        std::snprintf(user_id, sizeof user_id, "%u", static_cast<unsigned>(text_.status.st_uid));
+        return qz::report(SEC_S_FILE_ERROR, qz::msg::cannot_set_owner, cache_name_.text, user_id,
+                          static_cast<int>(text_.status.st_gid));
+    }
+    if (!text_.entries.give_to(fd) || fchmod(fd, text_.status.st_mode & qz::permission_bits) != 0)
+        return cannot_protect(cache_name_.text, text_.status);
     return SEC_S_OK;
 }
 
 } // namespace
 
-namespace qz {
-
-text_origin::text_origin(const struct stat &vetted) : device(vetted.st_dev), inode(vetted.st_ino), time() {
-    // The coarse clock: the kernel stamps files from it or from a finer one, never earlier than it.
-    clock_gettime(CLOCK_REALTIME_COARSE, &time);
-}
-
-bool make_cache_name(const char *aclfname, path_buffer &name) {
-    const std::size_t length = strnlen(aclfname, path_max);
-    if (length + sizeof cache_extension > sizeof name.text)
-        return false;
-    std::memcpy(name.text, aclfname, length);
-    std::memcpy(name.text + length, cache_extension, sizeof cache_extension);
-    return true;
-}
-
-} // namespace qz
-
 int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, int force,
                          const qz::text_origin &origin) {
-    constexpr int lock_for_replacing = 2;
     if (acl->length == 0) {
         if (qz::trace_level(qz::trace_category::info) == 1)
             qz::trace_data(107, qz::item(aclfname));
         return SEC_S_ADVISORY;
     }
-    qz::path_buffer cache_name;
-    if (std::strlen(aclfname) >= qz::uncached_path_length || !qz::make_cache_name(aclfname, cache_name)) {
-        const int shown_length = qz::shown_size(std::strlen(aclfname));
-        if (qz::traces(qz::trace_category::errors))
-            qz::trace_data(108, qz::item(aclfname), qz::number(shown_length));
-        return qz::report(SEC_S_FILE_ERROR, qz::msg::name_too_long_for_cache, aclfname);
-    }
-
-    struct stat acl_status = {};
-    if (stat(aclfname, &acl_status) != 0)
-        return query_failed(aclfname, aclfname, errno);
-    if (acl_status.st_dev != origin.device || acl_status.st_ino != origin.inode ||
-        !S_ISREG(acl_status.st_mode))
-        return query_failed(aclfname, aclfname, ESTALE);
-    struct stat cache_status = {};
-    const bool is_new = stat(cache_name.text, &cache_status) != 0;
-    if (is_new) {
-        if (errno != ENOENT)
-            return query_failed(cache_name.text, aclfname, errno);
-        if (qz::traces(qz::trace_category::info))
-            qz::trace_data(110, qz::item(cache_name.text));
-    } else {
-        const int result = check_existing(aclfname, cache_name.text, acl_status, cache_status);
-        if (result != SEC_S_OK)
-            return result;
-        if (force == 0 && acl_status.st_mtime < cache_status.st_mtime)
-            return SEC_S_ADVISORY;
-    }
-
-    made_file placeholder(
-        cache_name.text,
-        is_new ? qz::descriptor(open(cache_name.text, O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC | O_NOCTTY, 0))
-               : qz::open_vetted(cache_name.text, O_WRONLY, cache_status));
-    if (!placeholder)
-        return cannot_open(cache_name.text);
-    if (!is_new)
-        placeholder.keep();
-    if (const int result = acl__lock_acl_file(cache_name.text, placeholder.fd(), lock_for_replacing);
-        result != 0)
-        return result;
-
-    qz::path_buffer temporary_name;
-    made_file temporary(temporary_name.text, create_temporary(aclfname, temporary_name));
-    if (!temporary)
-        return cannot_open(temporary_name.text);
-    const int result =
-        fill_and_rename(temporary.fd(), temporary_name.text, cache_name.text, *acl, acl_status, origin.time);
-    if (result == SEC_S_OK) {
-        temporary.keep();
-        placeholder.keep();
-    }
+    cache_writer writer(aclfname, origin);
+    int result = writer.name_cache();
+    if (result == SEC_S_OK)
+        result = writer.examine_text();
+    if (result == SEC_S_OK)
+        result = writer.examine_cache(force != 0);
+    if (result == SEC_S_OK)
+        result = writer.replace(*acl);
     return result;
 }

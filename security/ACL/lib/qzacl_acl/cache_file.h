@@ -3,31 +3,15 @@
 #define QZACL_CACHE_FILE_H
 
 #include "qz/acl.h"
+#include "qzacl_acl/cache_vetting.h"
 #include "qzacl_acl/file_name.h"
 
 #include <cstddef>
-#include <ctime>
-#include <sys/stat.h>
 
 namespace qz {
 
-inline constexpr char cache_extension[] = ".cacl";
 // For an ACL file's path that is as long as this, or longer, no cache is written.
 inline constexpr std::size_t uncached_path_length = path_max - sizeof cache_extension;
-
-// Where the text of a cache comes from: the file that is read, and the time, as the kernel stamps files now,
-// before any of it is read. The cache is stamped with that time, so that an edit that comes later is never
-// older than it; and no other file that was exchanged for the one read lends its owner and mode to the cache.
-struct text_origin {
-    explicit text_origin(const struct stat &vetted);
-
-    dev_t device;
-    ino_t inode;
-    timespec time;
-};
-
-// Forms the name of a file's cache; false when it would be longer than a path.
-bool make_cache_name(const char *aclfname, path_buffer &name);
 
 } // namespace qz
 

@@ -132,10 +132,11 @@ int sec__acltrees_to_acl(std::span<sec_acltree_t *const> trees, sec_acl_buffer_t
         if (++count > format::subacls_max || size > format::buffer_max)
             return qz::report_no_memory(function, size);
     }
-    auto memory = qz::allocate<unsigned char>(size);
+    const auto whole = static_cast<std::size_t>(size);
+    auto memory = qz::allocate<unsigned char>(whole);
     if (memory == nullptr)
         return qz::report_no_memory(function, size);
-    qz::byte_writer writer({memory.get(), size});
+    qz::byte_writer writer({memory.get(), whole});
     format::write_header(writer, static_cast<std::uint16_t>(count));
     for (std::size_t index = trees.size(); index > 0; --index) {
         const sec_acltree_t *tree = trees[index - 1];

@@ -2,8 +2,8 @@
 #ifndef QZACL_COMPILE_H
 #define QZACL_COMPILE_H
 
+#include "base/owned.h"
 #include "bytes.h"
-#include "owned.h"
 #include "qz/acl.h"
 #include "qzacl_acl/tree.h"
 

@@ -2,7 +2,8 @@
 // and cleared; nothing stays recorded behind it.
 #include "qzacl_acl/dump.h"
 
-#include "owned.h"
+#include "base/owned.h"
+#include "base/uncancelled.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/entry.h"
@@ -20,6 +21,7 @@ constexpr char as_it_stands[] = "";
 constexpr char with_empty_line[] = "\n";
 
 void print_and_clear(std::FILE *stream, const char *ending) {
+    const qz::uncancelled until_all_is_released;
     static_cast<void>(qz::print_recorded(stream, ending));
     cu_set_no_error_1();
 }

@@ -4,7 +4,7 @@
 // The plain way expands that sub-ACL into a tree, changes the tree and compiles it again. Where the stored
 // entries already are what compiling such a tree gives, well-formed and in ascending order, the bytes of the
 // one entry are changed in place instead: the result is the same, without a second copy of the sub-ACL.
-#include "owned.h"
+#include "base/owned.h"
 #include "qzacl_acl/acle_report.h"
 #include "qzacl_acl/buffer.h"
 #include "qzacl_acl/buffer_format.h"
@@ -106,7 +106,7 @@ int finish_deletion(sec_acl_buffer_t &acl) {
 // The sub-ACL that an edit is about, as it stands in the buffer.
 struct stored_subacl {
     const unsigned char *start = nullptr; // null when the key has none
-    std::size_t offset = 0;
+    std::size_t offset = 0;               // of the sub-ACL, or where a new one goes
     format::subacl head;
 };
 
@@ -240,19 +240,17 @@ int add_packed(const sec_acle_t &acle, int report_duplicates, const stored_subac
     return SEC_S_OK;
 }
 
-// Puts what a changed tree compiled to in the place of the stored sub-ACL, or behind all others when there
-// was none.
+// Puts what a changed tree compiled to in the place of the stored sub-ACL, or where a new one goes.
 int splice(const qz::loose_subacl &compiled, const stored_subacl &stored, const char *function,
            sec_acl_buffer_t &acl) {
     const bool is_new = stored.start == nullptr;
     const std::size_t count = subacl_count(acl);
-    const std::size_t offset = is_new ? static_cast<std::size_t>(acl.length) : stored.offset;
     if (is_new && count == format::subacls_max)
         return qz::report_no_memory(function, static_cast<std::size_t>(acl.length) + compiled.length);
-    const int result = make_gap(acl, offset, is_new ? 0 : stored.head.length, compiled.length, function);
+    const int result = make_gap(acl, stored.offset, stored.head.length, compiled.length, function);
     if (result != SEC_S_OK)
         return result;
-    qz::byte_writer writer(writable(acl).subspan(offset, compiled.length));
+    qz::byte_writer writer(writable(acl).subspan(stored.offset, compiled.length));
     writer.bytes(compiled.data.get(), compiled.length);
     if (is_new)
         set_subacl_count(acl, count + 1);
@@ -292,6 +290,8 @@ int add_to_buffer(const sec_acle_t &acle, int report_duplicates, sec_acl_buffer_
     stored_subacl stored;
     if (const int result = find(acl, acle, stored); result != SEC_S_OK)
         return result;
+    if (stored.start == nullptr && !format::find_end(format::bytes_of(acl), stored.offset))
+        return qz::report_corrupt(__LINE__);
     packed_place place;
     if (stored.start != nullptr && may_edit_packed(acle, acl) &&
         std::strlen(acle.identity) <= format::identity_max &&

@@ -1,7 +1,7 @@
 // Creating, displaying and releasing entries and lists of entries.
 #include "qzacl_acl/entry.h"
 
-#include "owned.h"
+#include "base/owned.h"
 #include "qzacl_trace.h"
 #include "qzacl_utils.h"
 #include "report.h"
@@ -150,7 +150,8 @@ int display_checked(const sec_acle_t *acle, char **mechanism, char **identity) {
 int sec__create_acle(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
                      int convert, sec_acle_t **acle) {
     *acle = nullptr;
-    qz::owned_acle made(static_cast<sec_acle_t *>(std::calloc(1, sizeof(sec_acle_t))));
+    // Its identity comes last; and an entry that nobody gets is none whose release is told.
+    qz::owned<sec_acle_t> made(static_cast<sec_acle_t *>(std::calloc(1, sizeof(sec_acle_t))));
     if (made == nullptr)
         return qz::report_no_memory("sec__create_acle", sizeof(sec_acle_t));
     made->perm_mask = perm_mask;

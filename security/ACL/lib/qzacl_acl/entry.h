@@ -67,11 +67,6 @@ inline acle_view view_of(const sec_acle_t &acle) {
             acle.identity == nullptr ? no_text : acle.identity};
 }
 
-struct release_acle {
-    void operator()(sec_acle_t *acle) const { sec_release_acle(acle); }
-};
-using owned_acle = std::unique_ptr<sec_acle_t, release_acle>;
-
 } // namespace qz
 
 // Records the trace points of releasing an entry, which may be null.

@@ -1,5 +1,5 @@
 // Access decisions: which permissions a compiled ACL grants one party, or the groups of one. The buffer is
-// read in place, nothing is allocated, and the one lock is held only while a handler is looked up.
+// read in place, nothing is allocated but what recording a long identity takes, and the one lock is held only while a handler is looked up.
 #include "qzacl_acl/buffer.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/entry.h"
@@ -65,6 +65,14 @@ int evaluate_single_entry(const single_request &request, const format::subacl &h
         return qz::report_corrupt(__LINE__);
     mask = entry.perm_mask;
     return SEC_S_OK;
+}
+
+// A look-up that fails is none of the decision's failures: it is made with what was found.
+sec_id_compare_fn find_handler(std::uint32_t kind, const char *mechanism) {
+    sec_id_compare_fn handler = nullptr;
+    if (sec__get_id_handler(kind, mechanism, &handler) != SEC_S_OK)
+        cu_set_no_error_1();
+    return handler;
 }
 
 // Asks a handler about each entry in turn. Whatever the handler recorded about an entry that does not match
@@ -161,14 +169,14 @@ int evaluate_single(const sec_acl_buffer_t *acl, single_request &request, const 
 
     sec_id_compare_fn handler = nullptr;
     if (type == SEC_ACLE_EXPANDED) {
-        static_cast<void>(sec__get_id_handler(SEC_ID_HANDLER_EXPANDED, request.mechanism, &handler));
+        handler = find_handler(SEC_ID_HANDLER_EXPANDED, request.mechanism);
         if (handler == nullptr)
             return no_match(request, request.identity);
         return evaluate_by_handler(request, handler, false, head, entries, *mask);
     }
     request.walked = static_cast<std::int32_t>(head.entry_count);
     if (request.uses_handler())
-        static_cast<void>(sec__get_id_handler(SEC_ID_HANDLER_USER, request.mechanism, &handler));
+        handler = find_handler(SEC_ID_HANDLER_USER, request.mechanism);
     return handler == nullptr ? evaluate_user(request, head, entries, *mask)
                               : evaluate_by_handler(request, handler, true, head, entries, *mask);
 }

@@ -1,7 +1,7 @@
-// Where an ACL file is: the full path for a name, and the user whose home directory holds it.
+// Where an ACL file is: the full path for a name, the user whose home directory holds it, and its cache.
 #include "qzacl_acl/file_name.h"
 
-#include "owned.h"
+#include "base/owned.h"
 #include "report.h"
 
 #include <cerrno>
@@ -37,6 +37,19 @@ int in_home_directory(const char *aclfname, const char *username, qz::path_buffe
 }
 
 } // namespace
+
+namespace qz {
+
+bool make_cache_name(const char *aclfname, path_buffer &name) {
+    const std::size_t length = strnlen(aclfname, path_max);
+    if (length + sizeof cache_extension > sizeof name.text)
+        return false;
+    std::memcpy(name.text, aclfname, length);
+    std::memcpy(name.text + length, cache_extension, sizeof cache_extension);
+    return true;
+}
+
+} // namespace qz
 
 int sec__get_user_info(const char *username, std::uint32_t *uid, qz::path_buffer &home) {
     constexpr long usual_size = 1024; // where the system suggests none

@@ -1,4 +1,4 @@
-// Where an ACL file is: the full path for a name, and the user whose home directory holds it.
+// Where an ACL file is: the full path for a name, the user whose home directory holds it, and its cache.
 #ifndef QZACL_FILE_NAME_H
 #define QZACL_FILE_NAME_H
 
@@ -10,6 +10,8 @@ namespace qz {
 
 // The longest path, without its NUL.
 inline constexpr std::size_t path_max = 4096;
+// What the name of a cache has behind that of its ACL file.
+inline constexpr char cache_extension[] = ".cacl";
 
 struct path_buffer {
     char text[path_max + 1] = {};
@@ -20,6 +22,9 @@ struct vetted_file {
     path_buffer path;
     struct stat status = {};
 };
+
+// Forms the name of a file's cache; false when it would be longer than a path.
+bool make_cache_name(const char *aclfname, path_buffer &name);
 
 } // namespace qz
 

@@ -1,7 +1,8 @@
 // Identity handlers: registering comparison functions for mechanisms, and looking one up.
 #include "qzacl_acl/id_handlers.h"
 
-#include "owned.h"
+#include "base/owned.h"
+#include "base/uncancelled.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_init.h"
 #include "qzacl_trace.h"
@@ -56,6 +57,7 @@ int register_checked(std::uint32_t kind, const char *mechanism, sec_id_compare_f
 } // namespace
 
 int sec__register_id_handler(std::uint32_t kind, const char *mechanism, sec_id_compare_fn handler) {
+    const qz::uncancelled until_unlocked;
     qz::trace_entry(74,
                     [&] { qz::trace_data(76, qz::number(kind), qz::item(mechanism), qz::number(handler)); });
     cu_set_no_error_1();
@@ -66,6 +68,7 @@ int sec__register_id_handler(std::uint32_t kind, const char *mechanism, sec_id_c
 }
 
 int sec__get_id_handler(std::uint32_t kind, const char *mechanism, sec_id_compare_fn *handler) {
+    const qz::uncancelled until_unlocked;
     *handler = nullptr;
     if (const int error = pthread_mutex_lock(&acl__state.lock); error != 0)
         return report_lock_failure(__LINE__, error);

@@ -6,6 +6,7 @@
 #define QZACL_IDENTITY_ORDER_H
 
 #include "libqz_cu/posix_fold.h"
+#include "libqz_cu/wide_product.h"
 
 #include <bit>
 #include <cstddef>
@@ -68,9 +69,8 @@ identity_hash_key make_identity_hash_key();
 
 // Mixes one more word into the state of a hash, which starts as the second multiplier and ends with one more mix.
 inline std::uint64_t hash_word(std::uint64_t state, std::uint64_t word, const identity_hash_key &key) {
-    __extension__ using wide = unsigned __int128;
-    const wide product = static_cast<wide>(state ^ word) * key.first;
-    return static_cast<std::uint64_t>(product) ^ static_cast<std::uint64_t>(product >> 64);
+    const wide_number product = wide_product(state ^ word, key.first);
+    return product.low ^ product.high;
 }
 
 // `first` is the identity's first word.

@@ -3,7 +3,7 @@
 #ifndef QZACL_IDENTITY_STORE_H
 #define QZACL_IDENTITY_STORE_H
 
-#include "owned.h"
+#include "base/owned.h"
 #include "qzacl_acl/entry.h"
 
 #include <cstddef>

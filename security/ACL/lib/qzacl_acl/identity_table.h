@@ -6,7 +6,7 @@
 #ifndef QZACL_IDENTITY_TABLE_H
 #define QZACL_IDENTITY_TABLE_H
 
-#include "owned.h"
+#include "base/owned.h"
 #include "qzacl_acl/identity_order.h"
 
 #include <bit>

@@ -27,12 +27,15 @@ bool is_acl(const sec_acl_buffer_t &acl) {
     return bytes.size() > 1 && bytes[0] == format::buffer_type && bytes[1] == format::buffer_version;
 }
 
+// The empty ACL may have no bytes; what has some has a header.
+bool is_cut_short(qz::byte_span bytes) { return !bytes.empty() && bytes.size() < format::header_size; }
+
 // Lists the sub-ACLs that are wanted, in the order in which they stand.
 template <class Wanted>
 int append_all(const sec_acl_buffer_t &acl, sec_aclelist_t &list, const Wanted &is_wanted) {
     const qz::byte_span bytes = format::bytes_of(acl);
-    if (bytes.size() < format::header_size)
-        return bytes.empty() ? SEC_S_OK : qz::report_corrupt(__LINE__);
+    if (is_cut_short(bytes))
+        return qz::report_corrupt(__LINE__);
     format::subacl_walk walk(bytes);
     for (;;) {
         switch (walk.next()) {
@@ -51,6 +54,8 @@ int append_all(const sec_acl_buffer_t &acl, sec_aclelist_t &list, const Wanted &
 }
 
 int append_one(const sec_acl_buffer_t &acl, std::uint8_t type, const char *mechanism, sec_aclelist_t &list) {
+    if (is_cut_short(format::bytes_of(acl)))
+        return qz::report_corrupt(__LINE__);
     const unsigned char *subacl = nullptr;
     if (const int result = sec__find_subacl(&acl, type, mechanism, &subacl); result != SEC_S_OK)
         return result;

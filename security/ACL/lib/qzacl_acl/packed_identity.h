@@ -114,6 +114,16 @@ public:
     }
 };
 
+// The place of the first NUL among the eight bytes of a word; eight where there is none.
+constexpr unsigned nul_in_word(std::uint64_t word) {
+    // Sums that cannot carry from one byte into another, where a NUL might be seen that is none.
+    constexpr std::uint64_t low_bits = 0x7f7f7f7f7f7f7f7f;
+    const std::uint64_t nuls = ~(((word & low_bits) + low_bits) | word | low_bits);
+    return static_cast<unsigned>(std::endian::native == std::endian::little ? std::countr_zero(nuls)
+                                                                            : std::countl_zero(nuls)) /
+           8;
+}
+
 // The place of the first NUL among the sixteen bytes of a block; at least sixteen where there is none.
 inline unsigned nul_in_block(const unsigned char *bytes) {
 #ifdef __x86_64__
@@ -121,7 +131,9 @@ inline unsigned nul_in_block(const unsigned char *bytes) {
     const int nuls = _mm_movemask_epi8(_mm_cmpeq_epi8(raw, _mm_setzero_si128()));
     return static_cast<unsigned>(std::countr_zero(static_cast<unsigned>(nuls)));
 #else
-    return static_cast<unsigned>(std::find(bytes, bytes + identity_block::size, 0) - bytes);
+    const char *const at = reinterpret_cast<const char *>(bytes);
+    const unsigned nul = nul_in_word(load8(at));
+    return nul < sizeof(std::uint64_t) ? nul : nul + nul_in_word(load8(at + sizeof(std::uint64_t)));
 #endif
 }
 

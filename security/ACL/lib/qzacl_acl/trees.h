@@ -2,7 +2,7 @@
 #ifndef QZACL_TREES_H
 #define QZACL_TREES_H
 
-#include "owned.h"
+#include "base/owned.h"
 #include "qz/acl.h"
 #include "qzacl_acl/arena.h"
 #include "qzacl_acl/entry.h"

@@ -60,10 +60,11 @@ public:
 
     explicit operator bool() const { return fd_ >= 0; }
     int get() const { return fd_; }
+    int release() { return std::exchange(fd_, -1); }
 
     void close() {
         if (fd_ >= 0)
-            ::close(std::exchange(fd_, -1));
+            ::close(release());
     }
 
 private:

@@ -1,0 +1,37 @@
+// Opening a file for a library, whose service may run without standard streams.
+#ifndef QZ_OPEN_FILE_H
+#define QZ_OPEN_FILE_H
+
+#include "base/owned.h"
+
+#include <cerrno>
+#include <fcntl.h>
+#include <unistd.h>
+
+namespace qz {
+
+// Opens a file as open() does, on a descriptor that is none of a standard stream's: what another thread prints
+// must not end up in the file, nor what it reads come from there. The descriptor does not survive an exec, and a
+// terminal does not become the controlling one. On failure the descriptor is empty and errno set.
+inline descriptor open_file(const char *path, int flags, mode_t mode = 0) {
+    descriptor low(open(path, flags | O_CLOEXEC | O_NOCTTY, mode));
+    if (!low || low.get() > STDERR_FILENO)
+        return low;
+    descriptor high(fcntl(low.get(), F_DUPFD_CLOEXEC, STDERR_FILENO + 1));
+    const int error = errno;
+    low.close();
+    if ((flags & O_EXCL) != 0) {
+        // A file that was just made stays empty, whatever was printed into it meanwhile. Moving to its start waits
+        // for a print that is still going on. If it cannot be kept open, nobody is to find it.
+        if (!high)
+            unlink(path);
+        else if (lseek(high.get(), 0, SEEK_SET) != 0 || ftruncate(high.get(), 0) != 0)
+            return {};
+    }
+    errno = error;
+    return high;
+}
+
+} // namespace qz
+
+#endif

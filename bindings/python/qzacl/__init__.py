@@ -1,0 +1,40 @@
+"""Access control lists for Python: reads, lists, edits and evaluates them through libqzacl. Needs ctypes alone.
+
+    import qzacl
+
+    qzacl.register_expanded("unix", qzacl.domain)       # "e unix .cluster.example": everybody of that domain
+    live = qzacl.LiveAcl("/etc/service.acl")            # read anew when the file changes
+    live.refresh()
+    alice = qzacl.Requester("unix", "alice@head.cluster.example", ("operators",))
+    answer = qzacl.decide(live.snapshot(), alice, qzacl.to_mask("rw"))
+    if not answer.allowed:
+        print(answer.explain())                         # each entry that speaks of her, and which one decides
+
+    with qzacl.Acl.read("service.acl") as acl:          # one's own, to look at and to change
+        for entry in acl:
+            print(entry)                                # "u unix alice@head.cluster.example rwxCqle"
+        acl.add(qzacl.Entry.create(qzacl.GROUP, qzacl.to_mask("rq"), identity="auditors"))
+
+The libraries are those that the loader finds, or those in the folder that QZ_LIBRARY_DIR names.
+
+A failure raises qzacl.Error, with the code, the number and the text of the message; nothing is granted then. Texts are str,
+and UTF-8 in the library: bytes of a file that are none come out as surrogate escapes and go in again as they were. A NUL in
+a text raises ValueError. Permissions are masks of bits; to_mask and to_letters turn letters into them and back, by the
+library's own permissions or by a PermissionSet of a service.
+
+Any number of threads may ask one Acl at a time; while one edits or closes it, no other may use it. Handlers are called in
+the thread that asks.
+"""
+from ._acl import Acl, same
+from ._decide import Answer, Order, PartyAnswer, Requester, Who, decide, granted, stored_identity
+from ._entry import ANY_OTHER, EXPANDED, GROUP, UNAUTHENTICATED, USER, Entry
+from ._handlers import domain, exact, register_expanded, register_user
+from ._library import Error
+from ._live import LiveAcl
+from ._permissions import Permission, PermissionSet, to_letters, to_mask
+
+__all__ = [
+    "ANY_OTHER", "Acl", "Answer", "EXPANDED", "Entry", "Error", "GROUP", "LiveAcl", "Order", "PartyAnswer", "Permission",
+    "PermissionSet", "Requester", "UNAUTHENTICATED", "USER", "Who", "decide", "domain", "exact", "granted",
+    "register_expanded", "register_user", "same", "stored_identity", "to_letters", "to_mask",
+]

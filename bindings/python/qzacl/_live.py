@@ -1,0 +1,110 @@
+"""An ACL file that is followed while it changes."""
+from __future__ import annotations
+
+import os
+import threading
+import time
+from typing import NamedTuple
+
+from ._acl import Acl
+from ._library import FILE_ERROR, Error
+from ._permissions import PermissionSet
+
+_SECOND = 10**9
+_TICK = _SECOND // 50  # more than the coarse clock's, from which the system takes the time of a change
+_EXCHANGES = 100
+_COARSE_CLOCK = 5  # CLOCK_REALTIME_COARSE, which the module time does not name
+
+
+class _Stamp(NamedTuple):
+    """What tells two states of a file apart."""
+
+    device: int
+    number: int
+    size: int
+    modified: int
+    changed: int
+
+    def is_settled(self, now: int) -> bool:
+        """Whether every change from now on gives another stamp. Whole seconds may come from a file system that keeps no
+        more, and those of some have two."""
+        reach = _TICK if self.changed % _SECOND else 2 * _SECOND
+        return abs(now - self.changed) > reach
+
+
+class LiveAcl:
+    """An ACL file as it is now: any number of threads decide by the snapshot, while refresh, in one of them or in several,
+    reads the file anew when it has changed."""
+
+    def __init__(self, path: str | os.PathLike[str], permissions: PermissionSet | None = None, *,
+                 default_permissions: bool = False) -> None:
+        """Follows a file, which the first refresh reads: always its text, unless default_permissions says that everybody reads
+        it with the library's own permissions. Then its cache file may be read as well, in which nothing tells by which set
+        it was compiled."""
+        if default_permissions and permissions is not None:
+            raise ValueError("a set of one's own is not the default one")
+        self._path, self._permissions, self._cache = os.fspath(path), permissions, default_permissions
+        self._refreshing = threading.Lock()
+        self._seen: _Stamp | None = None  # before the last reading that was tried
+        self._stamp: _Stamp | None = None  # of the current snapshot, once it has settled
+        self._current: Acl | None = None
+        self._problem: Error | None = Error(FILE_ERROR, reason="not read yet")
+
+    def refresh(self) -> bool:
+        """Reads the file if its device, number, size or one of its times is another than at the last reading, or if it had
+        changed so shortly before that a further change might show the same times. Tells whether there is a new snapshot,
+        which is not so where the bytes are the same.
+
+        Raises Error when the file cannot be read. The last good snapshot stays, and the next refresh tries again.
+        """
+        with self._refreshing:
+            try:
+                changed = self._refresh()
+            except Error as problem:
+                self._problem = problem
+                raise
+            self._problem = None
+            return changed
+
+    @property
+    def problem(self) -> Error | None:
+        """What the last refresh, by whatever thread, raised; None after a good one."""
+        return self._problem
+
+    def snapshot(self) -> Acl:
+        """What was read last, which does not change and is not to be closed. Raises Error as long as nothing could be read."""
+        current, problem = self._current, self._problem
+        if current is None:
+            raise problem or Error(FILE_ERROR)
+        return current
+
+    def _refresh(self) -> bool:
+        for _ in range(_EXCHANGES):
+            try:
+                return self._refresh_once()
+            except Error as problem:
+                # A file that is exchanged between the looks that are taken at it is no trouble of the new one.
+                if problem.code != FILE_ERROR or self._look() in (None, self._seen):
+                    raise
+        return self._refresh_once()
+
+    def _refresh_once(self) -> bool:
+        # Both before the reading, so that a change during it shows the next time.
+        now = time.clock_gettime_ns(_COARSE_CLOCK)
+        self._seen = self._look()
+        if self._seen is not None and self._seen == self._stamp:
+            return False
+        read = Acl.read(self._path, permissions=self._permissions, cache=self._cache)
+        self._stamp = self._seen if self._seen is not None and self._seen.is_settled(now) else None
+        if self._current is not None and bytes(self._current) == bytes(read):
+            return False
+        read._frozen = True
+        self._current = read
+        return True
+
+    def _look(self) -> _Stamp | None:
+        try:
+            status = os.stat(self._path)
+        except OSError:
+            return None
+        return _Stamp(status.st_dev, status.st_ino, status.st_size, status.st_mtime_ns, status.st_ctime_ns)

@@ -1,0 +1,143 @@
+// Whether a cache belongs to its text.
+#include "qzacl_acl/cache_vetting.h"
+
+#include "qz/acl.h"
+#include "qzacl_trace.h"
+#include "qzacl_utils.h"
+#include "report.h"
+
+#include <cerrno>
+
+namespace {
+
+bool has_same_owner(const struct stat &text, const struct stat &cache) {
+    return text.st_uid == cache.st_uid && text.st_gid == cache.st_gid;
+}
+
+bool has_same_permissions(const struct stat &text, const struct stat &cache) {
+    return ((text.st_mode ^ cache.st_mode) & qz::permission_bits) == 0;
+}
+
+// True when the name still leads to the file that was examined, which is protected as it was then; else errno is
+// set, to ESTALE for another file.
+bool is_unchanged(const char *path, const struct stat &examined) {
+    struct stat now = {};
+    if (stat(path, &now) != 0)
+        return false;
+    errno = ESTALE;
+    return qz::same_file(now, examined) && has_same_owner(now, examined) && now.st_mode == examined.st_mode;
+}
+
+// True when the text says what was read, or is so late that a cache of what was read is not believed: who copies an
+// old file over it may keep its number, and gives it the old time.
+bool is_text_of(const struct stat &status, const qz::text_origin &origin) {
+    return qz::same_file(status, origin.file) && S_ISREG(status.st_mode) &&
+           (status.st_mtime == origin.file.st_mtime || status.st_mtime >= origin.time.tv_sec);
+}
+
+int owner_differs(const char *aclfname, const char *cache_name, const struct stat &text,
+                  const struct stat &cache) {
+    if (qz::traces(qz::trace_category::errors))
+        qz::trace_data(111, qz::item(cache_name), qz::number(cache.st_uid), qz::number(cache.st_gid),
+                       qz::number(text.st_uid), qz::number(text.st_gid));
+    return qz::report(SEC_S_FILE_ERROR, qz::msg::cache_owner_differs, aclfname);
+}
+
+int mode_differs(const char *aclfname, const char *cache_name, const struct stat &text,
+                 const struct stat &cache) {
+    const std::uint32_t cache_bits = cache.st_mode & qz::permission_bits;
+    const std::uint32_t text_bits = text.st_mode & qz::permission_bits;
+    if (qz::traces(qz::trace_category::errors))
+        qz::trace_data(111, qz::item(cache_name), qz::number(cache_bits), qz::number(text_bits));
+    return qz::report(SEC_S_FILE_ERROR, qz::msg::cache_mode_differs, aclfname);
+}
+
+void trace_unlike(const qz::vetted_file &text, const qz::vetted_file &cache) {
+    if (qz::traces(qz::trace_category::info))
+        qz::trace_data(120, qz::item(text.path.text), qz::number(text.status.st_uid),
+                       qz::number(text.status.st_gid), qz::number(cache.status.st_uid),
+                       qz::number(cache.status.st_gid), qz::number(text.status.st_mode),
+                       qz::number(cache.status.st_mode));
+}
+
+} // namespace
+
+namespace qz {
+
+text_origin::text_origin(const struct stat &vetted) : file(vetted), time() {
+    // The coarse clock: the kernel stamps files from it or from a finer one, never earlier than it.
+    clock_gettime(CLOCK_REALTIME_COARSE, &time);
+}
+
+bool cache_is_current(const vetted_file &text, vetted_file &cache) {
+    const bool is_traced = traces(trace_category::info);
+    if (!make_cache_name(text.path.text, cache.path))
+        return false;
+    if (is_traced)
+        trace_data(117, item(cache.path.text));
+    if (stat(cache.path.text, &cache.status) != 0) {
+        const int error = errno;
+        if (is_traced)
+            trace_data(118, item(cache.path.text), number(error));
+        return false;
+    }
+    if (cache.status.st_size == 0 || cache.status.st_mtime <= text.status.st_mtime) {
+        if (is_traced)
+            trace_data(119, item(cache.path.text));
+        return false;
+    }
+    if (has_same_owner(text.status, cache.status) && has_same_permissions(text.status, cache.status))
+        return true;
+    trace_unlike(text, cache);
+    return false;
+}
+
+bool cache_has_entries_of_text(const vetted_file &text, const vetted_file &cache, int cache_fd) {
+    posix_acl of_cache;
+    posix_acl of_text;
+    // Where the group bits, the entries' mask, let nobody write, nobody but the owner can have written the cache,
+    // whatever the entries are; elsewhere they must be those of the very file that was vetted.
+    const bool is_writable = (text.status.st_mode & S_IWGRP) != 0;
+    if (of_cache.read(cache_fd) && of_text.read(text.path.text) && of_cache == of_text &&
+        (!is_writable || is_unchanged(text.path.text, text.status)))
+        return true;
+    trace_unlike(text, cache);
+    return false;
+}
+
+int text_protection::examine(const char *aclfname, const text_origin &origin) {
+    if (stat(aclfname, &status) != 0)
+        return query_failed(aclfname, "stat()", aclfname, errno);
+    if (!is_text_of(status, origin))
+        return query_failed(aclfname, "stat()", aclfname, ESTALE);
+    if (!entries.read(aclfname))
+        return query_failed(aclfname, "getxattr()", aclfname, errno);
+    // The entries must be those of the file whose owner and mode the cache gets.
+    if (!is_unchanged(aclfname, status))
+        return query_failed(aclfname, "stat()", aclfname, errno);
+    return SEC_S_OK;
+}
+
+int text_protection::vet_cache(const char *aclfname, const char *cache_name, const struct stat &cache) const {
+    if (!has_same_owner(status, cache))
+        return owner_differs(aclfname, cache_name, status, cache);
+    if (cache.st_mode != status.st_mode)
+        return mode_differs(aclfname, cache_name, status, cache);
+    return SEC_S_OK;
+}
+
+int text_protection::vet_opened_cache(const char *aclfname, const char *cache_name, int cache_fd) const {
+    posix_acl of_cache;
+    if (of_cache.read(cache_fd) && of_cache == entries)
+        return SEC_S_OK;
+    // The entries are part of the mode, whose bits are alike.
+    return mode_differs(aclfname, cache_name, status, status);
+}
+
+int query_failed(const char *queried, const char *call, const char *aclfname, int error) {
+    if (traces(trace_category::errors))
+        trace_data(109, item(queried), item(call), number(error));
+    return report(SEC_S_FILE_ERROR, msg::bad_file_name, aclfname, error);
+}
+
+} // namespace qz

@@ -1,0 +1,117 @@
+// What concerns the process as a whole: the registration for tracing, and forks. Whatever another thread holds of a
+// library when a process forks, the child can use the library.
+#include "qzacl_trace.h"
+#include "support.h"
+#include <condition_variable>
+#include <mutex>
+#include <sys/wait.h>
+#include <thread>
+#include <unistd.h>
+
+namespace {
+
+using namespace support;
+
+// One thread stops in the library with its lock held, until the process has forked or has to wait for the lock.
+struct stop_with_lock_held {
+    void here() {
+        std::unique_lock lock(mutex);
+        is_holding = true;
+        changed.notify_all();
+        changed.wait_for(lock, std::chrono::milliseconds(200), [this] { return is_forked; });
+    }
+    void wait_for_holder() {
+        std::unique_lock lock(mutex);
+        changed.wait(lock, [this] { return is_holding; });
+    }
+    void tell_forked() {
+        const std::lock_guard lock(mutex);
+        is_forked = true;
+        changed.notify_all();
+    }
+    std::mutex mutex;
+    std::condition_variable changed;
+    bool is_holding = false, is_forked = false;
+};
+thread_local stop_with_lock_held *stop = nullptr;
+
+int sizes_asked = 0, names_asked = 0;
+
+} // namespace
+
+// The linker leads the libraries' calls here.
+extern "C" int __real_pthread_mutex_unlock(pthread_mutex_t *mutex);
+extern "C" int __wrap_pthread_mutex_unlock(pthread_mutex_t *mutex) {
+    if (stop_with_lock_held *held = std::exchange(stop, nullptr)) held->here();
+    return __real_pthread_mutex_unlock(mutex);
+}
+extern "C" int __real_tr_get_size_1(std::uint32_t *size);
+extern "C" int __wrap_tr_get_size_1(std::uint32_t *size) {
+    ++sizes_asked;
+    return __real_tr_get_size_1(size);
+}
+extern "C" int __real_tr_get_filename_1(char *name);
+extern "C" int __wrap_tr_get_filename_1(char *name) {
+    ++names_asked;
+    return __real_tr_get_filename_1(name);
+}
+
+namespace {
+
+// The configuration is read once, so that each row has a process of its own.
+TEST(registration, asks_for_the_trace_file_when_times_are_traced) {
+    const temporary_folder folder;
+    for (const auto &[levels, times] : {std::pair("_SEL:Perf=1", 1), {"_SEL:Perf=5", 0}, {"_SEL:API=1", 0}}) {
+        const pid_t child = fork();
+        if (child == 0) {
+            setenv("QZ_TRACE_LEVELS", levels, 1);
+            setenv("QZ_TRACE_FILE", (folder / "trace").c_str(), 1);
+            acl__trace_register_component();
+            _exit(sizes_asked == times && names_asked == times ? 0 : 1);
+        }
+        int status = -1;
+        EXPECT_TRUE(waitpid(child, &status, 0) == child && status == 0) << levels;
+    }
+}
+
+bool looks_up_a_handler() {
+    const buffer acl(rich);
+    std::uint32_t mask = 0;
+    return sec__single_acle_perm(&acl.acl, 0x84, "unix", nullptr, "al", &mask) == 0 && mask == 1;
+}
+bool fetches_a_text() {
+    cu_set_error_1(4, 0, "none.cat", 1, 1, "text");
+    return recorded_error().text == "text";
+}
+bool registers_for_tracing() {
+    std::uint8_t level = 1;
+    const tr_category_t category = {0, "Any", 0};
+    return tr_register_component_1("fork_test", &level, &category, 1) == TR_OK;
+}
+
+TEST(fork, leaves_a_child_that_can_use_the_libraries) {
+    const std::pair<const char *, bool (*)()> uses[] = {
+        {"libqzacl", looks_up_a_handler}, {"libqz_cu", fetches_a_text}, {"libqz_tr", registers_for_tracing}};
+    for (const auto &[library, use] : uses) {
+        SCOPED_TRACE(library);
+        ASSERT_TRUE(use()); // what is done once is done
+        stop_with_lock_held held;
+        std::thread holder([&held, use = use] {
+            stop = &held;
+            use();
+        });
+        held.wait_for_holder();
+        const pid_t child = fork();
+        if (child == 0) {
+            alarm(10); // ends a child that waits for the holder, whom it does not have
+            _exit(use() ? 0 : 1);
+        }
+        held.tell_forked();
+        holder.join();
+        int status = -1;
+        EXPECT_TRUE(waitpid(child, &status, 0) == child && status == 0) << status;
+        EXPECT_TRUE(use());
+    }
+}
+
+} // namespace
