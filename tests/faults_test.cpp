@@ -195,6 +195,32 @@ TEST_F(files, every_allocation_fails) {
     std::cout << sites << " allocations\n";
 }
 
+// Insertions wait for lines that come after them; what is told is the first mistake all the same.
+TEST_F(files, tell_their_first_mistake) {
+    const int duplicate = 161, bad_type = 165;
+    const std::string twice = "g a\ng A\n", bad = "x y\n";
+    const auto good = [](int count) {
+        std::string lines;
+        while (count-- != 0) lines += "g member" + std::to_string(count) + "\n";
+        return lines;
+    };
+    const std::pair<std::string, int> rows[] = {
+        {twice, duplicate},
+        {twice + bad, duplicate},
+        {bad + twice, bad_type},
+        {"g a\n" + bad + "g A\n", bad_type},
+        {twice + good(14) + bad, duplicate},
+        {twice + good(100) + bad, duplicate},
+        {good(100) + twice + good(3), duplicate},
+        {good(40) + "g MEMBER39\n", duplicate},
+    };
+    for (const auto &[text, id] : rows) {
+        write_file(path, text);
+        EXPECT_EQ(read_acl(path, text_only).id, id) << text;
+        EXPECT_EQ(watched({}, [this] { return check(path, 0); }).id, id) << text;
+    }
+}
+
 TEST_F(files, are_read_with_few_allocations) {
     std::string lines;
     std::size_t counts[2];
