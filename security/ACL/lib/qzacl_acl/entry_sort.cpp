@@ -61,7 +61,9 @@ public:
                 std::copy(from.begin(), from.end(), to.begin());
             return;
         }
-        const auto digit = [shift](const small_entry &entry) { return (entry.key >> (56 - shift)) & 0xff; };
+        const auto digit = [shift](const small_entry &entry) {
+            return static_cast<std::size_t>((entry.key >> (56 - shift)) & 0xff);
+        };
         std::array<std::uint32_t, 257> starts{};
         for (const small_entry &entry : from)
             ++starts[digit(entry) + 1];

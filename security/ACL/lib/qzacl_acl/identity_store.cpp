@@ -4,6 +4,7 @@
 #include <algorithm>
 #include <cstdlib>
 #include <cstring>
+#include <limits>
 
 namespace qz {
 namespace {
@@ -60,9 +61,13 @@ bool identity_store::copy(const acle_view &acle, std::uint32_t &place, std::size
 bool identity_store::grow(std::uint64_t units, std::size_t &refused) {
     constexpr std::uint64_t first_units = 16;
     const std::uint64_t size = std::max({units, std::uint64_t{size_} * 2, first_units});
-    void *grown = size > last_place ? nullptr : std::realloc(base_, size * own_unit);
+    // On a 32-bit machine more may be asked for than memory can be.
+    constexpr std::size_t most_bytes = std::numeric_limits<std::ptrdiff_t>::max();
+    const bool fits = size <= last_place && size <= most_bytes / own_unit;
+    const std::size_t bytes = fits ? static_cast<std::size_t>(size) * own_unit : most_bytes;
+    void *grown = fits ? std::realloc(base_, bytes) : nullptr;
     if (grown == nullptr) {
-        refused = size * own_unit;
+        refused = bytes;
         return false;
     }
     base_ = static_cast<char *>(grown);
