@@ -10,15 +10,15 @@ bool identity_table::reset(std::uint32_t count, std::size_t &refused) {
     while (room_of(bits) < count)
         ++bits;
     const std::size_t table_size = sizeof(head) + (sizeof(group) << bits);
-    std::size_t size = table_size + alignof(head);
+    const std::size_t size = table_size + alignof(head);
     owned<void> memory(std::calloc(size, 1));
     if (memory == nullptr) {
         refused = size;
         return false;
     }
     release();
-    void *aligned = memory.get();
-    std::align(alignof(head), table_size, aligned, size);
+    const std::size_t misaligned = reinterpret_cast<std::uintptr_t>(memory.get()) % alignof(head);
+    void *const aligned = static_cast<char *>(memory.get()) + (alignof(head) - misaligned);
     head_ = new (aligned) head{std::move(memory), make_identity_hash_key(), bits};
     return true;
 }
