@@ -3,17 +3,20 @@
  * ACL in memory.
  *
  * usage: service ACL-FILE USER@HOST [GROUP...]
+ *
+ * Run it in a UTF-8 locale: decisions take names in UTF-8, new entries take them in the locale's code set.
  */
 #include <qz/acl.h>
 #include <qz/cu.h>
 
 #include <inttypes.h>
+#include <locale.h>
 #include <stdio.h>
 #include <string.h>
 
 static const char mechanism[] = "unix";
 
-/* Says why the last operation failed. */
+/* Prints why the last operation failed. */
 static int failed(const char *what) {
     cu_error_t *error = NULL;
     char *text = NULL;
@@ -25,11 +28,21 @@ static int failed(const char *what) {
     return 1;
 }
 
-/* A user-expanded entry of "unix" names a domain: it stands for everybody whose name ends with it. */
-static int is_in_domain(const char *requested, const char *entry) {
-    size_t length = strlen(requested), end = strlen(entry);
+/*
+ * A user-expanded entry of "unix" names a host or, with a dot in front, a domain. It accepts every user at that
+ * host, or at any host in that domain. The dot matters: a bare suffix would also accept "evilcluster.example".
+ */
+static int compare_host(const char *requested, const char *entry) {
+    const char *host = strchr(requested, '@');
+    size_t length, suffix = strlen(entry);
 
-    return length < end || strcmp(requested + length - end, entry) != 0;
+    if (host == NULL)
+        return 1;
+    ++host;
+    length = strlen(host);
+    if (entry[0] == '.' && length > suffix)
+        host += length - suffix;
+    return cu_strcasecmp_posix_1(host, entry);
 }
 
 static int granted(const char *by, uint32_t mask) {
@@ -42,15 +55,15 @@ static int granted(const char *by, uint32_t mask) {
 }
 
 /*
- * The closest answer wins: what is said about the user, else about the user's domain, else about the
- * groups, else about anybody. SEC_S_BAD_ACLE says that there is no entry, which is an answer and no failure.
+ * The most specific match decides: the user's own entry, else the user's domain, else the groups together, else
+ * any other. SEC_S_BAD_ACLE means that no entry matches, which is an answer and not a failure.
  */
 static int decide(const sec_acl_buffer_t *acl, const char *user, const sec_group_ref_t *groups,
                   int32_t count) {
     uint32_t mask = 0;
     int result;
 
-    if (acl->length == 0) { /* a file without entries gives a buffer without bytes, which grants nothing */
+    if (acl->length == 0) { /* a file without entries grants nothing, and evaluation refuses its buffer */
         puts("nothing is granted");
         return 0;
     }
@@ -79,7 +92,7 @@ static int decide(const sec_acl_buffer_t *acl, const char *user, const sec_group
     return failed("decision");
 }
 
-/* Grants a user without an entry of its own reading, asks again, and takes it back; the file does not change. */
+/* Adds an entry for a user who has none, asks again, and deletes it. Only the ACL in memory changes. */
 static int edit(sec_acl_buffer_t *acl, const char *user) {
     sec_acle_t *entry = NULL;
     uint32_t mask = 0;
@@ -109,8 +122,10 @@ int main(int argc, char **argv) {
     int32_t count = 0;
     sec_acl_buffer_t acl;
     uint32_t flags = 0;
+    const char *source;
     int status;
 
+    setlocale(LC_ALL, ""); /* before the library first converts a name or fetches a message */
     if (argc < 3 || argc - 3 > max_groups) {
         fputs("usage: service ACL-FILE USER@HOST [GROUP...]\n", stderr);
         return 2;
@@ -119,13 +134,15 @@ int main(int argc, char **argv) {
         groups[count].id = 0;
         groups[count].name = argv[count + 3];
     }
-    if (sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, mechanism, is_in_domain) != SEC_S_OK)
+    if (sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, mechanism, compare_host) != SEC_S_OK)
         return failed("handler");
     if (sec_read_acl_file(argv[1], NULL, NULL, SEC_READ_ACL_CONVERT | SEC_READ_ACL_CACHE, &acl, &flags) !=
         SEC_S_OK)
         return failed(argv[1]);
-    printf("read from %s, %" PRId32 " bytes%s\n", (flags & SEC_READ_ACL_TEXT) != 0 ? "the text" : "the cache",
-           acl.length, (flags & SEC_READ_ACL_CACHE) != 0 ? ", cached" : "");
+    /* An empty file has no cache and sets no flag. */
+    source = acl.length == 0 || (flags & SEC_READ_ACL_TEXT) != 0 ? "text" : "cache";
+    printf("read from the %s, %" PRId32 " bytes%s\n", source, acl.length,
+           (flags & SEC_READ_ACL_CACHE) != 0 ? ", cached" : "");
 
     status = decide(&acl, argv[2], groups, count);
     if (status == 0)

@@ -1,26 +1,34 @@
-// The service of service.c in C++: it decides by the same rules and says the same.
+// The service of service.c in C++: the same rules, the same output.
 //
 // usage: service_cpp ACL-FILE USER@HOST [GROUP...]
 #include <qz/acl.hpp>
 
+#include <clocale>
 #include <cstdio>
-#include <string_view>
+#include <cstring>
 #include <vector>
 
 namespace {
 
 constexpr char mechanism[] = "unix";
 
-// Says why the last operation failed.
+// Prints why the last operation failed.
 int failed(const char *what) {
     std::fprintf(stderr, "%s: %s", what, qz::error::current().text().data());
     return 1;
 }
 
-// A user-expanded entry of "unix" names a domain: it stands for everybody whose name ends with it.
-int is_in_domain(const char *requested, const char *entry) {
-    const std::string_view name = requested, end = entry;
-    return name.size() < end.size() || name.substr(name.size() - end.size()) != end;
+// A user-expanded entry of "unix" names a host or, with a dot in front, a domain. It accepts every user at that
+// host, or at any host in that domain.
+int compare_host(const char *requested, const char *entry) {
+    const char *host = std::strchr(requested, '@');
+    if (host == nullptr)
+        return 1;
+    ++host;
+    const std::size_t length = std::strlen(host), suffix = std::strlen(entry);
+    if (entry[0] == '.' && length > suffix)
+        host += length - suffix;
+    return cu_strcasecmp_posix_1(host, entry);
 }
 
 int say(const char *by, qz::decision found) {
@@ -35,7 +43,7 @@ int say(const char *by, qz::decision found) {
     return 0;
 }
 
-// The closest answer wins: what is said about the user, the user's domain, the groups, anybody.
+// The most specific match decides: the user, else the user's domain, else the groups together, else any other.
 int decide(const qz::acl &acl, const char *user, const std::vector<sec_group_ref_t> &groups) {
     if (acl.bytes().empty()) // a file without entries
         return say("nobody", {SEC_S_BAD_ACLE, 0});
@@ -48,7 +56,7 @@ int decide(const qz::acl &acl, const char *user, const std::vector<sec_group_ref
     return say("any other", acl.single(qz::party::any_other()));
 }
 
-// Grants a user without an entry of its own reading, asks again, and takes it back; the file does not change.
+// Adds an entry for a user who has none, asks again, and deletes it. Only the ACL in memory changes.
 int edit(qz::acl &acl, const char *user) {
     const auto entry = qz::acl_entry::create(SEC_ACLE_USER, *qz::to_mask("r"), mechanism, user);
     const int added = entry ? acl.add_new(*entry) : entry.code();
@@ -68,6 +76,7 @@ int edit(qz::acl &acl, const char *user) {
 } // namespace
 
 int main(int argc, char **argv) {
+    std::setlocale(LC_ALL, ""); // before the library first converts a name or fetches a message
     if (argc < 3) {
         std::fputs("usage: service_cpp ACL-FILE USER@HOST [GROUP...]\n", stderr);
         return 2;
@@ -75,14 +84,16 @@ int main(int argc, char **argv) {
     std::vector<sec_group_ref_t> groups;
     for (int at = 3; at < argc; ++at)
         groups.push_back({0, argv[at]});
-    if (sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, mechanism, is_in_domain) != SEC_S_OK)
+    if (sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, mechanism, compare_host) != SEC_S_OK)
         return failed("handler");
     std::uint32_t flags = SEC_READ_ACL_CONVERT | SEC_READ_ACL_CACHE;
     auto acl = qz::acl::read_file(argv[1], nullptr, nullptr, flags, &flags);
     if (!acl)
         return failed(argv[1]);
-    std::printf("read from %s, %zu bytes%s\n", (flags & SEC_READ_ACL_TEXT) != 0 ? "the text" : "the cache",
-                acl->bytes().size(), (flags & SEC_READ_ACL_CACHE) != 0 ? ", cached" : "");
+    // An empty file has no cache and sets no flag.
+    const char *source = acl->bytes().empty() || (flags & SEC_READ_ACL_TEXT) != 0 ? "text" : "cache";
+    std::printf("read from the %s, %zu bytes%s\n", source, acl->bytes().size(),
+                (flags & SEC_READ_ACL_CACHE) != 0 ? ", cached" : "");
     const int status = decide(*acl, argv[2], groups);
     return status == 0 ? edit(*acl, argv[2]) : status;
 }

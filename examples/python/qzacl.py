@@ -3,12 +3,12 @@
     with qzacl.Acl.read("service.acl") as acl:
         for entry in acl:
             print(entry)
-        mask = acl.user("unix", "alice@host")  # None: no entry speaks of her
+        mask = acl.user("unix", "alice@host")  # None: no entry matches her
 
-The libraries are those that the loader finds, or those in the folder that QZ_LIBRARY_DIR names. The C header
+The libraries are those that the loader finds, or those in the folder named by QZ_LIBRARY_DIR. The C header
 <qz/acl.h> is the manual; a failure raises qzacl.Error.
 
-usage: qzacl.py FILE USER [GROUP...]   prints the entries, and what they grant to a user of the mechanism "unix"
+usage: qzacl.py FILE USER@HOST [GROUP...]   prints the entries, and what they grant to a user of the mechanism "unix"
 """
 import ctypes
 import os
@@ -39,12 +39,12 @@ class _Group(ctypes.Structure):
     _fields_ = [("id", c_uint64), ("name", c_char_p)]
 
 
-class _RecordedError(ctypes.Structure):  # the public fields at its start; the library makes and releases it
+class _RecordedError(ctypes.Structure):  # its public fields; the library makes and releases it
     _fields_ = [("code", c_int), ("message_id", c_int)]
 
 
 _Compare = ctypes.CFUNCTYPE(c_int, c_char_p, c_char_p)
-_PermSet = c_void_p  # only ever null here, which means the permissions of acl__default_perm_set
+_PermSet = c_void_p  # always null here: the permissions of acl__default_perm_set
 
 
 def _load(library, functions):
@@ -76,7 +76,7 @@ _acl = _load("libqzacl.so.1", {
 
 
 class Error(Exception):
-    """A failed call: its code, the index of its message (0: none), and the message with its printed number."""
+    """A failed call: its code, the index of its message (0: none), and the message text with its number."""
 
     def __init__(self, code, message_id, text):
         super().__init__(text.rstrip() or f"code {code}")
@@ -84,7 +84,7 @@ class Error(Exception):
 
     @classmethod
     def recorded(cls, code):
-        """The error that the last call of this thread recorded, for the code that it returned."""
+        """The error recorded by this thread's last call, which returned the given code."""
         error, text = POINTER(_RecordedError)(), c_void_p()
         try:
             if _cu.cu_get_error_1(byref(error)) != OK or _cu.cu_get_errmsg_1(error, byref(text)) != OK:
@@ -100,7 +100,7 @@ def _check(code):
         raise Error.recorded(code)
 
 
-def _utf8(text):  # bytes that are no UTF-8 come out as they went in; a NUL would cut the text short
+def _utf8(text):  # bytes that are not UTF-8 are kept as they are; a NUL would cut the text short
     encoded = text.encode(errors="surrogateescape")
     if b"\0" in encoded:
         raise ValueError("embedded NUL")
@@ -125,18 +125,18 @@ def to_letters(mask):
     return letters.value.decode()
 
 
-_handlers = []  # registered for the life of the process, so these are never let go
+_handlers = []  # registered for the life of the process, so never released
 
 
 def register_expanded(mechanism, matches):
-    """Gives user-expanded entries of the mechanism their meaning: matches(requested, entry) tells whom they stand for.
+    """Registers matches(requested, entry): whether a user-expanded entry of the mechanism accepts an identity.
 
-    Where it raises, the entry does not match, and the exception is shown on standard error.
+    If it raises, the entry does not match, and the exception is printed on standard error.
     """
     def compare(requested, entry):
         try:
             return 0 if matches(_text(requested), _text(entry)) else 1
-        except BaseException:  # whatever left this function would be a match to its caller
+        except BaseException:  # an exception that left this function would count as a match
             sys.excepthook(*sys.exc_info())
             return 1
 
@@ -146,7 +146,7 @@ def register_expanded(mechanism, matches):
 
 class Entry(NamedTuple):
     type: int
-    mechanism: str  # empty where the type takes none, as is the identity
+    mechanism: str  # empty if the type takes none; so is the identity
     identity: str
     permissions: int
 
@@ -156,14 +156,14 @@ class Entry(NamedTuple):
 
 
 class Acl:
-    """An ACL in memory, released by close or at the end of a with block. Threads may ask it at the same time."""
+    """An ACL in memory, released by close() or at the end of a with block. Threads may evaluate it at the same time."""
 
     def __init__(self):
         self._buffer = _Buffer()
 
     @classmethod
     def read(cls, path, user=None, flags=0):
-        """Reads a file, or with a user a bare file name in that user's home directory. A cache is always checked."""
+        """Reads a file; with a user, a bare file name in that user's home directory. A cache is always checked."""
         acl = cls()
         _check(_acl.sec_read_acl_file(os.fsencode(path), None if user is None else _utf8(user), None,
                                       flags | READ_CONVERT, byref(acl._buffer), None))
@@ -201,7 +201,7 @@ class Acl:
         return self._single(EXPANDED, _utf8(mechanism), _utf8(identity))
 
     def groups(self, names):
-        """What groups are granted together."""
+        """The permissions of all these groups together."""
         names = [_utf8(name) for name in names]
         if not names:
             return None
@@ -211,7 +211,7 @@ class Acl:
         return self._ask(_acl.sec__single_acle_perm, kind, mechanism, None, identity)
 
     def _ask(self, function, *arguments):
-        """The permissions as a mask; None when no entry speaks of the party."""
+        """The permissions as a mask; None if no entry matches."""
         if not self._buffer.length:  # a file without entries
             return None
         mask = c_uint32()
@@ -222,13 +222,19 @@ class Acl:
         return mask.value
 
 
+def at_host(requested, entry):
+    """Whether a user-expanded entry, a host or, with a dot in front, a domain, accepts USER@HOST."""
+    _, at, host = requested.partition("@")
+    host, entry = (_utf8(name).lower() for name in (host, entry))  # in bytes, only A to Z have another case
+    return bool(at) and (host == entry or entry.startswith(b".") and host.endswith(entry))
+
+
 def _main(path, user, *groups):
-    # A user-expanded entry of "unix" names a domain: it stands for everybody whose name ends with it.
-    register_expanded("unix", str.endswith)
+    register_expanded("unix", at_host)
     with Acl.read(path) as acl:
         for entry in acl:
             print(entry)
-        # The closest answer wins: the user, the user's domain, the groups, anybody.
+        # The most specific match decides: the user, the user's domain, the groups together, any other.
         for by, ask in (("user", lambda: acl.user("unix", user)), ("domain", lambda: acl.expanded("unix", user)),
                         ("groups", lambda: acl.groups(groups)), ("any other", acl.any_other)):
             if (mask := ask()) is not None:
@@ -239,8 +245,8 @@ def _main(path, user, *groups):
 
 if __name__ == "__main__":
     if len(sys.argv) < 3:
-        sys.exit("usage: qzacl.py FILE USER [GROUP...]")
-    sys.stdout.reconfigure(errors="surrogateescape")  # identities are shown byte by byte as the file has them
+        sys.exit("usage: qzacl.py FILE USER@HOST [GROUP...]")
+    sys.stdout.reconfigure(errors="surrogateescape")  # identities are printed byte for byte
     try:
         _main(*sys.argv[1:])
     except Error as failure:
