@@ -169,6 +169,12 @@ class Documents(unittest.TestCase):
         self.assertEqual(["{}:{}: {}".format(*each.group(*keys)) for each in found], places)
         self.assertIn("Der ACL-Eintrag in Zeile 5", found[0][matcher["message"]])
 
+    def test_tracing_as_the_readme_shows_it(self):
+        command = re.search(r"(?m)^QZ_TRACE_LEVELS=.*\\\n.*$", DOCS[SOURCE / "README.md"])[0]
+        shown = self.run_in_shell(f"mkdir build; {command.replace('build/release/examples/', '')}")
+        self.assertEqual(shown[0], 0, shown)
+        self.assertIn('"id":84', (self.dir / "build/trace.jsonl").read_text())  # an answer of sec__single_acle_perm
+
     def test_table_of_trace_points(self):
         calls = re.findall(r"trace_(exit|entry|release_exit|id|data|elapsed|arguments)\((\d+)", "".join(
             path.read_text() for path in (SOURCE / "security").rglob("*.cpp")))
