@@ -1,7 +1,7 @@
-"""Writes the manual pages of sections 3 and 7 from the sources, so that they say what these say.
+"""Generates the manual pages of sections 3 and 7 from the sources, so that the two always agree.
 
-Usage: from_headers.py SOURCE_DIR MAN_DIR. Section 3 comes from include/qz/acl.h and cu.h, where a comment stands above
-each declaration; section 7 from the message table and remedies.txt, which must have a block for every message.
+Usage: from_headers.py SOURCE_DIR MAN_DIR. Section 3 comes from include/qz/acl.h and cu.h, where each declaration follows
+its comment; section 7 from the message table and remedies.txt, which must have a block for every message.
 """
 import pathlib
 import re
@@ -105,7 +105,7 @@ class Prose:
 
 
 def folded(text):
-    """Text lines of at most 79 bytes; requests, and what is shown as it stands, are left alone."""
+    """Text lines of at most 79 bytes; requests and literal displays are left alone."""
     lines, is_literal = [], False
     for line in text.split("\n"):
         is_literal = line.startswith(".Bd") or (is_literal and not line.startswith(".Ed"))
@@ -129,11 +129,11 @@ def page(name, section, names, about, body):
 # ---- Headers -------------------------------------------------------------------------------------------------------
 
 def uncommented(comment):
-    """The lines of a comment, without what makes it one."""
+    """The lines of a comment, without its delimiters."""
     return [re.sub(r"^ ?\* ?", "", line).rstrip() for line in re.sub(r"^/\*+|\*/$", "", comment).splitlines()]
 
 
-ROW = re.compile(r"( *)(\S+(?: \S+)*)  +(\S.*)")  # of a table: what it is about, and what is said
+ROW = re.compile(r"( *)(\S+(?: \S+)*)  +(\S.*)")  # of a table: its tag, and the text
 
 
 def indent(line):
@@ -145,7 +145,7 @@ def starts_anew(line):
 
 
 def straightened(lines):
-    """Lines that the layout tool broke to the left margin, behind the row of a table that they belong to."""
+    """Lines that clang-format broke to the left margin, moved back to the table row that they continue."""
     in_codes, before = False, ""
     for line in lines:
         in_codes = bool(line) and (in_codes or line.startswith("Codes:"))
@@ -155,7 +155,7 @@ def straightened(lines):
 
 
 def row_content(text, column, further):
-    """What is said in one row: text, and a table within it where rows stand further right than the text."""
+    """The content of one row: text, and a nested table if rows are indented further than the text."""
     content = [("text", text)]
     for line in further:
         row = ROW.fullmatch(line)

@@ -76,8 +76,8 @@ typedef struct tr_category {
  *
  * - component: the component's name; not null.
  * - levels: array of count bytes, written in the order of the table, each by one atomic store; may be
- *   null only if count is 0. The caller keeps it valid, and only reads it, until the component is unregistered
- *   or registered with another array.
+ *   null only if count is 0. The caller keeps it valid, and only reads it, until the component is
+ *   unregistered or registered with another array.
  * - categories: table of count categories, read only during the call; may be null only if count is 0.
  * - count: the number of categories, 0 or more.
  *
