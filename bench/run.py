@@ -1,5 +1,5 @@
 #!/usr/bin/env python3
-"""Measures everything and prints one table: each figure beside its reference. See docs/performance.md.
+"""Measures everything and prints one table: each figure with its reference. See docs/performance.md.
 
 usage: run.py BUILD_FOLDER [quick]   quick: no file above 100,000 lines, fewer repetitions
 """
@@ -59,7 +59,7 @@ class Commands:
         return usage.ru_utime + usage.ru_stime, usage.ru_maxrss * 1024
 
     def run(self, rounds):
-        """Runs what was added, once in each round, so that whatever disturbs the machine disturbs all alike."""
+        """Runs each added command once per round, so that a disturbance affects all alike."""
         jobs, self.jobs = list(self.jobs.items()), {}
         cpu = {name: [] for name, _ in jobs}
         memory = {name: [] for name, _ in jobs}

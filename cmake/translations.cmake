@@ -1,6 +1,6 @@
-# Compiles the translations for catopen. Under /usr its default search finds LANGUAGE/LC_MESSAGES in every locale of the
-# language, whatever the code set; elsewhere NLSPATH must name the place. catgets converts nothing, so that
-# the locales of an older code set get, under their own names, which are searched first, a catalog in it.
+# Compiles the translations for catopen. Under /usr, its default search finds LANGUAGE/LC_MESSAGES in every locale of the
+# language, whatever the code set; elsewhere NLSPATH must name the folder. catgets converts nothing, so locales of an
+# older code set get a catalog in that code set under their own names, which are searched first.
 find_program(GENCAT gencat)
 find_program(ICONV iconv)
 

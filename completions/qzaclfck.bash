@@ -1,6 +1,6 @@
 # shellcheck shell=bash
-# Completion of qzaclfck in bash: the options that are not there yet, users behind -u, and files behind -f, which with
-# -u are those in the user's home.
+# Completion of qzaclfck in bash: options not given yet, users after -u, and files after -f; with -u, files in that
+# user's home directory.
 
 # Prints what a path begun as $2 may become, seen from the folder $1.
 _qzaclfck_files() { (cd -- "$1" 2>/dev/null && compgen -f -- "$2"); }

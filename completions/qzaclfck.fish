@@ -1,5 +1,5 @@
-# Completion of qzaclfck in fish: the options that are not there yet, users behind -u, and files behind -f, which with
-# -u are those in the user's home.
+# Completion of qzaclfck in fish: options not given yet, users after -u, and files after -f; with -u, files in that
+# user's home directory.
 
 function __qzaclfck_files
     set -l words (commandline -opc)
@@ -19,7 +19,7 @@ function __qzaclfck_may
 end
 
 complete -c qzaclfck -f
-complete -c qzaclfck -s c -n 'not __fish_contains_opt -s c' -d 'Go on after bad lines and duplicates'
+complete -c qzaclfck -s c -n 'not __fish_contains_opt -s c' -d 'Continue after bad lines and duplicates'
 complete -c qzaclfck -s f -n '__qzaclfck_may -f' -x -a '(__qzaclfck_files)' -d 'Check this ACL file'
 complete -c qzaclfck -s h -n 'not __fish_contains_opt -s h' -d 'Show the help'
 complete -c qzaclfck -s s -n 'not __fish_contains_opt -s s' -d 'Compile the file into FILE.cacl'

@@ -1,6 +1,6 @@
-"""Tries what README.md, docs/ and the manual tell: their commands, examples and recipes, and that nothing is left out.
+"""Runs what README.md, docs/ and the manual show: commands, examples and recipes; and checks that nothing is missing.
 
-usage: documents_test.py BUILD-FOLDER [unittest arguments]; --write writes the outputs in the documents anew"""
+usage: documents_test.py BUILD-FOLDER [unittest arguments]; --write renews the outputs in the documents"""
 import json
 import os
 import re
@@ -19,6 +19,7 @@ RECIPES = dict(re.findall(r"<!-- recipe: (.*?) -->\n```\w*\n(.*?)```\n", "".join
 OUTPUT = re.compile(r"(<!-- output: (.*?) -->\n```\n)((?s:.*?))(?=```\n)")
 EXAMPLE = re.compile(r"(?m)^(\$ ((?:.*\\e\n)*.*\n))((?:.*\n)*?)(?=\$ |\.Ed)")
 WRITTEN = {"./dev run": "qzaclfck", "build/release/examples/": "", "\\-": "-", "\\(aq": "'", "\\e": "\\"}
+SANITIZED = "QZ_SANITIZE:STRING=\n" not in (BUILD / "CMakeCache.txt").read_text()
 TIMES = re.compile(r"\d+:\d+:\d+|\d+(?= us)")  # which differ each time
 MARKUP = str.maketrans({"\\": "\\e", "-": "\\-", "'": "\\(aq"})
 # What docs/tracing.md takes as its example.
@@ -30,6 +31,19 @@ SERVED = """set -e; export QZ_TRACE_LEVELS=_SEL:Errors=1,Info=1,API=8,Perf=1 QZ_
     touch service.acl; service service.acl root@head.cluster.example
     chmod 644 service.acl*; echo >service.acl.cacl; touch -d '1 hour ago' service.acl
     service service.acl root@head.cluster.example"""
+# A text that grants, its later cache, and a new text between their times that does not.
+REVOKED = """set -e; rm -f service.acl*; echo u unix carol@a.example r >service.acl; touch -d '3 hours ago' service.acl
+    qzaclfck -s -f service.acl; touch -d '1 hour ago' service.acl.cacl
+    echo n r >new.acl; touch -d '2 hours ago' new.acl"""
+# The program that the library's snippet in README.md belongs to.
+PROGRAM = """#include <qz/acl.h>
+#include <stdio.h>
+static void show_error(void) { puts("shown"); }
+int main(void) {
+%s
+    return 0;
+}
+"""
 
 
 class Documents(unittest.TestCase):
@@ -69,18 +83,79 @@ class Documents(unittest.TestCase):
                     path.write_text(shown)
 
     def test_recipes_tell_right_from_wrong(self):
-        for command in re.findall("(?:validate: |=/usr/bin/)(qzaclfck .*)(?:%s|/etc/)", "".join(RECIPES.values())):
+        commands = re.findall("(?:validate|command): (qzaclfck .*)(?:%s|/etc/)", RECIPES["ansible"])
+        self.assertEqual(len(commands), 2)
+        for command in commands:
             self.assertEqual(self.run_in_shell(command + "examples/service.acl"), (0, ""))
             self.assertEqual(self.run_in_shell(command + "examples/mistakes.acl")[0], 37)
-        self.assertTrue((self.dir / "examples/service.acl.cacl").exists())
+
+    def starts(self):  # whether systemd would go on: a command with "-" may fail
+        recipe = RECIPES["unit"].replace("/etc/", "examples/")
+        commands = re.findall(r"ExecStartPre=(-?)/usr/bin/(.*)", recipe)
+        return all(may_fail or self.run_in_shell(command)[0] == 0 for may_fail, command in commands)
+
+    def test_unit_needs_a_valid_file_but_no_cache(self):
+        cache = self.dir / "examples/service.acl.cacl"
+        cache.mkdir()  # so that none can be written
+        self.assertTrue(self.starts())
+        shutil.copy(self.dir / "examples/mistakes.acl", self.dir / "examples/service.acl")
+        self.assertFalse(self.starts())
+
+    def test_replacing_a_file_by_an_older_one_takes_effect(self):
+        manual = re.search(r"\$ (.*mv new\.acl site\.acl.*)", DOCS[SOURCE / "docs/man/qzaclfck.1"])[1]
+        manual = manual.replace("\\-", "-").replace("site.acl", "service.acl")
+        recipe = re.search(r"(?m)^(.*mv new\.acl /etc/.*)$", DOCS[SOURCE / "docs/recipes.md"])[1]
+        task = re.search("command: (.*)", RECIPES["ansible"])[1]
+        (self.dir / "postinst").write_text(RECIPES["postinst"].replace("/etc/", ""))
+        move = "mv new.acl service.acl"
+        for way in manual, recipe, f"{move}; {task}", f"{move}; postinst configure":
+            replace = way.replace("/etc/", "")
+            shown = self.run_in_shell(f"{REVOKED}; {replace}; service service.acl carol@a.example")
+            self.assertRegex(shown[1], "^read from the cache, 22 bytes\nnothing is granted\n", way)
+
+    def with_checker(self, script):  # an environment in which this is qzaclfck
+        checker = self.dir / "checker/qzaclfck"
+        checker.parent.mkdir(exist_ok=True)
+        checker.write_text("#!/bin/sh\n" + script)
+        checker.chmod(0o755)
+        return {"PATH": f"{checker.parent}:{self.dir}:{os.environ['PATH']}"}
+
+    def test_aclcheck_fails_when_the_checker_does(self):
+        for script in "kill -KILL $$", "exit 1":
+            status, shown = self.run_in_shell("aclcheck examples/service.acl", **self.with_checker(script))
+            self.assertEqual(status, 1, script)
+            self.assertIn("examples/service.acl", shown)
+
+    @unittest.skipUnless(shutil.which("vim"), "there is no Vim")
+    def test_vim_finds_the_mistakes(self):
+        for folder in "ftdetect", "after/ftplugin":
+            (self.dir / ".vim" / folder).mkdir(parents=True)
+            shutil.copy(self.dir / f"{Path(folder).name}.vim", self.dir / ".vim" / folder / "acl.vim")
+        places = "map(filter(getqflist(), 'v:val.valid'), 'v:val.lnum')"
+        ask = f"silent make | call writefile({places}, 'places') | qall!"
+        self.run_in_shell(f'vim -es -u DEFAULTS -c "{ask}" examples/mistakes.acl </dev/null')
+        expected = re.findall(r"(?m)^examples/mistakes\.acl:(\d+):", DOCS[SOURCE / "docs/recipes.md"])
+        self.assertEqual((self.dir / "places").read_text().split(), expected)
+
+    @unittest.skipIf(SANITIZED or not shutil.which("cc"), "needs a compiler and a plain build")
+    def test_snippet_shows_a_broken_file(self):
+        snippet = re.search(r"```c\n(.*?)```", DOCS[SOURCE / "README.md"], re.S)[1].replace("/etc/", "")
+        (self.dir / "snippet.c").write_text(PROGRAM % snippet)
+        flags = f"-Wall -Wextra -Werror -I{SOURCE}/include -L{BUILD}/lib -Wl,-rpath,{BUILD}/lib"
+        self.assertEqual(self.run_in_shell(f"cc {flags} snippet.c -o snippet -lqzacl"), (0, ""))
+        for text, shown in (r"u unix a@b r\nu unix a@b r\n", "shown\n"), (r"o r\n", ""), ("", ""):
+            self.assertEqual(self.run_in_shell(f"printf '{text}' >service.acl; ./snippet"), (0, shown), text)
 
     @unittest.skipUnless(shutil.which("git"), "there is no git")
     def test_commits(self):
         self.run_in_shell("git init repo; mv pre-commit repo/.git/hooks")
-        for staged, present, expected in ("service", "mistakes", 0), ("mistakes", "service", 1):
+        killed = self.with_checker("kill -KILL $$")
+        (self.dir / "examples/other.acl").write_text("o r\n")
+        for staged, present, expected, environment in (
+                ("service", "mistakes", 0, {}), ("mistakes", "service", 1, {}), ("other", "service", 1, killed)):
             change = f"cd repo && cp ../examples/{staged}.acl 'a b.acl' && git add . && cp ../examples/{present}.acl *"
             commit = "git -c user.name=x -c user.email=x commit -m x"
-            self.assertEqual(self.run_in_shell(f"{change} && {commit}")[0], expected, staged)
+            self.assertEqual(self.run_in_shell(f"{change} && {commit}", **environment)[0], expected, staged)
 
     @unittest.skipUnless(shutil.which("gencat") and os.path.exists("/usr/share/i18n/locales/de_DE"), "no German locale")
     def test_places_of_mistakes_in_another_language(self):
@@ -93,6 +168,12 @@ class Documents(unittest.TestCase):
         keys = [matcher[key] for key in ("file", "line", "code")]
         self.assertEqual(["{}:{}: {}".format(*each.group(*keys)) for each in found], places)
         self.assertIn("Der ACL-Eintrag in Zeile 5", found[0][matcher["message"]])
+
+    def test_tracing_as_the_readme_shows_it(self):
+        command = re.search(r"(?m)^QZ_TRACE_LEVELS=.*\\\n.*$", DOCS[SOURCE / "README.md"])[0]
+        shown = self.run_in_shell(f"mkdir build; {command.replace('build/release/examples/', '')}")
+        self.assertEqual(shown[0], 0, shown)
+        self.assertIn('"id":84', (self.dir / "build/trace.jsonl").read_text())  # an answer of sec__single_acle_perm
 
     def test_table_of_trace_points(self):
         calls = re.findall(r"trace_(exit|entry|release_exit|id|data|elapsed|arguments)\((\d+)", "".join(

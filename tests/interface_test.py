@@ -43,9 +43,18 @@ CASES = [  # an ACL, its size when it is compiled, who asks, and the answer of t
     (SERVICE, 478, "carol@login.cluster.example operators", "granted by expanded: rql"),
     (SERVICE, 478, "carol@there.example operators AUDITORS staff", "granted by group: rwxCqlev"),
     (SERVICE, 478, "carol@there.example staff", "granted by any other: rql"),
-    ("n r\n", 22, "carol@there", "nothing is granted"), ("# nobody\n", 0, "carol@there", "nothing is granted")]
+    ("n r\n", 22, "carol@there", "nothing is granted"), ("# nobody\n", 0, "carol@there", "nothing is granted"),
+    ("", 0, "carol@there", "nothing is granted"), ("n r\n", 22, "zoë@there", "nothing is granted"),
+    # A user-expanded entry is a host, or with a dot in front a domain.
+    ("e unix cluster.example r\n", 43, "carol@Cluster.EXAMPLE", "granted by expanded: r"),
+    ("e unix cluster.example r\n", 43, "carol@evilcluster.example", "nothing is granted"),
+    ("e unix cluster.example r\n", 43, "carol@head.cluster.example", "nothing is granted"),
+    ("e unix .Cluster.example r\n", 44, "carol@head.cluster.EXAMPLE", "granted by expanded: r"),
+    ("e unix .cluster.example r\n", 44, "carol@evilcluster.example", "nothing is granted"),
+    ("e unix .cluster.example r\n", 44, "carol@cluster.example", "nothing is granted")]
 ADDED, KEPT = "granted by user: r\ndeleted again\n", "has an entry of its own, which stays\n"
-ENVIRONMENT = {**os.environ, "QZ_LIBRARY_DIR": str(BUILD / "lib"), "PYTHONPATH": str(SOURCE / "bindings/python")}
+UTF8 = {**os.environ, "LC_ALL": "C.UTF-8"}
+ENVIRONMENT = {**UTF8, "QZ_LIBRARY_DIR": str(BUILD / "lib"), "PYTHONPATH": str(SOURCE / "bindings/python")}
 if "address" in SANITIZED:  # its runtime must come first; what Python never frees is no leak of ours
     asked = CACHE["CMAKE_CXX_COMPILER"], f"-print-file-name=libclang_rt.asan-{platform.machine()}.so"
     ENVIRONMENT |= {"LD_PRELOAD": subprocess.check_output(asked, text=True).strip(), "ASAN_OPTIONS": "detect_leaks=0"}
@@ -125,7 +134,7 @@ class Interface(unittest.TestCase):
             end = KEPT if "by user" in answer else ADDED
             sources = [f"text, {size} bytes, cached", f"cache, {size} bytes"] if size else ["text, 0 bytes"] * 2
             for program, source in zip(SERVICES, sources):
-                shown = run(program, "service.acl", *requester.split(), cwd=self.dir)
+                shown = run(program, "service.acl", *requester.split(), cwd=self.dir, env=UTF8)
                 self.assertEqual(shown, f"read from the {source}\n{answer}\n{end}", program)
             if LOADABLE:
                 shown = run(*PYTHON, SCRIPT, "service.acl", *requester.split(), cwd=self.dir, env=ENVIRONMENT)

@@ -1,7 +1,7 @@
-"""Writes the manual pages of sections 3 and 7 from the sources, so that they say what these say.
+"""Generates the manual pages of sections 3 and 7 from the sources, so that the two always agree.
 
-Usage: from_headers.py SOURCE_DIR MAN_DIR. Section 3 comes from include/qz/acl.h and cu.h, where a comment stands above
-each declaration; section 7 from the message table and remedies.txt, which must have a block for every message.
+Usage: from_headers.py SOURCE_DIR MAN_DIR. Section 3 comes from include/qz/acl.h and cu.h, where each declaration follows
+its comment; section 7 from the message table and remedies.txt, which must have a block for every message.
 """
 import pathlib
 import re
@@ -18,7 +18,7 @@ FAMILIES = {  # the sections of acl.h, with their pages and what these are about
     "ACL files": ("qzacl_read", "read an ACL file"),
     "Listing": ("qzacl_list", "list the entries of an ACL"),
     "Editing": ("qzacl_edit", "add and delete entries of an ACL"),
-    "Access decisions": ("qzacl_evaluate", "tell what an ACL grants"),
+    "Access decisions": ("qzacl_evaluate", "evaluate what an ACL grants"),
     "Dumps": ("qzacl_dump", "print ACLs for people"),
 }
 EVERYWHERE = ("3417-101", "3417-102")  # messages of almost every operation
@@ -105,7 +105,7 @@ class Prose:
 
 
 def folded(text):
-    """Text lines of at most 79 bytes; requests, and what is shown as it stands, are left alone."""
+    """Text lines of at most 79 bytes; requests and literal displays are left alone."""
     lines, is_literal = [], False
     for line in text.split("\n"):
         is_literal = line.startswith(".Bd") or (is_literal and not line.startswith(".Ed"))
@@ -129,11 +129,11 @@ def page(name, section, names, about, body):
 # ---- Headers -------------------------------------------------------------------------------------------------------
 
 def uncommented(comment):
-    """The lines of a comment, without what makes it one."""
+    """The lines of a comment, without its delimiters."""
     return [re.sub(r"^ ?\* ?", "", line).rstrip() for line in re.sub(r"^/\*+|\*/$", "", comment).splitlines()]
 
 
-ROW = re.compile(r"( *)(\S+(?: \S+)*)  +(\S.*)")  # of a table: what it is about, and what is said
+ROW = re.compile(r"( *)(\S+(?: \S+)*)  +(\S.*)")  # of a table: its tag, and the text
 
 
 def indent(line):
@@ -145,7 +145,7 @@ def starts_anew(line):
 
 
 def straightened(lines):
-    """Lines that the layout tool broke to the left margin, behind the row of a table that they belong to."""
+    """Lines that clang-format broke to the left margin, moved back to the table row that they continue."""
     in_codes, before = False, ""
     for line in lines:
         in_codes = bool(line) and (in_codes or line.startswith("Codes:"))
@@ -155,7 +155,7 @@ def straightened(lines):
 
 
 def row_content(text, column, further):
-    """What is said in one row: text, and a table within it where rows stand further right than the text."""
+    """The content of one row: text, and a nested table if rows are indented further than the text."""
     content = [("text", text)]
     for line in further:
         row = ROW.fullmatch(line)
@@ -327,8 +327,8 @@ def write_acl_pages(acl):
         described = function_lines(prose, acl, items)
         page(name, 3, [name, *(each for each, *_ in acl.declared(items))], about, [
             *synopsis(acl, items), ".Sh DESCRIPTION", *prose.blocks(parsed(text), spaced=False), *([".Pp"] * any(text)),
-            "The rules that hold for every call are those of", ".Xr qzacl 3 ;",
-            "a number such as 3417-101 is that of a message of", ".Xr qzacl_messages 7 .", *described,
+            "The rules for every call are described in", ".Xr qzacl 3 ;",
+            "a number such as 3417-101 refers to a message in", ".Xr qzacl_messages 7 .", *described,
             *see_also([("qz_cu", 3), ("qzacl", 3), ("qzacl", 5), ("qzacl_messages", 7)])])
 
 
@@ -386,11 +386,11 @@ def write_messages(acl):
     page("qzacl_messages", 7, ["qzacl_messages"], "messages of the ACL library and of qzaclfck by number", [
         ".Sh DESCRIPTION", *prose.lines(
             "Each failure records one message. The command prints it on standard error; a program fetches it with "
-            "cu_get_error_1 and cu_get_errmsg_1. The texts stand here as the message catalog has them: %1$s and the "
-            "like are the places of its values. The functions named beside the library are those whose pages list "
-            "the message; others that refer to these may report it, too."),
-        ".Pp", *prose.lines("The usage and help of the command and the lines of a dump are texts of the same catalog, "
-                            "but carry no number and are not listed."),
+            "cu_get_error_1 and cu_get_errmsg_1. The texts are shown as in the message catalog, with placeholders "
+            "such as %1$s for the values. The functions listed after \"the library\" are those whose pages list the "
+            "message; functions that refer to these may report it, too."),
+        ".Pp", *prose.lines("The usage and help of the command and the lines of a dump are in the same catalog, but "
+                            "have no number and are not listed."),
         ".Sh MESSAGES", *body, *see_also([("gencat", 1), ("qzaclfck", 1), ("qz_cu", 3), ("qzacl", 3)])])
 
 

@@ -1,6 +1,6 @@
-"""The service of service.c in Python: it decides by the same rules, and says why.
+"""The service of service.c in Python: the same rules, with the reason for each decision.
 
-usage: service.py FILE USER@HOST [GROUP...]   with the package qzacl, of bindings/python, where Python finds it
+usage: service.py FILE USER@HOST [GROUP...]   needs the package qzacl of bindings/python
 """
 import sys
 
@@ -22,7 +22,7 @@ def main(path: str, user: str, *groups: str) -> None:
 if __name__ == "__main__":
     if len(sys.argv) < 3:
         sys.exit("usage: service.py FILE USER@HOST [GROUP...]")
-    sys.stdout.reconfigure(errors="surrogateescape")  # identities are shown byte by byte as the file has them
+    sys.stdout.reconfigure(errors="surrogateescape")  # identities are printed byte for byte
     try:
         main(*sys.argv[1:])
     except qzacl.Error as failure:

@@ -1,20 +1,20 @@
 /*
- * Access control lists for C++17 and later: owners, views and results over <qz/acl.h> and <qz/cu.h>.
+ * Access control lists for C++17 and later: owners, views and results for <qz/acl.h> and <qz/cu.h>.
  *
- * Everything here is inline, needs neither exceptions nor RTTI, and links to libqzacl and libqz_cu alone. It
- * adds owners that release what the C interface hands out, and keeps its rules: codes, recorded errors, code
- * sets, trust, order, threads and forks are those that stand at the top of <qz/acl.h> and at the C function
- * that a description names. "Codes: those of F" includes its messages. What takes no owner is called as in C:
- * sec__register_id_handler, and the flags, types and codes SEC_... . A handler must not change, assign to or
- * destroy the acl that is being asked.
+ * Everything here is inline, needs neither exceptions nor RTTI, and links only to libqzacl and libqz_cu. It
+ * adds RAII owners for the results of the C interface and keeps its rules: for codes, recorded errors, code
+ * sets, trust, order, threads and forks, see the top of <qz/acl.h> and the C function that a description
+ * names. "Codes: those of F" includes its messages. Call functions that need no owner as in C:
+ * sec__register_id_handler. The flags, types and codes SEC_... are those of C, too. A handler must not change,
+ * assign to or destroy the acl that is being evaluated.
  *
- * Texts that go in are pointers to NUL-terminated strings, as the C functions need them; texts that come out
- * are views whose data() ends with a NUL.
+ * Texts passed in are pointers to NUL-terminated strings, as the C functions need them; texts returned are
+ * views whose data() ends with a NUL.
  *
- * Owners are movable and not copyable. One that was moved from, or made by default, is empty: all its
- * operations may be called, and it may be assigned to. Destroying or assigning an owner leaves the recorded
- * error as it is, so that a failure may be asked about after the owner is gone. Const operations are
- * "Threads: shared", others "Threads: exclusive".
+ * Owners are movable but not copyable. A moved-from or default-constructed owner is empty: all its operations
+ * may be called, and it may be assigned to. Destroying or assigning an owner does not change the recorded
+ * error, so you can inspect a failure after the owner is gone. Const operations are "Threads: shared", others
+ * "Threads: exclusive".
  */
 #ifndef QZ_ACL_HPP
 #define QZ_ACL_HPP
@@ -37,7 +37,7 @@ namespace qz {
 /* ---- Results ---- */
 
 /*
- * A code, and after SEC_S_OK what was made. After a failure the value is empty (an owner without anything, no
+ * A code and, after SEC_S_OK, the value. After a failure the value is empty (an owner of nothing, no
  * permissions) unless the operation says otherwise.
  */
 template <class T>
@@ -52,7 +52,7 @@ public:
     explicit operator bool() const noexcept { return code_ == SEC_S_OK; }
 
     /*
-     * The value; moved out of a result that is about to go, so that a range-for over "*acl.list()" is sound.
+     * The value; moved out of an expiring result, so that a range-for over "*acl.list()" is safe.
      */
     /* Laid out by hand, because versions of clang-format disagree on the blank behind "&". */
     /* clang-format off */
@@ -72,8 +72,8 @@ private:
 class error {
 public:
     /*
-     * Copies the calling thread's recorded error, which stays recorded. When there is no memory for the copy
-     * the code is CU_NO_MEMORY, without message and text; when there is none for the text alone, the text is
+     * Copies the calling thread's recorded error, which stays recorded. If there is no memory for the copy,
+     * the code is CU_NO_MEMORY, without message and text; if there is none for the text only, the text is
      * empty.
      *
      * Uses cu_get_error_1 and cu_get_errmsg_1.
@@ -96,10 +96,10 @@ public:
     /* The code that the failing operation returned; 0 when no error was recorded. */
     [[nodiscard]] int code() const noexcept { return code_; }
 
-    /* The message's index in the message table; the number that descriptions name stands in the text. */
+    /* The message's index in the message table; the number used in descriptions is in the text. */
     [[nodiscard]] int message_id() const noexcept { return message_id_; }
 
-    /* The message, as it is to be shown: with its number, and a line feed at its end. */
+    /* The message to be shown: with its number and a final line feed. */
     [[nodiscard]] std::string_view text() const noexcept { return text_ ? text_.get() : ""; }
 
     /* Whether an error was recorded. */
@@ -133,12 +133,12 @@ private:
 };
 
 /*
- * Turns permission letters into a mask.
+ * Converts permission letters to a mask.
  *
  *   letters   may be null, as for sec_translate_perms
  *   set       null: acl__default_perm_set
  *
- * Codes: those of sec_translate_perms. After 36 the value holds the letters before the refused one.
+ * Codes: those of sec_translate_perms. After 36 the value holds the letters before the unknown one.
  */
 inline result<std::uint32_t> to_mask(const char *letters, const sec_perm_set_t *set = nullptr) noexcept {
     std::uint32_t mask = 0;
@@ -147,7 +147,7 @@ inline result<std::uint32_t> to_mask(const char *letters, const sec_perm_set_t *
 }
 
 /*
- * Turns a mask into permission letters. Allocates nothing.
+ * Converts a mask to permission letters. Allocates nothing.
  *
  *   set   null: acl__default_perm_set
  *
@@ -170,7 +170,7 @@ public:
     /* No texts. */
     entry_texts() noexcept = default;
 
-    /* The texts; empty where the entry's type takes none. */
+    /* The texts; empty if the entry's type takes none. */
     [[nodiscard]] std::string_view mechanism() const noexcept { return mechanism_ ? mechanism_.get() : ""; }
     [[nodiscard]] std::string_view identity() const noexcept { return identity_ ? identity_.get() : ""; }
 
@@ -186,9 +186,9 @@ private:
 };
 
 /*
- * An entry that somebody else keeps: a list, an acl_entry, or a record of the caller's. As cheap to copy as a
- * pointer, and good as long as what it looks at. The view of an empty acl_entry, or of null, shows type 0 and
- * no texts or permissions; operations refuse it as they do a null entry.
+ * A view of an entry owned by a list, an acl_entry, or the caller. As cheap to copy as a pointer, and valid
+ * as long as the entry. The view of an empty acl_entry, or of null, shows type 0 and no texts or permissions;
+ * operations reject it like a null entry.
  */
 class entry_view {
 public:
@@ -205,7 +205,7 @@ public:
         return entry_ != nullptr ? entry_->perm_mask : 0;
     }
 
-    /* The texts in UTF-8; empty where the type takes none. */
+    /* The texts in UTF-8; empty if the type takes none. */
     [[nodiscard]] std::string_view mechanism() const noexcept {
         return entry_ != nullptr ? entry_->mechanism : "";
     }
@@ -213,7 +213,7 @@ public:
         return entry_ != nullptr && entry_->identity != nullptr ? entry_->identity : "";
     }
 
-    /* The texts as they are to be shown, in the locale's code set. Codes: those of sec_display_acle_id. */
+    /* The texts to be shown, in the locale's code set. Codes: those of sec_display_acle_id. */
     [[nodiscard]] result<entry_texts> displayed() const noexcept {
         entry_texts texts;
         char *mechanism = nullptr;
@@ -236,14 +236,14 @@ private:
     const sec_acle_t *entry_;
 };
 
-/* An entry of one's own. */
+/* An owned entry. */
 class acl_entry {
 public:
     /* No entry. */
     acl_entry() noexcept = default;
 
     /*
-     * Makes an entry from texts in the locale's code set.
+     * Creates an entry from texts in the locale's code set.
      *
      *   type         SEC_ACLE_...
      *   mechanism    types 4 and 8; others: ignored, may be null
@@ -259,10 +259,10 @@ public:
         return {code, acl_entry(made)};
     }
 
-    /* Takes over an entry that sec_create_acle made; may be null. */
+    /* Takes ownership of an entry that sec_create_acle made; may be null. */
     explicit acl_entry(sec_acle_t *owned) noexcept : entry_(owned) {}
 
-    /* The entry as operations take it and its parts are read. */
+    /* The entry as an argument of operations, and to read its parts. */
     [[nodiscard]] entry_view view() const noexcept { return entry_view(entry_.get()); }
     operator entry_view() const noexcept { return view(); }
 
@@ -277,10 +277,10 @@ private:
     std::unique_ptr<sec_acle_t, release> entry_;
 };
 
-/* The entries that a listing hands out: a range of entry_view in the order of the list. */
+/* The result of a listing: a range of entry_view in the order of the list. */
 class acl_entries {
 public:
-    /* Goes through the entries. A forward iterator whose elements are values; good as long as the list. */
+    /* A forward iterator over the entries whose elements are values; valid as long as the list. */
     class iterator {
     public:
         using iterator_concept = std::forward_iterator_tag;
@@ -308,7 +308,7 @@ public:
     /* No entries. */
     acl_entries() noexcept = default;
 
-    /* Takes over a list of the C interface. */
+    /* Takes ownership of a list of the C interface. */
     explicit acl_entries(sec_aclelist_t owned) noexcept : list_(owned) {}
 
     acl_entries(acl_entries &&other) noexcept : list_(std::exchange(other.list_, sec_aclelist_t{})) {}
@@ -322,7 +322,7 @@ public:
     [[nodiscard]] std::size_t size() const noexcept { return static_cast<std::size_t>(list_.count); }
     [[nodiscard]] bool empty() const noexcept { return list_.count == 0; }
 
-    /* The entry at a place below size(). */
+    /* The entry at a position below size(). */
     [[nodiscard]] entry_view operator[](std::size_t place) const noexcept { return *list_.acles[place]; }
 
     [[nodiscard]] iterator begin() const noexcept { return iterator(list_.acles); }
@@ -335,8 +335,7 @@ private:
 /* ---- Access decisions ---- */
 
 /*
- * What an ACL says to a question: permissions, that no entry speaks of the party, or that it could not be
- * asked.
+ * The result of an evaluation: permissions, no matching entry, or a failure.
  */
 class [[nodiscard]] decision {
 public:
@@ -345,13 +344,13 @@ public:
     /* SEC_S_OK, SEC_S_BAD_ACLE or the failure. */
     [[nodiscard]] int code() const noexcept { return code_; }
 
-    /* Whether an entry decided, be it that it grants nothing. */
+    /* Whether an entry decided, even if it grants nothing. */
     explicit operator bool() const noexcept { return code_ == SEC_S_OK; }
 
-    /* Whether there is no entry for the party: nothing is granted, and the next question may be asked. */
+    /* Whether no entry matches: nothing is granted, and you can ask the next question. */
     [[nodiscard]] bool no_entry() const noexcept { return code_ == SEC_S_BAD_ACLE; }
 
-    /* Whether the question failed: nothing is granted, and the recorded error says why. */
+    /* Whether the evaluation failed: nothing is granted, and the recorded error says why. */
     [[nodiscard]] bool failed() const noexcept { return !*this && !no_entry(); }
 
     /* The permissions; none unless an entry decided. */
@@ -367,14 +366,14 @@ private:
     std::uint32_t permissions_;
 };
 
-/* Whom a decision is about. Keeps the pointers that it is given. */
+/* The subject of a decision. Stores the given pointers without copying. */
 class party {
 public:
-    /* Who did not authenticate, and any authenticated party. */
+    /* Anyone who did not authenticate, and anyone else who did. */
     [[nodiscard]] static constexpr party unauthenticated() noexcept { return {SEC_ACLE_UNAUTHENTICATED}; }
     [[nodiscard]] static constexpr party any_other() noexcept { return {SEC_ACLE_ANYOTHER}; }
 
-    /* An identity of a mechanism, both UTF-8, as user and as user-expanded entries mean it. */
+    /* An identity of a mechanism, both UTF-8, for user and for user-expanded entries. */
     [[nodiscard]] static constexpr party user(const char *mechanism, const char *identity) noexcept {
         return {SEC_ACLE_USER, mechanism, identity};
     }
@@ -382,14 +381,14 @@ public:
         return {SEC_ACLE_EXPANDED, mechanism, identity};
     }
 
-    /* The same party, compared with user entries through the mechanism's SEC_ID_HANDLER_USER. */
+    /* The same party, compared with user entries by the mechanism's SEC_ID_HANDLER_USER. */
     [[nodiscard]] constexpr party through_handler() const noexcept {
         party changed = *this;
         changed.type_ = static_cast<std::uint8_t>(type_ | SEC_ACLE_USE_ID_HANDLER);
         return changed;
     }
 
-    /* The same party, looked for among the entries of another mechanism; null: its own. */
+    /* The same party, searched for among the entries of another mechanism; null: its own. */
     [[nodiscard]] constexpr party among_entries_of(const char *mechanism) const noexcept {
         party changed = *this;
         changed.subacl_mechanism_ = mechanism;
@@ -412,15 +411,15 @@ private:
 /* ---- Buffers ---- */
 
 /*
- * A compiled ACL. Made by default it has no bytes: that is also what a file without entries gives. Listing
- * and editing take such an ACL; asking it fails with 42 (3417-109), so look at bytes().empty() first.
+ * A compiled ACL. A default-constructed one has no bytes, like that of a file without entries. Listing and
+ * editing take such an ACL; evaluating it fails with 42 (3417-109), so test bytes().empty() first.
  */
 class acl {
 public:
     /* An ACL without bytes. */
     acl() noexcept = default;
 
-    /* Takes over a buffer of the C interface. */
+    /* Takes ownership of a buffer of the C interface. */
     explicit acl(sec_acl_buffer_t owned) noexcept : buffer_(owned) {}
 
     acl(acl &&other) noexcept : buffer_(other.release()) {}
@@ -429,11 +428,12 @@ public:
         std::swap(buffer_, taken.buffer_);
         return *this;
     }
-    /* Not by sec_release_acl, which keeps bytes that are no ACL and clears the recorded error. */
+    /* sec_release_acl would keep bytes that are not an ACL and clear the recorded error. */
     ~acl() { std::free(buffer_.data); }
 
     /*
-     * Makes an ACL without entries, which has bytes and may be asked. Codes: those of sec_create_empty_acl.
+     * Creates an ACL without entries, which has bytes and can be evaluated. Codes: those of
+     * sec_create_empty_acl.
      */
     [[nodiscard]] static result<acl> create_empty() noexcept {
         acl made;
@@ -447,10 +447,11 @@ public:
      * Reads an ACL file.
      *
      *   path        the file; with user a bare file name
-     *   user        null, or the user in whose home directory the file lies
-     *   set         the permissions of the text; null: acl__default_perm_set
-     *   flags       SEC_READ_ACL_...; by default bytes of a cache file are checked
-     *   out_flags   out, may be null: the flags as they came to hold
+     *   user        null, or the user in whose home directory the file is
+     *   set         the permissions of the text; null: acl__default_perm_set. With another set, pass
+     *               SEC_READ_ACL_TEXT: a cache file does not record its set.
+     *   flags       SEC_READ_ACL_...; by default the bytes of a cache file are checked
+     *   out_flags   out, may be null: the resulting flags
      *
      * Codes: those of sec_read_acl_file.
      */
@@ -464,8 +465,8 @@ public:
     }
 
     /*
-     * Copies bytes from elsewhere, unexamined: call to_host before anything else. More than 2^31 - 1 bytes
-     * are refused like none.
+     * Copies bytes from elsewhere, unchecked: call to_host before anything else. More than 2^31 - 1 bytes are
+     * rejected as if there were none.
      *
      * Codes: those of sec_read_acl_from_data.
      */
@@ -478,8 +479,8 @@ public:
     }
 
     /*
-     * Brings the ACL into host byte order, in place. With check its structure is checked as well, also when
-     * it had to be converted, which takes the C function two calls. After a failure only destroy or assign.
+     * Converts the ACL to host byte order, in place. With check, also checks its structure, even if it had to
+     * be converted, for which the C function needs two calls. After a failure, only destroy or assign it.
      *
      * Codes: those of sec_convert_acl_to_host.
      */
@@ -492,8 +493,8 @@ public:
     }
 
     /*
-     * Adds an entry, or gives the one that is there the new permissions; add_new refuses one that is there;
-     * remove deletes it. Of the entry that is removed the permissions do not matter.
+     * add adds an entry or gives an existing one the new permissions; add_new rejects a duplicate; remove
+     * deletes the entry, whatever its permissions.
      *
      * Codes: those of sec_add_acle_to_acl, sec_add_acle_to_acl2 and sec_del_acle_from_acl.
      */
@@ -523,7 +524,7 @@ public:
     }
 
     /*
-     * Tells what is granted to a party. Allocates nothing, as <qz/acl.h> puts it under "Memory".
+     * Evaluates what a party is granted. Allocates nothing; <qz/acl.h> lists the exceptions under "Memory".
      *
      * Codes: those of sec__single_acle_perm.
      */
@@ -535,10 +536,10 @@ public:
     }
 
     /*
-     * Tells what is granted to groups together. Allocates nothing. More than 2^31 - 1 groups count as groups
-     * without an entry.
+     * Evaluates what groups are granted together. Allocates nothing. More than 2^31 - 1 groups count as
+     * groups without an entry.
      *
-     *   first    the groups, in a row; may be null when count is 0
+     *   first    an array of groups; may be null if count is 0
      *   range    or a container, array or span of them
      *
      * Codes: those of sec__group_acles_perm.
@@ -556,7 +557,7 @@ public:
         return groups(std::data(range), std::size(range));
     }
 
-    /* The compiled bytes, good until the ACL changes. */
+    /* The compiled bytes, valid until the ACL changes. */
     [[nodiscard]] std::string_view bytes() const noexcept {
         return {static_cast<const char *>(buffer_.data), static_cast<std::size_t>(buffer_.length)};
     }
@@ -568,7 +569,7 @@ public:
     [[nodiscard]] sec_acl_buffer_t *get() noexcept { return &buffer_; }
     [[nodiscard]] const sec_acl_buffer_t *get() const noexcept { return &buffer_; }
 
-    /* Gives up the bytes, which the caller then releases; the ACL is left without. */
+    /* Gives up the bytes, which the caller then releases; the ACL is left empty. */
     [[nodiscard]] sec_acl_buffer_t release() noexcept { return std::exchange(buffer_, sec_acl_buffer_t{}); }
 
 private:

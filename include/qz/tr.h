@@ -1,41 +1,41 @@
-/* Tracing: components register their trace categories, ask the level of each by reading one byte, and
- * record trace points with data into the trace file of the process. This header is the manual.
+/* Tracing: components register their trace categories, test the level of each by reading one byte, and
+ * record trace points with data in the trace file of the process. This header is the manual.
  *
- * CODES. Every function returns TR_OK (0) or one of the codes below, and says which. A caller that traces
- * may ignore them all: a record that cannot be made is dropped, and nothing else happens. errno is always
- * left as it was, no signal is raised, and no function is a point where a thread can be cancelled.
+ * CODES. Every function returns TR_OK (0) or one of the codes below; its description says which. A caller
+ * that traces may ignore them all: a record that cannot be written is dropped, and nothing else happens.
+ * errno is preserved, no signal is raised, and no function is a cancellation point.
  *
- * CONFIGURATION. Two environment variables are read once in the life of a process, by its first
- * registration (or by a query before it). A privileged program (set-user-ID and the like) ignores them.
+ * CONFIGURATION. Two environment variables are read once per process, by its first registration (or by a
+ * query before it). A privileged program (set-user-ID and the like) ignores them.
  *
  * - QZ_TRACE_LEVELS: the level, 0 to 255, of each category: "COMP:Category=8,Other=2;COMP2:Category=1".
- *   Names are compared byte by byte, blanks included. What is not named is 0; of two settings for the
- *   same category the later holds; a part that cannot be read is skipped and the rest holds.
+ *   Names are compared byte by byte, including blanks. Unnamed categories have level 0; the last setting of
+ *   a category wins; a part that cannot be parsed is skipped and the rest is used.
  * - QZ_TRACE_FILE: the file that records are appended to. It is opened when it is first needed and stays
- *   open. It is created with mode 0600 when missing. One that is there is used only when it is a regular
- *   file of the process's effective user, has no second name (hard link), and neither its group nor others
- *   may write it, by an ACL either; a symbolic link is refused. Its folder is best one in which nobody but
- *   that user may make files, such as the service's own: elsewhere anybody can keep the file from being
- *   made, by making one first.
+ *   open. If it does not exist, it is created with mode 0600. An existing file is used only if it is a
+ *   regular file of the process's effective user, has one name (no second hard link), and neither its mode
+ *   nor an ACL lets its group or others write to it; a symbolic link is refused. Choose a folder in which
+ *   only that user can create files, such as the service's own: elsewhere, anyone can keep the trace from
+ *   being written by creating a file of its name first.
  *
- * Without a usable file every level stays 0, so that a component that tests its levels never records.
+ * Without a usable file every level is 0, so that a component that tests its levels never records.
  *
- * RECORDS. One record is one line of JSON, written by one write to a descriptor opened for appending;
- * records of several threads and processes do not mix. After a fork the child's records carry its own
- * process id. The time is UTC. In one line:
+ * RECORDS. A record is one line of JSON, written by one write to a descriptor opened for appending; records
+ * of several threads and processes do not mix. After a fork, the child's records have its own process id.
+ * The time is UTC. In one line:
  *
  * - {"time":"2026-11-24T19:05:00.123456789Z","pid":4711,"tid":4711,"component":"_SEL","id":11,
  * - "items":[{"len":11,"hex":"2f6574632f612e61636c00","text":"/etc/a.acl"}]}
  *
- * An item has a text beside its bytes when these are one NUL-terminated string of printable UTF-8.
+ * If its bytes are one NUL-terminated string of printable UTF-8, an item also has a text.
  *
- * NAMES. A component is named by a NUL-terminated string of 1 to 63 bytes of printable UTF-8. It is
+ * NAMES. The name of a component is a NUL-terminated string of 1 to 63 bytes of printable UTF-8. It is
  * copied: no function keeps a pointer to a name, category table or item of the caller.
  *
  * THREADS. Every function may be called by any thread at any time; none may be called from a signal
- * handler. Recording takes no lock. The child of a fork may call every function, whatever threads of its
- * parent were doing: the fork waits until none of them holds a lock of this library, for which reason a
- * signal handler must not call fork. */
+ * handler. Recording takes no lock. The child of a fork may call every function, whatever other threads of
+ * its parent were doing: fork waits until no thread holds a lock of this library. A signal handler must
+ * therefore not call fork. */
 #ifndef QZ_TR_H
 #define QZ_TR_H
 
@@ -55,25 +55,25 @@ extern "C" {
 /* Return codes. */
 #define TR_OK 0             /* done */
 #define TR_BAD_PARAMETER 1  /* an argument is null, negative or not a name where that is not allowed */
-#define TR_NO_MEMORY 2      /* no memory for the line, or no place for a further component */
+#define TR_NO_MEMORY 2      /* no memory for the line, or too many components */
 #define TR_NOT_REGISTERED 3 /* the component is not registered */
-#define TR_NO_FILE 4        /* the process has no trace file, or has closed the descriptor of it */
-#define TR_FILE_ERROR 5     /* the trace file did not take the whole line */
+#define TR_NO_FILE 4        /* the process has no trace file, or has closed its descriptor */
+#define TR_FILE_ERROR 5     /* the whole line could not be written */
 #define TR_TOO_LARGE 6      /* the line is longer than TR_LINE_LIMIT, or the file name does not fit */
 
-/* The longest line that is written, in bytes with its line feed: 64 MiB. */
+/* The longest line that is written, in bytes including its line feed: 64 MiB. */
 #define TR_LINE_LIMIT 67108864
 
 /* The size in bytes of the buffer for tr_get_filename_1: a name of 256 bytes and its NUL. */
 #define TR_FILENAME_SIZE 257
 
-/* How many different component names a process can register in its life. */
+/* The number of different component names that a process can register. */
 #define TR_COMPONENT_LIMIT 64
 
 /* One trace category of a component. */
 typedef struct tr_category {
     uintptr_t number;   /* the component's own number for it; the facility does not use it */
-    const char *name;   /* as QZ_TRACE_LEVELS names it; null: cannot be configured, its level is 0 */
+    const char *name;   /* as in QZ_TRACE_LEVELS; null: cannot be configured, its level is 0 */
     uintptr_t reserved; /* 0 */
 } tr_category_t;
 
@@ -81,24 +81,24 @@ typedef struct tr_category {
  *
  * - component: the component's name; not null.
  * - levels: array of count bytes, written in the order of the table, each by one atomic store; may be
- *   null only when count is 0. It stays the caller's, who from now on only reads it, and must live until
- *   the component is unregistered or registered with another array.
- * - categories: table of count categories, read during the call only; may be null only when count is 0.
+ *   null only if count is 0. The caller keeps it valid, and only reads it, until the component is
+ *   unregistered or registered with another array.
+ * - categories: table of count categories, read only during the call; may be null only if count is 0.
  * - count: the number of categories, 0 or more.
  *
- * Registering a registered component again fills the new array, which takes the place of the former; the
- * former is left as it is.
+ * Registering a component again fills the new array, which replaces the previous one; the previous one is
+ * not changed.
  *
- * - TR_OK: registered; also when tracing is not configured or the trace file is not usable: the levels
+ * - TR_OK: registered; also if tracing is not configured or the trace file is not usable: the levels
  *   are 0.
  * - TR_BAD_PARAMETER: component is null or not a name, count is negative, or levels or categories is null
  *   with a count above 0; nothing was written.
- * - TR_NO_MEMORY: TR_COMPONENT_LIMIT other names have been registered already; the levels are 0. */
+ * - TR_NO_MEMORY: TR_COMPONENT_LIMIT other names are already registered; the levels are 0. */
 QZ_TR_API int tr_register_component_1(const char *component, uint8_t *levels, const tr_category_t *categories,
                                       int count);
 
-/* Ends recording for a component: its levels are set to 0, and the facility forgets the level array. A
- * record that another thread is making at that moment may still be written.
+/* Ends recording for a component: its levels are set to 0, and the level array is no longer used. A record
+ * that another thread is making at that moment may still be written.
  *
  * - component: the component's name; not null.
  *
@@ -107,8 +107,8 @@ QZ_TR_API int tr_register_component_1(const char *component, uint8_t *levels, co
  * - TR_NOT_REGISTERED: no such component is registered. */
 QZ_TR_API int tr_unregister_component_1(const char *component);
 
-/* Records a bare trace point: a record without items. The levels are not looked at; testing them is the
- * caller's part.
+/* Records a bare trace point: a record without items. The levels are not tested; that is up to the
+ * caller.
  *
  * - component: the component's name; not null.
  * - id: the trace point number, any value.
@@ -118,13 +118,13 @@ QZ_TR_API int tr_unregister_component_1(const char *component);
  * - TR_NOT_REGISTERED, TR_NO_FILE, TR_FILE_ERROR: as for tr_record_data_1. */
 QZ_TR_API int tr_record_id_1(const char *component, int id);
 
-/* Records a trace point with data. The levels are not looked at; testing them is the caller's part.
+/* Records a trace point with data. The levels are not tested; that is up to the caller.
  *
  * - component: the component's name; not null.
  * - id: the trace point number, any value.
  * - count: the number of items, 0 or more.
  * - ...: count pairs (const void *address, size_t length in bytes), of exactly these types. The bytes
- *   must not change during the call. A null address is recorded as an item of no bytes, whatever its
+ *   must not change during the call. A null address is recorded as an item without bytes, whatever its
  *   length.
  *
  * - TR_OK: the line has been written.
@@ -132,31 +132,31 @@ QZ_TR_API int tr_record_id_1(const char *component, int id);
  *   the line outgrew its memory.
  * - TR_NO_MEMORY: the line is longer than 4096 bytes and there is no memory for it.
  * - TR_NOT_REGISTERED: no such component is registered.
- * - TR_NO_FILE: the process has no trace file, or the program has closed its descriptor. The descriptor's
- *   number is not written to when it has come to name another file.
- * - TR_FILE_ERROR: the file did not take the whole line: no space, a file size limit, a failing device.
+ * - TR_NO_FILE: the process has no trace file, or the program has closed its descriptor. Nothing is written
+ *   if the descriptor's number now refers to another file.
+ * - TR_FILE_ERROR: the whole line could not be written: no space, a file size limit, a failing device.
  * - TR_TOO_LARGE: the line would be longer than TR_LINE_LIMIT.
  *
- * With every code but TR_OK the record is lost; only TR_FILE_ERROR may leave the beginning of a line
- * behind. */
+ * With every code except TR_OK the record is lost; only TR_FILE_ERROR may leave the beginning of a line
+ * in the file. */
 QZ_TR_API int tr_record_data_1(const char *component, int id, int count, ...);
 
-/* Tells the present size of the trace file.
+/* Gets the current size of the trace file.
  *
- * - size: receives the size in bytes: 4294967295 when it is that or more, 0 when there is no file; not
+ * - size: receives the size in bytes: 4294967295 if it is that or more, 0 if there is no file; not
  *   null.
  *
- * - TR_OK: told.
+ * - TR_OK: *size holds the size.
  * - TR_BAD_PARAMETER: size is null.
  * - TR_NO_FILE: the process has no trace file, or the program has closed its descriptor. */
 QZ_TR_API int tr_get_size_1(uint32_t *size);
 
-/* Tells the name of the trace file, as QZ_TRACE_FILE gives it.
+/* Gets the name of the trace file, as given in QZ_TRACE_FILE.
  *
- * - name: buffer of TR_FILENAME_SIZE bytes that receives the name with its NUL; not null; untouched on
+ * - name: buffer of TR_FILENAME_SIZE bytes that receives the name with its NUL; not null; unchanged on
  *   failure.
  *
- * - TR_OK: told.
+ * - TR_OK: *name holds the file name.
  * - TR_BAD_PARAMETER: name is null.
  * - TR_NO_FILE: the process has no trace file, or the program has closed its descriptor.
  * - TR_TOO_LARGE: the name is longer than 256 bytes. */
