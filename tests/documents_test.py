@@ -182,7 +182,7 @@ class Documents(unittest.TestCase):
         self.assertEqual(recorded, set(map(int, re.findall(r"\*\*(\d+)\*\*", DOCS[SOURCE / "docs/tracing.md"]))))
 
     def test_manual_is_sound_and_has_every_function_and_option(self):
-        for name in "security/ACL/lib/libqzacl.map", "platform/libqz_cu/libqz_cu.map":
+        for name in "security/ACL/lib/libqzacl.map", "platform/libqz_cu/libqz_cu.map", "platform/libqz_tr/libqz_tr.map":
             for function in re.findall(r"(\w+);\n", (SOURCE / name).read_text()):
                 page = BUILD / "share/man" / (BUILD / f"share/man/man3/{function}.3").read_text().split()[1]
                 self.assertRegex(page.read_text(), rf"(?m)^\.Nm {function}\b")

@@ -1,6 +1,6 @@
 """Generates the manual pages of sections 3 and 7 from the sources, so that the two always agree.
 
-Usage: from_headers.py SOURCE_DIR MAN_DIR. Section 3 comes from include/qz/acl.h and cu.h, where each declaration follows
+Usage: from_headers.py SOURCE_DIR MAN_DIR. Section 3 comes from the C headers of include/qz, where each declaration follows
 its comment; section 7 from the message table and remedies.txt, which must have a block for every message.
 """
 import pathlib
@@ -297,17 +297,23 @@ def link_pages(header, page_of):
 
 # ---- The pages -----------------------------------------------------------------------------------------------------
 
+def opening_lines(prose, header):
+    """The opening comment: what the header is for, and the rules for every call, each under its name."""
+    rules_at = next(i for i, line in enumerate(header.opening) if "----" in line)
+    rules = []
+    for kind, content in parsed(header.opening[rules_at + 1:]):
+        match = re.fullmatch(r"([A-Z][\w -]{3,40})\. (.*)", content, re.S) if kind == "text" else None
+        rules += [f".Ss {match[1]}", *prose.lines(match[2])] if match else prose.blocks([(kind, content)])
+    return list(prose.blocks(parsed(header.opening[1:rules_at]), spaced=False)), [".Sh RULES FOR EVERY CALL", *rules]
+
+
 def write_acl_pages(acl):
-    rules_at = next(i for i, line in enumerate(acl.opening) if "----" in line)
     first = acl.sections[0]
     if [title for title, *_ in acl.sections[1:]] != list(FAMILIES):
         sys.exit("the sections of acl.h are not those that this script knows")
     prose = Prose("qzacl")
     names = [name for name, *_ in acl.declared(first[2])]
-    rules = []
-    for kind, content in parsed(acl.opening[rules_at + 1:]):
-        match = re.fullmatch(r"([A-Z][\w -]{3,40})\. (.*)", content, re.S) if kind == "text" else None
-        rules += [f".Ss {match[1]}", *prose.lines(match[2])] if match else prose.blocks([(kind, content)])
+    purpose, rules = opening_lines(prose, acl)
     families = [".Sh OPERATIONS"]
     for (name, about), (_, _, items) in zip(FAMILIES.values(), acl.sections[1:]):
         families += [".Pp", f".Xr {name} 3 :", f"{about}", ".Bd -ragged -offset indent -compact"]
@@ -316,12 +322,12 @@ def write_acl_pages(acl):
     page("qzacl", 3, ["qzacl", *names], "access control lists: the library and the rules for every call", [
         ".Sh LIBRARY", "libqzacl (link with", ".Fl lqzacl ,", "or by", ".Nm pkg-config", "or CMake as",
         ".Qq qzacl )", *synopsis(acl, first[2]), ".Sh DESCRIPTION",
-        *prose.blocks(parsed(acl.opening[1:rules_at]), spaced=False), ".Pp",
+        *purpose, ".Pp",
         *prose.blocks([block for lines, code in first[2] if code.startswith("QZ_") for block in parsed(lines)],
                       spaced=False),
-        *families, ".Sh RULES FOR EVERY CALL", *rules, ".Sh CONSTANTS AND TYPES",
+        *families, *rules, ".Sh CONSTANTS AND TYPES",
         *other_lines(prose, acl, first[2]),
-        *see_also([("qzaclfck", 1), ("qz_cu", 3), ("qzacl", 5), ("qzcacl", 5), ("qzacl_messages", 7)])])
+        *see_also([("qzaclfck", 1), ("qz_cu", 3), ("qz_tr", 3), ("qzacl", 5), ("qzcacl", 5), ("qzacl_messages", 7)])])
     for (name, about), (title, text, items) in zip(FAMILIES.values(), acl.sections[1:]):
         prose = Prose(name)
         described = function_lines(prose, acl, items)
@@ -332,16 +338,17 @@ def write_acl_pages(acl):
             *see_also([("qz_cu", 3), ("qzacl", 3), ("qzacl", 5), ("qzacl_messages", 7)])])
 
 
-def write_cu_page(cu):
-    prose = Prose("qz_cu")
-    body = [".Sh LIBRARY", "libqz_cu (link with", ".Fl lqz_cu )",
-            *synopsis(cu, [item for _, _, items in cu.sections for item in items]), ".Sh DESCRIPTION",
-            *prose.blocks(parsed(cu.opening[1:]), spaced=False), *other_lines(prose, cu, cu.sections[0][2])]
-    for title, text, items in cu.sections[1:]:
+def write_platform_page(header, name, about, related):
+    """A library of the platform: one page for all its functions."""
+    prose = Prose(name)
+    purpose, rules = opening_lines(prose, header)
+    body = [".Sh LIBRARY", f"lib{name} (link with", f".Fl l{name} )",
+            *synopsis(header, [item for _, _, items in header.sections for item in items]), ".Sh DESCRIPTION",
+            *purpose, *rules, ".Sh CONSTANTS AND TYPES", *other_lines(prose, header, header.sections[0][2])]
+    for title, text, items in header.sections[1:]:
         body += [f".Sh {title.upper()}", *prose.blocks(parsed(text), spaced=False)]
-        body += [*other_lines(prose, cu, items), *function_lines(prose, cu, items)]
-    page("qz_cu", 3, ["qz_cu", *cu.all_names()], "errors, code sets, strings, clock and addresses",
-         [*body, *see_also([("qzacl", 3), ("qzacl_messages", 7)])])
+        body += [*other_lines(prose, header, items), *function_lines(prose, header, items)]
+    page(name, 3, [name, *header.all_names()], about, [*body, *see_also(related)])
 
 
 def write_messages(acl):
@@ -397,16 +404,19 @@ def write_messages(acl):
 def main():
     for section in ("man3", "man7"):
         shutil.rmtree(MAN / section, ignore_errors=True)
-    acl, cu = Header("acl.h"), Header("cu.h")
+    acl, cu, tr = Header("acl.h"), Header("cu.h"), Header("tr.h")
     pages = ["qzacl", *(name for name, _ in FAMILIES.values())]
     for name, (_, _, items) in zip(pages, acl.sections):
         Prose.page_of.update({each: name for each, *_ in acl.declared(items)})
     Prose.page_of.update({name: "qz_cu" for name in cu.all_names()})
-    Prose.constants = acl.constants.keys() | cu.constants.keys()
+    Prose.page_of.update({name: "qz_tr" for name in tr.all_names()})
+    Prose.constants = acl.constants.keys() | cu.constants.keys() | tr.constants.keys()
     write_acl_pages(acl)
-    write_cu_page(cu)
+    write_platform_page(cu, "qz_cu", "errors, code sets, strings, clock and addresses",
+                        [("qz_tr", 3), ("qzacl", 3), ("qzacl_messages", 7)])
+    write_platform_page(tr, "qz_tr", "trace categories and records", [("qzaclfck", 1), ("qz_cu", 3), ("qzacl", 3)])
     write_messages(acl)
-    for header in (acl, cu):
+    for header in (acl, cu, tr):
         link_pages(header, Prose.page_of)
 
 

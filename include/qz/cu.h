@@ -2,27 +2,35 @@
  * The platform utility library libqz_cu: the error facility, code-set conversion, strings compared by the
  * rules of the POSIX locale, a clock, and the text of network addresses.
  *
- * Conventions that hold for every operation, unless its own description says otherwise:
+ * ---- Rules that hold for every operation ----
  *
- * - An int result is a code: CU_OK (0) is success, every other value a failure named below. The three string
- *   operations and the three questions about UTF-8 return their answer instead.
- * - Pointer arguments must not be null. If the description says "null: CU_BAD_PARAMETER", a null pointer is
- * rejected with that code; otherwise passing one is an error that is not detected.
- * - On failure, nothing that an out-parameter points to is changed, unless the description says otherwise.
- * - A result returned through a pointer to a pointer belongs to the caller, who releases it with the
+ * Results. An int result is a code: CU_OK (0) is success, every other value a failure named below. The three
+ * string operations and the three questions about UTF-8 return their answer instead.
+ *
+ * Null arguments. A pointer argument must not be null. If its description says "Null: CU_BAD_PARAMETER", a
+ * null pointer is rejected with that code; otherwise, unless the description allows null, passing one is an
+ * error that is not detected.
+ *
+ * Memory. A result returned through a pointer to a pointer belongs to the caller, who releases it with the
  * operation (or the function of the C library) that the description names.
- * - The child of a fork may call every operation, whatever other threads of its parent were doing: fork waits
- * until no thread holds a lock of this library. A signal handler must therefore not call fork. The child has
- * the recorded error of the thread that forked. This does not cover locks of the C library: a thread's first
- * conversion with a handle for a code set other than UTF-8 may need one.
- * - Every operation may be called from several threads at once. An object that one thread releases must not
- * be in use in another.
- * - No operation changes errno, prints, exits, or records an error about itself; only cu_set_error_1,
- *   cu_set_no_error_1 and cu_pset_error_1 change the recorded error.
- * - No operation is a cancellation point: one that opens a file or holds a lock disables cancellation and
- *   restores its state before it returns.
- * - Nothing here may be called from a signal handler, except the string operations and the questions about
- * UTF-8.
+ *
+ * Out-parameters. On failure, nothing that an out-parameter points to is changed unless the description says
+ * otherwise.
+ *
+ * Side effects. No operation changes errno, prints, exits, or records an error about itself; only
+ * cu_set_error_1, cu_set_no_error_1 and cu_pset_error_1 change the recorded error.
+ *
+ * Threads. Every operation may be called from several threads at once. An object that one thread releases
+ * must not be in use in another. Nothing here may be called from a signal handler, except the string
+ * operations and the questions about UTF-8.
+ *
+ * Forks. The child of a fork may call every operation, whatever other threads of its parent were doing: fork
+ * waits until no thread holds a lock of this library. A signal handler must therefore not call fork. The child
+ * has the recorded error of the thread that forked. This does not cover locks of the C library: a thread's
+ * first conversion with a handle for a code set other than UTF-8 may need one.
+ *
+ * Cancellation. No operation is a cancellation point: one that opens a file or holds a lock disables
+ * cancellation and restores its state before it returns.
  */
 #ifndef QZ_CU_H
 #define QZ_CU_H
@@ -97,12 +105,12 @@ typedef struct cu_error {
  * Strings of any length are kept. They are truncated only if they do not fit the storage of the thread and an
  * allocation fails, too.
  *
- * Always returns CU_OK.
+ * Codes: CU_OK, always.
  */
 QZ_CU_API int cu_set_error_1(int code, int reserved, const char *catalog, int set, int message_id,
                              const char *default_text, ...);
 
-/* Puts the calling thread into the no-error state. Always returns CU_OK. */
+/* Puts the calling thread into the no-error state. Codes: CU_OK, always. */
 QZ_CU_API int cu_set_no_error_1(void);
 
 /*
@@ -111,7 +119,7 @@ QZ_CU_API int cu_set_no_error_1(void);
  *   error  out: a handle, owned by the caller and released with cu_rel_error_1; later errors do not change
  *          it. Null: CU_BAD_PARAMETER.
  *
- * Returns CU_OK; CU_BAD_PARAMETER; CU_NO_MEMORY, and then *error is null.
+ * Codes: CU_OK; CU_BAD_PARAMETER; CU_NO_MEMORY, and then *error is null.
  */
 QZ_CU_API int cu_get_error_1(cu_error_t **error);
 
@@ -129,7 +137,7 @@ QZ_CU_API int cu_get_error_1(cu_error_t **error);
  *   text   out: a NUL-terminated string, owned by the caller and released with cu_rel_errmsg_1; empty in the
  *          no-error state. Null: CU_BAD_PARAMETER.
  *
- * Returns CU_OK; CU_BAD_PARAMETER, and then *text is null unless text is; CU_NO_MEMORY, and then *text is
+ * Codes: CU_OK; CU_BAD_PARAMETER, and then *text is null unless text is; CU_NO_MEMORY, and then *text is
  * null.
  */
 QZ_CU_API int cu_get_errmsg_1(const cu_error_t *error, char **text);
@@ -140,7 +148,7 @@ QZ_CU_API int cu_get_errmsg_1(const cu_error_t *error, char **text);
  *
  *   error  the handle; it remains the caller's. Null: CU_BAD_PARAMETER.
  *
- * Returns CU_OK; CU_BAD_PARAMETER. Strings are truncated as cu_set_error_1 describes.
+ * Codes: CU_OK; CU_BAD_PARAMETER. Strings are truncated as cu_set_error_1 describes.
  */
 QZ_CU_API int cu_pset_error_1(const cu_error_t *error);
 
@@ -173,7 +181,7 @@ typedef struct cu_iconv *cu_iconv_t;
  *   handle   out: the handle, valid as long as the process runs; null after any failure. Null:
  *            CU_BAD_PARAMETER.
  *
- * Returns CU_OK; CU_BAD_PARAMETER; CU_ICONV_UNKNOWN_CODESET if the system cannot convert in the requested
+ * Codes: CU_OK; CU_BAD_PARAMETER; CU_ICONV_UNKNOWN_CODESET if the system cannot convert in the requested
  * direction; CU_ICONV_NO_MEMORY; CU_NO_RESOURCE if the system provides no converter or has no more keys for
  * thread-specific data; CU_INTERNAL.
  */
@@ -192,7 +200,7 @@ QZ_CU_API int cu_iconv_open_1(const char *codeset, uint32_t flags, cu_iconv_t *h
  *               success, even for no bytes. Null: CU_BAD_PARAMETER.
  *   out_length  out: the number of converted bytes. Null: CU_BAD_PARAMETER.
  *
- * Returns CU_OK; CU_BAD_PARAMETER; CU_ICONV_UNCONVERTIBLE if the bytes are invalid or end within a character,
+ * Codes: CU_OK; CU_BAD_PARAMETER; CU_ICONV_UNCONVERTIBLE if the bytes are invalid or end within a character,
  * the other code set lacks a character, or a flag of the handle forbids one; CU_ICONV_NO_MEMORY;
  * CU_NO_RESOURCE if the system provides no converter for the thread; CU_INTERNAL.
  */
@@ -254,7 +262,7 @@ typedef struct cu_timeinfo {
  *
  *   counter  out: its value, in ticks. Null: CU_BAD_PARAMETER.
  *
- * Returns CU_OK; CU_BAD_PARAMETER; CU_INTERNAL if the system's clock cannot be read.
+ * Codes: CU_OK; CU_BAD_PARAMETER; CU_INTERNAL if the system's clock cannot be read.
  */
 QZ_CU_API int cu_get_ctr_1(uint64_t *counter);
 
@@ -263,7 +271,7 @@ QZ_CU_API int cu_get_ctr_1(uint64_t *counter);
  *
  *   timeinfo  out: the speed, for cu_cvt_time_1. Null: CU_BAD_PARAMETER.
  *
- * Returns CU_OK; CU_BAD_PARAMETER.
+ * Codes: CU_OK; CU_BAD_PARAMETER.
  */
 QZ_CU_API int cu_get_procspeed_1(cu_timeinfo_t *timeinfo);
 
@@ -274,7 +282,7 @@ QZ_CU_API int cu_get_procspeed_1(cu_timeinfo_t *timeinfo);
  *   timeinfo  the result of cu_get_procspeed_1. Null, or never filled in (all zero): CU_BAD_PARAMETER.
  *   time      out: the time. Null: CU_BAD_PARAMETER.
  *
- * Returns CU_OK; CU_BAD_PARAMETER.
+ * Codes: CU_OK; CU_BAD_PARAMETER.
  */
 QZ_CU_API int cu_cvt_time_1(uint64_t counter, const cu_timeinfo_t *timeinfo, cu_time_t *time);
 
@@ -289,7 +297,7 @@ QZ_CU_API int cu_cvt_time_1(uint64_t counter, const cu_timeinfo_t *timeinfo, cu_
  *   address16  the 16 bytes of the address, in network order. Null: CU_BAD_PARAMETER.
  *   out        receives the NUL-terminated text; at least 46 bytes. Null: CU_BAD_PARAMETER.
  *
- * Returns CU_OK; CU_BAD_PARAMETER.
+ * Codes: CU_OK; CU_BAD_PARAMETER.
  */
 QZ_CU_API int cu_ipaddr_ntop_1(const void *address16, char *out);
 
