@@ -2,7 +2,9 @@
 #include "../fuzz/fuzz.h"
 #include "faults.h"
 #include "qzacl_acl/compile.h"
+#include "qzacl_acl/entry_array.h"
 #include "qzacl_acl/entry_parser.h"
+#include "qzacl_acl/identity_table.h"
 #include "qzacl_acl/tree_shape.h"
 #include "qzacl_acl/trees.h"
 #include "support.h"
@@ -152,5 +154,25 @@ TEST(tree, is_released_from_its_leaves_up) {
         again.mechanism[16] = 'x'; // in place of the NUL, as a caller may fill the array
         EXPECT_EQ(sec__add_acle_to_tree(0, &again, &root), 0);
         sec__free_acltree(root);
+    }
+}
+
+// A text of a gigabyte may promise more entries than 32 bits can say the size of.
+TEST(tree, asks_for_no_less_memory_than_it_means) {
+    constexpr std::uint64_t entry_size = sizeof(qz::small_entry);
+    constexpr std::uint64_t least_slot_size = 5; // a tag and a number
+    for (const std::uint32_t count : {0x10000001u, 0x30000000u, 0x7fffffffu}) {
+        SCOPED_TRACE(count);
+        std::size_t refused = 0;
+        qz::entry_array entries;
+        faults::allocations = {0, 1};
+        EXPECT_FALSE(entries.reserve(count, refused));
+        EXPECT_GE(refused, std::min<std::uint64_t>(count * entry_size, PTRDIFF_MAX));
+
+        qz::identity_table table;
+        faults::allocations = {0, 1};
+        EXPECT_FALSE(table.reset(count, refused));
+        EXPECT_GE(refused, std::min<std::uint64_t>(count * least_slot_size, PTRDIFF_MAX));
+        faults::allocations = {};
     }
 }
