@@ -20,12 +20,15 @@ inline descriptor open_file(const char *path, int flags, mode_t mode = 0) {
     descriptor high(fcntl(low.get(), F_DUPFD_CLOEXEC, STDERR_FILENO + 1));
     const int error = errno;
     low.close();
+    // Whoever read or printed meanwhile moved the place in the file, which both numbers share; moving back to its start
+    // waits for one who still does.
+    const bool is_at_start = high && lseek(high.get(), 0, SEEK_SET) == 0;
     if ((flags & O_EXCL) != 0) {
-        // A file that was just made stays empty, whatever was printed into it meanwhile. Moving to its start waits
-        // for a print that is still going on. If it cannot be kept open, nobody is to find it.
+        // A file that was just made stays empty, whatever was printed into it meanwhile. If it cannot be kept open,
+        // nobody is to find it.
         if (!high)
             unlink(path);
-        else if (lseek(high.get(), 0, SEEK_SET) != 0 || ftruncate(high.get(), 0) != 0)
+        else if (!is_at_start || ftruncate(high.get(), 0) != 0)
             return {};
     }
     errno = error;

@@ -560,6 +560,23 @@ TEST_F(files, have_no_descriptor_of_a_standard_stream) {
     }
 }
 
+// Nor do those that read their standard input take a part of a file away.
+TEST_F(files, are_read_whole_while_another_thread_reads_its_input) {
+    const auto take_a_part = [](std::size_t) {
+        char part[4];
+        [[maybe_unused]] const ssize_t taken = read(STDIN_FILENO, part, sizeof part);
+        return 0;
+    };
+    const pid_t child = fork();
+    if (child == 0) {
+        close(STDIN_FILENO);
+        const outcome found = faults::watched(take_a_part, [this] { return read_acl(path, text_only); });
+        _exit(found == from_text ? 0 : 1);
+    }
+    int status = 0;
+    EXPECT_TRUE(waitpid(child, &status, 0) == child && status == 0) << status;
+}
+
 TEST_F(files, nobody_may_use_a_new_file_before_it_is_its_owners) {
     constexpr uid_t owner = 65534;
     if (geteuid() != 0 || !has_entries()) GTEST_SKIP() << "needs root, and a file system with POSIX ACLs";
