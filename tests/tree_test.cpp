@@ -176,3 +176,23 @@ TEST(tree, asks_for_no_less_memory_than_it_means) {
         faults::allocations = {};
     }
 }
+
+// Where a few entries stand before a long comment, their tree leaves the memory to others.
+TEST(tree, takes_no_memory_for_a_comment) {
+    constexpr std::size_t line_size = 4;
+    std::string text;
+    for (char name = 'z'; name >= 'a'; --name) text += "g "s + name + '\0';
+    const std::size_t count = text.size() / line_size;
+    text.append(std::size_t{1} << 22, '#');
+    std::size_t most = 0;
+    for (std::size_t at = 1; at == 1 || faults::allocations.fails_at <= faults::allocations.count; ++at) {
+        sec_acltree_array trees(text);
+        faults::allocations = {0, at};
+        for (std::size_t line = 0; line < count; ++line)
+            trees.add({1, SEC_ACLE_GROUP, "", std::string_view(text.data() + line * line_size + 2, 1)});
+        most = std::max(most, faults::allocations.refused);
+    }
+    faults::allocations = {};
+    EXPECT_GT(most, 0u);
+    EXPECT_LT(most, 10'000u);
+}
