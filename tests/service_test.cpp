@@ -3,8 +3,10 @@
 #include "support.h"
 
 #include <atomic>
+#include <fcntl.h>
 #include <qz/service.hpp>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <thread>
 
 namespace {
@@ -275,6 +277,37 @@ TEST(service, texts_lead_back_to_the_same_bytes) {
     EXPECT_EQ(qz::to_text(acl_of("u HBA2 A@B wr # why\n"))->view(), "u hba2 A@B rw\n");
     EXPECT_EQ(qz::from_text("o r\nx y\n").code(), SEC_S_BAD_ACL);
     EXPECT_EQ(qz::error::current().text().substr(0, 8), "3417-179");
+}
+
+void *read_text_when_cancelled(void *entry_count) {
+    pthread_cancel(pthread_self());
+    const auto entries = qz::from_text(service_text)->list();
+    *static_cast<std::size_t *>(entry_count) = entries->size();
+    pthread_testcancel(); // the first point at which the thread ends
+    return nullptr;
+}
+
+TEST(service, texts_are_read_in_a_thread_that_is_cancelled) {
+    std::size_t entry_count = 0;
+    void *ended = nullptr;
+    pthread_t thread = {};
+    ASSERT_EQ(pthread_create(&thread, nullptr, read_text_when_cancelled, &entry_count), 0);
+    pthread_join(thread, &ended);
+    EXPECT_EQ(entry_count, acl_of(service_text).list()->size());
+    EXPECT_EQ(ended, PTHREAD_CANCELED);
+}
+
+// What other threads of a service without standard streams print does not become part of a text.
+TEST(service, texts_are_in_no_file_of_a_standard_stream) {
+    const pid_t child = fork();
+    if (child == 0) {
+        for (const int stream : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) close(stream);
+        const qz::detail::descriptor file(qz::detail::make_memory_file());
+        const bool are_free = fcntl(STDIN_FILENO, F_GETFD) < 0 && fcntl(STDERR_FILENO, F_GETFD) < 0;
+        _exit(file.number() > STDERR_FILENO && are_free ? 0 : 1);
+    }
+    int status = -1;
+    EXPECT_TRUE(waitpid(child, &status, 0) == child && status == 0) << status;
 }
 
 TEST(service, no_text_holds_what_no_line_can) {

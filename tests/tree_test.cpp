@@ -2,7 +2,9 @@
 #include "../fuzz/fuzz.h"
 #include "faults.h"
 #include "qzacl_acl/compile.h"
+#include "qzacl_acl/entry_array.h"
 #include "qzacl_acl/entry_parser.h"
+#include "qzacl_acl/identity_table.h"
 #include "qzacl_acl/tree_shape.h"
 #include "qzacl_acl/trees.h"
 #include "support.h"
@@ -153,4 +155,44 @@ TEST(tree, is_released_from_its_leaves_up) {
         EXPECT_EQ(sec__add_acle_to_tree(0, &again, &root), 0);
         sec__free_acltree(root);
     }
+}
+
+// A text of a gigabyte may promise more entries than 32 bits can say the size of.
+TEST(tree, asks_for_no_less_memory_than_it_means) {
+    constexpr std::uint64_t entry_size = sizeof(qz::small_entry);
+    constexpr std::uint64_t least_slot_size = 5; // a tag and a number
+    for (const std::uint32_t count : {0x10000001u, 0x30000000u, 0x7fffffffu}) {
+        SCOPED_TRACE(count);
+        std::size_t refused = 0;
+        qz::entry_array entries;
+        faults::allocations = {0, 1};
+        EXPECT_FALSE(entries.reserve(count, refused));
+        EXPECT_GE(refused, std::min<std::uint64_t>(count * entry_size, PTRDIFF_MAX));
+
+        qz::identity_table table;
+        faults::allocations = {0, 1};
+        EXPECT_FALSE(table.reset(count, refused));
+        EXPECT_GE(refused, std::min<std::uint64_t>(count * least_slot_size, PTRDIFF_MAX));
+        faults::allocations = {};
+    }
+}
+
+// Where a few entries stand before a long comment, their tree leaves the memory to others.
+TEST(tree, takes_no_memory_for_a_comment) {
+    constexpr std::size_t line_size = 4;
+    std::string text;
+    for (char name = 'z'; name >= 'a'; --name) text += "g "s + name + '\0';
+    const std::size_t count = text.size() / line_size;
+    text.append(std::size_t{1} << 22, '#');
+    std::size_t most = 0;
+    for (std::size_t at = 1; at == 1 || faults::allocations.fails_at <= faults::allocations.count; ++at) {
+        sec_acltree_array trees(text);
+        faults::allocations = {0, at};
+        for (std::size_t line = 0; line < count; ++line)
+            trees.add({1, SEC_ACLE_GROUP, "", std::string_view(text.data() + line * line_size + 2, 1)});
+        most = std::max(most, faults::allocations.refused);
+    }
+    faults::allocations = {};
+    EXPECT_GT(most, 0u);
+    EXPECT_LT(most, 10'000u);
 }

@@ -13,6 +13,7 @@
 #include <cstdio>
 #include <cstring>
 #include <new>
+#include <pthread.h>
 #include <sys/mman.h>
 #include <unistd.h>
 
@@ -128,6 +129,30 @@ public:
 
 private:
     int number_;
+};
+
+/*
+ * Makes a file in memory, on a descriptor that is none of a standard stream's: what another thread prints must
+ * not end up in it. Negative when the system gives none.
+ */
+inline int make_memory_file() noexcept {
+    const int made = memfd_create("acl", MFD_CLOEXEC);
+    if (made < 0 || made > STDERR_FILENO)
+        return made;
+    const descriptor kept(made); /* keeps its number taken until there is one with a higher number */
+    return make_memory_file();
+}
+
+/* Disables the cancellation of the thread for its scope: no operation is a point where it happens. */
+class uncancelled {
+public:
+    uncancelled() noexcept { pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, &before_); }
+    uncancelled(const uncancelled &) = delete;
+    uncancelled &operator=(const uncancelled &) = delete;
+    ~uncancelled() { pthread_setcancelstate(before_, nullptr); }
+
+private:
+    int before_ = PTHREAD_CANCEL_ENABLE;
 };
 
 } // namespace detail
@@ -268,7 +293,8 @@ inline result<text> to_text(const acl &acl, const sec_perm_set_t *set = nullptr)
  * Codes: those of sec_read_acl_file for a text; 37, not recorded: the system gave no file in memory.
  */
 inline result<acl> from_text(std::string_view lines, const sec_perm_set_t *set = nullptr) noexcept {
-    const detail::descriptor file(memfd_create("acl", MFD_CLOEXEC));
+    const detail::uncancelled until_the_file_is_closed;
+    const detail::descriptor file(detail::make_memory_file());
     if (file.number() < 0 || !file.write_all(lines))
         return {detail::unrecorded(SEC_S_FILE_ERROR), acl()};
     char path[32];

@@ -99,6 +99,10 @@ struct file_stamp {
 /*
  * An ACL file as it is now: any number of threads take the snapshot and decide by it, while refresh, in one
  * of them or in several, reads the file anew when it has changed.
+ *
+ * Forks: the child must not use the live_acl of its parent when another thread may have been using it, as one of
+ * its locks may stay held there. It follows the file with one of its own; the snapshots that the thread that
+ * forked holds are good in the child, too.
  */
 class live_acl {
 public:

@@ -94,9 +94,11 @@ std::uint32_t identity_store::expected_count(std::uint32_t count, std::uint32_t 
     constexpr std::uint64_t least = 16;
     std::uint64_t expected = std::max(std::uint64_t{count} * 2, least);
     if (is_in_text() && count >= least) {
-        // A little more than the part that was read promises, and whatever it promises a fair step.
+        // A little more than the part that was read promises, and whatever it promises a fair step: a few entries
+        // before a long comment must not get room that others lack.
         const std::uint64_t promised = std::uint64_t{count} * size_ / place;
-        expected = std::max(promised + promised / 8, std::uint64_t{count} + count / 4);
+        expected =
+            std::clamp(promised + promised / 8, std::uint64_t{count} + count / 4, std::uint64_t{count} * 16);
     }
     return static_cast<std::uint32_t>(std::min(expected, std::uint64_t{last_place}));
 }

@@ -1,6 +1,7 @@
 // The numbers of entries by the hashes of their identities.
 #include "qzacl_acl/identity_table.h"
 
+#include <algorithm>
 #include <new>
 
 namespace qz {
@@ -9,8 +10,9 @@ bool identity_table::reset(std::uint32_t count, std::size_t &refused) {
     unsigned bits = 0;
     while (room_of(bits) < count)
         ++bits;
-    const std::size_t table_size = sizeof(head) + (sizeof(group) << bits);
-    const std::size_t size = table_size + alignof(head);
+    // Where a size has 32 bits, it may be too small to say it; an allocation of that much fails.
+    const std::uint64_t wanted = alignof(head) + sizeof(head) + (std::uint64_t{sizeof(group)} << bits);
+    const auto size = static_cast<std::size_t>(std::min<std::uint64_t>(wanted, SIZE_MAX));
     owned<void> memory(std::calloc(size, 1));
     if (memory == nullptr) {
         refused = size;
