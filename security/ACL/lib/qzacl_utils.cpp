@@ -2,8 +2,8 @@
 #include "qzacl_utils.h"
 
 #include "base/open_file.h"
-#include "qzacl_trace.h"
 #include "report.h"
+#include "trace_points.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -63,8 +63,7 @@ bool is_as_vetted(const struct stat &opened, const struct stat &vetted) {
 }
 
 int not_found(const char *file_name, int error) {
-    if (qz::traces(qz::trace_category::info))
-        qz::trace_data(123, qz::item(file_name), qz::number(error));
+    qz::trace(qz::point::file_not_examined, file_name, error);
     return qz::report(SEC_S_FILE_ERROR, qz::msg::bad_file_name, file_name, error);
 }
 
@@ -83,16 +82,14 @@ int read_file(const char *file_name, int fd, const struct stat &vetted, qz::file
         static_cast<std::uintmax_t>(status.st_size), std::numeric_limits<std::ptrdiff_t>::max()));
     auto text = qz::allocate<char>(size + 1);
     if (text == nullptr) {
-        if (qz::traces(qz::trace_category::info))
-            qz::trace_data(125, qz::item(file_name), qz::number(size));
+        qz::trace(qz::point::no_memory_for_file, file_name, size);
         return qz::report_no_memory("sec_read_acl_file", size);
     }
     errno = 0;
     const ssize_t count = read(fd, text.get(), size);
     if (count != status.st_size) {
         const int error = errno;
-        if (qz::traces(qz::trace_category::info))
-            qz::trace_data(127, qz::item(file_name), qz::number(size), qz::number(count));
+        qz::trace(qz::point::read_is_short, file_name, size, count);
         return qz::report(SEC_S_FILE_ERROR, qz::msg::short_read, qz::shown_size(count), qz::shown_size(size),
                           error);
     }
@@ -134,12 +131,10 @@ int acl__convert_from_utf8(const char *in, const std::size_t *in_length, char **
 int acl__lock_acl_file(const char * /*file_name*/, int /*fd*/, int /*mode*/) { return 0; }
 
 int acl__read_acl_file(const char *file_name, int fd, const struct stat &vetted, qz::file_bytes &bytes) {
-    const bool is_timed = qz::trace_level(qz::trace_category::perf) == 2;
-    const std::uint64_t start = is_timed ? qz::read_counter() : 0;
+    const qz::trace_timer<qz::point::reading_descriptor> timer;
     bytes = {};
     const int result = read_file(file_name, fd, vetted, bytes);
-    if (is_timed)
-        qz::trace_elapsed(6, start);
+    timer.stop();
     return result;
 }
 

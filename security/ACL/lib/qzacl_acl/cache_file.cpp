@@ -4,9 +4,9 @@
 #include "base/open_file.h"
 #include "base/owned.h"
 #include "qzacl_acl/posix_acl.h"
-#include "qzacl_trace.h"
 #include "qzacl_utils.h"
 #include "report.h"
+#include "trace_points.h"
 
 #include <cerrno>
 #include <csignal>
@@ -138,9 +138,7 @@ int cache_writer::name_cache() {
     const std::size_t length = std::strlen(aclfname_);
     if (length < qz::uncached_path_length && qz::make_cache_name(aclfname_, cache_name_))
         return SEC_S_OK;
-    const int shown_length = qz::shown_size(length);
-    if (qz::traces(qz::trace_category::errors))
-        qz::trace_data(108, qz::item(aclfname_), qz::number(shown_length));
+    qz::trace(qz::point::name_too_long_for_cache, aclfname_, qz::shown_size(length));
     return qz::report(SEC_S_FILE_ERROR, qz::msg::name_too_long_for_cache, aclfname_);
 }
 
@@ -149,8 +147,7 @@ int cache_writer::examine_cache(bool even_when_current) {
     if (is_new_) {
         if (errno != ENOENT)
             return qz::query_failed(cache_name_.text, "stat()", aclfname_, errno);
-        if (qz::traces(qz::trace_category::info))
-            qz::trace_data(110, qz::item(cache_name_.text));
+        qz::trace(qz::point::cache_is_new, cache_name_.text);
         return SEC_S_OK;
     }
     if (const int result = text_.vet_cache(aclfname_, cache_name_.text, cache_); result != SEC_S_OK)
@@ -236,8 +233,7 @@ int cache_writer::protect(int fd) const {
 int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, int force,
                          const qz::text_origin &origin) {
     if (acl->length == 0) {
-        if (qz::trace_level(qz::trace_category::info) == 1)
-            qz::trace_data(107, qz::item(aclfname));
+        qz::trace(qz::point::nothing_to_cache, aclfname);
         return SEC_S_ADVISORY;
     }
     cache_writer writer(aclfname, origin);
