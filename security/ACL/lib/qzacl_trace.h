@@ -270,25 +270,6 @@ requires(Operation::arguments::template takes<std::remove_cv_t<Args>...>) int ru
     return result;
 }
 
-// ---- For points that are not described yet ----
-
-inline traced::text item(const char *text) { return traced::text(text); }
-
-template <std::size_t Size>
-traced::text bounded_item(const char (&text)[Size]) {
-    return traced::text(text);
-}
-
-template <class Number>
-traced::number<Number> number(const Number &value) {
-    return {value};
-}
-
-template <class... Items>
-void trace_data(int id, const Items &...items) {
-    record(id, items...);
-}
-
 } // namespace qz
 
 #endif

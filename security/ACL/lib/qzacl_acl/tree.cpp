@@ -2,8 +2,8 @@
 #include "qzacl_acl/tree.h"
 
 #include "qzacl_acl/buffer_format.h"
-#include "qzacl_trace.h"
 #include "report.h"
+#include "trace_points.h"
 
 #include <algorithm>
 #include <new>
@@ -431,7 +431,7 @@ int sec__report_duplicate(const sec_acle_t *acle) {
 }
 
 void sec__trace_replacement(const sec_acle_t *acle) {
-    if (!qz::traces(qz::trace_category::info))
+    if (!qz::traces(qz::point::entry_replaced))
         return;
     const char *type = "group";
     switch (acle->type) {
@@ -450,9 +450,11 @@ void sec__trace_replacement(const sec_acle_t *acle) {
     default:
         break;
     }
-    qz::trace_data(113, qz::item(type),
-                   qz::is_single_type(acle->type) ? qz::item("<none>") : qz::bounded_item(acle->mechanism),
-                   qz::item(acle->type == SEC_ACLE_USER ? acle->identity : "<none>"));
+    const char *identity = acle->type == SEC_ACLE_USER ? acle->identity : "<none>";
+    if (qz::is_single_type(acle->type))
+        qz::point::entry_replaced.record(type, "<none>", identity);
+    else
+        qz::point::entry_replaced.record(type, acle->mechanism, identity);
 }
 
 int sec__acle_not_found(int code, const sec_acle_t *acle) {
