@@ -5,7 +5,7 @@
 #include "qz/acl.h"
 #include "qzacl_acl/cache_file.h"
 #include "qzacl_acl/file_name.h"
-#include "qzacl_utils.h"
+#include "qzacl_utils/file_bytes.h"
 #include "report.h"
 
 #include <cstddef>

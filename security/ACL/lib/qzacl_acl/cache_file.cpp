@@ -4,7 +4,7 @@
 #include "base/open_file.h"
 #include "base/owned.h"
 #include "qzacl_acl/posix_acl.h"
-#include "qzacl_utils.h"
+#include "qzacl_utils/file_bytes.h"
 #include "report.h"
 #include "trace_points.h"
 
@@ -171,7 +171,6 @@ int cache_writer::vet_opened_cache(int fd) const {
 }
 
 int cache_writer::replace(const sec_acl_buffer_t &acl) {
-    constexpr int lock_for_replacing = 2;
     made_file placeholder(cache_name_.text, open_cache());
     if (!placeholder)
         return cannot_open(cache_name_.text);
@@ -179,7 +178,7 @@ int cache_writer::replace(const sec_acl_buffer_t &acl) {
         placeholder.keep();
     int result = vet_opened_cache(placeholder.fd());
     if (result == SEC_S_OK)
-        result = acl__lock_acl_file(cache_name_.text, placeholder.fd(), lock_for_replacing);
+        result = acl__lock_acl_file(cache_name_.text, placeholder.fd(), qz::lock_purpose::replacing);
     if (result == SEC_S_OK)
         result = write_and_rename(acl);
     if (result == SEC_S_OK)

@@ -2,7 +2,7 @@
 #include "qzacl_acl/cache_vetting.h"
 
 #include "qz/acl.h"
-#include "qzacl_utils.h"
+#include "qzacl_utils/file_bytes.h"
 #include "report.h"
 #include "trace_points.h"
 

@@ -2,7 +2,7 @@
 #include "qzacl_acl/entry.h"
 
 #include "base/owned.h"
-#include "qzacl_utils.h"
+#include "qzacl_utils/code_set.h"
 #include "report.h"
 #include "trace_points.h"
 

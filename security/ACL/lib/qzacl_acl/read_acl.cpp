@@ -8,7 +8,7 @@
 #include "qzacl_acl/file_name.h"
 #include "qzacl_acl/tree.h"
 #include "qzacl_acl/validate.h"
-#include "qzacl_utils.h"
+#include "qzacl_utils/file_bytes.h"
 #include "report.h"
 #include "trace_points.h"
 

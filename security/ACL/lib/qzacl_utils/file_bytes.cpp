@@ -1,5 +1,5 @@
-// Conversion of strings between the locale's code set and UTF-8, and reading a whole file.
-#include "qzacl_utils.h"
+// Opening a file that was vetted by its name, and reading it whole.
+#include "qzacl_utils/file_bytes.h"
 
 #include "base/open_file.h"
 #include "report.h"
@@ -8,53 +8,10 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstdint>
-#include <cstdio>
 #include <fcntl.h>
-#include <langinfo.h>
 #include <limits>
 
 namespace {
-
-cu_iconv_t acl__to_utf8_hdl = nullptr;
-cu_iconv_t acl__from_utf8_hdl = nullptr;
-pthread_once_t acl__init_to_utf8_once_block = PTHREAD_ONCE_INIT;
-pthread_once_t acl__init_from_utf8_once_block = PTHREAD_ONCE_INIT;
-
-// A failed open leaves the handle null; each later conversion in that direction reports it.
-void open_handle(std::uint32_t direction, cu_iconv_t *handle) {
-    char code_set[256] = {};
-    const char *name = cu_utf8_is_assumed_1() != 0 ? "UTF-8" : nl_langinfo(CODESET);
-    std::snprintf(code_set, sizeof code_set, "%s", name);
-    std::uint32_t flags = direction;
-    if (cu_utf8_is_not_modified_1() != 0)
-        flags |= CU_ICONV_UTF8_UNMODIFIED;
-    if (cu_utf8_is_limited_to_bmp_1() != 0)
-        flags |= CU_ICONV_BMP_ONLY;
-    static_cast<void>(cu_iconv_open_1(code_set, flags, handle));
-}
-
-void acl__init_to_utf8_handle() { open_handle(0, &acl__to_utf8_hdl); }
-void acl__init_from_utf8_handle() { open_handle(CU_ICONV_FROM_UTF8, &acl__from_utf8_hdl); }
-
-int convert(const char *function, cu_iconv_t handle, const char *in, const std::size_t *in_length, char **out,
-            std::size_t *out_length) {
-    constexpr int facility_no_memory = 15;
-    if (handle == nullptr)
-        return qz::report(SEC_S_CODESET, qz::msg::conversion_unavailable);
-    constexpr int line = __LINE__ + 1; // of the call that may fail
-    const int result = cu_iconv_str_1(handle, 0, in, in_length, out, out_length);
-    switch (result) {
-    case 0:
-        return SEC_S_OK;
-    case 17:
-    case 20:
-        return qz::report(SEC_S_INTERNAL, qz::msg::internal_failure, qz::utils_source, line, result);
-    case facility_no_memory:
-        return qz::report_no_memory(function, *in_length);
-    default:
-        return qz::report(SEC_S_CODESET, qz::msg::conversion_failed);
-    }
-}
 
 // Whether the file is the one that was vetted by its name, and still owned and protected as it was then.
 bool is_as_vetted(const struct stat &opened, const struct stat &vetted) {
@@ -117,18 +74,7 @@ descriptor open_vetted(const char *path, int access, const struct stat &vetted) 
 
 } // namespace qz
 
-int acl__convert_to_utf8(const char *in, const std::size_t *in_length, char **out, std::size_t *out_length) {
-    pthread_once(&acl__init_to_utf8_once_block, acl__init_to_utf8_handle);
-    return convert("acl__convert_to_utf8", acl__to_utf8_hdl, in, in_length, out, out_length);
-}
-
-int acl__convert_from_utf8(const char *in, const std::size_t *in_length, char **out,
-                           std::size_t *out_length) {
-    pthread_once(&acl__init_from_utf8_once_block, acl__init_from_utf8_handle);
-    return convert("acl__convert_from_utf8", acl__from_utf8_hdl, in, in_length, out, out_length);
-}
-
-int acl__lock_acl_file(const char * /*file_name*/, int /*fd*/, int /*mode*/) { return 0; }
+int acl__lock_acl_file(const char * /*file_name*/, int /*fd*/, qz::lock_purpose /*purpose*/) { return 0; }
 
 int acl__read_acl_file(const char *file_name, int fd, const struct stat &vetted, qz::file_bytes &bytes) {
     const qz::trace_timer<qz::point::reading_descriptor> timer;
@@ -141,8 +87,7 @@ int acl__read_acl_file(const char *file_name, int fd, const struct stat &vetted,
 namespace qz {
 
 int lock_and_read(const char *path, const descriptor &file, const struct stat &vetted, file_bytes &bytes) {
-    constexpr int for_reading = 1;
-    if (const int result = acl__lock_acl_file(path, file.get(), for_reading); result != 0)
+    if (const int result = acl__lock_acl_file(path, file.get(), lock_purpose::reading); result != 0)
         return result;
     return acl__read_acl_file(path, file.get(), vetted, bytes);
 }
