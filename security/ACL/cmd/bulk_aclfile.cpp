@@ -3,10 +3,10 @@
 #include "bulk_aclfile.h"
 
 #include "base/owned.h"
+#include "print_recorded.h"
 #include "qzacl_acl/acl_text.h"
 #include "qzacl_acl/cache_file.h"
 #include "qzacl_acl/compile.h"
-#include "qzacl_acl/dump.h"
 #include "qzacl_acl/file_name.h"
 #include "qzacl_acl/tree.h"
 #include "report.h"
