@@ -96,13 +96,12 @@ private:
 
 int compile_and_cache(const qz::vetted_file &file, const sec_acltree_array &trees,
                       const qz::text_origin &origin) {
-    constexpr int even_when_current = 1;
     sec_acl_buffer_t buffer = {};
     if (const int result = sec__acltrees_to_acl(trees.trees(), &buffer); result != SEC_S_OK)
         return result;
     const qz::owned<void> buffer_owner(buffer.data);
     const held_signals until_cache_is_whole;
-    return sec__cache_aclbuffer(file.path.text, &buffer, even_when_current, origin);
+    return sec__cache_aclbuffer(file.path.text, &buffer, qz::cache_rewriting::always, origin);
 }
 
 } // namespace

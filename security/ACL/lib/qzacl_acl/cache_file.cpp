@@ -115,7 +115,7 @@ public:
 
     int name_cache();
     int examine_text() { return text_.examine(aclfname_, origin_); }
-    int examine_cache(bool even_when_current);
+    int examine_cache(qz::cache_rewriting rewriting);
     int replace(const sec_acl_buffer_t &acl);
 
 private:
@@ -142,7 +142,7 @@ int cache_writer::name_cache() {
     return qz::report(SEC_S_FILE_ERROR, qz::msg::name_too_long_for_cache, aclfname_);
 }
 
-int cache_writer::examine_cache(bool even_when_current) {
+int cache_writer::examine_cache(qz::cache_rewriting rewriting) {
     is_new_ = stat(cache_name_.text, &cache_) != 0;
     if (is_new_) {
         if (errno != ENOENT)
@@ -152,7 +152,7 @@ int cache_writer::examine_cache(bool even_when_current) {
     }
     if (const int result = text_.vet_cache(aclfname_, cache_name_.text, cache_); result != SEC_S_OK)
         return result;
-    if (!even_when_current && text_.status.st_mtime < cache_.st_mtime)
+    if (rewriting == qz::cache_rewriting::unless_current && text_.status.st_mtime < cache_.st_mtime)
         return SEC_S_ADVISORY;
     return SEC_S_OK;
 }
@@ -229,7 +229,7 @@ int cache_writer::protect(int fd) const {
 
 } // namespace
 
-int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, int force,
+int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, qz::cache_rewriting rewriting,
                          const qz::text_origin &origin) {
     if (acl->length == 0) {
         qz::trace(qz::point::nothing_to_cache, aclfname);
@@ -240,7 +240,7 @@ int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, int 
     if (result == SEC_S_OK)
         result = writer.examine_text();
     if (result == SEC_S_OK)
-        result = writer.examine_cache(force != 0);
+        result = writer.examine_cache(rewriting);
     if (result == SEC_S_OK)
         result = writer.replace(*acl);
     return result;

@@ -118,7 +118,8 @@ int acl_file_reader::read_text(sec_acl_buffer_t &out) {
     if (const int result = parse(out); result != SEC_S_OK)
         return result;
     if ((flags_ & SEC_READ_ACL_CACHE) != 0 &&
-        sec__cache_aclbuffer(acl_.path.text, &out, 0, text_.origin()) != SEC_S_OK) {
+        sec__cache_aclbuffer(acl_.path.text, &out, qz::cache_rewriting::unless_current, text_.origin()) !=
+            SEC_S_OK) {
         // A cache that cannot be written is no failure of the read.
         cu_set_no_error_1();
         flags_ &= ~std::uint32_t{SEC_READ_ACL_CACHE};
