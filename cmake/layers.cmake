@@ -83,3 +83,14 @@ function(qz_install_library name headers requires description)
   install(FILES ${made}/${name}-config.cmake ${made}/${name}-config-version.cmake DESTINATION ${package_dir}
     COMPONENT development)
 endfunction()
+
+# A program that is not installed: it finds the libraries in the build tree. It uses layers or libraries, and goes into a
+# FOLDER of the build tree.
+function(qz_program name)
+  cmake_parse_arguments(arg "" "FOLDER" "SOURCES;USES" ${ARGN})
+  add_executable(${name} ${arg_SOURCES})
+  target_link_libraries(${name} PRIVATE ${arg_USES})
+  set_target_properties(${name} PROPERTIES
+    INSTALL_RPATH ${PROJECT_BINARY_DIR}/lib
+    RUNTIME_OUTPUT_DIRECTORY ${PROJECT_BINARY_DIR}/${arg_FOLDER})
+endfunction()
