@@ -7,8 +7,8 @@
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/entry_parser.h"
 #include "qzacl_acl/trees.h"
-#include "qzacl_trace.h"
-#include "qzacl_utils.h"
+#include "trace_points.h"
+#include "qzacl_utils/file_bytes.h"
 
 #include <benchmark/benchmark.h>
 
@@ -24,9 +24,9 @@
 namespace {
 
 void bench_trace_point(benchmark::State &state) {
-    int item = 0;
+    const sec_acl_buffer_t *acl = nullptr;
     for (auto _ : state)
-        qz::trace_entry(79, [&] { qz::trace_data(81, qz::number(item)); });
+        qz::trace_entry(qz::operation::release_acl, std::tie(acl));
 }
 
 class stopwatch {

@@ -22,9 +22,6 @@ install(FILES ${PROJECT_BINARY_DIR}/share/doc/README.md ${PROJECT_BINARY_DIR}/sh
 install(DIRECTORY ${PROJECT_BINARY_DIR}/share/doc/docs DESTINATION ${CMAKE_INSTALL_DOCDIR} COMPONENT development)
 install(DIRECTORY examples DESTINATION ${CMAKE_INSTALL_DOCDIR} COMPONENT development
   PATTERN CMakeLists.txt EXCLUDE PATTERN *.cacl EXCLUDE PATTERN __pycache__ EXCLUDE)
-# The texts for translators.
-install(FILES ${PROJECT_BINARY_DIR}/share/qzseclib.msg DESTINATION ${CMAKE_INSTALL_DATADIR}/${PROJECT_NAME}
-  COMPONENT development)
 
 set(CPACK_PACKAGE_DESCRIPTION_SUMMARY "Checker of ACL files, and the ACL library beneath it")
 set(CPACK_PACKAGE_VENDOR "the maintainers of ${PROJECT_NAME}")

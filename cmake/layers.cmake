@@ -11,18 +11,18 @@ function(qz_layer name)
     file(MAKE_DIRECTORY ${links}/${folder})
     file(CREATE_LINK ${root}/${header} ${links}/${header} SYMBOLIC)
   endforeach()
+  set(scope INTERFACE)
   if(arg_SOURCES)
+    set(scope PUBLIC)
     list(TRANSFORM arg_SOURCES PREPEND ${root}/)
     add_library(${name} STATIC ${arg_SOURCES})
     # The libraries must load where only libc is: nothing that the C++ runtime would have to supply.
     target_compile_options(${name} PRIVATE -fno-exceptions -fno-rtti -fno-threadsafe-statics -fvisibility=hidden)
-    target_include_directories(${name} PUBLIC ${links})
-    target_link_libraries(${name} PUBLIC ${arg_USES})
   else()
     add_library(${name} INTERFACE)
-    target_include_directories(${name} INTERFACE ${links})
-    target_link_libraries(${name} INTERFACE ${arg_USES})
   endif()
+  target_include_directories(${name} ${scope} ${links})
+  target_link_libraries(${name} ${scope} ${arg_USES})
 endfunction()
 
 # A shared library made of whole layers. It is linked as C because it may need libc alone, and exports what its map
@@ -50,13 +50,14 @@ function(qz_shared_library name)
   target_include_directories(${name} INTERFACE
     $<BUILD_INTERFACE:${PROJECT_BINARY_DIR}/layers/layer_interface>
     $<INSTALL_INTERFACE:${CMAKE_INSTALL_INCLUDEDIR}>)
-  qz_install_library(${name} "${arg_HEADERS}" "${arg_REQUIRES}" "${arg_DESCRIPTION}")
+  list(JOIN arg_REQUIRES " " requires)
+  qz_install_library(${name} "${arg_HEADERS}" "${requires}" "${arg_DESCRIPTION}")
 endfunction()
 
-# Installs a library for those who run with it and for those who build against it, by pkg-config or by CMake.
-function(qz_install_library name headers requires_list arg_DESCRIPTION)
+# Installs a library for those who run with it and for those who build against it, by pkg-config or by CMake. The names
+# that it requires have blanks between them, as both packages want them.
+function(qz_install_library name headers requires description)
   set(package_dir ${CMAKE_INSTALL_LIBDIR}/cmake/${name})
-  list(JOIN requires_list " " requires)
   # Relative, so that an installed tree may be moved, unless the libraries have a place of their own.
   if(IS_ABSOLUTE ${CMAKE_INSTALL_LIBDIR})
     set(pc_prefix ${CMAKE_INSTALL_PREFIX})
@@ -75,11 +76,21 @@ function(qz_install_library name headers requires_list arg_DESCRIPTION)
   include(CMakePackageConfigHelpers)
   set(made ${PROJECT_BINARY_DIR}/packages)
   configure_file(${PROJECT_SOURCE_DIR}/cmake/library.pc.in ${made}/${name}.pc @ONLY)
-  string(REPLACE ";" " " requires_list "${requires_list}")
   configure_package_config_file(${PROJECT_SOURCE_DIR}/cmake/library-config.cmake.in ${made}/${name}-config.cmake
     INSTALL_DESTINATION ${package_dir})
   write_basic_package_version_file(${made}/${name}-config-version.cmake COMPATIBILITY SameMajorVersion)
   install(FILES ${made}/${name}.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig COMPONENT development)
   install(FILES ${made}/${name}-config.cmake ${made}/${name}-config-version.cmake DESTINATION ${package_dir}
     COMPONENT development)
+endfunction()
+
+# A program that is not installed: it finds the libraries in the build tree. It uses layers or libraries, and goes into a
+# FOLDER of the build tree.
+function(qz_program name)
+  cmake_parse_arguments(arg "" "FOLDER" "SOURCES;USES" ${ARGN})
+  add_executable(${name} ${arg_SOURCES})
+  target_link_libraries(${name} PRIVATE ${arg_USES})
+  set_target_properties(${name} PROPERTIES
+    INSTALL_RPATH ${PROJECT_BINARY_DIR}/lib
+    RUNTIME_OUTPUT_DIRECTORY ${PROJECT_BINARY_DIR}/${arg_FOLDER})
 endfunction()

@@ -1,3 +1,14 @@
+# The message catalog: the texts as translators receive them, and the translations, which ./dev catalog checks.
+if(Python3_FOUND)
+  set(catalog_source ${PROJECT_BINARY_DIR}/share/qzseclib.msg)
+  file(MAKE_DIRECTORY ${PROJECT_BINARY_DIR}/share)
+  add_custom_command(OUTPUT ${catalog_source}
+    COMMAND Python3::Interpreter -B ${PROJECT_SOURCE_DIR}/tools/catalog.py write > ${catalog_source}
+    DEPENDS ${PROJECT_SOURCE_DIR}/tools/catalog.py ${PROJECT_SOURCE_DIR}/security/msg/qzseclib_msg.h VERBATIM)
+  add_custom_target(catalog ALL DEPENDS ${catalog_source})
+  install(FILES ${catalog_source} DESTINATION ${CMAKE_INSTALL_DATADIR}/${PROJECT_NAME} COMPONENT development)
+endif()
+
 # Compiles the translations for catopen. Under /usr, its default search finds LANGUAGE/LC_MESSAGES in every locale of the
 # language, whatever the code set; elsewhere NLSPATH must name the folder. catgets converts nothing, so locales of an
 # older code set get a catalog in that code set under their own names, which are searched first.

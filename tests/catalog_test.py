@@ -17,6 +17,7 @@ TRANSLATIONS = [  # a text, its translation, arguments, status and what is then 
     (85, "%5$s|%1$s%4$s|%3$s%%|%2$c\\n", ["-v", "-f", "a"], 0, "rw|alice|unix%|u\n"),
     (80, "\xc3\xa9\\n", ["-x"], 4, UNKNOWN_X + message(147) + "\xc3\xa9\n\n"),
 ]
+CHECKER = TABLE.parents[2] / "tools" / "catalog.py"
 GERMAN = (TABLE.parents[2] / "translations" / "de.msg").read_text("utf-8")
 BROKEN = [  # a message of the German source, what stands in its place, and what is said of that line
     (81, '80 "?\\n"', "message 80 stands at line 6 already"), (82, '82"?\\n"', "a blank and a text must follow the id"),
@@ -101,7 +102,7 @@ class Catalog(CommandCase):
         complaints += [f"{broken.count(chr(10))}: message {number} is missing" for number in (81, 84)]
         for source, told in ((GERMAN, []), (SOURCE, []), (broken, complaints)):
             path = self.write("de.msg", source.encode())
-            done = subprocess.run([BUILD / "tools/check_catalog", path], stdout=subprocess.PIPE, check=False)
+            done = subprocess.run([sys.executable, "-B", CHECKER, "check", path], stdout=subprocess.PIPE, check=False)
             self.assertEqual(done.stdout.decode().replace(path + ":", "").splitlines(), told)
             self.assertEqual(done.returncode, int(told != []))
 

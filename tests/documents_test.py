@@ -176,9 +176,14 @@ class Documents(unittest.TestCase):
         self.assertIn('"id":84', (self.dir / "build/trace.jsonl").read_text())  # an answer of sec__single_acle_perm
 
     def test_table_of_trace_points(self):
-        calls = re.findall(r"trace_(exit|entry|release_exit|id|data|elapsed|arguments)\((\d+)", "".join(
-            path.read_text() for path in (SOURCE / "security").rglob("*.cpp")))
-        recorded = {int(number) + more for how, number in calls for more in range(1 + (how == "exit"))}
+        declared = (SOURCE / "security/ACL/lib/trace_points.h").read_text()
+        recorded = set(map(int, re.findall(r"(?:trace|timed)_point<(\d+)", declared)))
+        operations = re.findall(r"traced_operation<\s*(\d+),\s+\w+,\s+with_(\w+)<.*?leaves_(\w+)", declared, re.S)
+        for entry, arguments, leaving in operations:
+            entered = int(entry)
+            left = entered + {"arguments": 3, "acl_and": 5}[arguments]
+            recorded.update(range(entered, left, 2))
+            recorded.update(range(left, left + {"bare": 1, "result": 2, "outputs": 3}[leaving]))
         self.assertEqual(recorded, set(map(int, re.findall(r"\*\*(\d+)\*\*", DOCS[SOURCE / "docs/tracing.md"]))))
 
     def test_manual_is_sound_and_has_every_function_and_option(self):

@@ -108,7 +108,7 @@ TEST(entries, are_made_from_sound_parameters) {
 
 // An internal failure names the line of the call that failed.
 TEST(entries, tell_where_a_conversion_failed) {
-    std::ifstream file(QZ_SOURCES "/security/ACL/lib/qzacl_utils.cpp");
+    std::ifstream file(QZ_SOURCES "/security/ACL/lib/qzacl_utils/code_set.cpp");
     std::string line;
     int number = 1;
     while (std::getline(file, line) && line.find("cu_iconv_str_1(") == std::string::npos) ++number;

@@ -3,10 +3,10 @@
 #include "bulk_aclfile.h"
 
 #include "base/owned.h"
+#include "print_recorded.h"
 #include "qzacl_acl/acl_text.h"
 #include "qzacl_acl/cache_file.h"
 #include "qzacl_acl/compile.h"
-#include "qzacl_acl/dump.h"
 #include "qzacl_acl/file_name.h"
 #include "qzacl_acl/trees.h"
 #include "report.h"
@@ -103,13 +103,12 @@ private:
 
 int compile_and_cache(const qz::vetted_file &file, const sec_acltree_array &trees,
                       const qz::text_origin &origin) {
-    constexpr int even_when_current = 1;
     sec_acl_buffer_t buffer = {};
     if (const int result = sec__acltrees_to_acl(trees.trees(), &buffer); result != SEC_S_OK)
         return result;
     const qz::owned<void> buffer_owner(buffer.data);
     const held_signals until_cache_is_whole;
-    return sec__cache_aclbuffer(file.path.text, &buffer, even_when_current, origin);
+    return sec__cache_aclbuffer(file.path.text, &buffer, qz::cache_rewriting::always, origin);
 }
 
 } // namespace

@@ -1,6 +1,8 @@
 // Registration of the trace component and the category table that it is registered with.
 #include "qzacl_trace.h"
 
+#include "trace_points.h"
+
 std::uint8_t acl__trace_detail_levels[qz::trace_category_count] = {};
 pthread_once_t acl__trace_register_once = PTHREAD_ONCE_INIT;
 bool acl__trace_is_registered = false;
@@ -42,7 +44,7 @@ int acl__trace_register_component() {
         &acl__trace_detail_levels[static_cast<std::size_t>(qz::trace_category::perf)], __ATOMIC_RELAXED);
     if (perf_level_is_recorded(level)) {
         ask_about_trace_file();
-        qz::trace_data(0, qz::number(level));
+        qz::point::registered.record(level);
     }
     __atomic_store_n(&acl__trace_is_registered, true, __ATOMIC_RELEASE);
     return result;

@@ -1,17 +1,19 @@
-// Trace points of the library: registration, the level tests, and the records of operations and timings. A
-// point that is switched off costs a once-guard and a comparison of one byte; nothing is measured for it.
+// Tracing: registration, the level tests, and how points, operations and timings are described and recorded. A point
+// that is switched off costs a once-guard and a comparison of one byte; nothing is measured for it. The points
+// themselves are in trace_points.h.
 #ifndef QZACL_TRACE_H
 #define QZACL_TRACE_H
 
 #include "qz/cu.h"
 #include "qz/tr.h"
+#include "trace_items.h"
 
 #include <cstddef>
 #include <cstdint>
-#include <cstring>
 #include <pthread.h>
 #include <string_view>
 #include <tuple>
+#include <type_traits>
 
 namespace qz {
 
@@ -42,85 +44,59 @@ inline unsigned trace_level(trace_category category) {
 
 inline bool traces(trace_category category) { return trace_level(category) != 0; }
 
-// One data item of a record: an address and a number of bytes.
-struct trace_item {
-    const void *address;
-    std::size_t length;
+// Records a number with its items, whatever the level.
+template <class... Items>
+void record(int id, const Items &...items) {
+    if constexpr (sizeof...(Items) == 0) {
+        static_cast<void>(tr_record_id_1(trace_component, id));
+    } else {
+        std::apply(
+            [id](auto... parts) {
+                constexpr int count = sizeof...(parts) / 2;
+                static_cast<void>(tr_record_data_1(trace_component, id, count, parts...));
+            },
+            std::tuple_cat(items.parts()...));
+    }
+}
+
+// ---- Points ----
+
+// The levels of a category at which a point is recorded.
+struct traced_at {
+    trace_category category;
+    unsigned first = 1;
+    unsigned last = UINT8_MAX;
+
+    constexpr bool includes(unsigned level) const { return level >= first && level <= last; }
 };
 
-// A string with its NUL, an empty one standing for null.
-inline trace_item item(const char *text) {
-    return text == nullptr ? trace_item{"", 1} : trace_item{text, std::strlen(text) + 1};
+// A point with its items: what is recorded at it must be these, in number and kind.
+template <int Id, traced_at At, class... Items>
+struct trace_point {
+    static constexpr traced_at at = At;
+
+    template <class... Args>
+    static constexpr bool takes = traced::fit<traced::list<Items...>, traced::list<Args...>>;
+
+    template <class... Args>
+    static void record(const Args &...args) {
+        qz::record(Id, Items{args}...);
+    }
+};
+
+template <class Point>
+bool traces(Point) {
+    return Point::at.includes(trace_level(Point::at.category));
 }
 
-// A string whose length is known, with its NUL.
-inline trace_item item(std::string_view text) { return {text.data(), text.size() + 1}; }
-
-// A string in an array that a caller filled: no more of it than the array, whether a NUL ends it or not.
-template <std::size_t Size>
-trace_item bounded_item(const char (&text)[Size]) {
-    const std::size_t length = strnlen(text, Size);
-    return {text, length < Size ? length + 1 : Size};
+// Records a point at its levels.
+template <class Point, class... Args>
+requires(Point::template takes<Args...>) void trace(Point point, const Args &...args) {
+    if (traces(point)) [[unlikely]]
+        Point::record(args...);
 }
 
-// A number by its address, with the width of its type: 4 bytes, or 8 for sizes, pointers and times.
-template <class Number>
-trace_item number(const Number &value) {
-    static_assert(sizeof value == 4 || sizeof value == 8);
-    return {&value, sizeof value};
-}
-
-// Records a bare number.
-inline void trace_id(int id) { static_cast<void>(tr_record_id_1(trace_component, id)); }
-
-// Records a number with its items.
-template <class... Items>
-void trace_data(int id, const Items &...items) {
-    std::apply(
-        [id](auto... pairs) {
-            static_cast<void>(
-                tr_record_data_1(trace_component, id, static_cast<int>(sizeof...(Items)), pairs...));
-        },
-        std::tuple_cat(std::make_tuple(items.address, items.length)...));
-}
-
-// The entry point of a public operation: the bare number at level 1, the data record at level 8.
-template <class Record>
-void trace_entry(int entry, const Record &record) {
-    const unsigned level = trace_level(trace_category::api);
-    if (level == 1)
-        trace_id(entry);
-    else if (level == 8)
-        record();
-}
-
-// The exit point of an operation whose success has a data record of its own, numbered two above the exit
-// point.
-template <class Record>
-void trace_exit(int exit, int result, const Record &success) {
-    const unsigned level = trace_level(trace_category::api);
-    if (level == 1)
-        trace_id(exit);
-    else if (level == 8 && result != 0)
-        trace_data(exit + 1, number(result));
-    else if (level == 8)
-        success();
-}
-
-// The exit point of an operation that records its result and nothing else.
-inline void trace_exit(int exit, int result) {
-    const unsigned level = trace_level(trace_category::api);
-    if (level == 1)
-        trace_id(exit);
-    else if (level == 8)
-        trace_data(exit + 1, number(result));
-}
-
-// The exit point of a release operation, recorded at every level.
-inline void trace_release_exit(int exit) {
-    if (traces(trace_category::api))
-        trace_id(exit);
-}
+// ---- Timings ----
 
 inline std::uint64_t read_counter() {
     std::uint64_t counter = 0;
@@ -131,13 +107,168 @@ inline std::uint64_t read_counter() {
 // The time between two counter values, with a nanosecond part that is never negative.
 cu_time_t elapsed_time(std::uint64_t start, std::uint64_t end);
 
-// Records what a step took since `start`, after the items that belong to the point.
+// A point that records what a step took, after the items of its own: ticks, seconds and nanoseconds.
+template <int Id, traced_at At, class... Items>
+struct timed_point {
+    static constexpr traced_at at = At;
+
+    template <class... Args>
+    static constexpr bool takes = traced::fit<traced::list<Items...>, traced::list<Args...>>;
+
+    template <class... Args>
+    static void record_since(std::uint64_t start, const Args &...args) {
+        const std::uint64_t end = read_counter();
+        const cu_time_t time = elapsed_time(start, end);
+        record(Id, Items{args}..., traced::number{end - start}, traced::number{time.seconds},
+               traced::number{time.nanoseconds});
+    }
+};
+
+// Times a step from here to stop(), at the levels of its point. An `is_wanted` of false switches it off.
+template <auto Point>
+class trace_timer {
+public:
+    explicit trace_timer(bool is_wanted = true)
+        : is_running_(is_wanted && traces(Point)), start_(is_running_ ? read_counter() : 0) {}
+
+    template <class... Args>
+    requires(decltype(Point)::template takes<Args...>) void stop(const Args &...args) const {
+        if (is_running_) [[unlikely]]
+            Point.record_since(start_, args...);
+    }
+
+    bool is_running() const { return is_running_; }
+
+private:
+    bool is_running_;
+    std::uint64_t start_;
+};
+
+// ---- Operations ----
+
+// The recorded error when an operation is entered.
+enum class error_at_entry { cleared, kept };
+
+// What an operation records of its arguments at level 8.
 template <class... Items>
-void trace_elapsed(int id, std::uint64_t start, const Items &...items) {
-    const std::uint64_t end = read_counter();
-    const std::uint64_t ticks = end - start;
-    const cu_time_t time = elapsed_time(start, end);
-    trace_data(id, items..., number(ticks), number(time.seconds), number(time.nanoseconds));
+struct with_arguments {
+    static constexpr int numbers = 1;
+
+    template <class... Args>
+    static constexpr bool takes = traced::fit<traced::list<Items...>, traced::list<Args...>>;
+
+    template <class... Args>
+    static void record(int id, const Args &...args) {
+        qz::record(id, Items{args}...);
+    }
+};
+
+// The same of an operation on an ACL, given first: where there is none, its address is recorded under a number of its
+// own, in place of its bytes.
+template <class... Items>
+struct with_acl_and {
+    static constexpr int numbers = 2;
+
+    template <class... Args>
+    static constexpr bool takes =
+        traced::fit<traced::list<traced::acl_bytes, Items...>, traced::list<Args...>>;
+
+    template <class... Args>
+    static void record(int id, const sec_acl_buffer_t *acl, const Args &...args) {
+        if (acl == nullptr)
+            qz::record(id, traced::address{acl}, Items{args}...);
+        else
+            qz::record(id + 2, traced::acl_bytes{acl}, Items{args}...);
+    }
+};
+
+// What it records when it is left. A release: the number of leaving at every level.
+struct leaves_bare {};
+// The result.
+struct leaves_result {};
+// The result, and after success the outputs.
+template <class... Items>
+struct leaves_outputs {
+    template <class... Args>
+    static constexpr bool takes = traced::fit<traced::list<Items...>, traced::list<Args...>>;
+
+    template <class... Args>
+    static void record(int id, int result, const Args &...args) {
+        qz::record(id, traced::number{result}, Items{args}...);
+    }
+};
+
+// A public operation. All of its numbers follow from that of entering it: that of its arguments is two above, and
+// another one two above that where there are two; then leaving, failure and success in a row.
+template <int Entry, error_at_entry Error, class Arguments, class Leaving>
+struct traced_operation {
+    using arguments = Arguments;
+    using leaving = Leaving;
+    static constexpr bool clears_error = Error == error_at_entry::cleared;
+    static constexpr int entry = Entry;
+    static constexpr int entry_arguments = entry + 2;
+    static constexpr int exit = entry + 2 * Arguments::numbers + 1;
+    static constexpr int exit_result = exit + 1;
+    static constexpr int exit_success = exit + 2;
+};
+
+inline constexpr unsigned bare_level = 1; // of the API category: numbers without items
+inline constexpr unsigned full_level = 8; // arguments and results instead
+
+template <class Operation, class... Args>
+void trace_entry(Operation, const std::tuple<Args &...> &arguments) {
+    const unsigned level = trace_level(trace_category::api);
+    if (level == 0) [[likely]]
+        return;
+    if (level == bare_level)
+        record(Operation::entry);
+    else if (level == full_level)
+        std::apply(
+            [](const auto &...args) { Operation::arguments::record(Operation::entry_arguments, args...); },
+            arguments);
+}
+
+// `outputs` gives a tuple of the outputs, and is asked after success alone.
+template <class Operation, class Outputs>
+void trace_exit(Operation, int result, const Outputs &outputs) {
+    using leaving = typename Operation::leaving;
+    const unsigned level = trace_level(trace_category::api);
+    if (level == 0) [[likely]]
+        return;
+    if (level == bare_level || std::is_same_v<leaving, leaves_bare>) {
+        record(Operation::exit);
+    } else if (level == full_level) {
+        if constexpr (!std::is_same_v<Outputs, std::nullptr_t>) {
+            if (result == 0) {
+                std::apply(
+                    [result](const auto &...args) {
+                        static_assert(leaving::template takes<std::remove_cvref_t<decltype(args)>...>);
+                        leaving::record(Operation::exit_success, result, args...);
+                    },
+                    outputs());
+                return;
+            }
+        }
+        record(Operation::exit_result, traced::number{result});
+    }
+}
+
+// Runs a public operation: records that it is entered, clears the recorded error where it does, runs the body and
+// records its result.
+template <class Operation, class... Args, class Body, class Outputs = std::nullptr_t>
+requires(Operation::arguments::template takes<std::remove_cv_t<Args>...>) int run(
+    Operation operation, const std::tuple<Args &...> &arguments, const Body &body,
+    const Outputs &outputs = nullptr) {
+    static_assert(std::is_same_v<Outputs, std::nullptr_t> ==
+                      (std::is_same_v<typename Operation::leaving, leaves_bare> ||
+                       std::is_same_v<typename Operation::leaving, leaves_result>),
+                  "outputs are given where the operation records them");
+    trace_entry(operation, arguments);
+    if constexpr (Operation::clears_error)
+        cu_set_no_error_1();
+    const int result = body();
+    trace_exit(operation, result, outputs);
+    return result;
 }
 
 } // namespace qz

@@ -3,7 +3,7 @@
 
 #include "base/open_file.h"
 #include "qzacl_acl/entry_parser.h"
-#include "qzacl_trace.h"
+#include "trace_points.h"
 
 #include <cerrno>
 #include <fcntl.h>
@@ -31,27 +31,24 @@ namespace {
 int open_and_read(const vetted_file &file, const vetted_file *text_of_cache, const acl_file_use &use,
                   file_bytes &bytes) {
     const char *path = file.path.text;
-    const bool traces_steps = use.is_traced && traces(trace_category::info);
-    const unsigned perf_level = use.is_traced ? trace_level(trace_category::perf) : 0;
-    if (traces_steps)
-        trace_data(121, item(path));
-    const std::uint64_t start = perf_level == 1 || perf_level == 2 ? read_counter() : 0;
+    if (use.is_traced)
+        trace(point::opening, path);
+    const trace_timer<point::reading_file> reading(use.is_traced);
+    const trace_timer<point::opening_file> opening(use.is_traced);
     // A file that turned into a FIFO must not block.
     descriptor opened = open_file(path, O_RDONLY | O_NONBLOCK);
     if (!opened) {
         const int error = errno;
-        if (traces_steps)
-            trace_data(122, item(path), number(error));
+        if (use.is_traced)
+            trace(point::cannot_open, path, error);
         return report(use.cannot_open, path, error);
     }
-    if (perf_level == 2)
-        trace_elapsed(4, start, item(path));
+    opening.stop(path);
     if (text_of_cache != nullptr && !cache_has_entries_of_text(*text_of_cache, file, opened.get()))
         return SEC_S_ADVISORY;
     const int result = lock_and_read(path, opened, file.status, bytes);
     opened.close();
-    if (perf_level == 1)
-        trace_elapsed(2, start, item(path));
+    reading.stop(path);
     return result;
 }
 

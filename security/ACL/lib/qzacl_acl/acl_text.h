@@ -6,7 +6,7 @@
 #include "qzacl_acl/cache_file.h"
 #include "qzacl_acl/entry_parser.h"
 #include "qzacl_acl/file_name.h"
-#include "qzacl_utils.h"
+#include "qzacl_utils/file_bytes.h"
 #include "report.h"
 
 #include <cstddef>

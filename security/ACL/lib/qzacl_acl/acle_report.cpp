@@ -1,7 +1,7 @@
 // What trees and packed sub-ACLs tell alike of an entry that they hold already, or do not hold.
 #include "qzacl_acl/acle_report.h"
 
-#include "qzacl_trace.h"
+#include "trace_points.h"
 #include "report.h"
 
 int sec__report_duplicate(const qz::acle_view &acle) {
@@ -15,7 +15,7 @@ int sec__report_duplicate(const qz::acle_view &acle) {
 }
 
 void sec__trace_replacement(const qz::acle_view &acle) {
-    if (!qz::traces(qz::trace_category::info))
+    if (!qz::traces(qz::point::entry_replaced))
         return;
     const char *type = "group";
     switch (acle.type) {
@@ -34,8 +34,9 @@ void sec__trace_replacement(const qz::acle_view &acle) {
     default:
         break;
     }
-    qz::trace_data(113, qz::item(type), qz::item(qz::is_single_type(acle.type) ? "<none>" : acle.mechanism),
-                   qz::item(acle.type == SEC_ACLE_USER ? acle.identity : "<none>"));
+    constexpr std::string_view none = "<none>";
+    qz::point::entry_replaced.record(type, qz::is_single_type(acle.type) ? none : acle.mechanism,
+                                     acle.type == SEC_ACLE_USER ? acle.identity : none);
 }
 
 int sec__acle_not_found(int code, const qz::acle_view &acle) {

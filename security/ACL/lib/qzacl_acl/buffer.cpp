@@ -5,8 +5,8 @@
 #include "libqz_cu/posix_fold.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/entry.h"
-#include "qzacl_trace.h"
 #include "report.h"
+#include "trace_points.h"
 
 namespace {
 
@@ -53,22 +53,12 @@ int sec_create_empty_acl(sec_acl_buffer_t *acl) {
 }
 
 int sec_read_acl_from_data(int length, const void *data, sec_acl_buffer_t *acl) {
-    qz::trace_entry(15, [&] { qz::trace_data(17, qz::number(length), qz::number(data), qz::number(acl)); });
-    cu_set_no_error_1();
-    const int result = read_checked(length, data, acl);
-    qz::trace_exit(18, result);
-    return result;
+    return qz::run(qz::operation::read_acl_from_data, std::tie(length, data, acl),
+                   [&] { return read_checked(length, data, acl); });
 }
 
 int sec_release_acl(sec_acl_buffer_t *acl) {
-    qz::trace_entry(70, [&] {
-        const sec_acl_buffer_t shown = acl == nullptr ? sec_acl_buffer_t{} : *acl;
-        qz::trace_data(72, qz::number(acl), qz::number(shown.length), qz::number(shown.data));
-    });
-    cu_set_no_error_1();
-    const int result = release_checked(acl);
-    qz::trace_release_exit(73);
-    return result;
+    return qz::run(qz::operation::release_acl, std::tie(acl), [&] { return release_checked(acl); });
 }
 
 int sec__find_subacl(const sec_acl_buffer_t *acl, std::uint8_t type, const char *mechanism,

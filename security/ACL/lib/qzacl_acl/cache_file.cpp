@@ -4,9 +4,9 @@
 #include "base/open_file.h"
 #include "base/owned.h"
 #include "qzacl_acl/posix_acl.h"
-#include "qzacl_trace.h"
-#include "qzacl_utils.h"
+#include "qzacl_utils/file_bytes.h"
 #include "report.h"
+#include "trace_points.h"
 
 #include <cerrno>
 #include <csignal>
@@ -115,7 +115,7 @@ public:
 
     int name_cache();
     int examine_text() { return text_.examine(aclfname_, origin_); }
-    int examine_cache(bool even_when_current);
+    int examine_cache(qz::cache_rewriting rewriting);
     int replace(const sec_acl_buffer_t &acl);
 
 private:
@@ -138,24 +138,21 @@ int cache_writer::name_cache() {
     const std::size_t length = std::strlen(aclfname_);
     if (length < qz::uncached_path_length && qz::make_cache_name(aclfname_, cache_name_))
         return SEC_S_OK;
-    const int shown_length = qz::shown_size(length);
-    if (qz::traces(qz::trace_category::errors))
-        qz::trace_data(108, qz::item(aclfname_), qz::number(shown_length));
+    qz::trace(qz::point::name_too_long_for_cache, aclfname_, qz::shown_size(length));
     return qz::report(SEC_S_FILE_ERROR, qz::msg::name_too_long_for_cache, aclfname_);
 }
 
-int cache_writer::examine_cache(bool even_when_current) {
+int cache_writer::examine_cache(qz::cache_rewriting rewriting) {
     is_new_ = stat(cache_name_.text, &cache_) != 0;
     if (is_new_) {
         if (errno != ENOENT)
             return qz::query_failed(cache_name_.text, "stat()", aclfname_, errno);
-        if (qz::traces(qz::trace_category::info))
-            qz::trace_data(110, qz::item(cache_name_.text));
+        qz::trace(qz::point::cache_is_new, cache_name_.text);
         return SEC_S_OK;
     }
     if (const int result = text_.vet_cache(aclfname_, cache_name_.text, cache_); result != SEC_S_OK)
         return result;
-    if (!even_when_current && text_.status.st_mtime < cache_.st_mtime)
+    if (rewriting == qz::cache_rewriting::unless_current && text_.status.st_mtime < cache_.st_mtime)
         return SEC_S_ADVISORY;
     return SEC_S_OK;
 }
@@ -174,7 +171,6 @@ int cache_writer::vet_opened_cache(int fd) const {
 }
 
 int cache_writer::replace(const sec_acl_buffer_t &acl) {
-    constexpr int lock_for_replacing = 2;
     made_file placeholder(cache_name_.text, open_cache());
     if (!placeholder)
         return cannot_open(cache_name_.text);
@@ -182,7 +178,7 @@ int cache_writer::replace(const sec_acl_buffer_t &acl) {
         placeholder.keep();
     int result = vet_opened_cache(placeholder.fd());
     if (result == SEC_S_OK)
-        result = acl__lock_acl_file(cache_name_.text, placeholder.fd(), lock_for_replacing);
+        result = acl__lock_acl_file(cache_name_.text, placeholder.fd(), qz::lock_purpose::replacing);
     if (result == SEC_S_OK)
         result = write_and_rename(acl);
     if (result == SEC_S_OK)
@@ -233,11 +229,10 @@ int cache_writer::protect(int fd) const {
 
 } // namespace
 
-int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, int force,
+int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, qz::cache_rewriting rewriting,
                          const qz::text_origin &origin) {
     if (acl->length == 0) {
-        if (qz::trace_level(qz::trace_category::info) == 1)
-            qz::trace_data(107, qz::item(aclfname));
+        qz::trace(qz::point::nothing_to_cache, aclfname);
         return SEC_S_ADVISORY;
     }
     cache_writer writer(aclfname, origin);
@@ -245,7 +240,7 @@ int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, int 
     if (result == SEC_S_OK)
         result = writer.examine_text();
     if (result == SEC_S_OK)
-        result = writer.examine_cache(force != 0);
+        result = writer.examine_cache(rewriting);
     if (result == SEC_S_OK)
         result = writer.replace(*acl);
     return result;

@@ -2,9 +2,9 @@
 #include "qzacl_acl/cache_vetting.h"
 
 #include "qz/acl.h"
-#include "qzacl_trace.h"
-#include "qzacl_utils.h"
+#include "qzacl_utils/file_bytes.h"
 #include "report.h"
+#include "trace_points.h"
 
 #include <cerrno>
 
@@ -37,27 +37,21 @@ bool is_text_of(const struct stat &status, const qz::text_origin &origin) {
 
 int owner_differs(const char *aclfname, const char *cache_name, const struct stat &text,
                   const struct stat &cache) {
-    if (qz::traces(qz::trace_category::errors))
-        qz::trace_data(111, qz::item(cache_name), qz::number(cache.st_uid), qz::number(cache.st_gid),
-                       qz::number(text.st_uid), qz::number(text.st_gid));
+    qz::trace(qz::point::cache_owner_differs, cache_name, cache.st_uid, cache.st_gid, text.st_uid,
+              text.st_gid);
     return qz::report(SEC_S_FILE_ERROR, qz::msg::cache_owner_differs, aclfname);
 }
 
 int mode_differs(const char *aclfname, const char *cache_name, const struct stat &text,
                  const struct stat &cache) {
-    const std::uint32_t cache_bits = cache.st_mode & qz::permission_bits;
-    const std::uint32_t text_bits = text.st_mode & qz::permission_bits;
-    if (qz::traces(qz::trace_category::errors))
-        qz::trace_data(111, qz::item(cache_name), qz::number(cache_bits), qz::number(text_bits));
+    qz::trace(qz::point::cache_mode_differs, cache_name, cache.st_mode & qz::permission_bits,
+              text.st_mode & qz::permission_bits);
     return qz::report(SEC_S_FILE_ERROR, qz::msg::cache_mode_differs, aclfname);
 }
 
 void trace_unlike(const qz::vetted_file &text, const qz::vetted_file &cache) {
-    if (qz::traces(qz::trace_category::info))
-        qz::trace_data(120, qz::item(text.path.text), qz::number(text.status.st_uid),
-                       qz::number(text.status.st_gid), qz::number(cache.status.st_uid),
-                       qz::number(cache.status.st_gid), qz::number(text.status.st_mode),
-                       qz::number(cache.status.st_mode));
+    qz::trace(qz::point::cache_unlike_text, text.path.text, text.status.st_uid, text.status.st_gid,
+              cache.status.st_uid, cache.status.st_gid, text.status.st_mode, cache.status.st_mode);
 }
 
 } // namespace
@@ -70,20 +64,15 @@ text_origin::text_origin(const struct stat &vetted) : file(vetted), time() {
 }
 
 bool cache_is_current(const vetted_file &text, vetted_file &cache) {
-    const bool is_traced = traces(trace_category::info);
     if (!make_cache_name(text.path.text, cache.path))
         return false;
-    if (is_traced)
-        trace_data(117, item(cache.path.text));
+    trace(point::examining_cache, cache.path.text);
     if (stat(cache.path.text, &cache.status) != 0) {
-        const int error = errno;
-        if (is_traced)
-            trace_data(118, item(cache.path.text), number(error));
+        trace(point::cache_not_examined, cache.path.text, errno);
         return false;
     }
     if (cache.status.st_size == 0 || cache.status.st_mtime <= text.status.st_mtime) {
-        if (is_traced)
-            trace_data(119, item(cache.path.text));
+        trace(point::cache_not_current, cache.path.text);
         return false;
     }
     if (has_same_owner(text.status, cache.status) && has_same_permissions(text.status, cache.status))
@@ -135,8 +124,7 @@ int text_protection::vet_opened_cache(const char *aclfname, const char *cache_na
 }
 
 int query_failed(const char *queried, const char *call, const char *aclfname, int error) {
-    if (traces(trace_category::errors))
-        trace_data(109, item(queried), item(call), number(error));
+    trace(point::query_failed, queried, call, error);
     return report(SEC_S_FILE_ERROR, msg::bad_file_name, aclfname, error);
 }
 

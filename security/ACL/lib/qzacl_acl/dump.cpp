@@ -1,9 +1,8 @@
 // Readable printing of entries, trees and buffers. Every line is a message of the catalog, recorded, printed
 // and cleared; nothing stays recorded behind it.
-#include "qzacl_acl/dump.h"
-
 #include "base/owned.h"
 #include "base/uncancelled.h"
+#include "print_recorded.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/entry.h"
@@ -53,23 +52,6 @@ void dump_subacl(qz::byte_span bytes, const char *indentation) {
 }
 
 } // namespace
-
-namespace qz {
-
-bool print_recorded(std::FILE *stream, const char *ending) {
-    cu_error_t *error = nullptr;
-    char *text = nullptr;
-    const bool has_text = cu_get_error_1(&error) == SEC_S_OK && cu_get_errmsg_1(error, &text) == SEC_S_OK;
-    if (has_text) {
-        std::fputs(text, stream);
-        std::fputs(ending, stream);
-    }
-    cu_rel_error_1(error);
-    cu_rel_errmsg_1(text);
-    return has_text;
-}
-
-} // namespace qz
 
 void sec__dump_acle(const sec_acle_t *acle, const sec_perm_set_t *set, const char *indentation) {
     if (acle == nullptr)

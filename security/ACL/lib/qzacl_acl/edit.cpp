@@ -12,8 +12,8 @@
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/packed_identity.h"
 #include "qzacl_acl/tree.h"
-#include "qzacl_trace.h"
 #include "report.h"
+#include "trace_points.h"
 
 namespace {
 
@@ -381,23 +381,9 @@ int delete_checked(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
     return delete_by_tree(*acle, stored, *acl);
 }
 
-// The entry and the descriptor, as the entry records of all edits show them.
-void trace_arguments(int id, const sec_acle_t *acle, const sec_acl_buffer_t *acl) {
-    const std::uint32_t type = acle == nullptr ? 0 : acle->type;
-    const std::uint32_t mask = acle == nullptr ? 0 : acle->perm_mask;
-    const sec_acl_buffer_t shown = acl == nullptr ? sec_acl_buffer_t{} : *acl;
-    qz::trace_data(id, qz::number(acle), qz::number(type), qz::number(mask),
-                   acle == nullptr ? qz::item(nullptr) : qz::bounded_item(acle->mechanism),
-                   qz::item(acle == nullptr ? nullptr : acle->identity), qz::number(acl),
-                   qz::number(shown.length), qz::number(shown.data));
-}
-
 int sec__add_acle_to_acl(int report_duplicates, const sec_acle_t *acle, sec_acl_buffer_t *acl) {
-    qz::trace_entry(60, [&] { trace_arguments(62, acle, acl); });
-    cu_set_no_error_1();
-    const int result = add_checked(acle, report_duplicates, acl);
-    qz::trace_exit(63, result);
-    return result;
+    return qz::run(qz::operation::add_acle_to_acl, std::tie(acle, acl),
+                   [&] { return add_checked(acle, report_duplicates, acl); });
 }
 
 } // namespace
@@ -411,9 +397,6 @@ int sec_add_acle_to_acl2(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
 }
 
 int sec_del_acle_from_acl(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
-    qz::trace_entry(65, [&] { trace_arguments(67, acle, acl); });
-    cu_set_no_error_1();
-    const int result = delete_checked(acle, acl);
-    qz::trace_exit(68, result);
-    return result;
+    return qz::run(qz::operation::del_acle_from_acl, std::tie(acle, acl),
+                   [&] { return delete_checked(acle, acl); });
 }

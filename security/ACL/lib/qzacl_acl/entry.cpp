@@ -2,9 +2,9 @@
 #include "qzacl_acl/entry.h"
 
 #include "base/owned.h"
-#include "qzacl_trace.h"
-#include "qzacl_utils.h"
+#include "qzacl_utils/code_set.h"
 #include "report.h"
+#include "trace_points.h"
 
 #include <arpa/inet.h>
 #include <cstring>
@@ -145,6 +145,13 @@ int display_checked(const sec_acle_t *acle, char **mechanism, char **identity) {
     return SEC_S_OK;
 }
 
+void release_entries(sec_aclelist_t &list) {
+    for (std::int32_t index = 0; index < list.count; ++index)
+        sec_release_acle(list.acles[index]);
+    std::free(list.acles);
+    list = {};
+}
+
 } // namespace
 
 int sec__create_acle(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
@@ -170,52 +177,24 @@ int sec__create_acle(std::uint8_t type, std::uint32_t perm_mask, const char *mec
 
 int sec_create_acle(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
                     sec_acle_t **acle) {
-    qz::trace_entry(40, [&] {
-        const std::uint32_t shown_type = type;
-        qz::trace_data(42, qz::number(shown_type), qz::number(perm_mask), qz::item(mechanism),
-                       qz::item(identity), qz::number(acle));
-    });
-    cu_set_no_error_1();
-    const int result = create_checked(type, perm_mask, mechanism, identity, acle);
-    qz::trace_exit(43, result);
-    return result;
+    return qz::run(qz::operation::create_acle, std::tie(type, perm_mask, mechanism, identity, acle),
+                   [&] { return create_checked(type, perm_mask, mechanism, identity, acle); });
 }
 
 int sec_display_acle_id(const sec_acle_t *acle, char **mechanism, char **identity) {
-    qz::trace_entry(49, [&] {
-        const std::uint32_t type = acle == nullptr ? 0 : acle->type;
-        const std::uint32_t mask = acle == nullptr ? 0 : acle->perm_mask;
-        qz::trace_data(51, qz::number(acle), qz::number(type), qz::number(mask),
-                       acle == nullptr ? qz::item(nullptr) : qz::bounded_item(acle->mechanism),
-                       qz::item(acle == nullptr ? nullptr : acle->identity), qz::number(mechanism),
-                       qz::number(identity));
-    });
-    cu_set_no_error_1();
-    const int result = display_checked(acle, mechanism, identity);
-    qz::trace_exit(52, result, [&] {
-        qz::trace_data(54, qz::number(result), qz::item(*mechanism), qz::item(*identity));
-    });
-    return result;
+    return qz::run(
+        qz::operation::display_acle_id, std::tie(acle, mechanism, identity),
+        [&] { return display_checked(acle, mechanism, identity); },
+        [&] { return std::tie(*mechanism, *identity); });
 }
 
 void sec__trace_release(const sec_acle_t *acle) {
-    qz::trace_entry(45, [&] {
-        const std::uint32_t type = acle == nullptr ? 0 : acle->type;
-        const std::uint32_t mask = acle == nullptr ? 0 : acle->perm_mask;
-        qz::trace_data(47, qz::number(acle), qz::number(type), qz::number(mask),
-                       acle == nullptr ? qz::item(nullptr) : qz::bounded_item(acle->mechanism),
-                       qz::item(acle == nullptr ? nullptr : acle->identity));
-    });
-    qz::trace_release_exit(48);
+    qz::run(qz::operation::release_acle, std::tie(acle), [] { return SEC_S_OK; });
 }
 
 void sec__trace_release(const void *place, const qz::acle_view &acle) {
-    qz::trace_entry(45, [&] {
-        const std::uint32_t type = acle.type;
-        qz::trace_data(47, qz::number(place), qz::number(type), qz::number(acle.perm_mask),
-                       qz::item(acle.mechanism), qz::item(acle.identity));
-    });
-    qz::trace_release_exit(48);
+    const qz::traced::acle shown(place, acle.type, acle.perm_mask, acle.mechanism, acle.identity);
+    qz::run(qz::operation::release_acle, std::tie(shown), [] { return SEC_S_OK; });
 }
 
 void sec_release_acle(sec_acle_t *acle) {
@@ -227,15 +206,9 @@ void sec_release_acle(sec_acle_t *acle) {
 }
 
 void sec_release_aclelist(sec_aclelist_t *list) {
-    qz::trace_entry(36, [&] {
-        const std::int32_t count = list == nullptr ? 0 : list->count;
-        qz::trace_data(38, qz::number(list), qz::number(count));
+    qz::run(qz::operation::release_aclelist, std::tie(list), [&] {
+        if (list != nullptr && list->count != 0 && list->acles != nullptr)
+            release_entries(*list);
+        return SEC_S_OK;
     });
-    if (list != nullptr && list->count != 0 && list->acles != nullptr) {
-        for (std::int32_t index = 0; index < list->count; ++index)
-            sec_release_acle(list->acles[index]);
-        std::free(list->acles);
-        *list = {};
-    }
-    qz::trace_release_exit(39);
 }

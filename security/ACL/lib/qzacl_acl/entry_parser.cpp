@@ -11,8 +11,8 @@
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/identity_order.h"
 #include "qzacl_acl/permission.h"
-#include "qzacl_trace.h"
 #include "report.h"
+#include "trace_points.h"
 
 #include <algorithm>
 #include <bit>
@@ -202,8 +202,7 @@ int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size
 
     int result = SEC_S_OK;
     if (length > qz::line_length_max) {
-        if (qz::traces(qz::trace_category::errors))
-            qz::trace_data(115, qz::number(*line), qz::number(length));
+        qz::trace(qz::point::line_too_long, *line, length);
         result = qz::report(SEC_S_FILE_ERROR, qz::msg::line_too_long, shown_line);
     } else {
         result = parse_line(line_tokens(begin, end, limit), set == nullptr ? acl__default_perm_set : *set,

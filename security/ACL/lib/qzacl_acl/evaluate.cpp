@@ -6,8 +6,8 @@
 #include "qzacl_acl/id_handlers.h"
 #include "qzacl_acl/packed_identity.h"
 #include "qzacl_init.h"
-#include "qzacl_trace.h"
 #include "report.h"
+#include "trace_points.h"
 
 #include <algorithm>
 #include <array>
@@ -258,45 +258,29 @@ int evaluate_groups(const sec_acl_buffer_t *acl, std::int32_t count, const sec_g
 
 int sec__single_acle_perm(const sec_acl_buffer_t *acl, std::uint8_t type, const char *mechanism,
                           const char *subacl_mechanism, const char *identity, std::uint32_t *mask) {
-    qz::trace_entry(79, [&] {
-        const sec_acl_buffer_t shown = acl == nullptr ? sec_acl_buffer_t{} : *acl;
-        const std::uint32_t shown_type = type;
-        qz::trace_data(81, qz::number(acl), qz::number(shown.length), qz::number(shown.data),
-                       qz::number(shown_type), qz::item(mechanism), qz::item(identity), qz::number(mask));
-    });
-    cu_set_no_error_1();
-    pthread_once(&acl__init_once_block, acl__state_init);
-    const bool is_timed = qz::trace_level(qz::trace_category::perf) == 2;
-    const std::uint64_t start = is_timed ? qz::read_counter() : 0;
-
-    single_request request{type, mechanism, identity};
-    const int result = evaluate_single(acl, request, subacl_mechanism, mask);
-
-    if (is_timed) {
-        const std::uint32_t shown_type = type;
-        qz::trace_elapsed(7, start, qz::number(request.walked), qz::number(shown_type), qz::item(mechanism),
-                          qz::item(identity));
-    }
-    qz::trace_exit(82, result, [&] { qz::trace_data(84, qz::number(result), qz::number(*mask)); });
-    return result;
+    return qz::run(
+        qz::operation::single_acle_perm, std::tie(acl, type, mechanism, identity, mask),
+        [&] {
+            pthread_once(&acl__init_once_block, acl__state_init);
+            const qz::trace_timer<qz::point::deciding> timer;
+            single_request request{type, mechanism, identity};
+            const int result = evaluate_single(acl, request, subacl_mechanism, mask);
+            timer.stop(request.walked, type, mechanism, identity);
+            return result;
+        },
+        [&] { return std::tie(*mask); });
 }
 
 int sec__group_acles_perm(const sec_acl_buffer_t *acl, std::int32_t count, const sec_group_ref_t *groups,
                           std::uint32_t *mask) {
-    qz::trace_entry(85, [&] {
-        const sec_acl_buffer_t shown = acl == nullptr ? sec_acl_buffer_t{} : *acl;
-        qz::trace_data(87, qz::number(acl), qz::number(shown.length), qz::number(shown.data),
-                       qz::number(count), qz::number(groups), qz::number(mask));
-    });
-    cu_set_no_error_1();
-    pthread_once(&acl__init_once_block, acl__state_init);
-    const bool is_timed = qz::trace_level(qz::trace_category::perf) == 2;
-    const std::uint64_t start = is_timed ? qz::read_counter() : 0;
-
-    const int result = evaluate_groups(acl, count, groups, mask);
-
-    if (is_timed)
-        qz::trace_elapsed(8, start);
-    qz::trace_exit(88, result, [&] { qz::trace_data(90, qz::number(result), qz::number(*mask)); });
-    return result;
+    return qz::run(
+        qz::operation::group_acles_perm, std::tie(acl, count, groups, mask),
+        [&] {
+            pthread_once(&acl__init_once_block, acl__state_init);
+            const qz::trace_timer<qz::point::deciding_for_groups> timer;
+            const int result = evaluate_groups(acl, count, groups, mask);
+            timer.stop();
+            return result;
+        },
+        [&] { return std::tie(*mask); });
 }

@@ -5,8 +5,8 @@
 #include "base/uncancelled.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_init.h"
-#include "qzacl_trace.h"
 #include "report.h"
+#include "trace_points.h"
 
 #include <cstring>
 
@@ -58,13 +58,10 @@ int register_checked(std::uint32_t kind, const char *mechanism, sec_id_compare_f
 
 int sec__register_id_handler(std::uint32_t kind, const char *mechanism, sec_id_compare_fn handler) {
     const qz::uncancelled until_unlocked;
-    qz::trace_entry(74,
-                    [&] { qz::trace_data(76, qz::number(kind), qz::item(mechanism), qz::number(handler)); });
-    cu_set_no_error_1();
-    pthread_once(&acl__init_once_block, acl__state_init);
-    const int result = register_checked(kind, mechanism, handler);
-    qz::trace_exit(77, result);
-    return result;
+    return qz::run(qz::operation::register_id_handler, std::tie(kind, mechanism, handler), [&] {
+        pthread_once(&acl__init_once_block, acl__state_init);
+        return register_checked(kind, mechanism, handler);
+    });
 }
 
 int sec__get_id_handler(std::uint32_t kind, const char *mechanism, sec_id_compare_fn *handler) {

@@ -4,8 +4,8 @@
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/tree.h"
-#include "qzacl_trace.h"
 #include "report.h"
+#include "trace_points.h"
 
 namespace {
 
@@ -107,31 +107,15 @@ int list_by_type_checked(const sec_acl_buffer_t *acl, std::uint8_t type, const c
 } // namespace
 
 int sec_list_acl(const sec_acl_buffer_t *acl, sec_aclelist_t *list) {
-    qz::trace_entry(20, [&] {
-        if (acl == nullptr)
-            qz::trace_data(22, qz::number(acl), qz::number(list));
-        else
-            qz::trace_data(24, qz::number(acl->length), qz::number(acl->data), qz::number(list));
-    });
-    cu_set_no_error_1();
-    const int result = list_checked(acl, list);
-    qz::trace_exit(25, result, [&] { qz::trace_data(27, qz::number(result), qz::number(list->count)); });
-    return result;
+    return qz::run(
+        qz::operation::list_acl, std::tie(acl, list), [&] { return list_checked(acl, list); },
+        [&] { return std::tie(list->count); });
 }
 
 int sec_list_acl_by_type(const sec_acl_buffer_t *acl, std::uint8_t type, const char *mechanism,
                          sec_aclelist_t *list) {
-    qz::trace_entry(28, [&] {
-        const std::uint32_t shown_type = type;
-        if (acl == nullptr)
-            qz::trace_data(30, qz::number(acl), qz::number(shown_type), qz::item(mechanism),
-                           qz::number(list));
-        else
-            qz::trace_data(32, qz::number(acl->length), qz::number(acl->data), qz::number(shown_type),
-                           qz::item(mechanism), qz::number(list));
-    });
-    cu_set_no_error_1();
-    const int result = list_by_type_checked(acl, type, mechanism, list);
-    qz::trace_exit(33, result, [&] { qz::trace_data(35, qz::number(result), qz::number(list->count)); });
-    return result;
+    return qz::run(
+        qz::operation::list_acl_by_type, std::tie(acl, type, mechanism, list),
+        [&] { return list_by_type_checked(acl, type, mechanism, list); },
+        [&] { return std::tie(list->count); });
 }

@@ -1,8 +1,8 @@
 // Permission templates: the default set, and the translation of characters to a mask and back.
 #include "qzacl_acl/permission.h"
 
-#include "qzacl_trace.h"
 #include "report.h"
+#include "trace_points.h"
 
 #include <bit>
 
@@ -61,35 +61,32 @@ int sec__translate_bitmask(std::uint32_t mask, const sec_perm_set_t *set, char *
 }
 
 int sec_translate_perms(const char *text, const sec_perm_set_t *set, std::uint32_t *mask) {
-    qz::trace_entry(91, [&] {
-        qz::trace_data(93, qz::item(text == nullptr ? "<nil>" : text), qz::number(set), qz::number(mask));
-    });
-    int result = SEC_S_OK;
-    if (mask == nullptr) {
-        result = qz::report_bad_parameter("sec_translate_perms", 3, 0);
-    } else {
-        *mask = 0;
-        if (text != nullptr)
-            result = sec__translate_perms(text, set == nullptr ? &acl__default_perm_set : set, mask);
-    }
-    qz::trace_exit(94, result, [&] { qz::trace_data(96, qz::number(result), qz::number(*mask)); });
-    return result;
+    return qz::run(
+        qz::operation::translate_perms, std::tie(text, set, mask),
+        [&] {
+            if (mask == nullptr)
+                return qz::report_bad_parameter("sec_translate_perms", 3, 0);
+            *mask = 0;
+            if (text == nullptr)
+                return SEC_S_OK;
+            return sec__translate_perms(text, set == nullptr ? &acl__default_perm_set : set, mask);
+        },
+        [&] { return std::tie(*mask); });
 }
 
 int sec_translate_bitmask(std::uint32_t mask, const sec_perm_set_t *set, char *out) {
     // Before the entry point, whose record shows the output.
     if (out != nullptr)
         out[0] = '\0';
-    qz::trace_entry(97, [&] {
-        qz::trace_data(99, qz::number(mask), qz::number(set), qz::item(out == nullptr ? "<nil>" : out));
-    });
-    int result = SEC_S_OK;
-    if (out == nullptr) {
-        // The name in this message differs from the operation's; callers match on it as it stands.
-        result = qz::report_bad_parameter("sec_translate_mask", 3, 0);
-    } else if (mask != 0) {
-        result = sec__translate_bitmask(mask, set == nullptr ? &acl__default_perm_set : set, out);
-    }
-    qz::trace_exit(100, result, [&] { qz::trace_data(102, qz::number(result), qz::item(out)); });
-    return result;
+    return qz::run(
+        qz::operation::translate_bitmask, std::tie(mask, set, out),
+        [&] {
+            // The name in this message differs from the operation's; callers match on it as it stands.
+            if (out == nullptr)
+                return qz::report_bad_parameter("sec_translate_mask", 3, 0);
+            if (mask == 0)
+                return SEC_S_OK;
+            return sec__translate_bitmask(mask, set == nullptr ? &acl__default_perm_set : set, out);
+        },
+        [&] { return std::tie(out); });
 }

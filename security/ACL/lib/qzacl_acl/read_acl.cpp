@@ -8,9 +8,9 @@
 #include "qzacl_acl/file_name.h"
 #include "qzacl_acl/trees.h"
 #include "qzacl_acl/validate.h"
-#include "qzacl_trace.h"
-#include "qzacl_utils.h"
+#include "qzacl_utils/file_bytes.h"
 #include "report.h"
+#include "trace_points.h"
 
 namespace {
 
@@ -36,19 +36,20 @@ int convert_and_check(sec_acl_buffer_t &acl) {
 class acl_file_reader {
 public:
     acl_file_reader(const char *username, const sec_perm_set_t *set, std::uint32_t flags)
-        : username_(username), asked_(flags), flags_(flags), text_(set),
-          perf_level_(qz::trace_level(qz::trace_category::perf)),
-          start_(perf_level_ == 1 ? qz::read_counter() : 0) {}
+        : username_(username), asked_(flags), flags_(flags), text_(set) {}
 
     int read(const char *aclfname, sec_acl_buffer_t &out) {
-        return text_.open_again_while_replaced([&] { return read_once(aclfname, out); });
+        const choosing_timer choosing;
+        return text_.open_again_while_replaced([&] { return read_once(aclfname, choosing, out); });
     }
 
     std::uint32_t flags() const { return flags_; }
     std::uint32_t line() const { return text_.line(); }
 
 private:
-    int read_once(const char *aclfname, sec_acl_buffer_t &out);
+    using choosing_timer = qz::trace_timer<qz::point::choosing_file>;
+
+    int read_once(const char *aclfname, const choosing_timer &choosing, sec_acl_buffer_t &out);
     bool read_cache(sec_acl_buffer_t &out);
     int read_text(sec_acl_buffer_t &out);
     int parse(sec_acl_buffer_t &out);
@@ -59,8 +60,6 @@ private:
     std::uint32_t asked_;
     std::uint32_t flags_; // of the attempt at hand
     qz::acl_text text_;
-    unsigned perf_level_;
-    std::uint64_t start_;
     qz::vetted_file acl_;
     qz::vetted_file cache_;
 };
@@ -84,9 +83,8 @@ bool acl_file_reader::read_cache(sec_acl_buffer_t &out) {
 }
 
 int acl_file_reader::parse_lines(sec_acltree_array &trees) {
-    constexpr unsigned every_line = 7; // the Info level above which each line is traced
-    const bool traces_lines = qz::trace_level(qz::trace_category::info) > every_line;
-    const bool may_wait = !traces_lines && perf_level_ != 1; // traces show the line of the failure
+    const bool traces_lines = qz::traces(qz::point::line_read);
+    const bool may_wait = !traces_lines && !qz::traces(qz::point::parsing); // traces show the line of the failure
     qz::parsed_acle entry;
     for (;;) {
         const qz::acl_line line = text_.next(entry);
@@ -94,32 +92,24 @@ int acl_file_reader::parse_lines(sec_acltree_array &trees) {
             return trees.settle(SEC_S_OK);
         if (line == qz::acl_line::bad)
             return trees.settle(text_.failure());
-        if (traces_lines) {
-            const std::uint32_t number = text_.line();
-            const std::uint32_t type = entry.type;
-            const qz::acle_view shown = qz::view_of(entry);
-            qz::trace_data(114, qz::number(number), qz::number(type), qz::item(shown.mechanism),
-                           qz::item(shown.identity), qz::number(entry.perm_mask));
-        }
+        const qz::acle_view acle = qz::view_of(entry);
+        if (traces_lines)
+            qz::point::line_read.record(text_.line(), entry.type, acle.mechanism, acle.identity, entry.perm_mask);
         if (line == qz::acl_line::none)
             continue;
-        const qz::acle_view acle = qz::view_of(entry);
         if (const int added = may_wait ? trees.add_soon(acle) : trees.add(acle); added != SEC_S_OK)
             return added;
     }
 }
 
 int acl_file_reader::parse(sec_acl_buffer_t &out) {
-    const std::uint64_t start = perf_level_ == 1 ? qz::read_counter() : 0;
+    const qz::trace_timer<qz::point::parsing> parsing;
     flags_ &= ~std::uint32_t{SEC_READ_ACL_CONVERT};
     sec_acltree_array trees(text_.all());
     int result = parse_lines(trees);
     if (result == SEC_S_OK && !trees.trees().empty())
         result = sec__acltrees_to_acl(trees.trees(), &out);
-    if (perf_level_ == 1) {
-        const std::uint32_t line = text_.line();
-        qz::trace_elapsed(3, start, qz::item(acl_.path.text), qz::number(line));
-    }
+    parsing.stop(acl_.path.text, text_.line());
     return result;
 }
 
@@ -129,7 +119,8 @@ int acl_file_reader::read_text(sec_acl_buffer_t &out) {
     if (const int result = parse(out); result != SEC_S_OK)
         return result;
     if ((flags_ & SEC_READ_ACL_CACHE) != 0 &&
-        sec__cache_aclbuffer(acl_.path.text, &out, 0, text_.origin()) != SEC_S_OK) {
+        sec__cache_aclbuffer(acl_.path.text, &out, qz::cache_rewriting::unless_current, text_.origin()) !=
+            SEC_S_OK) {
         // A cache that cannot be written is no failure of the read.
         cu_set_no_error_1();
         flags_ &= ~std::uint32_t{SEC_READ_ACL_CACHE};
@@ -137,20 +128,18 @@ int acl_file_reader::read_text(sec_acl_buffer_t &out) {
     return SEC_S_OK;
 }
 
-int acl_file_reader::read_once(const char *aclfname, sec_acl_buffer_t &out) {
+int acl_file_reader::read_once(const char *aclfname, const choosing_timer &choosing, sec_acl_buffer_t &out) {
     flags_ = asked_;
     if (const int result = qz::vet_acl_file(aclfname, username_, by_library, acl_); result != SEC_S_OK)
         return result;
     if (acl_.status.st_size == 0) {
-        if (qz::traces(qz::trace_category::info))
-            qz::trace_data(116, qz::item(acl_.path.text));
+        qz::trace(qz::point::file_is_empty, acl_.path.text);
         flags_ &= ~std::uint32_t{SEC_READ_ACL_CACHE};
         return SEC_S_OK;
     }
     if (!reads_text() && !qz::cache_is_current(acl_, cache_))
         flags_ |= SEC_READ_ACL_TEXT;
-    if (perf_level_ == 1)
-        qz::trace_elapsed(1, start_, qz::item(reads_text() ? acl_.path.text : cache_.path.text));
+    choosing.stop(reads_text() ? acl_.path.text : cache_.path.text);
     if (!reads_text()) {
         if (read_cache(out)) {
             flags_ &= ~std::uint32_t{SEC_READ_ACL_CACHE};
@@ -161,34 +150,32 @@ int acl_file_reader::read_once(const char *aclfname, sec_acl_buffer_t &out) {
     return read_text(out);
 }
 
+int read_checked(acl_file_reader &reader, const char *aclfname, const char *username, sec_acl_buffer_t *acl) {
+    constexpr const char *function = "sec_read_acl_file";
+    if (acl != nullptr)
+        *acl = {};
+    if (aclfname == nullptr)
+        return qz::report_bad_parameter(function, 1, 0);
+    if (acl == nullptr)
+        return qz::report_bad_parameter(function, 5, 0);
+    if (username != nullptr && *username == '\0')
+        return qz::report(SEC_S_BAD_PARAMETER, qz::msg::bad_user_name);
+    return reader.read(aclfname, *acl);
+}
+
 } // namespace
 
 int sec_read_acl_file(const char *aclfname, const char *username, const sec_perm_set_t *set,
                       std::uint32_t flags, sec_acl_buffer_t *acl, std::uint32_t *out_flags) {
-    constexpr const char *function = "sec_read_acl_file";
     const qz::uncancelled until_all_is_closed;
-    qz::trace_entry(9, [&] {
-        qz::trace_data(11, qz::item(aclfname), qz::item(username), qz::number(set), qz::number(flags),
-                       qz::number(acl));
-    });
-    cu_set_no_error_1();
-    if (acl != nullptr)
-        *acl = {};
     acl_file_reader reader(username, set, flags);
-    int result = SEC_S_OK;
-    if (aclfname == nullptr)
-        result = qz::report_bad_parameter(function, 1, 0);
-    else if (acl == nullptr)
-        result = qz::report_bad_parameter(function, 5, 0);
-    else if (username != nullptr && *username == '\0')
-        result = qz::report(SEC_S_BAD_PARAMETER, qz::msg::bad_user_name);
-    else
-        result = reader.read(aclfname, *acl);
-    if (out_flags != nullptr)
-        *out_flags = reader.flags();
-    qz::trace_exit(12, result, [&] {
-        const std::uint32_t line = reader.line();
-        qz::trace_data(14, qz::number(result), qz::number(line));
-    });
-    return result;
+    return qz::run(
+        qz::operation::read_acl_file, std::tie(aclfname, username, set, flags, acl),
+        [&] {
+            const int result = read_checked(reader, aclfname, username, acl);
+            if (out_flags != nullptr)
+                *out_flags = reader.flags();
+            return result;
+        },
+        [&] { return std::make_tuple(reader.line()); });
 }

@@ -5,8 +5,8 @@
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/identity_order.h"
 #include "qzacl_acl/tree_shape.h"
-#include "qzacl_trace.h"
 #include "report.h"
+#include "trace_points.h"
 
 #include <algorithm>
 #include <new>

@@ -4,8 +4,8 @@
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/packed_identity.h"
-#include "qzacl_trace.h"
 #include "report.h"
+#include "trace_points.h"
 
 namespace {
 
@@ -177,12 +177,10 @@ int convert_checked(int check, sec_acl_buffer_t *acl) {
         return check != 0 ? report_shorter_than_header(acl->length, __LINE__) : qz::report_corrupt(__LINE__);
 
     if (order == format::host_order) {
-        if (qz::traces(qz::trace_category::info))
-            qz::trace_id(104);
+        qz::trace(qz::point::in_host_order);
         return check != 0 ? sec__check_acl_buffer(acl) : SEC_S_OK;
     }
-    if (qz::traces(qz::trace_category::info))
-        qz::trace_id(106);
+    qz::trace(qz::point::converting_to_host_order);
     return convert({static_cast<unsigned char *>(acl->data), bytes.size()});
 }
 
@@ -218,13 +216,6 @@ int sec__check_acl_buffer(const sec_acl_buffer_t *acl) {
 }
 
 int sec_convert_acl_to_host(int check, sec_acl_buffer_t *acl) {
-    qz::trace_entry(55, [&] {
-        const sec_acl_buffer_t shown = acl == nullptr ? sec_acl_buffer_t{} : *acl;
-        qz::trace_data(57, qz::number(check), qz::number(acl), qz::number(shown.length),
-                       qz::number(shown.data));
-    });
-    cu_set_no_error_1();
-    const int result = convert_checked(check, acl);
-    qz::trace_exit(58, result);
-    return result;
+    return qz::run(qz::operation::convert_acl_to_host, std::tie(check, acl),
+                   [&] { return convert_checked(check, acl); });
 }

@@ -1,6 +1,6 @@
-// Readable printing of entries, trees and buffers, and of the recorded error.
-#ifndef QZACL_DUMP_H
-#define QZACL_DUMP_H
+// Printing the recorded error, for dumps and commands: the library itself prints nothing else.
+#ifndef QZ_PRINT_RECORDED_H
+#define QZ_PRINT_RECORDED_H
 
 #include <cstdio>
 

@@ -361,7 +361,7 @@ def write_messages(acl):
         if number := re.match(r"3417-\d{3}", text):
             texts[number[0]] = text
     blocks = {}
-    file = (pathlib.Path(__file__).parent / "remedies.txt").read_text(encoding="utf-8")
+    file = (SOURCE / "docs/man/remedies.txt").read_text(encoding="utf-8")
     for block in re.split(r"\n\n+", re.sub(r"^#.*\n", "", file, flags=re.M).strip()):
         match = re.fullmatch(r"(\S+) (command|library|both)\ncause: (.+?)\nremedy: (.+)", block, re.S)
         if not match or match[1] in blocks:

@@ -1,0 +1,66 @@
+// Conversion of strings between the locale's code set and UTF-8: a handle for each direction, opened at its first use.
+#include "qzacl_utils/code_set.h"
+
+#include "report.h"
+
+#include <cstdint>
+#include <cstdio>
+#include <langinfo.h>
+#include <pthread.h>
+
+namespace {
+
+cu_iconv_t acl__to_utf8_hdl = nullptr;
+cu_iconv_t acl__from_utf8_hdl = nullptr;
+pthread_once_t acl__init_to_utf8_once_block = PTHREAD_ONCE_INIT;
+pthread_once_t acl__init_from_utf8_once_block = PTHREAD_ONCE_INIT;
+
+constexpr std::uint32_t to_utf8 = 0; // the direction without a flag of its own
+
+// A failed open leaves the handle null; each later conversion in that direction reports it.
+void open_handle(std::uint32_t direction, cu_iconv_t *handle) {
+    char code_set[256] = {};
+    const char *name = cu_utf8_is_assumed_1() != 0 ? "UTF-8" : nl_langinfo(CODESET);
+    std::snprintf(code_set, sizeof code_set, "%s", name);
+    std::uint32_t flags = direction;
+    if (cu_utf8_is_not_modified_1() != 0)
+        flags |= CU_ICONV_UTF8_UNMODIFIED;
+    if (cu_utf8_is_limited_to_bmp_1() != 0)
+        flags |= CU_ICONV_BMP_ONLY;
+    static_cast<void>(cu_iconv_open_1(code_set, flags, handle));
+}
+
+void acl__init_to_utf8_handle() { open_handle(to_utf8, &acl__to_utf8_hdl); }
+void acl__init_from_utf8_handle() { open_handle(CU_ICONV_FROM_UTF8, &acl__from_utf8_hdl); }
+
+int convert(const char *function, cu_iconv_t handle, const char *in, const std::size_t *in_length, char **out,
+            std::size_t *out_length) {
+    if (handle == nullptr)
+        return qz::report(SEC_S_CODESET, qz::msg::conversion_unavailable);
+    constexpr int line = __LINE__ + 1; // of the call that may fail
+    const int result = cu_iconv_str_1(handle, 0, in, in_length, out, out_length);
+    switch (result) {
+    case CU_OK:
+        return SEC_S_OK;
+    case CU_NO_RESOURCE:
+    case CU_INTERNAL:
+        return qz::report(SEC_S_INTERNAL, qz::msg::internal_failure, qz::utils_source, line, result);
+    case CU_ICONV_NO_MEMORY:
+        return qz::report_no_memory(function, *in_length);
+    default:
+        return qz::report(SEC_S_CODESET, qz::msg::conversion_failed);
+    }
+}
+
+} // namespace
+
+int acl__convert_to_utf8(const char *in, const std::size_t *in_length, char **out, std::size_t *out_length) {
+    pthread_once(&acl__init_to_utf8_once_block, acl__init_to_utf8_handle);
+    return convert("acl__convert_to_utf8", acl__to_utf8_hdl, in, in_length, out, out_length);
+}
+
+int acl__convert_from_utf8(const char *in, const std::size_t *in_length, char **out,
+                           std::size_t *out_length) {
+    pthread_once(&acl__init_from_utf8_once_block, acl__init_from_utf8_handle);
+    return convert("acl__convert_from_utf8", acl__from_utf8_hdl, in, in_length, out, out_length);
+}
