@@ -21,7 +21,8 @@ line_facts parse_plainly(const std::string &text, std::size_t at, std::uint32_t 
     const std::size_t end = std::min(text.find_first_of("\n\f\r\0"s, at), text.size());
     const std::string line = " " + std::to_string(number);
     length = end - at + 1;
-    if (length > 1096) return "145" + line;
+    if (length > 1096)
+        return "145" + line;
     std::vector<std::string> tokens;
     while ((at = std::min(text.find_first_not_of(" \t\v", at), end)) < end && text[at] != '#') {
         const std::size_t stop = std::min(text.find_first_of(" \t\v", at), end);
@@ -29,23 +30,28 @@ line_facts parse_plainly(const std::string &text, std::size_t at, std::uint32_t 
         at = stop;
     }
     const bool is_cut = end < text.size() && text[end] == '\0';
-    if (tokens.empty()) return is_cut ? "131" + line : "-";
+    if (tokens.empty())
+        return is_cut ? "131" + line : "-";
     if (tokens[0].size() != 1 || "nouegNOUEG"s.find(tokens[0]) == std::string::npos)
         return "165" + line + " " + tokens[0];
     std::string facts = folded(tokens[0]);
     const bool has_mechanism = facts == "u" || facts == "e";
     const std::size_t named = has_mechanism ? 3 : facts == "g" ? 2 : 1;
-    if (has_mechanism && tokens.size() > 1 && tokens[1].size() > 16) return "132 " + tokens[1] + line;
-    if (tokens.size() < named) return "158" + line;
+    if (has_mechanism && tokens.size() > 1 && tokens[1].size() > 16)
+        return "132 " + tokens[1] + line;
+    if (tokens.size() < named)
+        return "158" + line;
     for (std::size_t index = 1; index < named; ++index)
         facts += " " + (has_mechanism && index == 1 ? folded(tokens[index]) : tokens[index]);
     std::uint32_t mask = 0;
     for (char letter : tokens.size() > named ? tokens[named] : "") {
         const std::size_t bit = "rwcxCqledvsao"s.find(letter);
-        if (bit == std::string::npos) return "166" + line + " " + tokens[named];
+        if (bit == std::string::npos)
+            return "166" + line + " " + tokens[named];
         mask |= 1u << bit;
     }
-    if (tokens.size() > named + 1) return "159" + line;
+    if (tokens.size() > named + 1)
+        return "159" + line;
     return is_cut ? "131" + line : facts + " " + std::to_string(mask);
 }
 
@@ -67,7 +73,8 @@ model compile(const std::string &text, buffer &out) {
             const arguments facts = words(wanted);
             const int code = facts[0] == "145" ? 37 : facts[0] == "166" ? 36 : 42;
             EXPECT_EQ(result, code);
-            EXPECT_EQ(recorded_error(), error_of(code, std::stoi(facts[0]), {facts.begin() + 1, facts.end()}));
+            EXPECT_EQ(recorded_error(),
+                      error_with(code, std::stoi(facts[0]), {facts.begin() + 1, facts.end()}));
         } else {
             EXPECT_EQ(acle.type == 0 ? "-" : text_of(acle), wanted);
         }
@@ -80,7 +87,8 @@ model compile(const std::string &text, buffer &out) {
         const std::size_t end = place + length;
         const bool is_last = end > text.size() || text[end - 1] == '\0';
         EXPECT_EQ(cursor, is_last ? nullptr : start + end);
-        if (is_last) break;
+        if (is_last)
+            break;
         EXPECT_EQ(left, size - end);
     }
     EXPECT_EQ(sec__read_acle_from_text(nullptr, &cursor, &left, &line, &acle), 0);
@@ -96,7 +104,7 @@ model compile(const std::string &text, buffer &out) {
 int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
     buffer held, recompiled;
     const model plain = compile(std::string(input(data, size)), held);
-    EXPECT_EQ(after(sec_convert_acl_to_host(1, &held.acl)), no_error);
+    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(1, &held.acl)), no_error);
     EXPECT_EQ(list_of(held.acl), plain.entries(0, nullptr));
     std::vector<sec_acltree_t *> trees;
     std::vector<qz::owned_acltree> owners;

@@ -16,7 +16,9 @@ using qz::who;
 
 const std::string folder_of_examples = QZ_SOURCE "/examples/";
 const std::string service_text = read_file(folder_of_examples + "service.acl");
-int is_alias(const char *requested, const char *entry) { return requested == "root"s && entry == "admin"s ? 0 : 1; }
+int is_alias(const char *requested, const char *entry) {
+    return requested == "root"s && entry == "admin"s ? 0 : 1;
+}
 [[maybe_unused]] const int registered[] = {
     sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "unix", qz::domain_handler),
     sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "hba2", qz::domain_handler),
@@ -33,7 +35,8 @@ qz::acl acl_of(const std::string &lines) {
 // Borrows the names.
 std::vector<sec_group_ref_t> references(const arguments &names) {
     std::vector<sec_group_ref_t> made;
-    for (const std::string &name : names) made.push_back({0, name.c_str()});
+    for (const std::string &name : names)
+        made.push_back({0, name.c_str()});
     return made;
 }
 
@@ -53,9 +56,11 @@ struct access_case {
 // A line of a file of cases; one without words gives no mechanism.
 access_case case_of(const std::string &line) {
     arguments parts = words(line.substr(0, line.find('#')));
-    if (parts.empty()) return {};
+    if (parts.empty())
+        return {};
     access_case made{parts[0], parts[1], parts.end()[-2], parts.end()[-1]};
-    for (std::size_t at = 2; at + 2 < parts.size(); ++at) made.groups.push_back(parts[at].substr(1));
+    for (std::size_t at = 2; at + 2 < parts.size(); ++at)
+        made.groups.push_back(parts[at].substr(1));
     return made;
 }
 
@@ -65,14 +70,17 @@ void expect_cases(const std::string &path, order taken) {
     int count = 0;
     for (std::string line; std::getline(lines, line);) {
         const access_case read = case_of(line);
-        if (read.mechanism.empty()) continue;
+        if (read.mechanism.empty())
+            continue;
         ++count;
         const auto groups = references(read.groups);
-        const requester user = requester::user(read.mechanism.c_str(), read.identity.c_str()).in_groups(groups);
+        const requester user =
+            requester::user(read.mechanism.c_str(), read.identity.c_str()).in_groups(groups);
         const requester whom = read.mechanism == "-" ? requester::unauthenticated() : user;
         const std::uint32_t wanted = *qz::to_mask(read.letters.c_str());
         const auto answer = qz::decide(acl, whom, wanted, taken);
-        EXPECT_EQ(answer->allowed() ? "yes" : "no", read.expected) << line << "\n" << answer->explain()->view();
+        EXPECT_EQ(answer->allowed() ? "yes" : "no", read.expected) << line << "\n"
+                                                                   << answer->explain()->view();
         EXPECT_EQ(qz::granted(acl, whom, taken).grants(wanted), answer->allowed()) << line;
     }
     EXPECT_GT(count, 5);
@@ -110,7 +118,9 @@ TEST(service, explains_itself) {
     const auto answer = qz::decide(acl, al, 0);
     arguments lines;
     const auto write = [&](std::string_view line) { lines.emplace_back(line); };
-    const auto place = [](const qz::party_answer &said) { return "site.acl:" + std::to_string(said.entry.type); };
+    const auto place = [](const qz::party_answer &said) {
+        return "site.acl:" + std::to_string(said.entry.type);
+    };
     EXPECT_EQ(answer->explain(write, place), SEC_S_OK);
     EXPECT_EQ(lines.front(), "user: site.acl:4: u unix Al@h.x r (decides)\n");
     EXPECT_FALSE(answer->allowed()); // nothing was wanted
@@ -121,8 +131,9 @@ TEST(service, explains_itself) {
 }
 
 // What the questions of the C interface answer, combined by hand: the mask and who decided.
-std::pair<std::uint32_t, who> by_hand(const qz::acl &acl, const std::string &mechanism, const std::string &identity,
-                                      const std::vector<sec_group_ref_t> &groups, order taken) {
+std::pair<std::uint32_t, who> by_hand(const qz::acl &acl, const std::string &mechanism,
+                                      const std::string &identity, const std::vector<sec_group_ref_t> &groups,
+                                      order taken) {
     std::uint32_t sum = 0;
     bool is_found = false;
     for (const who each : {who::user, who::expanded, who::group, who::any_other}) {
@@ -130,10 +141,12 @@ std::pair<std::uint32_t, who> by_hand(const qz::acl &acl, const std::string &mec
         const auto count = static_cast<std::int32_t>(groups.size());
         std::uint32_t mask = 0;
         const int code = each == who::group ? sec__group_acles_perm(acl.get(), count, groups.data(), &mask)
-                                            : sec__single_acle_perm(acl.get(), type, mechanism.c_str(), nullptr,
-                                                                    identity.c_str(), &mask);
-        if (code != SEC_S_OK || (each == who::group && groups.empty())) continue;
-        if (taken == order::closest) return {mask, each};
+                                            : sec__single_acle_perm(acl.get(), type, mechanism.c_str(),
+                                                                    nullptr, identity.c_str(), &mask);
+        if (code != SEC_S_OK || (each == who::group && groups.empty()))
+            continue;
+        if (taken == order::closest)
+            return {mask, each};
         is_found = true;
         sum |= mask;
     }
@@ -153,7 +166,8 @@ public:
     }
     arguments groups() {
         arguments made(random_() % 4);
-        for (std::string &each : made) each = any_of({"ops", "OPS", "audit", "staff"});
+        for (std::string &each : made)
+            each = any_of({"ops", "OPS", "audit", "staff"});
         return made;
     }
     qz::acl acl() {
@@ -163,7 +177,8 @@ public:
             const std::string name = type == 16  ? any_of({"ops", "audit", "staff"})
                                      : type == 8 ? any_of({".x", "h.x", "k.y", ".Y", "al@h.x", "X"})
                                                  : identity();
-            const sec_acle_t added = entry(type, mechanism(), type < 4 ? nullptr : name.c_str(), random_() % 8192);
+            const sec_acle_t added =
+                entry(type, mechanism(), type < 4 ? nullptr : name.c_str(), random_() % 8192);
             EXPECT_EQ(made.add(added), SEC_S_OK);
         }
         return made;
@@ -177,7 +192,8 @@ private:
 void expect_entries_of(const qz::acl &acl, const qz::answer &answer) {
     const auto listed = acl.list();
     for (const qz::party_answer &said : answer) {
-        if (!said.has_entry()) continue;
+        if (!said.has_entry())
+            continue;
         const bool is_listed = std::any_of(listed->begin(), listed->end(), [&](qz::entry_view entry) {
             return entry.type() == said.entry.type && entry.mechanism() == said.entry.mechanism &&
                    entry.identity() == said.entry.identity && entry.permissions() == said.entry.permissions;
@@ -266,7 +282,8 @@ TEST(service, what_cannot_be_asked_grants_nothing) {
 // ---- Texts ----
 
 TEST(service, texts_lead_back_to_the_same_bytes) {
-    for (const std::string &lines : {service_text, "g b r\nu m z w\nu m A\ne m z\ne m a rw\nu k a x\no\nn q\n"s, ""s}) {
+    for (const std::string &lines :
+         {service_text, "g b r\nu m z w\nu m A\ne m z\ne m a rw\nu k a x\no\nn q\n"s, ""s}) {
         const qz::acl acl = acl_of(lines);
         const auto written = qz::to_text(acl);
         ASSERT_EQ(written.code(), SEC_S_OK);
@@ -293,8 +310,9 @@ TEST(service, no_text_holds_what_no_line_can) {
     };
     for (const auto &[type, mechanism, identity, mask, code] : rows) {
         // Bytes from elsewhere may hold what cannot be added.
-        const std::string bytes = type == 4 ? one(of_mechanism(4, mechanism, 1, named(mask, identity)))
-                                            : one(packed_subacl(16, "", 1, named(mask, identity)));
+        const std::string field = type == 4 ? text_field(mechanism) : "";
+        const std::string bytes =
+            acl_of_one(packed_subacl(type, field, 1, packed_entry(mask, text_field(identity))));
         const auto acl = qz::acl::from_bytes(bytes.data(), bytes.size());
         EXPECT_EQ(qz::to_text(*acl).code(), code) << std::string_view(identity).substr(0, 8);
     }
@@ -317,7 +335,8 @@ TEST(service, same_sees_what_decides) {
         {"u unix a@h r\n", "u hba2 a@h r\n", false},
         {"o\n", "", false},
     };
-    for (const auto &[a, b, is_same] : rows) EXPECT_EQ(*qz::same(acl_of(a), acl_of(b)), is_same) << a << "and\n" << b;
+    for (const auto &[a, b, is_same] : rows)
+        EXPECT_EQ(*qz::same(acl_of(a), acl_of(b)), is_same) << a << "and\n" << b;
     EXPECT_TRUE(*qz::same(*qz::acl::create_empty(), qz::acl()));
 }
 
@@ -387,7 +406,8 @@ TEST(live_acl, trusts_times_that_are_behind) {
     for (const auto &[changed, now, is_settled] : rows) {
         qz::detail::file_stamp stamp;
         stamp.changed = changed;
-        EXPECT_EQ(stamp.is_settled(now), is_settled) << changed.tv_nsec << " " << now.tv_sec << "." << now.tv_nsec;
+        EXPECT_EQ(stamp.is_settled(now), is_settled)
+            << changed.tv_nsec << " " << now.tv_sec << "." << now.tv_nsec;
     }
 }
 
@@ -438,7 +458,8 @@ TEST(live_acl, is_shared_by_threads) {
         std::filesystem::rename(next, path);
     }
     is_done = true;
-    for (std::thread &each : threads) each.join();
+    for (std::thread &each : threads)
+        each.join();
     EXPECT_EQ(live.refresh().code(), SEC_S_OK);
     EXPECT_EQ(granted_to_others(live), 1u);
 }

@@ -1,6 +1,6 @@
 // Trees of more entries than the fuzzers' texts have, through the fuzzer of texts; what names a tree; and its limit.
-#include "../fuzz/fuzz.h"
 #include "faults.h"
+#include "fuzz.h"
 #include "qzacl_acl/compile.h"
 #include "support.h"
 
@@ -15,7 +15,8 @@ TEST(tree, holds_what_a_text_says) {
             // Of few letters, of all bytes, and behind a long prefix that they share.
             std::string name(round % 5 == 2 ? round % 60 : 0, 'z');
             for (auto left = 1 + below(round % 5 == 1 ? 150 : 6); left != 0; --left)
-                name += round % 5 == 1 ? static_cast<char>(33 + below(223)) : "aAbBzZ@[`{\x7f\x80\xff"[below(13)];
+                name +=
+                    round % 5 == 1 ? static_cast<char>(33 + below(223)) : "aAbBzZ@[`{\x7f\x80\xff"[below(13)];
             const std::string mechanism = round % 3 == 1 ? std::to_string(below(500)) : "unix";
             text += std::array{"u " + mechanism, "e " + mechanism, "g"s}[below(3)] + " " + name + " rw\n";
         }
@@ -28,7 +29,8 @@ TEST(tree, holds_what_a_text_says) {
 TEST(tree, is_named_by_its_topmost_entry) {
     const auto acle_of = [](int type, const char *name) {
         std::string mechanism = "unix";
-        for (unsigned bit = 0; bit < 4; ++bit) mechanism[bit] ^= (*name >> bit & 1) == 0 ? 0 : 0x20;
+        for (unsigned bit = 0; bit < 4; ++bit)
+            mechanism[bit] ^= (*name >> bit & 1) == 0 ? 0 : 0x20;
         return entry(type, mechanism, name, 1);
     };
     std::vector<std::tuple<int, std::string, std::string>> rows = {{4, "m f t c i p w", "m f c i t p w"}};
