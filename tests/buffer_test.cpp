@@ -81,10 +81,7 @@ TEST(validate, finds_what_is_cut_short_or_of_another_length) {
         {"a sub-ACL too few", packed_acl(2, user_xyz), corrupted},
         {"a length too short", packed_acl(2, with(user_xyz, 0, 25, 4) + any_other), corrupted},
         {"a length too long", packed_acl(2, with(user_xyz, 0, 27, 4) + any_other), corrupted},
-        {"a header cut short", acl_of_one(user_xyz.substr(0, 9)), corrupted},
-        {"a mechanism cut short", acl_of_one(user_xyz.substr(0, 14)), corrupted},
         {"an entry cut short", acl_of_one(user_xyz.substr(0, 21)), corrupted},
-        {"an identity cut short", with(example, 25, 5, 2).substr(0, 30), corrupted},
         {"entries beyond number", acl_of_one(packed_subacl(4, "m\0"s, ~0u, xyz)), corrupted},
         // After a faulty entry the walk stands at that entry, where no further sub-ACL starts.
         {"a faulty entry before a sub-ACL", packed_acl(2, with(any_other, 10, 2) + any_other), corrupted},
@@ -127,19 +124,11 @@ TEST(validate, names_the_first_rule_that_is_broken) {
         expect_check(row);
 }
 
-TEST(convert, turns_the_other_byte_order) {
-    // What is not the sign of this host's order is the other one; what is wrong then is not looked for.
-    for (const auto &[offset, value] : {std::pair(2u, 255u), {9u, 99u}, {20u, 9u}}) {
-        buffer held(with(foreign, offset, value));
-        EXPECT_EQ(outcome_of(sec_convert_acl_to_host(1, &held.acl)), no_error);
-        EXPECT_EQ(held.bytes(), offset == 2 ? example : with(example, offset, value));
-    }
-}
-
 TEST(convert, marks_the_order_when_all_was_turned) {
     const std::string twice = foreign_with(foreign, 3, 2, 2) + foreign.substr(5);
     const std::pair<std::string, failure> rows[] = {
         {twice, no_error},
+        {with(foreign, 9, 99), no_error}, // what is wrong then is not looked for
         {"\x84\1\1\0\0"s, bad_acl(msg::not_an_acl_buffer)},
         {"\x85\2"s, bad_acl(msg::not_an_acl_buffer)},
         {"\x85\1"s, bad_acl(msg::shorter_than_header, 2)},
@@ -164,10 +153,7 @@ TEST(list, refuses_what_it_cannot_expand) {
          bad_acl(msg::single_acle_repeated)},
         {"a sub-ACL too few", packed_acl(2, any_other), corrupted},
         {"a length that leads nowhere", packed_acl(3, with(any_other, 0, 0, 4)), corrupted},
-        {"two bytes", "\x85\1"s, corrupted},
         {"another version", "\x85\2\2\0\0"s, bad_acl(msg::not_an_acl_buffer)},
-        {"type 0", acl_of_one(packed_subacl(0, "", 1, xyz)), corrupted},
-        {"entries beyond number", acl_of_one(packed_subacl(16, "", ~0u, xyz)), corrupted},
         {"no mechanism", acl_of_one(packed_subacl(4, "", 1, xyz)), corrupted},
         {"a long mechanism", acl_bytes("u seventeen-bytes-x: x 1"), bad_acl(msg::bad_mechanism_length, 18)},
         {"no identity", acl_bytes("u unix: x 1, 1"), corrupted},
@@ -294,32 +280,16 @@ static std::string dumped_subacl(const std::string &indentation, arguments field
     return error_with(0, msg::dump_subacl.id, fields).text + "\n";
 }
 
-TEST(dump, prints_a_buffer) {
-    EXPECT_EQ(dump_of(""), "");
-    EXPECT_EQ(dump_of("\x84\1\2\0\0"s), "The ACL provided is not valid!\n\n");
-    EXPECT_EQ(
-        dump_of(rich),
-        "ACL descriptor: 182 byte(s) long\n\tVersion: 1\n\tByte Ordering: " + std::to_string(this_order) +
-            "\n\tNumber of sub-ACLs: 6\n" + dumped_subacl("\t", {"37", "16", "", "2"}) +
-            "\t\ttype = g; id = Admins; permission = rC\n"
-            "\t\ttype = g; id = staff; permission = wC\n" +
-            dumped_subacl("\t", {"49", "4", "unix", "2"}) +
-            "\t\ttype = u; mech = unix; id = al; permission = r\n"
-            "\t\ttype = u; mech = unix; id = bob@host.example; permission = w\n" +
-            dumped_subacl("\t", {"33", "8", "kRb5", "2"}) +
-            "\t\ttype = e; mech = kRb5; id = z; permission = c\n"
-            "\t\ttype = e; mech = kRb5; id = a; permission = rc\n" +
-            dumped_subacl("\t", {"24", "4", "hba2", "1"}) +
-            "\t\ttype = u; mech = hba2; id = x; permission = wc\n" +
-            dumped_subacl("\t", {"17", "2", "", "1"}) + "\t\ttype = o; permission = rwc\n" +
-            dumped_subacl("\t", {"17", "1", "", "1"}) + "\t\ttype = n; permission = x\n");
-}
-
 TEST(dump, goes_on_after_what_cannot_be_expanded) {
     const std::string reason = bad_acl(msg::single_acle_repeated).text; // on standard output
-    EXPECT_EQ(dump_of(acl_bytes("o: 1, 1; n: 7")),
-              reason + dumped_head("46", "2") + dumped_subacl("\t", {"24", "2", "", "2"}) +
-                  dumped_subacl("\t", {"17", "1", "", "1"}) + "\t\ttype = n; permission = rwc\n");
+    EXPECT_EQ(
+        dump_of(acl_bytes("o: 1, 1; n: 7; g: Admins 17, staff 18; e kRb5: z 4")),
+        reason + dumped_head("107", "4") + dumped_subacl("\t", {"24", "2", "", "2"}) +
+            dumped_subacl("\t", {"17", "1", "", "1"}) + "\t\ttype = n; permission = rwc\n" +
+            dumped_subacl("\t", {"37", "16", "", "2"}) + "\t\ttype = g; id = Admins; permission = rC\n" +
+            "\t\ttype = g; id = staff; permission = wC\n" + dumped_subacl("\t", {"24", "8", "kRb5", "1"}) +
+            "\t\ttype = e; mech = kRb5; id = z; permission = c\n");
+    EXPECT_EQ(dump_of("\x84\1\2\0\0"s), "The ACL provided is not valid!\n\n");
 }
 
 TEST(dump, prints_parts) {

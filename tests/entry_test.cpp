@@ -44,16 +44,14 @@ const sec_perm_template_t own_templates[] = {
     {0x80000000, 'r', "", ""}, {1, '\xe9', "", ""}, {1, 'x', "", ""}, {2, 'r', "", ""}};
 const sec_perm_set_t own_letters = {4, own_templates};
 
+// After an error, what was found before it is there.
 TEST(permissions, turn_letters_into_bits) {
-    struct row {
-        const char *letters;
-        const sec_perm_set_t *set;
-        std::uint32_t mask; // after an error, what was found before it
-        const char *unknown = "";
-    };
-    const row rows[] = {
-        {nullptr, nullptr, 0},   {"oasvdelqCxcwr", nullptr, 0x1fff}, {"xr\xe9r", &own_letters, 0x80000001},
-        {"rR", nullptr, 1, "R"}, {"xw", &own_letters, 1, "w"},
+    const std::tuple<const char *, const sec_perm_set_t *, std::uint32_t, const char *> rows[] = {
+        {nullptr, nullptr, 0, ""},
+        {"oasvdelqCxcwr", nullptr, 0x1fff, ""},
+        {"xr\xe9r", &own_letters, 0x80000001, ""},
+        {"rR", nullptr, 1, "R"},
+        {"xw", &own_letters, 1, "w"},
     };
     for (const auto &[letters, set, wanted, unknown] : rows) {
         const failure error = error_of(SEC_S_BAD_PERMISSION, msg::no_template_for_letter, unknown);
@@ -65,15 +63,9 @@ TEST(permissions, turn_letters_into_bits) {
 }
 
 TEST(permissions, turn_bits_into_letters) {
-    struct row {
-        std::uint32_t mask;
-        const sec_perm_set_t *set;
-        const char *letters; // after an error, those that were found before it
-        const char *unknown = "";
-    };
-    const row rows[] = {
-        {0, nullptr, ""},
-        {0x80000001, &own_letters, "\xe9r"},
+    const std::tuple<std::uint32_t, const sec_perm_set_t *, const char *, const char *> rows[] = {
+        {0, nullptr, "", ""},
+        {0x80000001, &own_letters, "\xe9r", ""},
         {0x80000000, nullptr, "", "80000000"},
         {0xffffffff, nullptr, "rwcxCqledvsao", "00002000"},
         {5, &own_letters, "\xe9", "00000004"},
@@ -116,11 +108,9 @@ TEST(entries, are_made_with_addresses_in_their_short_form) {
         {SEC_ACLE_UNAUTHENTICATED, nullptr, nullptr, "/none"},
         {SEC_ACLE_GROUP, "seventeen-bytes-x", "a@::0", "/a@::0"},
         {SEC_ACLE_USER, "sixteen-bytes-xx", "x", "sixteen-bytes-xx/x"},
-        {SEC_ACLE_EXPANDED, "UNIX", "a@::0", "UNIX/a@::0"},
         {SEC_ACLE_USER, "unix", "alice@0:0:0:0:0:FFFF:a00:1", "unix/alice@::ffff:10.0.0.1"},
         {SEC_ACLE_USER, "hba2", "@FE80:0::1", "hba2/@fe80::1"},
-        {SEC_ACLE_EXPANDED, "hba2", "1111:2222:3333:4444:5555:6666:7777:888F",
-         "hba2/1111:2222:3333:4444:5555:6666:7777:888f"},
+        {SEC_ACLE_EXPANDED, "hba2", "1:2:3:4:5:6:7:888F", "hba2/1:2:3:4:5:6:7:888f"},
         {SEC_ACLE_USER, "unix", "a@b@::01", "unix/a@b@::01"},
         {SEC_ACLE_EXPANDED, "hba2", "alice", "hba2/alice"},
     };
@@ -134,7 +124,6 @@ TEST(entries, are_not_made_from_bad_parameters) {
     const char no_host[] = "alice";
     const char empty_host[] = "alice@";
     const parameters rows[] = {
-        {0, "unix", no_host, refused(1, "0")},
         {3, "unix", nullptr, refused(1, "3")},
         {SEC_ACLE_USER, nullptr, nullptr, refused(3, "0")},
         {SEC_ACLE_EXPANDED, empty, no_host, refused(3, address(empty))},
