@@ -200,6 +200,7 @@ TEST(edit, reports_what_it_refuses_and_leaves_the_buffer_alone) {
         {"\x84\2\1"s, al, bad_acl(msg::second_argument_not_acl)},
         {"\x85\2\1"s, al, bad_acl(msg::buffer_version_unsupported)},
         {example.substr(0, 4), al, bad_acl(msg::buffer_corrupted)},
+        {with(example, 5, 27, 4), user("abcd", "b", 1), bad_acl(msg::buffer_corrupted)}, // a byte too long
         {acl_bytes("n: 1, 1"), entry(1, "", nullptr, 1), bad_acl(msg::single_acle_repeated)},
     };
     for (const auto edit : {sec_add_acle_to_acl, sec_add_acle_to_acl2, sec_del_acle_from_acl}) {

@@ -41,8 +41,8 @@ TEST(Error, IsOfItsThreadAndKeptByAHandle) {
     EXPECT_EQ(first->code, 42);
     EXPECT_EQ(first->message_id, 97);
     cu_set_no_error_1();
-    EXPECT_EQ(current()->code, 0);
-    EXPECT_EQ(current_text(), "");
+    const auto none = current();
+    EXPECT_EQ(none->code, 0);
     cu_pset_error_1(first.get());
     first.reset();
     std::thread([] {
@@ -50,6 +50,8 @@ TEST(Error, IsOfItsThreadAndKeptByAHandle) {
         EXPECT_EQ(recorded("of another thread"), "of another thread");
     }).join();
     EXPECT_EQ(current_text(), "first 1");
+    cu_pset_error_1(none.get());
+    EXPECT_EQ(current_text(), "");
 }
 
 // Far above and around what needs no allocation, with every remainder by 16. The thread ends with a block in use.

@@ -59,7 +59,7 @@ int never(const char *, const char *) { return 1; }
 };
 
 TEST(evaluate, decides_by_exactly_one_entry) {
-    const std::string acl = acl_bytes("u unix: Alice 1; u Exact: A 8, a 16, C 4;"
+    const std::string acl = acl_bytes("u unix: Alice 1; e krb5: .x 32, x 64; u Exact: A 8, a 16, C 4;"
                                       "e unix: alice 1; o: 256");
     const std::tuple<const char *, question, decision> rows[] = {
         {"any other needs no names", {0x82, "unused", "unused"}, granted(256)},
@@ -68,6 +68,7 @@ TEST(evaluate, decides_by_exactly_one_entry) {
         {"the handler sorts it before the second", {by_handler, "exact", "C"}, denied(132, "exact", "C")},
         {"the requester's handler", {by_handler, "exact", "alice", "unix"}, denied(132, "exact", "alice")},
         {"no handler of the other kind", {by_handler, "krb5", "a", "exact"}, granted(8)},
+        {"whatever the sign for the first", {SEC_ACLE_EXPANDED, "krb5", "hx"}, granted(64)},
         {"entries, but no handler", {SEC_ACLE_EXPANDED, "unix", "alice"}, denied(8, "unix", "alice")},
     };
     for (const auto &[what, asked, wanted] : rows)
