@@ -551,6 +551,7 @@ struct disturbance {
 const disturbance disturbances[] = {
     {"exchanged", [](auto &path) { put(other_text, path, 0); }, true},
     {"exchanged by an old file", [](auto &path) { put(other_text, path, 50); }, true},
+    {"exchanged by an equally old file", [](auto &path) { put(other_text, path, 100); }, true},
     {"edited", [](auto &path) { write_file(path, other_text); }},
     {"edited like an old file", [](auto &path) { write_file(path, other_text, 50); }},
     {"grown", append},
