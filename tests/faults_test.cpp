@@ -358,7 +358,8 @@ struct system_calls : files {
         // Only what could not be removed is left.
         const std::size_t names = (row.cache_bytes.empty() ? 1 : 2) + (is_clean_up && !is_close ? 1 : 0);
         std::set<std::string> told_names;
-        for (const int fault : {EACCES, EIO, ENOSPC, EDQUOT, EROFS, EMFILE, ESTALE, faults::short_transfer}) {
+        for (const int fault :
+             {EACCES, EIO, ENOSPC, EDQUOT, EROFS, EMFILE, ENAMETOOLONG, ESTALE, faults::short_transfer}) {
             if (fault == faults::short_transfer && !is_transfer)
                 continue;
             SCOPED_TRACE(testing::Message() << call << " fails with " << fault);
