@@ -6,8 +6,9 @@
 // The folder holds files of generate.py; a size without its file is not measured.
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/entry_parser.h"
-#include "qzacl_acl/tree.h"
+#include "qzacl_acl/trees.h"
 #include "qzacl_trace.h"
+#include "qzacl_utils.h"
 
 #include <benchmark/benchmark.h>
 
@@ -53,22 +54,26 @@ void bench_phases(benchmark::State &state, const std::string &text) {
     double releasing = 0;
     std::size_t lines = 0;
     for (auto _ : state) {
-        std::string consumed = text;
-        std::vector<sec_acle_t> entries;
+        // With what a text that was read from a file has behind it, as trees point into it.
+        std::string consumed = text + std::string(qz::text_padding, '\0');
+        const std::size_t size = text.size() + 1;
+        std::vector<qz::parsed_acle> entries;
         entries.reserve(text.size() / 8);
         char *cursor = consumed.data();
-        std::size_t remaining = consumed.size() + 1;
+        std::size_t remaining = size;
         std::uint32_t line = 1;
         stopwatch watch;
         watch.lap();
-        for (sec_acle_t entry; sec__read_acle_from_text(nullptr, &cursor, &remaining, &line, &entry) == 1;)
+        for (qz::parsed_acle entry;
+             sec__read_acle_from_text(nullptr, &cursor, &remaining, &line, &entry) == 1;)
             entries.push_back(entry);
         parsing += watch.lap();
 
-        std::optional<sec_acltree_array> trees(std::in_place);
+        std::optional<sec_acltree_array> trees(std::in_place, std::span(consumed.data(), size));
         int result = SEC_S_OK;
-        for (const sec_acle_t &entry : entries)
-            result |= sec__add_acle_to_trees(&entry, *trees);
+        for (const qz::parsed_acle &entry : entries)
+            result |= trees->add_soon(qz::view_of(entry));
+        result = trees->settle(result);
         inserting += watch.lap();
 
         sec_acl_buffer_t acl = {};

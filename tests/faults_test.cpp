@@ -47,8 +47,8 @@ outcome read_acl(const std::string &path, unsigned flags, const char *user = nul
     return recorded(code, held.bytes());
 }
 // The command's check with a cache written.
-outcome check(const std::string &path) {
-    return recorded(aclfck__bulk_aclfile(path.c_str(), nullptr, ACLFCK_OPT_COMPILE));
+outcome check(const std::string &path, unsigned options = ACLFCK_OPT_COMPILE) {
+    return recorded(aclfck__bulk_aclfile(path.c_str(), nullptr, options));
 }
 
 // Runs something watched, and keeps what it prints.
@@ -259,6 +259,35 @@ TEST_F(allocations, of_files_fail) {
     fail_each({"read and cache", [&](acl_buffer &) { return read(text_only | cached); }});
     fail_each({"read the cache", [&](acl_buffer &) { return read(checked); }, true});
     fail_each({"check", check_and_tell, true});
+}
+
+// Insertions wait for lines that come after them; what is told is the first mistake all the same.
+TEST_F(files, tell_their_first_mistake) {
+    const int duplicate = msg::duplicate_group.id;
+    const int bad_type = msg::bad_type_token.id;
+    const std::string twice = "g a\ng A\n";
+    const std::string bad = "x y\n";
+    const auto good = [](int count) {
+        std::string lines;
+        while (count-- != 0)
+            lines += "g member" + std::to_string(count) + "\n";
+        return lines;
+    };
+    const std::pair<std::string, int> rows[] = {
+        {twice, duplicate},
+        {twice + bad, duplicate},
+        {bad + twice, bad_type},
+        {"g a\n" + bad + "g A\n", bad_type},
+        {twice + good(14) + bad, duplicate},
+        {twice + good(100) + bad, duplicate},
+        {good(100) + twice + good(3), duplicate},
+        {good(40) + "g MEMBER39\n", duplicate},
+    };
+    for (const auto &[text, id] : rows) {
+        write_file(path, text);
+        EXPECT_EQ(read_acl(path, text_only).id, id) << text;
+        EXPECT_EQ(watched({}, [this] { return check(path, 0); }).id, id) << text;
+    }
 }
 
 TEST_F(files, are_read_with_few_allocations) {

@@ -2,6 +2,9 @@
 #include "faults.h"
 #include "fuzz.h"
 #include "qzacl_acl/compile.h"
+#include "qzacl_acl/entry_parser.h"
+#include "qzacl_acl/tree_shape.h"
+#include "qzacl_acl/trees.h"
 #include "support.h"
 
 using namespace support;
@@ -56,6 +59,86 @@ TEST(tree, is_named_by_its_topmost_entry) {
             EXPECT_EQ(sec__del_acle_from_tree(&acle, root), SEC_S_OK);
             EXPECT_EQ(sec__del_acle_from_tree(&acle, root), SEC_S_ACLE_NOT_FOUND);
         }
+    }
+}
+
+// As a linked tree is released: what is below an entry before the entry itself.
+TEST(tree, is_released_in_post_order) {
+    const std::tuple<int, std::string, std::string> rows[] = {
+        {SEC_ACLE_USER, "m f t c i p w", "c i f p w t m"},
+        {SEC_ACLE_USER, "a b c d", "d c b a"},
+        {SEC_ACLE_USER, "d c b a", "a b c d"},
+        {SEC_ACLE_USER, "a d b c", "c b d a"},
+        {SEC_ACLE_GROUP, "b a c", "a c b"},
+        {SEC_ACLE_EXPANDED, "b a c", "c a b"},
+    };
+    for (const auto &[type, inserted, released] : rows) {
+        sec_acltree_t *root = nullptr;
+        for (const std::string &name : words(inserted)) {
+            const sec_acle_t acle = entry(type, "unix", name.c_str(), 0);
+            EXPECT_EQ(sec__add_acle_to_tree(1, &acle, &root), SEC_S_OK);
+        }
+        const qz::owned_acltree owner(root);
+        arguments found;
+        qz::in_post_order(root->in_order(),
+                          [&](const qz::small_entry &each) { found.emplace_back(root->identity(each)); });
+        EXPECT_EQ(found, words(released)) << inserted;
+    }
+}
+
+// A tree points into the text that it is told of, as far as its places reach, and copies what stands elsewhere.
+TEST(tree, copies_what_it_cannot_point_to) {
+    const std::string line = "u unix alice r\n";
+    const std::string alice = acl_bytes("u unix: alice 1");
+    const std::string other = acl_bytes("u xxxx: xxxxx 1");
+    const std::size_t whole = line.size() + 1;
+    const std::size_t out_of_reach = std::size_t{3} << 30;
+    const std::tuple<std::size_t, std::string> rows[] = {{0, alice}, {whole, other}, {out_of_reach, alice}};
+    for (const auto &[told, compiled] : rows) {
+        char text[64] = {};
+        line.copy(text, line.size());
+        char *cursor = text;
+        std::size_t left = whole;
+        std::uint32_t number = 1;
+        qz::parsed_acle parsed;
+        ASSERT_EQ(sec__read_acle_from_text(nullptr, &cursor, &left, &number, &parsed), 1);
+        sec_acltree_array trees({text, told});
+        EXPECT_EQ(trees.add(qz::view_of(parsed)), SEC_S_OK);
+        std::ranges::fill(parsed.mechanism, 'x');
+        std::ranges::fill(parsed.identity, 'x');
+        buffer out;
+        EXPECT_EQ(sec__acltrees_to_acl(trees.trees(), &out.acl), SEC_S_OK);
+        EXPECT_EQ(out.bytes(), compiled) << told;
+        const sec_acle_t elsewhere = entry(SEC_ACLE_USER, "unix", "bob", 1);
+        EXPECT_EQ(sec__add_acle_to_trees(&elsewhere, trees), told == 0 ? SEC_S_OK : SEC_S_INTERNAL);
+    }
+}
+
+// Compiling sorts the entries and leaves out of their keys what all share; a tree that grows on knows them all the same.
+TEST(tree, takes_more_entries_after_it_was_compiled) {
+    for (const int count : {3, 40}) {
+        sec_acltree_t *root = nullptr;
+        const auto add = [&](const std::string &name) {
+            const sec_acle_t acle = entry(SEC_ACLE_GROUP, "", name.c_str(), 1);
+            return sec__add_acle_to_tree(1, &acle, &root);
+        };
+        const auto name_of = [](int number) { return "common-" + std::to_string(1000 + number); };
+        for (int number = count; number != 0; --number)
+            EXPECT_EQ(add(name_of(number)), SEC_S_OK);
+        const qz::owned_acltree owner(root);
+        qz::loose_subacl first;
+        EXPECT_EQ(sec__acltree_to_subacl(root, first), SEC_S_OK);
+
+        EXPECT_EQ(add("common-0"), SEC_S_OK);
+        std::string entries = entry_bytes("common-0 1");
+        for (int number = 1; number <= count; ++number) {
+            EXPECT_EQ(add(name_of(number)), SEC_S_BAD_ACLE) << number;
+            entries += entry_bytes(name_of(number) + " 1");
+        }
+        qz::loose_subacl second;
+        EXPECT_EQ(sec__acltree_to_subacl(root, second), SEC_S_OK);
+        const std::string found(reinterpret_cast<const char *>(second.data.get()), second.length);
+        EXPECT_EQ(found, packed_subacl(SEC_ACLE_GROUP, "", static_cast<unsigned>(count) + 1, entries));
     }
 }
 

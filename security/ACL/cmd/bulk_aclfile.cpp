@@ -8,7 +8,7 @@
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/dump.h"
 #include "qzacl_acl/file_name.h"
-#include "qzacl_acl/tree.h"
+#include "qzacl_acl/trees.h"
 #include "report.h"
 
 #include <csignal>
@@ -53,23 +53,30 @@ void warn_of_skipped_cache(unsigned flags) {
 // clear `is_clean` instead.
 int read_entries(qz::acl_text &text, unsigned flags, sec_acltree_array &trees, bool &is_clean) {
     const bool goes_on = (flags & ACLFCK_OPT_CONTINUE) != 0;
-    sec_acle_t entry = {};
+    const bool is_verbose = (flags & ACLFCK_OPT_VERBOSE) != 0;
+    const bool may_wait = !goes_on && !is_verbose;
+    qz::parsed_acle entry;
     for (;;) {
         const qz::acl_line line = text.next(entry);
-        if (line == qz::acl_line::end)
-            return SEC_S_OK;
         if (line == qz::acl_line::none)
             continue;
-        int result = text.failure();
+        int result = SEC_S_OK;
         bool may_go_on = goes_on;
         if (line == qz::acl_line::entry) {
-            if ((flags & ACLFCK_OPT_VERBOSE) != 0)
-                sec__dump_acle(&entry, nullptr, "");
-            result = sec__add_acle_to_trees(&entry, trees);
-            if (result == SEC_S_OK)
-                continue;
+            if (is_verbose) {
+                const sec_acle_t shown = qz::record_of(entry);
+                sec__dump_acle(&shown, nullptr, "");
+            }
+            const qz::acle_view acle = qz::view_of(entry);
+            result = may_wait ? trees.add_soon(acle) : trees.add(acle);
             may_go_on = goes_on && result == SEC_S_BAD_ACLE;
+        } else {
+            result = trees.settle(line == qz::acl_line::bad ? text.failure() : SEC_S_OK);
         }
+        if (result == SEC_S_OK && line == qz::acl_line::end)
+            return SEC_S_OK;
+        if (result == SEC_S_OK)
+            continue;
         aclfck__print_error();
         if (!may_go_on)
             return result;
@@ -120,7 +127,7 @@ int aclfck__bulk_aclfile(const char *aclfname, const char *username, unsigned fl
         return SEC_S_OK;
     }
 
-    sec_acltree_array trees;
+    sec_acltree_array trees(text.all());
     bool is_clean = true;
     if (const int result = read_entries(text, flags, trees, is_clean); result != SEC_S_OK) {
         warn_of_skipped_cache(flags);

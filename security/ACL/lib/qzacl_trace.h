@@ -10,6 +10,7 @@
 #include <cstdint>
 #include <cstring>
 #include <pthread.h>
+#include <string_view>
 #include <tuple>
 
 namespace qz {
@@ -51,6 +52,9 @@ struct trace_item {
 inline trace_item item(const char *text) {
     return text == nullptr ? trace_item{"", 1} : trace_item{text, std::strlen(text) + 1};
 }
+
+// A string whose length is known, with its NUL.
+inline trace_item item(std::string_view text) { return {text.data(), text.size() + 1}; }
 
 // A string in an array that a caller filled: no more of it than the array, whether a NUL ends it or not.
 template <std::size_t Size>

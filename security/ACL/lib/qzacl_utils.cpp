@@ -9,6 +9,7 @@
 #include <cerrno>
 #include <cstdint>
 #include <cstdio>
+#include <cstring>
 #include <fcntl.h>
 #include <langinfo.h>
 #include <limits>
@@ -81,7 +82,7 @@ int read_file(const char *file_name, int fd, const struct stat &vetted, qz::file
     // On a 32-bit machine a file may be larger than memory can be, and its size wrap to that of a small one.
     const auto size = static_cast<std::size_t>(std::min<std::uintmax_t>(
         static_cast<std::uintmax_t>(status.st_size), std::numeric_limits<std::ptrdiff_t>::max()));
-    auto text = qz::allocate<char>(size + 1);
+    auto text = qz::allocate<char>(size + qz::text_padding);
     if (text == nullptr) {
         if (qz::traces(qz::trace_category::info))
             qz::trace_data(125, qz::item(file_name), qz::number(size));
@@ -96,7 +97,7 @@ int read_file(const char *file_name, int fd, const struct stat &vetted, qz::file
         return qz::report(SEC_S_FILE_ERROR, qz::msg::short_read, qz::shown_size(count), qz::shown_size(size),
                           error);
     }
-    text[size] = '\0';
+    std::memset(text.get() + size, '\0', qz::text_padding);
     file.data = std::move(text);
     file.length = size;
     return SEC_S_OK;

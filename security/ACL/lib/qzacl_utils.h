@@ -5,6 +5,7 @@
 #include "base/owned.h"
 
 #include <cstddef>
+#include <span>
 #include <sys/stat.h>
 
 namespace qz {
@@ -19,11 +20,18 @@ inline bool same_file(const struct stat &one, const struct stat &other) {
 // errno set, to ESTALE for another file. A file that turned into a FIFO or a terminal neither blocks nor becomes the controlling one.
 descriptor open_vetted(const char *path, int access, const struct stat &vetted);
 
+// How many bytes a text that was read has behind its end, a NUL and others: sixteen may be read from each of its
+// bytes on, and from the NUL.
+inline constexpr std::size_t text_padding = 16;
+
 // The bytes of a file, and a NUL behind them; none of an empty file.
 struct file_bytes {
     owned<char[]> data;
     std::size_t length = 0;
     bool is_replaced = false; // nothing was read, because what was opened is not the file that was vetted
+
+    // With the NUL.
+    std::span<char> all() const { return {data.get(), data == nullptr ? 0 : length + 1}; }
 };
 
 // Asks the lock hook and reads the whole file. Returns SEC_S_OK, the hook's result, or that of the read.

@@ -38,7 +38,7 @@ struct failure_kind {
 template <class... Args>
 int report(const failure_kind<Args...> &kind, std::type_identity_t<Args>... args) {
     cu_set_error_1(kind.code, 0, msg::catalog_name, msg::catalog_set, kind.id,
-                   cu_mesgtbl_qzseclib_msg[kind.id], args...);
+                   cu_mesgtbl_qzseclib_msg[static_cast<std::size_t>(kind.id)], args...);
     return kind.code;
 }
 

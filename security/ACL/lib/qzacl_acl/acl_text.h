@@ -4,6 +4,7 @@
 
 #include "qz/acl.h"
 #include "qzacl_acl/cache_file.h"
+#include "qzacl_acl/entry_parser.h"
 #include "qzacl_acl/file_name.h"
 #include "qzacl_utils.h"
 #include "report.h"
@@ -11,6 +12,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <optional>
+#include <span>
 
 namespace qz {
 
@@ -64,11 +66,13 @@ public:
     // Reads the file, and stands before its first line. Returns SEC_S_OK, SEC_S_FILE_ERROR or SEC_S_NO_MEMORY.
     int open(const vetted_file &file, const acl_file_use &use);
 
-    // Reads the next line into the entry, whose identity points into the text. A bad line does not keep those
+    // Reads the next line into the entry, which points into the text. A bad line does not keep those
     // that follow from being read.
-    acl_line next(sec_acle_t &entry);
+    acl_line next(parsed_acle &entry);
 
     bool is_empty() const { return bytes_.length == 0; }
+    // The whole text with its NUL, for trees that point into it.
+    std::span<char> all() const { return bytes_.all(); }
     // The number of the line that comes next, from 1.
     std::uint32_t line() const { return line_; }
     // The code of the bad line that was read last.

@@ -34,6 +34,7 @@
 #include <cstdint>
 #include <cstring>
 #include <limits>
+#include <string_view>
 
 namespace qz::format {
 
@@ -136,6 +137,15 @@ inline const char *string_in(byte_span field) {
     if (field.empty() || std::memchr(field.data(), '\0', field.size()) == nullptr)
         return nullptr;
     return reinterpret_cast<const char *>(field.data());
+}
+
+// The same with its length. Without an address where string_in gives null.
+inline std::string_view text_in(byte_span field) {
+    const void *end = field.empty() ? nullptr : std::memchr(field.data(), '\0', field.size());
+    if (end == nullptr)
+        return {};
+    const auto length = static_cast<std::size_t>(static_cast<const unsigned char *>(end) - field.data());
+    return {reinterpret_cast<const char *>(field.data()), length};
 }
 
 // The entries of a sub-ACL that are still to be looked at.

@@ -2,6 +2,7 @@
 #include "qzacl_acl/compile.h"
 
 #include "qzacl_acl/buffer_format.h"
+#include "qzacl_acl/identity_order.h"
 #include "qzacl_trace.h"
 #include "report.h"
 
@@ -12,22 +13,20 @@ namespace format = qz::format;
 // What a tree becomes: its header, measured before anything is allocated.
 struct measured_subacl {
     format::subacl head;
-    std::span<sec_acle_t *const> nodes;
+    const sec_acltree_t *tree = nullptr;
 };
 
 int measure(const sec_acltree_t &tree, measured_subacl &out) {
-    constexpr const char *function = "sec__acltree_to_subacl";
-    std::size_t refused = 0;
-    if (!tree.in_order(out.nodes, refused))
-        return qz::report_no_memory(function, refused);
     if (qz::has_identity(tree.type()) && tree.has_overlong_identity())
         return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_lacks_key, tree.type());
 
+    out.tree = &tree;
     out.head.type = tree.type();
     out.head.entry_count = tree.held_count();
     if (qz::has_mechanism(tree.type())) {
-        const char *mechanism = tree.first_held()->mechanism;
-        out.head.mechanism = {reinterpret_cast<const unsigned char *>(mechanism), std::strlen(mechanism) + 1};
+        const std::string_view mechanism = tree.compiled_mechanism();
+        out.head.mechanism = {reinterpret_cast<const unsigned char *>(mechanism.data()),
+                              mechanism.size() + 1};
     }
     const std::uint64_t length = format::subacl_header_size + out.head.mechanism.size() + tree.packed_size();
     if (length > format::buffer_max)
@@ -37,44 +36,46 @@ int measure(const sec_acltree_t &tree, measured_subacl &out) {
 }
 
 void write(qz::byte_writer &writer, const measured_subacl &subacl) {
-    // The nodes lie in memory in the order of insertion; fetching ahead hides most of the jumps between them.
-    constexpr std::size_t ahead = 8;
+    // The identities lie in the order of insertion; fetching ahead hides most of the jumps between them.
+    constexpr std::size_t ahead = 12;
     format::write_subacl_header(writer, subacl.head);
     const bool has_identity = qz::has_identity(subacl.head.type);
-    for (std::size_t index = 0; index < subacl.nodes.size(); ++index) {
-        if (index + ahead < subacl.nodes.size())
-            __builtin_prefetch(subacl.nodes[index + ahead]);
-        const sec_acle_t &acle = *subacl.nodes[index];
-        if (acle.type != 0)
-            format::write_entry(writer, acle.perm_mask, acle.identity,
-                                has_identity ? std::strlen(acle.identity) + 1 : 0);
+    const sec_acltree_t &tree = *subacl.tree;
+    const std::span<const qz::small_entry> entries = tree.in_order();
+    for (std::size_t index = 0; index < entries.size(); ++index) {
+        if (index + ahead < entries.size())
+            __builtin_prefetch(tree.identity(entries[index + ahead]));
+        const qz::small_entry &entry = entries[index];
+        const char *const identity = tree.identity(entry);
+        if (entry.is_deleted == 0)
+            format::write_entry(writer, entry.perm_mask, identity,
+                                has_identity ? qz::identity_length(identity) + 1 : 0);
     }
 }
 
 bool has_entries(const sec_acltree_t *root) { return root != nullptr && root->held_count() != 0; }
 
 // The parts of an expanded entry that all entries of a sub-ACL share.
-int common_part(const format::subacl &head, sec_acle_t &acle) {
-    acle = {};
-    acle.type = head.type;
+int common_part(const format::subacl &head, qz::acle_view &acle) {
+    acle = {.type = head.type};
     if (!qz::is_acle_type(head.type))
         return qz::report_corrupt(__LINE__);
     if (!qz::has_mechanism(head.type))
         return SEC_S_OK;
-    const char *mechanism = format::string_in(head.mechanism);
-    const std::size_t length = mechanism == nullptr ? head.mechanism.size() : std::strlen(mechanism);
+    const std::string_view mechanism = format::text_in(head.mechanism);
+    const std::size_t length = mechanism.data() == nullptr ? head.mechanism.size() : mechanism.size();
     if (length > qz::mechanism_max)
         return qz::report(SEC_S_BAD_ACL, qz::msg::bad_mechanism_length, qz::shown_size(head.mechanism.size()),
                           qz::acl_source, __LINE__);
-    if (mechanism == nullptr)
+    if (mechanism.data() == nullptr)
         return qz::report_corrupt(__LINE__);
-    std::memcpy(acle.mechanism, mechanism, length);
+    acle.mechanism = mechanism;
     return SEC_S_OK;
 }
 
 int expand(qz::byte_reader reader, const format::subacl &head, sec_acltree_t **root) {
     const bool is_traced = qz::traces(qz::trace_category::api);
-    sec_acle_t acle = {};
+    qz::acle_view acle;
     if (const int result = common_part(head, acle); result != SEC_S_OK)
         return result;
     for (std::uint32_t left = head.entry_count; left != 0; --left) {
@@ -83,16 +84,14 @@ int expand(qz::byte_reader reader, const format::subacl &head, sec_acltree_t **r
             return qz::report_corrupt(__LINE__);
         acle.perm_mask = entry.perm_mask;
         if (qz::has_identity(head.type)) {
-            const char *identity = format::string_in(entry.identity);
-            if (identity == nullptr)
+            acle.identity = format::text_in(entry.identity);
+            if (acle.identity.data() == nullptr)
                 return qz::report_corrupt(__LINE__);
-            // The tree copies the identity; nothing writes through this pointer.
-            acle.identity = const_cast<char *>(identity);
         }
-        if (const int result = sec__add_acle_to_tree(0, &acle, root); result != SEC_S_OK)
+        if (const int result = sec__add_acle_to_tree(0, acle, root); result != SEC_S_OK)
             return result;
         if (is_traced)
-            sec__trace_release(&acle);
+            sec__trace_release(&acle, acle);
     }
     return SEC_S_OK;
 }
@@ -174,11 +173,6 @@ int sec__acltree_to_aclelist(sec_acltree_t *root, sec_aclelist_t *list) {
     constexpr const char *function = "sec__acltree_to_aclelist";
     if (!has_entries(root))
         return SEC_S_OK;
-    std::span<sec_acle_t *const> nodes;
-    std::size_t refused = 0;
-    if (!root->in_order(nodes, refused))
-        return qz::report_no_memory(function, refused);
-
     const std::size_t count = static_cast<std::size_t>(list->count) + root->held_count();
     const std::size_t size = count * sizeof(sec_acle_t *);
     auto *acles = count > format::buffer_max
@@ -187,12 +181,13 @@ int sec__acltree_to_aclelist(sec_acltree_t *root, sec_aclelist_t *list) {
     if (acles == nullptr)
         return qz::report_no_memory(function, size);
     list->acles = acles;
-    for (sec_acle_t *node : nodes) {
-        if (node->type == 0)
+    for (qz::small_entry &entry : root->in_order()) {
+        if (entry.is_deleted != 0)
             continue;
+        const qz::acle_view held = root->view(entry);
         sec_acle_t *made = nullptr;
-        const int result =
-            sec__create_acle(node->type, node->perm_mask, node->mechanism, node->identity, 0, &made);
+        const int result = sec__create_acle(held.type, held.perm_mask, held.mechanism.data(),
+                                            held.identity.data(), 0, &made);
         if (result != SEC_S_OK) {
             // A list without entries owns no array.
             if (list->count == 0)
@@ -200,7 +195,7 @@ int sec__acltree_to_aclelist(sec_acltree_t *root, sec_aclelist_t *list) {
             return result;
         }
         list->acles[list->count++] = made;
-        root->erase(*node);
+        root->erase(entry);
     }
     return SEC_S_OK;
 }

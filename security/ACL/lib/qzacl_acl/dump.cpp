@@ -101,16 +101,10 @@ void sec__dump_acle(const sec_acle_t *acle, const sec_perm_set_t *set, const cha
 void sec__dump_acltree(const sec_acltree_t *node, const char *indentation) {
     if (node == nullptr)
         return;
-    std::span<sec_acle_t *const> nodes;
-    std::size_t refused = 0;
-    if (!node->in_order(nodes, refused)) {
-        qz::report_no_memory("sec__dump_acltree", refused);
-        print_and_clear(stderr, as_it_stands);
-        return;
-    }
-    for (const sec_acle_t *acle : nodes) {
-        if (acle->type != 0)
-            sec__dump_acle(acle, nullptr, indentation);
+    for (const qz::small_entry &entry : node->in_order()) {
+        const sec_acle_t shown = node->record(entry);
+        if (entry.is_deleted == 0)
+            sec__dump_acle(&shown, nullptr, indentation);
     }
 }
 

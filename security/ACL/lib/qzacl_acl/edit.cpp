@@ -5,6 +5,7 @@
 // entries already are what compiling such a tree gives, well-formed and in ascending order, the bytes of the
 // one entry are changed in place instead: the result is the same, without a second copy of the sub-ACL.
 #include "base/owned.h"
+#include "qzacl_acl/acle_report.h"
 #include "qzacl_acl/buffer.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/compile.h"
@@ -222,10 +223,10 @@ int add_packed(const sec_acle_t &acle, int report_duplicates, const stored_subac
                const packed_place &place, sec_acl_buffer_t &acl) {
     if (place.size != 0) {
         if (report_duplicates != 0)
-            return sec__report_duplicate(&acle);
+            return sec__report_duplicate(qz::view_of(acle));
         qz::store_field(writable(acl), stored.offset + place.offset + format::entry_mask_offset,
                         acle.perm_mask);
-        sec__trace_replacement(&acle);
+        sec__trace_replacement(qz::view_of(acle));
         return SEC_S_OK;
     }
     const std::size_t identity_size = std::strlen(acle.identity) + 1;
@@ -345,7 +346,7 @@ int delete_by_tree(const sec_acle_t &acle, const stored_subacl &stored, sec_acl_
         return result;
     const qz::owned_acltree tree(root);
     if (root == nullptr)
-        return sec__acle_not_found(SEC_S_BAD_ACLE, &acle);
+        return sec__acle_not_found(SEC_S_BAD_ACLE, qz::view_of(acle));
     result = sec__del_acle_from_tree(&acle, root);
     qz::loose_subacl compiled;
     if (result == SEC_S_OK)
@@ -371,11 +372,11 @@ int delete_checked(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
     if (const int result = find(*acl, *acle, stored); result != SEC_S_OK)
         return result;
     if (stored.start == nullptr)
-        return sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, acle);
+        return sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, qz::view_of(*acle));
     packed_place place;
     if (may_edit_packed(*acle, *acl) &&
         find_packed({stored.start, stored.head.length}, stored.head, acle->identity, place))
-        return place.size == 0 ? sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, acle)
+        return place.size == 0 ? sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, qz::view_of(*acle))
                                : delete_packed(stored, place, *acl);
     return delete_by_tree(*acle, stored, *acl);
 }

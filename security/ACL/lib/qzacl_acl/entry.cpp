@@ -209,6 +209,15 @@ void sec__trace_release(const sec_acle_t *acle) {
     qz::trace_release_exit(48);
 }
 
+void sec__trace_release(const void *place, const qz::acle_view &acle) {
+    qz::trace_entry(45, [&] {
+        const std::uint32_t type = acle.type;
+        qz::trace_data(47, qz::number(place), qz::number(type), qz::number(acle.perm_mask),
+                       qz::item(acle.mechanism), qz::item(acle.identity));
+    });
+    qz::trace_release_exit(48);
+}
+
 void sec_release_acle(sec_acle_t *acle) {
     sec__trace_release(acle);
     if (acle != nullptr) {

@@ -1,4 +1,4 @@
-// Entries of an ACL: their types, and the record that holds one in memory.
+// Entries of an ACL: their types, the record that owns one, and the view of one whose texts lie elsewhere.
 #ifndef QZACL_ENTRY_H
 #define QZACL_ENTRY_H
 
@@ -6,7 +6,9 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
 #include <memory>
+#include <string_view>
 
 namespace qz {
 
@@ -46,11 +48,31 @@ constexpr int type_letter(unsigned type) {
     }
 }
 
+inline constexpr char no_text[] = "";
+
+// An entry that is borrowed. A NUL, which the lengths do not count, ends the identity always and the mechanism
+// in entries of the types that have one.
+struct acle_view {
+    std::uint32_t perm_mask = 0;
+    std::uint8_t type = 0;
+    std::string_view mechanism = no_text;
+    std::string_view identity = no_text;
+};
+
+// The view of a record, whose identity may be null.
+inline acle_view view_of(const sec_acle_t &acle) {
+    return {acle.perm_mask,
+            acle.type,
+            {acle.mechanism, strnlen(acle.mechanism, mechanism_max)},
+            acle.identity == nullptr ? no_text : acle.identity};
+}
+
 } // namespace qz
 
-// Records the trace points of releasing an entry, which may be null: also for entries that others hold memory
-// for.
+// Records the trace points of releasing an entry, which may be null.
 void sec__trace_release(const sec_acle_t *acle);
+// The same for an entry that has no record: it stands at `place`.
+void sec__trace_release(const void *place, const qz::acle_view &acle);
 
 // Makes an entry whose arguments were checked by the caller: a mechanism of at most 16 bytes for types 4 and
 // 8, an identity for types 4, 8 and 16. With `convert` non-zero both are converted to UTF-8. Returns SEC_S_OK

@@ -9,10 +9,13 @@
 
 #include "libqz_cu/posix_fold.h"
 #include "qzacl_acl/entry.h"
+#include "qzacl_acl/identity_order.h"
 #include "qzacl_acl/permission.h"
 #include "qzacl_trace.h"
 #include "report.h"
 
+#include <algorithm>
+#include <bit>
 #include <cctype>
 #include <cstring>
 
@@ -35,29 +38,33 @@ private:
 #endif
 };
 
-// True when one of the eight bytes is a NUL or a line end. A byte of the difference is zero where it matches;
-// the borrow test may report a byte above a match, never miss one.
-bool may_end_line(std::uint64_t word) {
-    constexpr std::uint64_t ones = 0x0101010101010101;
-    constexpr std::uint64_t highs = 0x8080808080808080;
-    const auto has_zero = [](std::uint64_t bytes) { return (bytes - ones) & ~bytes & highs; };
-    return (has_zero(word) | has_zero(word ^ (ones * '\n')) | has_zero(word ^ (ones * '\f')) |
-            has_zero(word ^ (ones * '\r'))) != 0;
+constexpr std::uint64_t in_each_byte(unsigned char value) {
+    return value * std::uint64_t{0x0101010101010101};
 }
 
-// The first line end or NUL at or behind `at`; a NUL stands inside the `size` bytes.
-char *find_line_end(char *at, std::size_t size) {
-    while (size >= sizeof(std::uint64_t)) {
-        std::uint64_t word = 0;
-        std::memcpy(&word, at, sizeof word);
-        if (may_end_line(word))
-            break;
-        at += sizeof word;
-        size -= sizeof word;
+// The first byte at or after `at` that ends what is looked for. One that does lies before `limit`. Eight bytes at a
+// time are tested for any that may end it, as `may_end` says with their high bits, the first byte being the lowest.
+// It may name more of them behind one that does end it, but miss none.
+template <class MayEnd, class Ends>
+char *find_end(char *at, const char *limit, const MayEnd &may_end, const Ends &ends) {
+    for (; limit - at >= static_cast<std::ptrdiff_t>(qz::identity_word_size); at += qz::identity_word_size) {
+        for (auto some = may_end(qz::first_byte_lowest(at)); some != 0; some &= some - 1) {
+            char *const found = at + std::countr_zero(some) / 8;
+            if (ends(*found))
+                return found;
+        }
     }
-    while (*at != '\0' && !is_line_end(*at))
+    while (!ends(*at))
         ++at;
     return at;
+}
+
+// The first line end or NUL.
+char *find_line_end(char *at, const char *limit) {
+    const auto is_low = [](std::uint64_t word) { // below 14
+        return (word - in_each_byte(14)) & ~word & in_each_byte(0x80);
+    };
+    return find_end(at, limit, is_low, [](char c) { return c == '\0' || is_line_end(c); });
 }
 
 std::uint8_t type_of_letter(char letter) {
@@ -87,10 +94,10 @@ struct token {
     std::size_t length = 0;
 };
 
-// Cuts the tokens out of one line, ending each with a NUL in place.
+// Cuts the tokens out of one line of a text, ending each with a NUL in place.
 class line_tokens {
 public:
-    line_tokens(char *begin, char *end) : at_(begin), end_(end) {}
+    line_tokens(char *begin, char *end, const char *limit) : at_(begin), end_(end), limit_(limit) {}
 
     // False when only blanks and a comment are left.
     bool next(token &out) {
@@ -99,8 +106,7 @@ public:
         if (at_ == end_ || *at_ == '#')
             return false;
         out.text = at_;
-        while (at_ != end_ && !is_space_(*at_))
-            ++at_;
+        at_ = find_token_end();
         out.length = static_cast<std::size_t>(at_ - out.text);
         *at_ = '\0';
         // A token that ended at the line end was the last one.
@@ -110,13 +116,23 @@ public:
     }
 
 private:
+    // White space or the end of the line, which is a line end or a NUL.
+    char *find_token_end() const {
+        const auto is_no_sign = [](std::uint64_t word) { // a blank, a control character or beyond ASCII
+            return ((word - in_each_byte(' ' + 1)) | word) & in_each_byte(0x80);
+        };
+        return find_end(at_, limit_, is_no_sign,
+                        [this](char c) { return c == '\0' || is_line_end(c) || is_space_(c); });
+    }
+
     char *at_;
     char *end_;
+    const char *limit_;
     space_class is_space_;
 };
 
 // Fills the entry from the tokens of a line; a line without any leaves its type 0.
-int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, sec_acle_t &entry) {
+int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, qz::parsed_acle &entry) {
     token type;
     if (!tokens.next(type))
         return SEC_S_OK;
@@ -133,13 +149,13 @@ int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, sec_acle
         for (std::size_t index = 0; index < mechanism.length; ++index)
             mechanism.text[index] =
                 static_cast<char>(qz::fold(static_cast<unsigned char>(mechanism.text[index])));
-        std::memcpy(entry.mechanism, mechanism.text, mechanism.length);
+        entry.mechanism = {mechanism.text, mechanism.length};
     }
     if (qz::has_identity(entry.type)) {
         token identity;
         if (!tokens.next(identity))
             return qz::report(SEC_S_BAD_ACL, qz::msg::tokens_missing, line);
-        entry.identity = identity.text;
+        entry.identity = {identity.text, identity.length};
     }
 
     token permissions;
@@ -160,15 +176,26 @@ int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, sec_acle
 
 } // namespace
 
+namespace qz {
+
+sec_acle_t record_of(const parsed_acle &entry) {
+    sec_acle_t record = {entry.perm_mask, {}, entry.type, entry.identity.data()};
+    std::copy(entry.mechanism.begin(), entry.mechanism.end(), record.mechanism);
+    return record;
+}
+
+} // namespace qz
+
 int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size_t *remaining,
-                             std::uint32_t *line, sec_acle_t *entry) {
+                             std::uint32_t *line, qz::parsed_acle *entry) {
     constexpr int line_consumed = 1;
     *entry = {};
     char *begin = *cursor;
     if (begin == nullptr || *begin == '\0')
         return SEC_S_OK;
 
-    char *end = find_line_end(begin, *remaining);
+    const char *limit = begin + *remaining;
+    char *end = find_line_end(begin, limit);
     const bool ends_at_nul = *end == '\0';
     const std::size_t length = static_cast<std::size_t>(end - begin) + 1;
     const auto shown_line = static_cast<int>(*line);
@@ -179,7 +206,7 @@ int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size
             qz::trace_data(115, qz::number(*line), qz::number(length));
         result = qz::report(SEC_S_FILE_ERROR, qz::msg::line_too_long, shown_line);
     } else {
-        result = parse_line(line_tokens(begin, end), set == nullptr ? acl__default_perm_set : *set,
+        result = parse_line(line_tokens(begin, end, limit), set == nullptr ? acl__default_perm_set : *set,
                             shown_line, *entry);
         // A NUL that is not the text's own end hides whatever follows it.
         if (result == SEC_S_OK && ends_at_nul && *remaining != length) {
@@ -192,4 +219,12 @@ int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size
     *remaining -= length;
     ++*line;
     return result == SEC_S_OK ? line_consumed : result;
+}
+
+int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size_t *remaining,
+                             std::uint32_t *line, sec_acle_t *entry) {
+    qz::parsed_acle parsed;
+    const int result = sec__read_acle_from_text(set, cursor, remaining, line, &parsed);
+    *entry = qz::record_of(parsed);
+    return result;
 }

@@ -1,61 +1,87 @@
-// Identities laid out for quick comparison, and sorting them. Case folds as in the POSIX locale everywhere.
+// Identities as words of eight bytes: comparing and hashing them. Case folds as in the POSIX locale everywhere.
 //
-// An identity held by a tree starts at a multiple of eight bytes and is padded with NULs to the next, so that
-// it can be folded, hashed and compared eight bytes at a time without looking outside its own memory.
+// An identity ends in a NUL. Whoever hands one to these functions lets them read the seven bytes behind that NUL,
+// so that every word can be loaded whole.
 #ifndef QZACL_IDENTITY_ORDER_H
 #define QZACL_IDENTITY_ORDER_H
 
 #include "libqz_cu/posix_fold.h"
-#include "qz/acl.h"
+#include "libqz_cu/wide_product.h"
 
+#include <bit>
 #include <cstddef>
 #include <cstdint>
-#include <cstring>
-#include <span>
 
 namespace qz {
 
-// The number of eight-byte words that an identity of `length` bytes takes with its NUL.
-constexpr std::size_t identity_words(std::size_t length) { return length / sizeof(std::uint64_t) + 1; }
+inline constexpr std::size_t identity_word_size = sizeof(std::uint64_t);
 
-inline std::uint64_t folded_word(const char *padded, std::size_t word) {
-    std::uint64_t bytes = 0;
-    std::memcpy(&bytes, padded + word * sizeof bytes, sizeof bytes);
-    return fold8(bytes);
+// Eight bytes of an identity as a number of which the first byte is the lowest.
+inline std::uint64_t first_byte_lowest(const char *at) {
+    const std::uint64_t word = load8(at);
+    return std::endian::native == std::endian::little ? word : __builtin_bswap64(word);
 }
 
-// Secret multipliers: whoever writes an ACL file cannot choose names that collide.
+// The high bit of the lowest byte that is zero; 0 when none is. Bits above that one are cut off, where a borrow
+// may have set some that mean nothing.
+constexpr std::uint64_t lowest_nul(std::uint64_t word) {
+    const std::uint64_t nuls = (word - 0x0101010101010101) & ~word & 0x8080808080808080;
+    return nuls & (~nuls + 1);
+}
+
+// The first eight bytes of an identity, folded, as a number that compares as they do: the first byte is the highest,
+// and zeros stand from the NUL on.
+inline std::uint64_t ordered_word(const char *identity) {
+    const std::uint64_t word = first_byte_lowest(identity);
+    return __builtin_bswap64(fold8(word & (lowest_nul(word) - 1)));
+}
+
+// True when the identity ends among the eight bytes of its ordered word.
+constexpr bool ends_within(std::uint64_t ordered) { return (ordered & 0xff) == 0; }
+
+// The number of bytes before the NUL.
+inline std::size_t identity_length(const char *identity) {
+    for (std::size_t length = 0;; length += identity_word_size) {
+        const std::uint64_t nul = lowest_nul(first_byte_lowest(identity + length));
+        if (nul != 0)
+            return length + static_cast<std::size_t>(std::countr_zero(nul)) / 8;
+    }
+}
+
+// Negative, zero or positive as the first identity sorts before, with or after the second.
+inline int compare_identities(const char *a, const char *b) {
+    for (;; a += identity_word_size, b += identity_word_size) {
+        const std::uint64_t left = ordered_word(a);
+        const std::uint64_t right = ordered_word(b);
+        if (left != right)
+            return left < right ? -1 : 1;
+        if (ends_within(left))
+            return 0;
+    }
+}
+
+// Secret multipliers: the writer of an ACL file cannot choose names that collide.
 struct identity_hash_key {
     std::uint64_t first = 0;
     std::uint64_t second = 0;
 };
 identity_hash_key make_identity_hash_key();
 
-std::uint32_t hash_identity(const char *padded, std::size_t length, const identity_hash_key &key);
-
-// Both padded; `length` is that of the first.
-inline bool identities_are_equal(const char *padded, std::size_t length, const char *other) {
-    for (std::size_t word = 0; word < identity_words(length); ++word) {
-        // A shorter `other` differs in the word that holds its NUL, before its memory ends.
-        if (folded_word(padded, word) != folded_word(other, word))
-            return false;
-    }
-    return true;
+// Mixes one more word into the state of a hash, which starts as the second multiplier and ends with one more mix.
+inline std::uint64_t hash_word(std::uint64_t state, std::uint64_t word, const identity_hash_key &key) {
+    const wide_number product = wide_product(state ^ word, key.first);
+    return product.low ^ product.high;
 }
 
-// Negative, zero or positive as the first identity sorts before, with or behind the second; both padded.
-int compare_identities(const char *padded, const char *other);
-
-// An entry beside the part of its identity that decides most comparisons.
-struct keyed_acle {
-    std::uint64_t key;
-    sec_acle_t *acle;
-};
-
-// Sorts entries, whose identities are padded and no two equal, in ascending order of identity. Both scratch
-// arrays hold as many elements as there are entries. Takes O(n log n) comparisons whatever the order of
-// input, and a bounded depth of stack.
-void sort_by_identity(std::span<sec_acle_t *> acles, keyed_acle *scratch, keyed_acle *more_scratch);
+// `first` is the identity's first word.
+inline std::uint64_t hash_identity(const char *identity, std::uint64_t first, const identity_hash_key &key) {
+    std::uint64_t state = hash_word(key.second, first, key);
+    for (std::uint64_t word = first; !ends_within(word); state = hash_word(state, word, key)) {
+        identity += identity_word_size;
+        word = ordered_word(identity);
+    }
+    return hash_word(state, key.second, key);
+}
 
 } // namespace qz
 

@@ -6,7 +6,7 @@
 #include "qzacl_acl/cache_vetting.h"
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/file_name.h"
-#include "qzacl_acl/tree.h"
+#include "qzacl_acl/trees.h"
 #include "qzacl_acl/validate.h"
 #include "qzacl_trace.h"
 #include "qzacl_utils.h"
@@ -86,22 +86,25 @@ bool acl_file_reader::read_cache(sec_acl_buffer_t &out) {
 int acl_file_reader::parse_lines(sec_acltree_array &trees) {
     constexpr unsigned every_line = 7; // the Info level above which each line is traced
     const bool traces_lines = qz::trace_level(qz::trace_category::info) > every_line;
-    sec_acle_t entry = {};
+    const bool may_wait = !traces_lines && perf_level_ != 1; // traces show the line of the failure
+    qz::parsed_acle entry;
     for (;;) {
         const qz::acl_line line = text_.next(entry);
         if (line == qz::acl_line::end)
-            return SEC_S_OK;
+            return trees.settle(SEC_S_OK);
         if (line == qz::acl_line::bad)
-            return text_.failure();
+            return trees.settle(text_.failure());
         if (traces_lines) {
             const std::uint32_t number = text_.line();
             const std::uint32_t type = entry.type;
-            qz::trace_data(114, qz::number(number), qz::number(type), qz::item(entry.mechanism),
-                           qz::item(entry.identity), qz::number(entry.perm_mask));
+            const qz::acle_view shown = qz::view_of(entry);
+            qz::trace_data(114, qz::number(number), qz::number(type), qz::item(shown.mechanism),
+                           qz::item(shown.identity), qz::number(entry.perm_mask));
         }
         if (line == qz::acl_line::none)
             continue;
-        if (const int added = sec__add_acle_to_trees(&entry, trees); added != SEC_S_OK)
+        const qz::acle_view acle = qz::view_of(entry);
+        if (const int added = may_wait ? trees.add_soon(acle) : trees.add(acle); added != SEC_S_OK)
             return added;
     }
 }
@@ -109,7 +112,7 @@ int acl_file_reader::parse_lines(sec_acltree_array &trees) {
 int acl_file_reader::parse(sec_acl_buffer_t &out) {
     const std::uint64_t start = perf_level_ == 1 ? qz::read_counter() : 0;
     flags_ &= ~std::uint32_t{SEC_READ_ACL_CONVERT};
-    sec_acltree_array trees;
+    sec_acltree_array trees(text_.all());
     int result = parse_lines(trees);
     if (result == SEC_S_OK && !trees.trees().empty())
         result = sec__acltrees_to_acl(trees.trees(), &out);
