@@ -205,7 +205,7 @@ struct allocations : files {
         EXPECT_TRUE(!is_public || std::ranges::any_of(words(row.name), is_told)) << now.text;
         // A text is read with room for a NUL, and what is converted is told without the converter's room.
         arguments sizes;
-        for (const std::size_t room : {0, 1, 16})
+        for (const std::size_t room : {0u, 1u, 16u})
             sizes.push_back(" " + std::to_string(size - room) + " bytes");
         EXPECT_TRUE(and_on || std::ranges::any_of(sizes, is_told)) << size << " in " << now.text;
     }
