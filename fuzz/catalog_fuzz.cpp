@@ -17,47 +17,60 @@ std::vector<std::smatch> pieces(const std::string &text) {
 std::vector<std::string> sorted(const std::string &text) {
     std::vector<std::string> all;
     for (const std::smatch &each : pieces(text))
-        if (each[1].matched || each.str() == "%") all.push_back(each.str());
+        if (each[1].matched || each.str() == "%")
+            all.push_back(each.str());
     std::ranges::sort(all);
     return all;
 }
 
 // A conversion carried out by the C library, which may not be asked to fill strings and characters with zeros.
-std::string shown(const std::smatch &of, const auto &argument) {
-    const std::string kind = of[4], form = "%" + (kind == "s" || kind == "c" ? "" : of[2].str()) + of[3].str() + kind;
+std::string shown(const std::smatch &piece, const auto &argument) {
+    const std::string kind = piece[4];
+    const bool takes_zeros = kind != "s" && kind != "c";
+    const std::string form = "%" + (takes_zeros ? piece[2].str() : "") + piece[3].str() + kind;
     char text[1100];
-    return {text, static_cast<std::size_t>(std::snprintf(text, sizeof text, form.c_str(), argument))};
+    const int length = std::snprintf(text, sizeof text, form.c_str(), argument);
+    return {text, static_cast<std::size_t>(length)};
+}
+
+// The text that a conversion, a percent sign or a byte stands for.
+std::string expanded(const std::smatch &piece, const qz::cu::arguments &given,
+                     std::map<int, bool> &is_string) {
+    const int at = piece[1].matched ? *piece[1].first - '1' : 9;
+    const bool takes_string = piece[4] == "s";
+    if (at >= given.count || takes_string != is_string[at])
+        return piece.str() == "%%" ? "%" : piece.str();
+    return takes_string ? shown(piece, given.values[at].text) : shown(piece, given.values[at].number);
 }
 
 } // namespace
 
 int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
     std::string_view from = fuzz::input(data, size);
-    const std::string by_default = fuzz::line(from).substr(0, 300).c_str(), offered(std::string(from, 0, 300).c_str());
-    std::map<int, bool> strings; // what the default text takes, each by the first that takes it
+    const std::string by_default = fuzz::line(from).substr(0, 300).c_str();
+    const std::string offered(std::string(from, 0, 300).c_str());
+    std::map<int, bool> is_string; // what the default text takes, each by the first that takes it
     for (const std::smatch &each : pieces(by_default))
-        if (each[1].matched) strings.try_emplace(*each[1].first - '1', each[4] == "s");
+        if (each[1].matched)
+            is_string.try_emplace(*each[1].first - '1', each[4] == "s");
     qz::cu::arguments given = {};
     qz::cu::find_arguments(by_default.c_str(), given);
-    EXPECT_EQ(given.count, strings.empty() ? 0 : strings.rbegin()->first + 1);
+    EXPECT_EQ(given.count, is_string.empty() ? 0 : is_string.rbegin()->first + 1);
     for (int i = 0; i < 9; ++i) {
-        EXPECT_EQ(given.is_string(static_cast<unsigned>(i)), strings[i]);
+        EXPECT_EQ(given.is_string(static_cast<unsigned>(i)), is_string[i]);
         // What is not given holds a number, so that it would be a wild address.
         given.values[i].number = i % 2 == 0 ? -1234567 - i : 'a' + i;
-        if (strings[i]) given.values[i].text = i % 2 == 0 ? "" : "text";
+        if (is_string[i])
+            given.values[i].text = i % 2 == 0 ? "" : "text";
     }
     const std::vector<std::string> taken = sorted(offered);
     const bool is_sound = taken.size() <= 32 && (taken.empty() || taken[0] != "%");
-    EXPECT_EQ(qz::cu::has_conversions_of(offered.c_str(), by_default.c_str()), is_sound && taken == sorted(by_default));
+    const bool is_usable = is_sound && taken == sorted(by_default);
+    EXPECT_EQ(qz::cu::has_conversions_of(offered.c_str(), by_default.c_str()), is_usable);
     for (const std::string &text : {by_default, offered}) {
         std::string wanted;
-        for (const std::smatch &each : pieces(text)) {
-            const int at = each[1].matched ? *each[1].first - '1' : 9;
-            const bool is_string = each[4] == "s", is_given = at < given.count && is_string == strings[at];
-            wanted += !is_given   ? each.str().substr(each.str() == "%%")
-                      : is_string ? shown(each, given.values[at].text)
-                                  : shown(each, given.values[at].number);
-        }
+        for (const std::smatch &each : pieces(text))
+            wanted += expanded(each, given, is_string);
         std::vector<char> made(qz::cu::format_text(text.c_str(), given, nullptr));
         EXPECT_EQ(qz::cu::format_text(text.c_str(), given, made.data()), made.size());
         EXPECT_EQ(std::string(made.begin(), made.end()), wanted + '\0');

@@ -13,41 +13,69 @@ namespace {
 using namespace fuzz;
 using namespace support;
 
-// What a line is: "-" for none; an entry as its type, its mechanism, its identity and its mask; a failure as
-// its message and the message's arguments.
-using line_facts = std::string;
+// What a line is: nothing, an entry as text_of() shows it, or a failure.
+struct line_facts {
+    std::string entry = {};
+    failure error = no_error;
+    std::size_t length = 0; // its end included
+};
 
-// The second parser. `length` becomes the line's, its end included.
-line_facts parse_plainly(const std::string &text, std::size_t at, std::uint32_t number, std::size_t &length) {
+// The permissions of some letters; none: one of them is unknown.
+std::optional<std::uint32_t> mask_of(const std::string &letters) {
+    std::uint32_t mask = 0;
+    for (const char letter : letters) {
+        const std::size_t bit = "rwcxCqledvsao"s.find(letter);
+        if (bit == std::string::npos)
+            return std::nullopt;
+        mask |= 1u << bit;
+    }
+    return mask;
+}
+
+// The second parser, of a line that is neither too long nor empty; `is_cut` by a NUL.
+line_facts parse_tokens(const arguments &tokens, int line, bool is_cut) {
+    const std::string type = folded(tokens[0]);
+    if (type.size() != 1 || "noueg"s.find(type) == std::string::npos)
+        return {.error = bad_acl(msg::bad_type_token, line, tokens[0])};
+    const bool has_mechanism = type == "u" || type == "e";
+    const std::size_t needed = has_mechanism ? 3 : type == "g" ? 2 : 1;
+    if (has_mechanism && tokens.size() > 1 && tokens[1].size() > 16)
+        return {.error = bad_acl(msg::mechanism_too_long, tokens[1], line)};
+    if (tokens.size() < needed)
+        return {.error = bad_acl(msg::tokens_missing, line)};
+    std::string entry = type;
+    for (std::size_t index = 1; index < needed; ++index)
+        entry += " " + (has_mechanism && index == 1 ? folded(tokens[index]) : tokens[index]);
+    const std::string letters = tokens.size() > needed ? tokens[needed] : "";
+    const auto mask = mask_of(letters);
+    if (!mask)
+        return {.error = error_of(SEC_S_BAD_PERMISSION, msg::bad_permission_token, line, letters)};
+    if (tokens.size() > needed + 1)
+        return {.error = bad_acl(msg::tokens_in_excess, line)};
+    if (is_cut)
+        return {.error = bad_acl(msg::line_corrupted, line)};
+    return {.entry = entry + " " + std::to_string(*mask)};
+}
+
+line_facts parse_plainly(const std::string &text, std::size_t at, int line) {
     const std::size_t end = std::min(text.find_first_of("\n\f\r\0"s, at), text.size());
-    const std::string line = " " + std::to_string(number);
-    length = end - at + 1;
-    if (length > 1096) return "145" + line;
-    std::vector<std::string> tokens;
+    const std::size_t length = end - at + 1;
+    if (length > 1096)
+        return {.error = error_of(SEC_S_FILE_ERROR, msg::line_too_long, line), .length = length};
+    arguments tokens;
     while ((at = std::min(text.find_first_not_of(" \t\v", at), end)) < end && text[at] != '#') {
         const std::size_t stop = std::min(text.find_first_of(" \t\v", at), end);
         tokens.push_back(text.substr(at, stop - at));
         at = stop;
     }
     const bool is_cut = end < text.size() && text[end] == '\0';
-    if (tokens.empty()) return is_cut ? "131" + line : "-";
-    if (tokens[0].size() != 1 || "nouegNOUEG"s.find(tokens[0]) == std::string::npos)
-        return "165" + line + " " + tokens[0];
-    std::string facts = folded(tokens[0]);
-    const bool has_mechanism = facts == "u" || facts == "e";
-    const std::size_t named = has_mechanism ? 3 : facts == "g" ? 2 : 1;
-    if (has_mechanism && tokens.size() > 1 && tokens[1].size() > 16) return "132 " + tokens[1] + line;
-    if (tokens.size() < named) return "158" + line;
-    for (std::size_t index = 1; index < named; ++index)
-        facts += " " + (has_mechanism && index == 1 ? folded(tokens[index]) : tokens[index]);
-    std::uint32_t mask = 0;
-    for (char letter : tokens.size() > named ? tokens[named] : "") {
-        const std::size_t bit = "rwcxCqledvsao"s.find(letter);
-        if (bit == std::string::npos) return "166" + line + " " + tokens[named];
-        mask |= 1u << bit;
-    }
-    if (tokens.size() > named + 1) return "159" + line;
-    return is_cut ? "131" + line : facts + " " + std::to_string(mask);
+    line_facts facts;
+    if (!tokens.empty())
+        facts = parse_tokens(tokens, line, is_cut);
+    else if (is_cut)
+        facts.error = bad_acl(msg::line_corrupted, line);
+    facts.length = length;
+    return facts;
 }
 
 // Compiles a text beside the model, which in the end is as the bytes are.
@@ -55,44 +83,40 @@ model compile(const std::string &text, buffer &out) {
     // What trees point into has readable bytes behind it.
     const bool is_borrowed = text.size() % 3 != 0;
     const buffer copy(text_field(text) + std::string(is_borrowed ? 7 : 0, 'x'));
-    char *const start = static_cast<char *>(copy.acl.data), *cursor = start;
-    const std::size_t size = text.size() + 1;
-    std::size_t left = size;
+    char *const start = static_cast<char *>(copy.acl.data);
+    char *cursor = start;
+    std::size_t left = text.size() + 1;
     std::uint32_t line = 1;
     model plain;
-    sec_acltree_array array(is_borrowed ? std::span(start, size) : std::span<char>());
+    sec_acltree_array array(is_borrowed ? std::span(start, left) : std::span<char>());
     qz::parsed_acle parsed;
     for (std::size_t place = 0, length = 0; place < text.size() && text[place] != '\0'; place += length) {
         const std::uint32_t number = line;
-        const line_facts wanted = parse_plainly(text, place, number, length);
+        const line_facts wanted = parse_plainly(text, place, static_cast<int>(number));
+        length = wanted.length;
         const int result = sec__read_acle_from_text(nullptr, &cursor, &left, &line, &parsed);
         const sec_acle_t acle = qz::record_of(parsed);
-        if (result != 1) {
-            const arguments facts = words(wanted);
-            const int code = facts[0] == "145" ? 37 : facts[0] == "166" ? 36 : 42;
-            EXPECT_EQ(result, code);
-            EXPECT_EQ(recorded_error(), error_of(code, std::stoi(facts[0]), {facts.begin() + 1, facts.end()}));
-        } else {
-            EXPECT_EQ(acle.type == 0 ? "-" : text_of(acle), wanted);
-        }
+        const bool is_read = result == 1;
+        EXPECT_EQ(is_read ? no_error : outcome_of(result), wanted.error);
+        EXPECT_EQ(is_read && acle.type != 0 ? text_of(acle) : "", wanted.entry);
         EXPECT_EQ(line, number + 1);
-        if (result == 1 && acle.type != 0) {
+        if (is_read && acle.type != 0) {
             const int added = faults::patiently([&] { return array.add(qz::view_of(parsed)); });
-            const failure refused = plain.edit(sec_add_acle_to_acl2, acle);
-            EXPECT_TRUE(added == refused.code && recorded_error() == refused) << refused;
+            EXPECT_EQ(outcome_of(added), plain.edit(sec_add_acle_to_acl2, acle));
         }
         const std::size_t end = place + length;
         const bool is_last = end > text.size() || text[end - 1] == '\0';
         EXPECT_EQ(cursor, is_last ? nullptr : start + end);
-        if (is_last) break;
-        EXPECT_EQ(left, size - end);
+        if (is_last)
+            break;
+        EXPECT_EQ(left, text.size() + 1 - end);
     }
     EXPECT_EQ(sec__read_acle_from_text(nullptr, &cursor, &left, &line, &parsed), 0);
     // The trees, in the order in which their keys appeared, are compiled the last first.
     std::ranges::reverse(plain.subacls);
     // Where memory for it fails, sorting takes another way.
     const auto compiles = [&] { return sec__acltrees_to_acl(array.trees(), &out.acl); };
-    EXPECT_EQ(text.size() % 2 == 0 ? faults::patiently(compiles) : compiles(), 0);
+    EXPECT_EQ(text.size() % 2 == 0 ? faults::patiently(compiles) : compiles(), SEC_S_OK);
     EXPECT_EQ(out.bytes(), plain.bytes());
     return plain;
 }
@@ -102,7 +126,7 @@ model compile(const std::string &text, buffer &out) {
 int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
     buffer held, recompiled;
     const model plain = compile(std::string(input(data, size)), held);
-    EXPECT_EQ(after(sec_convert_acl_to_host(1, &held.acl)), no_error);
+    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(1, &held.acl)), no_error);
     EXPECT_EQ(list_of(held.acl), plain.entries(0, nullptr));
     std::vector<sec_acltree_t *> trees;
     std::vector<qz::owned_acltree> owners;
@@ -110,11 +134,11 @@ int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
     for (const model_subacl &each : plain.subacls) {
         sec_acltree_t *root = nullptr;
         const qz::byte_span bytes(at, each.bytes().size());
-        EXPECT_EQ(faults::patiently([&] { return sec__subacl_to_acltree(bytes, &root); }), 0);
+        EXPECT_EQ(faults::patiently([&] { return sec__subacl_to_acltree(bytes, &root); }), SEC_S_OK);
         at += bytes.size();
         owners.emplace_back(*trees.insert(trees.begin(), root));
     }
-    EXPECT_EQ(sec__acltrees_to_acl(trees, &recompiled.acl), 0);
+    EXPECT_EQ(sec__acltrees_to_acl(trees, &recompiled.acl), SEC_S_OK);
     EXPECT_EQ(recompiled.bytes(), held.bytes());
     return 0;
 }

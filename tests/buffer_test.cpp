@@ -1,6 +1,6 @@
-// Compiled buffers: made, checked, converted, listed, edited, released and dumped, and what each of these refuses. How
-// every operation bears bytes that were cut short or changed is tested by fuzz/buffer_fuzz.cpp, and what edits do
-// otherwise by fuzz/edit_fuzz.cpp.
+// Compiled buffers: made, checked, converted, listed, edited, released and dumped, and what each of these refuses.
+// How every operation takes bytes that were cut short or changed is tested by fuzz/buffer_fuzz.cpp, and what edits
+// do otherwise, also to bytes that no edit makes, by fuzz/edit_fuzz.cpp.
 #include "qzacl_acl/buffer.h"
 #include "qzacl_acl/tree.h"
 #include "qzacl_acl/validate.h"
@@ -8,8 +8,14 @@
 
 using namespace support;
 
-const std::string xyz = named(3, "xyz"), bare = packed_entry(1, ""), other = packed_subacl(2, "", 1, bare);
+// Entries and sub-ACLs that many rows are made of.
+const std::string xyz = entry_bytes("xyz 3");
+const std::string bare = entry_bytes("1");
+const std::string unended = packed_entry(1, "xyz");
+const std::string any_other = subacl_bytes("o: 1");
+const std::string user_xyz = subacl_bytes("u abcd: xyz 3");
 
+// Bytes in which a number was changed.
 static std::string with(std::string bytes, std::size_t offset, unsigned value, std::size_t width = 1) {
     return bytes.replace(offset, width, number(value, width));
 }
@@ -20,282 +26,282 @@ static std::string foreign_with(std::string bytes, std::size_t offset, unsigned 
     return bytes.replace(offset, width, field);
 }
 
-TEST(buffers, are_made_or_taken_over_unexamined_and_released) {
+TEST(buffers, are_made_empty_or_of_any_bytes) {
     buffer held;
-    held.acl.length = 77;
     const std::string reader = "sec_read_acl_from_data";
-    EXPECT_EQ(after(sec_read_acl_from_data(0, nullptr, nullptr)), bad_parameter(reader, 1));
-    EXPECT_EQ(after(sec_read_acl_from_data(-2, "x", &held.acl)), bad_parameter(reader, 1, "fffffffe"));
-    EXPECT_EQ(after(sec_read_acl_from_data(1, nullptr, nullptr)), bad_parameter(reader, 2));
-    EXPECT_EQ(after(sec_read_acl_from_data(1, "x", nullptr)), bad_parameter(reader, 3));
-    EXPECT_EQ(held.acl.length, 77);
-    EXPECT_EQ(after(sec_create_empty_acl(nullptr)), bad_parameter("sec_create_empty_acl", 1));
-    EXPECT_EQ(sec_create_empty_acl(&held.acl), 0);
+    EXPECT_EQ(outcome_of(sec_read_acl_from_data(0, nullptr, nullptr)), bad_parameter(reader, 1));
+    EXPECT_EQ(outcome_of(sec_read_acl_from_data(-2, "x", &held.acl)), bad_parameter(reader, 1, "fffffffe"));
+    EXPECT_EQ(outcome_of(sec_read_acl_from_data(1, nullptr, nullptr)), bad_parameter(reader, 2));
+    EXPECT_EQ(outcome_of(sec_read_acl_from_data(1, "x", nullptr)), bad_parameter(reader, 3));
+    EXPECT_EQ(outcome_of(sec_create_empty_acl(nullptr)), bad_parameter("sec_create_empty_acl", 1));
+    EXPECT_EQ(sec_create_empty_acl(&held.acl), SEC_S_OK);
     EXPECT_EQ(held.bytes(), packed_acl(0, ""));
-    EXPECT_EQ(sec_release_acl(&held.acl), 0);
-    ASSERT_EQ(sec_read_acl_from_data(4, "junk", &held.acl), 0);
-    EXPECT_EQ(after(sec_release_acl(&held.acl)), error_of(42, 93));
+}
+
+TEST(buffers, are_released_when_they_begin_as_an_acl) {
+    buffer held("junk");
+    EXPECT_EQ(outcome_of(sec_release_acl(&held.acl)), error_of(SEC_S_BAD_ACL, msg::acl_corrupted));
     ASSERT_EQ(held.bytes(), "junk");
     *static_cast<char *>(held.acl.data) = '\x85';
-    EXPECT_EQ(sec_release_acl(&held.acl) + sec_release_acl(&held.acl) + sec_release_acl(nullptr), 0);
-    EXPECT_TRUE(held.acl.length == 0 && held.acl.data == nullptr);
+    EXPECT_EQ(sec_release_acl(&held.acl), SEC_S_OK);
+    EXPECT_EQ(held.acl.length, 0);
+    EXPECT_EQ(held.acl.data, nullptr);
+    EXPECT_EQ(sec_release_acl(&held.acl), SEC_S_OK);
+    EXPECT_EQ(sec_release_acl(nullptr), SEC_S_OK);
 }
 
-TEST(validate, checks_every_rule_in_its_order) {
-    const std::string user = of_mechanism(4, "abcd", 1, xyz), endless = packed_entry(1, "xyz");
-    const std::string group = packed_subacl(16, "", 4, named(~0u, "z") + xyz + xyz + named(0, ""));
-    const std::string headless = with(packed_subacl(2, "", 1, ""), 0, 10, 4);
-    const failure structural = located(42, 97), bad_identity = located(43, 114);
-    const std::tuple<const char *, std::string, failure> rows[] = {
-        {"all types, and bytes behind the end", rich + "behind", no_error},
-        {"repetitions and none", packed_acl(4, user + user + of_mechanism(8, "m", 0, "") + group), no_error},
-        {"long mechanism", one(with(of_mechanism(8, std::string(254, 'm'), 1, xyz), 3, 9)), no_error},
-        {"4 bytes", example.substr(0, 4), located(42, 106, {"4"})},
-        {"a sub-ACL too many", packed_acl(2, user), structural},
-        {"a length that is too short", packed_acl(2, with(user, 0, 25, 4) + other), structural},
-        {"a length that is too long", packed_acl(2, with(user, 0, 27, 4) + other), structural},
-        {"a header cut short", one(user.substr(0, 9)), structural},
-        {"a mechanism cut short", one(user.substr(0, 14)), structural},
-        {"an entry cut short", one(user.substr(0, 21)), structural},
-        {"the example with a length of 5", with(example, 25, 5, 2), bad_identity},
-        {"the same cut short", with(example, 25, 5, 2).substr(0, 30), structural},
-        {"entries beyond number", one(of_mechanism(4, "m", ~0u, xyz)), structural},
-        {"type 132", one(packed_subacl(132, "m", 0, "")), located(42, 107, {"132"})},
-        {"a group's mechanism", one(packed_subacl(16, "abcde", 1, xyz)), located(42, 108, {"16"})},
-        {"an unauthenticated mechanism", one(packed_subacl(1, "m", 2, "")), located(42, 108, {"1"})},
-        {"two unauthenticated", one(packed_subacl(1, "", 2, "")), located(42, 109)},
-        {"no mechanism", one(packed_subacl(4, "", 1, xyz)), located(42, 110, {"0"})},
-        {"an empty mechanism", one(packed_subacl(8, "\0"s, 1, xyz)), located(42, 110, {"1"})},
-        {"a mechanism that ends early", one(packed_subacl(4, "ab\0\0"s, 1, xyz)), located(42, 111, {"ab"})},
-        {"a mechanism that does not end", one(packed_subacl(4, "ab", 1, named(0x03000003, "xyz"))),
-         located(42, 111, {"ab\1\3"})},
-        {"any other with an identity", one(packed_subacl(2, "", 1, xyz)), located(43, 113)},
-        {"an identity that ends late", one(packed_subacl(16, "", 2, endless + xyz)), bad_identity},
-        {"no identity field", one(of_mechanism(8, "m", 1, bare)), bad_identity},
-        {"two faults", one(of_mechanism(4, "m", 2, with(xyz, 0, 0) + endless)), located(43, 112, {"0"})},
+struct checked_bytes {
+    const char *what;
+    std::string bytes;
+    failure error = no_error;
+};
+
+static void expect_check(const checked_bytes &row) {
+    SCOPED_TRACE(row.what);
+    buffer held(row.bytes);
+    EXPECT_EQ(outcome_of(sec__check_acl_buffer(&held.acl)), row.error);
+    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(1, &held.acl)), row.error);
+    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(0, &held.acl)), no_error); // nothing to convert
+    EXPECT_EQ(held.bytes(), row.bytes);
+}
+
+TEST(validate, accepts_what_is_sound) {
+    const std::string long_mechanism =
+        packed_subacl(SEC_ACLE_EXPANDED, text_field(std::string(254, 'm')), 1, xyz);
+    expect_check({"all types, and bytes behind the end", rich + "behind"});
+    expect_check({"a sub-ACL repeated", packed_acl(2, user_xyz + user_xyz)});
+    expect_check({"no entries, and entries repeated", acl_bytes("e m:; g: z 4294967295, xyz 3, xyz 3")});
+    expect_check({"a long mechanism", acl_of_one(with(long_mechanism, 3, 9))});
+}
+
+TEST(validate, finds_what_is_cut_short_or_of_another_length) {
+    const failure corrupted = bad_acl(msg::buffer_corrupted);
+    const checked_bytes rows[] = {
+        {"four bytes", example.substr(0, 4), bad_acl(msg::shorter_than_header, 4)},
+        {"a sub-ACL too few", packed_acl(2, user_xyz), corrupted},
+        {"a length too short", packed_acl(2, with(user_xyz, 0, 25, 4) + any_other), corrupted},
+        {"a length too long", packed_acl(2, with(user_xyz, 0, 27, 4) + any_other), corrupted},
+        {"an entry cut short", acl_of_one(user_xyz.substr(0, 21)), corrupted},
+        {"entries beyond number", acl_of_one(packed_subacl(4, "m\0"s, ~0u, xyz)), corrupted},
         // After a faulty entry the walk stands at that entry, where no further sub-ACL starts.
-        {"a faulty entry before a sub-ACL", packed_acl(2, with(other, 10, 2) + other), structural},
-        {"one where a sub-ACL starts", packed_acl(2, headless + other),
-         located(43, 112, {is_low_byte_first ? "17" : "0"})}, // the first byte of its length
+        {"a faulty entry before a sub-ACL", packed_acl(2, with(any_other, 10, 2) + any_other), corrupted},
     };
-    for (const auto &[name, bytes, error] : rows) {
-        buffer held(bytes);
-        EXPECT_EQ(after(sec__check_acl_buffer(&held.acl)), error) << name;
-        EXPECT_EQ(after(sec_convert_acl_to_host(1, &held.acl)), error) << name;
-        EXPECT_EQ(after(sec_convert_acl_to_host(0, &held.acl)), no_error) << name; // nothing to convert
-        EXPECT_EQ(held.bytes(), bytes) << name;
-    }
+    for (const checked_bytes &row : rows)
+        expect_check(row);
     const sec_acl_buffer_t negative = {-7, nullptr};
-    EXPECT_EQ(after(sec__check_acl_buffer(&negative)), located(42, 106, {"-7"}));
+    EXPECT_EQ(outcome_of(sec__check_acl_buffer(&negative)), bad_acl(msg::shorter_than_header, -7));
 }
 
-TEST(validate, converts_the_other_byte_order) {
-    EXPECT_EQ(one(of_mechanism(4, "abcd", 1, xyz)), example);
-    // What is not the sign of this host's order is the other one; what is wrong then is not looked for by this call.
-    for (const auto &[offset, value] : {std::pair(2u, 255u), {9u, 99u}, {20u, 9u}}) {
-        buffer held(with(foreign, offset, value) + "behind");
-        EXPECT_EQ(after(sec_convert_acl_to_host(1, &held.acl)), no_error);
-        EXPECT_EQ(held.bytes(), offset == 2 ? example + "behind" : with(example, offset, value) + "behind");
-    }
+TEST(validate, names_the_first_rule_that_is_broken) {
+    const failure bad_identity = bad_acle(msg::bad_identity_length);
+    const std::string no_entry = with(packed_subacl(SEC_ACLE_ANYOTHER, "", 1, ""), 0, 10, 4);
+    const int first_length_byte = is_low_byte_first ? 17 : 0;
+    const checked_bytes rows[] = {
+        {"type 132", acl_of_one(packed_subacl(132, "m", 0, "")), bad_acl(msg::subacl_type_unknown, 132)},
+        {"a group's mechanism", acl_of_one(packed_subacl(16, "abcde", 1, xyz)),
+         bad_acl(msg::subacl_takes_no_mechanism, 16)},
+        {"an unauthenticated mechanism, and two entries", acl_of_one(packed_subacl(1, "m", 2, "")),
+         bad_acl(msg::subacl_takes_no_mechanism, 1)},
+        {"two unauthenticated", acl_of_one(packed_subacl(1, "", 2, "")), bad_acl(msg::more_than_one_acle)},
+        {"no mechanism", acl_of_one(packed_subacl(4, "", 1, xyz)), bad_acl(msg::bad_mechanism_length, 0)},
+        {"an empty mechanism", acl_of_one(packed_subacl(8, "\0"s, 1, xyz)),
+         bad_acl(msg::bad_mechanism_length, 1)},
+        {"a mechanism that ends early", acl_of_one(packed_subacl(4, "ab\0\0"s, 1, xyz)),
+         bad_acl(msg::bad_mechanism, "ab")},
+        {"a mechanism that does not end",
+         acl_of_one(packed_subacl(4, "ab", 1, packed_entry(0x03000003, "xyz"))),
+         bad_acl(msg::bad_mechanism, "ab\1\3")},
+        {"any other with an identity", acl_bytes("o: xyz 3"), bad_acle(msg::unexpected_identity)},
+        {"an identity that is too long", with(example, 25, 5, 2), bad_identity},
+        {"an identity that does not end", acl_of_one(packed_subacl(16, "", 2, unended + xyz)), bad_identity},
+        {"no identity", acl_bytes("e m: 1"), bad_identity},
+        {"an unknown version before one that does not end",
+         acl_of_one(packed_subacl(4, "m\0"s, 2, with(xyz, 0, 0) + unended)),
+         bad_acle(msg::acle_version_unsupported, 0)},
+        {"an unknown version where a sub-ACL starts", packed_acl(2, no_entry + any_other),
+         bad_acle(msg::acle_version_unsupported, first_length_byte)},
+    };
+    for (const checked_bytes &row : rows)
+        expect_check(row);
+}
+
+TEST(convert, marks_the_order_when_all_was_turned) {
     const std::string twice = foreign_with(foreign, 3, 2, 2) + foreign.substr(5);
     const std::pair<std::string, failure> rows[] = {
-        {"\x84\1\1\0\0"s, error_of(42, 96)},
-        {"\x85\2"s, error_of(42, 96)},
-        {"\x85\1"s, located(42, 106, {"2"})},
         {twice, no_error},
-        {foreign_with(twice, 5, 11, 4), located(42, 97)},
-        {foreign.substr(0, foreign.size() - 1), located(42, 97)},
+        {with(foreign, 9, 99), no_error}, // what is wrong then is not looked for
+        {"\x84\1\1\0\0"s, bad_acl(msg::not_an_acl_buffer)},
+        {"\x85\2"s, bad_acl(msg::not_an_acl_buffer)},
+        {"\x85\1"s, bad_acl(msg::shorter_than_header, 2)},
+        {foreign_with(twice, 5, 11, 4), bad_acl(msg::buffer_corrupted)},
+        {foreign.substr(0, foreign.size() - 1), bad_acl(msg::buffer_corrupted)},
     };
     for (const auto &[bytes, error] : rows) {
         buffer held(bytes);
-        EXPECT_EQ(after(sec_convert_acl_to_host(1, &held.acl)), error);
-        EXPECT_EQ(held.bytes().substr(0, 3) == bytes.substr(0, 3), error != no_error); // only success marks the order
+        EXPECT_EQ(outcome_of(sec_convert_acl_to_host(1, &held.acl)), error);
+        const bool is_marked = held.bytes().substr(0, 3) != bytes.substr(0, 3);
+        EXPECT_EQ(is_marked, error == no_error) << error;
     }
     sec_acl_buffer_t empty = {};
-    EXPECT_EQ(after(sec_convert_acl_to_host(0, &empty)), error_of(42, 96));
-    EXPECT_EQ(after(sec_convert_acl_to_host(1, nullptr)), bad_parameter("sec_convert_acl_to_host", 2));
+    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(0, &empty)), bad_acl(msg::not_an_acl_buffer));
+    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(1, nullptr)), bad_parameter("sec_convert_acl_to_host", 2));
 }
 
 TEST(list, refuses_what_it_cannot_expand) {
-    const std::string x1 = named(1, "x"), twice = packed_subacl(1, "", 2, bare + bare);
-    const std::pair<std::string, failure> rows[] = {
-        {packed_acl(2, other + twice), error_of(42, 98)},
-        {packed_acl(2, other), located(42, 97)},
-        {packed_acl(3, with(other, 0, 0, 4)), located(42, 97)}, // would be listed three times
-        {"\x85\1"s, located(42, 97)},
-        {"\x85\2\2\0\0"s, error_of(42, 96)},
-        {one(packed_subacl(0, "", 1, x1)), located(42, 97)},
-        {one(packed_subacl(16, "", 0xffffffff, x1)), located(42, 97)},
-        {one(packed_subacl(4, "", 1, x1)), located(42, 97)},
-        {one(packed_subacl(4, std::string(17, 'm'), 1, x1)), located(42, 110, {"17"})},
-        {one(of_mechanism(4, "unix", 2, x1 + bare)), located(42, 97)},
-        {one(packed_subacl(16, "", 2, x1 + packed_entry(1, "y"))), located(42, 97)},
+    const failure corrupted = bad_acl(msg::buffer_corrupted);
+    const checked_bytes rows[] = {
+        {"two for any other", packed_acl(2, any_other + subacl_bytes("n: 1, 1")),
+         bad_acl(msg::single_acle_repeated)},
+        {"a sub-ACL too few", packed_acl(2, any_other), corrupted},
+        {"a length that leads nowhere", packed_acl(3, with(any_other, 0, 0, 4)), corrupted},
+        {"another version", "\x85\2\2\0\0"s, bad_acl(msg::not_an_acl_buffer)},
+        {"no mechanism", acl_of_one(packed_subacl(4, "", 1, xyz)), corrupted},
+        {"a long mechanism", acl_bytes("u seventeen-bytes-x: x 1"), bad_acl(msg::bad_mechanism_length, 18)},
+        {"no identity", acl_bytes("u unix: x 1, 1"), corrupted},
+        {"an identity that does not end", acl_of_one(packed_subacl(16, "", 2, xyz + unended)), corrupted},
     };
-    for (const auto &[bytes, error] : rows) {
-        const buffer held(bytes);
+    for (const checked_bytes &row : rows) {
+        SCOPED_TRACE(row.what);
+        const buffer held(row.bytes);
         sec_aclelist_t list = {7, nullptr};
-        EXPECT_EQ(after(sec_list_acl(&held.acl, &list)), error);
-        EXPECT_EQ(list.count, error.id == 96 ? 7 : 0) << error; // touched once the first bytes are right
+        EXPECT_EQ(outcome_of(sec_list_acl(&held.acl, &list)), row.error);
+        // The list is touched once the first bytes are right.
+        EXPECT_EQ(list.count, row.error.id == msg::not_an_acl_buffer.id ? 7 : 0);
     }
-    sec_acl_buffer_t empty = {}, no_length = {0, &empty};
+}
+
+TEST(list, refuses_bad_parameters) {
+    const std::string by_type = "sec_list_acl_by_type";
+    sec_acl_buffer_t empty = {};
+    sec_acl_buffer_t no_length = {0, &empty};
     sec_aclelist_t list = {7, nullptr};
-    EXPECT_EQ(after(sec_list_acl(nullptr, nullptr)), bad_parameter("sec_list_acl", 1));
-    EXPECT_EQ(after(sec_list_acl(&no_length, nullptr)), bad_parameter("sec_list_acl", 2));
-    EXPECT_EQ(sec_list_acl(&empty, &list) + list.count, 0);
-    const std::string of = "sec_list_acl_by_type";
-    EXPECT_EQ(after(sec_list_acl_by_type(nullptr, 0, "", nullptr)), bad_parameter(of, 1));
-    EXPECT_EQ(after(sec_list_acl_by_type(&no_length, 0x84, "", nullptr)), bad_parameter(of, 2, "84"));
-    for (const char *bad : {"", "seventeen-bytes-x"})
-        EXPECT_EQ(after(sec_list_acl_by_type(&no_length, 4, bad, nullptr)), bad_parameter(of, 3, shown(bad)));
-    EXPECT_EQ(after(sec_list_acl_by_type(&no_length, 16, "", nullptr)), bad_parameter(of, 4));
-    EXPECT_EQ(after(sec_list_acl_by_type(&no_length, 1, "", &list)), error_of(42, 96));
-    const buffer cut("\x85\1\2\0"s);
-    for (const char *mechanism : {static_cast<const char *>(nullptr), "unix"})
-        EXPECT_EQ(after(sec_list_acl_by_type(&cut.acl, 4, mechanism, &list)), located(42, 97));
+    EXPECT_EQ(outcome_of(sec_list_acl(nullptr, nullptr)), bad_parameter("sec_list_acl", 1));
+    EXPECT_EQ(outcome_of(sec_list_acl(&no_length, nullptr)), bad_parameter("sec_list_acl", 2));
+    EXPECT_EQ(sec_list_acl(&empty, &list), SEC_S_OK);
+    EXPECT_EQ(list.count, 0);
+    EXPECT_EQ(outcome_of(sec_list_acl_by_type(nullptr, 0, "", nullptr)), bad_parameter(by_type, 1));
+    EXPECT_EQ(outcome_of(sec_list_acl_by_type(&no_length, 0x84, "", nullptr)),
+              bad_parameter(by_type, 2, "84"));
+    for (const char *bad : {"", "seventeen-bytes-x"}) {
+        const failure error = bad_parameter(by_type, 3, address(bad));
+        EXPECT_EQ(outcome_of(sec_list_acl_by_type(&no_length, SEC_ACLE_USER, bad, nullptr)), error);
+    }
+    EXPECT_EQ(outcome_of(sec_list_acl_by_type(&no_length, SEC_ACLE_GROUP, "", nullptr)),
+              bad_parameter(by_type, 4));
+    EXPECT_EQ(outcome_of(sec_list_acl_by_type(&no_length, 1, "", &list)), bad_acl(msg::not_an_acl_buffer));
 }
 
 TEST(edit, reports_what_it_refuses_and_leaves_the_buffer_alone) {
-    const sec_acle_t user = entry(4, "unix", "al", 1);
+    const sec_acle_t al = user("unix", "al", 1);
     const std::tuple<std::string, sec_acle_t, failure> rows[] = {
-        {rich, entry(0x84, "unix", "a", 1), error_of(43, 103, {"132"})},
-        {rich, entry(4, "", "a", 1), error_of(43, 104, {"4"})},
-        {"no ACL", entry(16, "", nullptr, 1), error_of(43, 104, {"16"})}, // the entry before the buffer
-        {foreign, user, error_of(42, 102)},
-        {"\x84\2\1"s, user, error_of(42, 100)},
-        {"\x85\2\1"s, user, error_of(42, 101)},
-        {example.substr(0, 4), user, located(42, 97)},
-        {one(packed_subacl(1, "", 2, bare + bare)), entry(1, "", nullptr, 1), error_of(42, 98)},
+        {rich, entry(0x84, "unix", "a", 1), bad_acle(msg::acle_type_unknown, 132)},
+        {rich, user("", "a", 1), bad_acle(msg::acle_lacks_key, 4)},
+        {"no ACL", group(nullptr, 1), bad_acle(msg::acle_lacks_key, 16)}, // the entry before the buffer
+        {foreign, al, bad_acl(msg::wrong_byte_order)},
+        {"\x84\2\1"s, al, bad_acl(msg::second_argument_not_acl)},
+        {"\x85\2\1"s, al, bad_acl(msg::buffer_version_unsupported)},
+        {example.substr(0, 4), al, bad_acl(msg::buffer_corrupted)},
+        {with(example, 5, 27, 4), user("abcd", "b", 1), bad_acl(msg::buffer_corrupted)}, // a byte too long
+        {acl_bytes("n: 1, 1"), entry(1, "", nullptr, 1), bad_acl(msg::single_acle_repeated)},
     };
     for (const auto edit : {sec_add_acle_to_acl, sec_add_acle_to_acl2, sec_del_acle_from_acl}) {
         for (const auto &[bytes, acle, error] : rows) {
             buffer held(bytes);
-            EXPECT_EQ(after(edit(&acle, &held.acl)), error);
+            EXPECT_EQ(outcome_of(edit(&acle, &held.acl)), error);
             EXPECT_EQ(held.bytes(), bytes) << error;
         }
         const char *name = edit == sec_del_acle_from_acl ? "sec_del_acle_from_acl" : "sec_add_acle_to_acl";
-        EXPECT_EQ(after(edit(nullptr, nullptr)), bad_parameter(name, 1, "0"));
-        EXPECT_EQ(after(edit(&user, nullptr)), bad_parameter(name, 2, "0"));
+        EXPECT_EQ(outcome_of(edit(nullptr, nullptr)), bad_parameter(name, 1));
+        EXPECT_EQ(outcome_of(edit(&al, nullptr)), bad_parameter(name, 2));
     }
 }
 
-TEST(edit, holds_at_most_65534_bytes_of_identity_and_65535_subacls) {
-    const std::string longest(65534, 'i'), too_long = longest + "i", a = named(1, "a"), b = named(2, "b");
-    const sec_acle_t refused = entry(16, "", too_long.c_str(), 7), fitting = entry(16, "", longest.c_str(), 7);
+TEST(edit, holds_at_most_65534_bytes_of_identity) {
+    const std::string longest(65534, 'i');
+    const std::string too_long = longest + "i";
+    const sec_acle_t refused = group(too_long.c_str(), 7);
+    const sec_acle_t fitting = group(longest.c_str(), 7);
+    const std::string sorted = entry_bytes("a 1") + entry_bytes("b 2");
     // A buffer that the call makes, which goes with its failure; one changed in place, one rebuilt.
-    for (const std::string &entries : {""s, a + b, b + a}) {
-        const std::string bytes = entries.empty() ? "" : one(packed_subacl(16, "", 2, entries));
+    for (const std::string &bytes : {""s, acl_bytes("g: a 1, b 2"), acl_bytes("g: b 2, a 1")}) {
         buffer held(bytes);
-        EXPECT_EQ(after(sec_add_acle_to_acl(&refused, &held.acl)), error_of(43, 104, {"16"}));
+        EXPECT_EQ(outcome_of(sec_add_acle_to_acl(&refused, &held.acl)), bad_acle(msg::acle_lacks_key, 16));
         EXPECT_EQ(held.bytes(), bytes);
-        EXPECT_EQ(sec_del_acle_from_acl(&refused, &held.acl), bytes.empty() ? 42 : 18);
-        EXPECT_EQ(after(sec_add_acle_to_acl(&fitting, &held.acl)), no_error);
-        EXPECT_TRUE(held.bytes().ends_with((bytes.empty() ? "" : a + b) + named(7, longest)));
+        EXPECT_EQ(outcome_of(sec_add_acle_to_acl(&fitting, &held.acl)), no_error);
+        EXPECT_TRUE(
+            held.bytes().ends_with((bytes.empty() ? "" : sorted) + packed_entry(7, text_field(longest))));
     }
+}
+
+TEST(edit, holds_at_most_65535_subacls) {
     std::string subacls;
-    for (int number = 10000; number < 75535; ++number) subacls += of_mechanism(8, std::to_string(number), 1, a);
-    const std::string full = packed_acl(65535, subacls), added = of_mechanism(4, "more", 1, a);
+    for (int number = 10000; number < 75535; ++number)
+        subacls += subacl_bytes("e " + std::to_string(number) + ": a 1");
+    const std::string full = packed_acl(65535, subacls);
+    const std::string added = subacl_bytes("u more: a 1");
+    const std::string size = std::to_string(full.size() + added.size());
+    const sec_acle_t more = user("more", "a", 1);
+    const sec_acle_t last = expanded("75534", "A", 1);
     buffer held(full);
-    const sec_acle_t more = entry(4, "more", "a", 1), last = entry(8, "75534", "A", 1);
-    EXPECT_EQ(after(sec_add_acle_to_acl(&more, &held.acl)),
-              error_of(6, 89, {"sec_add_acle_to_acl", std::to_string(full.size() + added.size())}));
-    EXPECT_EQ(sec_del_acle_from_acl(&last, &held.acl) + sec_add_acle_to_acl(&more, &held.acl), 0);
+    EXPECT_EQ(outcome_of(sec_add_acle_to_acl(&more, &held.acl)),
+              error_of(SEC_S_NO_MEMORY, msg::no_memory, "sec_add_acle_to_acl", size));
+    EXPECT_EQ(sec_del_acle_from_acl(&last, &held.acl), SEC_S_OK);
+    EXPECT_EQ(sec_add_acle_to_acl(&more, &held.acl), SEC_S_OK);
     EXPECT_TRUE(held.bytes() == full.substr(0, full.size() - 25) + added);
-}
-
-// Nothing compares the last sub-ACL's length with where its entries end. An edit replaces the bytes that the
-// length names by all of the entries that it counts.
-TEST(edit, replaces_as_many_bytes_as_the_stored_length_says) {
-    const std::string a = named(1, "a"), c = named(3, "c"), stored = of_mechanism(4, "unix", 2, a + c) + "behind";
-    const std::string changed = of_mechanism(4, "unix", 3, a + named(2, "b") + c);
-    const sec_acle_t acle = entry(4, "unix", "b", 2);
-    for (std::size_t length = 0; length <= stored.size() + 2; ++length) {
-        const std::string last = number(length, 4) + stored.substr(4);
-        buffer held(packed_acl(2, other + last));
-        const bool is_inside = length <= stored.size();
-        EXPECT_EQ(after(sec_add_acle_to_acl(&acle, &held.acl)), is_inside ? no_error : located(42, 97)) << length;
-        EXPECT_EQ(held.bytes(), packed_acl(2, other + (is_inside ? changed + last.substr(length) : last)));
-    }
-}
-
-// Bytes behind the last counted sub-ACL are out of force, and stay so.
-TEST(edit, adds_a_sub_acl_where_the_counted_ones_end) {
-    const std::string everything = packed_subacl(2, "", 1, packed_entry(~0u, ""));
-    const std::string stored = of_mechanism(8, "krb5", 2, named(1, "a") + named(2, "b"));
-    const std::string added = of_mechanism(4, "unix", 1, named(3, "al"));
-    const sec_acle_t acle = entry(4, "unix", "al", 3);
-    buffer none_counted(packed_acl(0, everything));
-    EXPECT_EQ(after(sec_add_acle_to_acl(&acle, &none_counted.acl)), no_error);
-    EXPECT_EQ(none_counted.bytes(), packed_acl(1, added + everything));
-    // Where the last one ends must be sure.
-    for (std::size_t length = 0; length <= stored.size() + everything.size(); ++length) {
-        const std::string last = number(length, 4) + stored.substr(4);
-        buffer held(packed_acl(2, other + last + everything));
-        const bool is_sure = length == stored.size();
-        EXPECT_EQ(after(sec_add_acle_to_acl(&acle, &held.acl)), is_sure ? no_error : located(42, 97)) << length;
-        EXPECT_EQ(held.bytes(), is_sure ? packed_acl(3, other + last + added + everything)
-                                        : packed_acl(2, other + last + everything));
-    }
-    for (const std::string &bytes : {packed_acl(2, other), one(of_mechanism(8, "krb5", 3, named(1, "a")))}) {
-        buffer cut(bytes);
-        EXPECT_EQ(after(sec_add_acle_to_acl(&acle, &cut.acl)), located(42, 97));
-        EXPECT_EQ(cut.bytes(), bytes);
-    }
 }
 
 // A handler is shown identities where they stand, and may keep one to add it: the buffer moves while that is done.
 TEST(edit, adds_an_identity_that_lies_in_the_buffer) {
-    const std::string stored = named(1, "of a long name that makes the buffer move");
-    buffer held(packed_acl(1, of_mechanism(4, "unix", 1, stored)));
-    sec_acle_t acle = entry(4, "unix", "", 2);
+    buffer held(acl_bytes("u unix: of-a-long-name-that-makes-the-buffer-move 1"));
+    sec_acle_t acle = user("unix", "", 2);
     acle.identity = static_cast<char *>(held.acl.data) + held.acl.length - 5;
-    EXPECT_EQ(after(sec_add_acle_to_acl(&acle, &held.acl)), no_error);
-    EXPECT_EQ(held.bytes(), packed_acl(1, of_mechanism(4, "unix", 2, named(2, "move") + stored)));
+    EXPECT_EQ(outcome_of(sec_add_acle_to_acl(&acle, &held.acl)), no_error);
+    EXPECT_EQ(held.bytes(), acl_bytes("u unix: move 2, of-a-long-name-that-makes-the-buffer-move 1"));
 }
 
-TEST(dump, prints_buffers_and_subacls) {
-    const auto head = [](const arguments &facts) {
-        return error_of(0, 84, {"\t", "\t", facts[0], facts[1], facts[2], facts[3]}).text + "\n";
-    };
-    const auto top = [](const char *length, const char *count) {
-        return "ACL descriptor: "s + length +
-               " byte(s) long\n\tVersion: 1\n\tByte Ordering: " + std::to_string(this_order) +
-               "\n\tNumber of sub-ACLs: " + count + "\n";
-    };
-    const std::string any = head({"17", "2", "", "1"}) + "\t\ttype = o; permission = rwc\n";
-    const std::pair<std::string, std::string> rows[] = {
-        {"", ""},
-        {"\x84\1\2\0\0"s, "The ACL provided is not valid!\n\n"},
-        {rich, top("182", "6") + head({"37", "16", "", "2"}) +
-                   "\t\ttype = g; id = Admins; permission = rC\n\t\ttype = g; id = staff; permission = wC\n" +
-                   head({"49", "4", "unix", "2"}) + "\t\ttype = u; mech = unix; id = al; permission = r\n" +
-                   "\t\ttype = u; mech = unix; id = bob@host.example; permission = w\n" +
-                   head({"33", "8", "kRb5", "2"}) + "\t\ttype = e; mech = kRb5; id = z; permission = c\n" +
-                   "\t\ttype = e; mech = kRb5; id = a; permission = rc\n" + head({"24", "4", "hba2", "1"}) +
-                   "\t\ttype = u; mech = hba2; id = x; permission = wc\n" + any + head({"17", "1", "", "1"}) +
-                   "\t\ttype = n; permission = x\n"},
-        // What cannot be expanded gives its reason on standard output, and the dump goes on.
-        {packed_acl(2, packed_subacl(2, "", 2, bare + bare) + packed_subacl(2, "", 1, packed_entry(7, ""))),
-         error_of(42, 98).text + top("46", "2") + head({"24", "2", "", "2"}) + any},
-    };
-    const auto printed = [](const auto &call) {
-        testing::internal::CaptureStdout();
-        testing::internal::CaptureStderr();
-        call();
-        const std::string out = testing::internal::GetCapturedStdout();
-        return out + testing::internal::GetCapturedStderr();
-    };
-    for (const auto &[bytes, wanted] : rows) {
-        const buffer held(bytes);
-        EXPECT_EQ(printed([&] { sec__dump_acl(&held.acl); }), wanted);
-        EXPECT_EQ(recorded_error(), no_error);
-    }
-    const auto parts = [] {
+// What is printed on standard output and then on standard error.
+static std::string printed(const auto &call) {
+    testing::internal::CaptureStdout();
+    testing::internal::CaptureStderr();
+    call();
+    const std::string out = testing::internal::GetCapturedStdout();
+    return out + testing::internal::GetCapturedStderr();
+}
+static std::string dump_of(const std::string &bytes) {
+    const buffer held(bytes);
+    const std::string text = printed([&] { sec__dump_acl(&held.acl); });
+    EXPECT_EQ(recorded_error(), no_error);
+    return text;
+}
+static std::string dumped_head(const char *length, const char *count) {
+    return error_of(SEC_S_OK, msg::dump_descriptor, length, 1, this_order, count).text;
+}
+// The fields are the length, the type, the mechanism and the number of entries.
+static std::string dumped_subacl(const std::string &indentation, arguments fields) {
+    fields.insert(fields.begin(), 2, indentation);
+    return error_with(0, msg::dump_subacl.id, fields).text + "\n";
+}
+
+TEST(dump, goes_on_after_what_cannot_be_expanded) {
+    const std::string reason = bad_acl(msg::single_acle_repeated).text; // on standard output
+    EXPECT_EQ(
+        dump_of(acl_bytes("o: 1, 1; n: 7; g: Admins 17, staff 18; e kRb5: z 4")),
+        reason + dumped_head("107", "4") + dumped_subacl("\t", {"24", "2", "", "2"}) +
+            dumped_subacl("\t", {"17", "1", "", "1"}) + "\t\ttype = n; permission = rwc\n" +
+            dumped_subacl("\t", {"37", "16", "", "2"}) + "\t\ttype = g; id = Admins; permission = rC\n" +
+            "\t\ttype = g; id = staff; permission = wC\n" + dumped_subacl("\t", {"24", "8", "kRb5", "1"}) +
+            "\t\ttype = e; mech = kRb5; id = z; permission = c\n");
+    EXPECT_EQ(dump_of("\x84\1\2\0\0"s), "The ACL provided is not valid!\n\n");
+}
+
+TEST(dump, prints_parts) {
+    const auto dump_parts = [] {
         sec__dump_acl(nullptr);
         sec__dump_subacl(nullptr, "");
         sec__dump_acltree(nullptr, "");
         sec__dump_acle(nullptr, nullptr, "");
         sec__dump_subacl(example.data() + 5, nullptr);
     };
-    const std::string heading = error_of(0, 84, {"", "", "26", "4", "abcd", "1"}).text;
-    EXPECT_EQ(printed(parts), heading + "\n\ttype = u; mech = abcd; id = xyz; permission = rw\n");
+    EXPECT_EQ(printed(dump_parts), dumped_subacl("", {"26", "4", "abcd", "1"}) +
+                                       "\ttype = u; mech = abcd; id = xyz; permission = rw\n");
 }

@@ -24,55 +24,71 @@ extern "C" char *nl_langinfo(nl_item item) noexcept {
 // What the conversion of code sets answers; 0: what it really does.
 static int claimed_result = 0;
 
-extern "C" int cu_iconv_str_1(cu_iconv_t handle, std::uint32_t options, const char *in, const std::size_t *in_length,
-                              char **out, std::size_t *out_length) {
+extern "C" int cu_iconv_str_1(cu_iconv_t handle, std::uint32_t options, const char *in,
+                              const std::size_t *in_length, char **out, std::size_t *out_length) {
     static const auto real = reinterpret_cast<decltype(&cu_iconv_str_1)>(dlsym(RTLD_NEXT, "cu_iconv_str_1"));
-    return claimed_result != 0 ? claimed_result : real(handle, options, in, in_length, out, out_length);
+    if (claimed_result != 0)
+        return claimed_result;
+    return real(handle, options, in, in_length, out, out_length);
 }
 
 namespace {
 
 TEST(messages, have_a_text_whatever_their_id) {
-    for (const int id : {-1, 1, qz::msg::table_size}) EXPECT_EQ(qz::msg::shown_text(id), cu_badid_qzseclib_msg);
-    EXPECT_EQ(qz::msg::shown_text(88), qz::msg::default_text(88));
+    for (const int id : {-1, 1, msg::table_size})
+        EXPECT_EQ(msg::shown_text(id), cu_badid_qzseclib_msg);
+    EXPECT_EQ(msg::shown_text(88), msg::default_text(88));
 }
 
-TEST(permissions, turn_letters_into_bits_and_back) {
-    const sec_perm_template_t list[] = {
-        {0x80000000, 'r', "", ""}, {1, '\xe9', "", ""}, {1, 'x', "", ""}, {2, 'r', "", ""}};
-    const sec_perm_set_t own = {4, list};
-    // After an error the result is what was found before it.
-    const auto bits = [](const char *text, const sec_perm_set_t *set, unsigned wanted, const char *bad) {
+const sec_perm_template_t own_templates[] = {
+    {0x80000000, 'r', "", ""}, {1, '\xe9', "", ""}, {1, 'x', "", ""}, {2, 'r', "", ""}};
+const sec_perm_set_t own_letters = {4, own_templates};
+
+// After an error, what was found before it is there.
+TEST(permissions, turn_letters_into_bits) {
+    const std::tuple<const char *, const sec_perm_set_t *, std::uint32_t, const char *> rows[] = {
+        {nullptr, nullptr, 0, ""},
+        {"oasvdelqCxcwr", nullptr, 0x1fff, ""},
+        {"xr\xe9r", &own_letters, 0x80000001, ""},
+        {"rR", nullptr, 1, "R"},
+        {"xw", &own_letters, 1, "w"},
+    };
+    for (const auto &[letters, set, wanted, unknown] : rows) {
+        const failure error = error_of(SEC_S_BAD_PERMISSION, msg::no_template_for_letter, unknown);
         std::uint32_t mask = 0xffffffff;
-        EXPECT_EQ(after(sec_translate_perms(text, set, &mask)), *bad == 0 ? no_error : error_of(36, 133, {bad}));
-        EXPECT_EQ(mask, wanted) << text;
+        EXPECT_EQ(outcome_of(sec_translate_perms(letters, set, &mask)), *unknown == '\0' ? no_error : error);
+        EXPECT_EQ(mask, wanted);
+    }
+    EXPECT_EQ(outcome_of(sec_translate_perms("", nullptr, nullptr)), bad_parameter("sec_translate_perms", 3));
+}
+
+TEST(permissions, turn_bits_into_letters) {
+    const std::tuple<std::uint32_t, const sec_perm_set_t *, const char *, const char *> rows[] = {
+        {0, nullptr, "", ""},
+        {0x80000001, &own_letters, "\xe9r", ""},
+        {0x80000000, nullptr, "", "80000000"},
+        {0xffffffff, nullptr, "rwcxCqledvsao", "00002000"},
+        {5, &own_letters, "\xe9", "00000004"},
     };
-    bits(nullptr, nullptr, 0, "");
-    bits("oasvdelqCxcwr", nullptr, 0x1fff, "");
-    bits("xr\xe9r", &own, 0x80000001, "");
-    bits("rR", nullptr, 1, "R");
-    bits("xw", &own, 1, "w");
-    const auto letters = [](unsigned mask, const sec_perm_set_t *set, const char *wanted, const char *bad) {
+    for (const auto &[mask, set, letters, unknown] : rows) {
+        const failure error = error_of(SEC_S_BAD_PERMISSION, msg::no_template_for_bit, unknown);
         char text[qz::permission_text_size + 1] = {};
-        EXPECT_EQ(after(sec_translate_bitmask(mask, set, text)), *bad == 0 ? no_error : error_of(36, 164, {bad}));
-        EXPECT_STREQ(text, wanted);
-    };
-    letters(0, nullptr, "", "");
-    letters(0x80000001, &own, "\xe9r", "");
-    letters(0x80000000, nullptr, "", "80000000");
-    letters(0xffffffff, nullptr, "rwcxCqledvsao", "00002000");
-    letters(5, &own, "\xe9", "00000004");
-    EXPECT_EQ(after(sec_translate_perms("", nullptr, nullptr)), bad_parameter("sec_translate_perms", 3, "0"));
-    EXPECT_EQ(after(sec_translate_bitmask(1, nullptr, nullptr)), bad_parameter("sec_translate_mask", 3, "0"));
+        EXPECT_EQ(outcome_of(sec_translate_bitmask(mask, set, text)), *unknown == '\0' ? no_error : error);
+        EXPECT_STREQ(text, letters);
+    }
+    EXPECT_EQ(outcome_of(sec_translate_bitmask(1, nullptr, nullptr)), bad_parameter("sec_translate_mask", 3));
 }
 
 // What an entry made of these parameters holds, or the error.
 std::string made_of(std::uint8_t type, const char *mechanism, const char *identity) {
     auto *made = reinterpret_cast<sec_acle_t *>(0x10);
-    const failure error = after(sec_create_acle(type, 1u << 31, mechanism, identity, &made));
+    const failure error = outcome_of(sec_create_acle(type, 1u << 31, mechanism, identity, &made));
     const std::unique_ptr<sec_acle_t, void (*)(sec_acle_t *)> owner(made, sec_release_acle);
-    if (made == nullptr) return PrintToString(error);
-    EXPECT_EQ(std::tuple(error, made->type, made->perm_mask), std::tuple(no_error, type, 1u << 31));
+    if (made == nullptr)
+        return PrintToString(error);
+    EXPECT_EQ(error, no_error);
+    EXPECT_EQ(made->type, type);
+    EXPECT_EQ(made->perm_mask, 1u << 31);
     return made->mechanism + "/"s + (made->identity == nullptr ? "none" : made->identity);
 }
 
@@ -80,91 +96,131 @@ std::string refused(int position, const std::string &value) {
     return PrintToString(bad_parameter("sec_create_acle", position, value));
 }
 
-TEST(entries, are_made_from_sound_parameters) {
-    const char mechanism17[] = "12345678901234567", empty[] = "", bare[] = "alice", no_host[] = "alice@";
-    const std::tuple<std::uint8_t, const char *, const char *, std::string> rows[] = {
-        {1, nullptr, nullptr, "/none"},
-        {16, mechanism17, "a@::0", "/a@::0"},
-        {4, mechanism17 + 1, "x", "2345678901234567/x"},
-        {8, "UNIX", "a@::0", "UNIX/a@::0"},
-        {4, "unix", "alice@0:0:0:0:0:FFFF:a00:1", "unix/alice@::ffff:10.0.0.1"},
-        {4, "hba2", "@FE80:0::1", "hba2/@fe80::1"},
-        {8, "hba2", "1111:2222:3333:4444:5555:6666:7777:888F", "hba2/1111:2222:3333:4444:5555:6666:7777:888f"},
-        {4, "unix", "a@b@::01", "unix/a@b@::01"},
-        {8, "hba2", bare, "hba2/alice"},
-        {0, "unix", bare, refused(1, "0")},
-        {3, mechanism17, nullptr, refused(1, "3")},
-        {4, nullptr, nullptr, refused(3, "0")},
-        {8, empty, bare, refused(3, shown(empty))},
-        {4, mechanism17, bare, refused(3, shown(mechanism17))},
-        {4, "kdz", nullptr, refused(4, "0")},
-        {16, nullptr, empty, refused(4, shown(empty))},
-        {4, "unix", bare, refused(4, shown(bare))},
-        {4, "hba2", no_host, refused(4, shown(no_host))},
+struct parameters {
+    std::uint8_t type;
+    const char *mechanism;
+    const char *identity;
+    std::string made; // or the error
+};
+
+TEST(entries, are_made_with_addresses_in_their_short_form) {
+    const parameters rows[] = {
+        {SEC_ACLE_UNAUTHENTICATED, nullptr, nullptr, "/none"},
+        {SEC_ACLE_GROUP, "seventeen-bytes-x", "a@::0", "/a@::0"},
+        {SEC_ACLE_USER, "sixteen-bytes-xx", "x", "sixteen-bytes-xx/x"},
+        {SEC_ACLE_USER, "unix", "alice@0:0:0:0:0:FFFF:a00:1", "unix/alice@::ffff:10.0.0.1"},
+        {SEC_ACLE_USER, "hba2", "@FE80:0::1", "hba2/@fe80::1"},
+        {SEC_ACLE_EXPANDED, "hba2", "1:2:3:4:5:6:7:888F", "hba2/1:2:3:4:5:6:7:888f"},
+        {SEC_ACLE_USER, "unix", "a@b@::01", "unix/a@b@::01"},
+        {SEC_ACLE_EXPANDED, "hba2", "alice", "hba2/alice"},
     };
-    for (const auto &[type, mechanism, identity, made] : rows) EXPECT_EQ(made_of(type, mechanism, identity), made);
-    EXPECT_EQ(after(sec_create_acle(1, 0, "", "", nullptr)), bad_parameter("sec_create_acle", 5, "0"));
+    for (const auto &[type, mechanism, identity, made] : rows)
+        EXPECT_EQ(made_of(type, mechanism, identity), made);
+}
+
+TEST(entries, are_not_made_from_bad_parameters) {
+    const char long_mechanism[] = "seventeen-bytes-x";
+    const char empty[] = "";
+    const char no_host[] = "alice";
+    const char empty_host[] = "alice@";
+    const parameters rows[] = {
+        {3, "unix", nullptr, refused(1, "3")},
+        {SEC_ACLE_USER, nullptr, nullptr, refused(3, "0")},
+        {SEC_ACLE_EXPANDED, empty, no_host, refused(3, address(empty))},
+        {SEC_ACLE_USER, long_mechanism, no_host, refused(3, address(long_mechanism))},
+        {SEC_ACLE_USER, "kdz", nullptr, refused(4, "0")},
+        {SEC_ACLE_GROUP, nullptr, empty, refused(4, address(empty))},
+        {SEC_ACLE_USER, "unix", no_host, refused(4, address(no_host))},
+        {SEC_ACLE_USER, "hba2", empty_host, refused(4, address(empty_host))},
+    };
+    for (const auto &[type, mechanism, identity, error] : rows)
+        EXPECT_EQ(made_of(type, mechanism, identity), error);
+    EXPECT_EQ(outcome_of(sec_create_acle(1, 0, "", "", nullptr)), bad_parameter("sec_create_acle", 5));
 }
 
 // An internal failure names the line of the call that failed.
 TEST(entries, tell_where_a_conversion_failed) {
     std::ifstream file(QZ_SOURCES "/security/ACL/lib/qzacl_utils/code_set.cpp");
-    std::string line;
-    int number = 1;
-    while (std::getline(file, line) && line.find("cu_iconv_str_1(") == std::string::npos) ++number;
+    std::string text;
+    int line = 1;
+    while (std::getline(file, text) && text.find("cu_iconv_str_1(") == std::string::npos)
+        ++line;
     sec_acle_t *made = nullptr;
-    claimed_result = 17;
-    const failure error = after(sec_create_acle(16, 0, nullptr, "staff", &made));
-    claimed_result = 0;
-    EXPECT_EQ(error, error_of(23, 91, {"security/ACL/lib/qzacl_utils", std::to_string(number), "17"}));
+    claimed_result = CU_NO_RESOURCE;
+    const failure error = outcome_of(sec_create_acle(SEC_ACLE_GROUP, 0, nullptr, "staff", &made));
+    claimed_result = CU_OK;
+    EXPECT_EQ(error, error_of(SEC_S_INTERNAL, msg::internal_failure, "security/ACL/lib/qzacl_utils", line,
+                              CU_NO_RESOURCE));
 }
 
 // The two texts of an entry, or the error.
 std::string shown_for(const sec_acle_t &acle) {
-    char *texts[2] = {const_cast<char *>("left over"), nullptr};
-    const failure error = after(sec_display_acle_id(&acle, &texts[0], &texts[1]));
-    const qz::owned<char> owners[] = {qz::owned<char>(texts[0]), qz::owned<char>(texts[1])};
-    return error == no_error ? texts[0] + "/"s + texts[1] : texts[0] == texts[1] ? PrintToString(error) : "a text";
+    char *mechanism = const_cast<char *>("left over");
+    char *identity = nullptr;
+    const failure error = outcome_of(sec_display_acle_id(&acle, &mechanism, &identity));
+    const qz::owned<char> mechanism_owner(mechanism);
+    const qz::owned<char> identity_owner(identity);
+    if (error == no_error)
+        return mechanism + "/"s + identity;
+    return mechanism == nullptr && identity == nullptr ? PrintToString(error) : "a text";
 }
 
 TEST(entries, are_shown_when_they_are_whole) {
-    const sec_acle_t good = entry(4, "kdz", "x", 1);
+    const sec_acle_t good = user("kdz", "x", 1);
+    const std::string name = "sec_display_acle_id";
     char *text = nullptr;
-    const std::string of = "sec_display_acle_id";
-    EXPECT_EQ(after(sec_display_acle_id(nullptr, nullptr, nullptr)), bad_parameter(of, 1));
-    EXPECT_EQ(after(sec_display_acle_id(&good, nullptr, &text)), bad_parameter(of, 2));
-    EXPECT_EQ(after(sec_display_acle_id(&good, &text, nullptr)), bad_parameter(of, 3));
-    EXPECT_EQ(shown_for(entry(3, "kdz", "x", 1)), PrintToString(error_of(43, 94, {"3"})));
-    for (const sec_acle_t &part : {entry(4, "", "x", 1), entry(8, "kdz", "", 1), entry(16, "kdz", nullptr, 1)})
-        EXPECT_EQ(shown_for(part), PrintToString(error_of(43, 95)));
+    EXPECT_EQ(outcome_of(sec_display_acle_id(nullptr, nullptr, nullptr)), bad_parameter(name, 1));
+    EXPECT_EQ(outcome_of(sec_display_acle_id(&good, nullptr, &text)), bad_parameter(name, 2));
+    EXPECT_EQ(outcome_of(sec_display_acle_id(&good, &text, nullptr)), bad_parameter(name, 3));
+    const failure bad_type = bad_acle(msg::acle_type_not_displayable, 3);
+    EXPECT_EQ(shown_for(entry(3, "kdz", "x", 1)), PrintToString(bad_type));
+    for (const sec_acle_t &part : {user("", "x", 1), expanded("kdz", "", 1), group(nullptr, 1)})
+        EXPECT_EQ(shown_for(part), PrintToString(bad_acle(msg::acle_incomplete)));
     sec_release_aclelist(nullptr);
 }
 
-// A process opens its converters once, so that each row has one of its own. These run before the other tests.
+struct conversion {
+    const char *code_set; // null: that of the locale
+    const char *locale;
+    const char *mechanism;
+    const char *identity;
+    std::string made; // of the two; nothing: the mechanism is too long
+    std::string displayed;
+};
+
+// A process opens its converters once, so that each conversion has one of its own.
+void expect_conversion(const conversion &row) {
+    if (fork() == 0) {
+        claimed_code_set = row.code_set;
+        std::setlocale(LC_ALL, row.locale);
+        const std::string too_long = refused(3, address(row.mechanism));
+        EXPECT_EQ(made_of(SEC_ACLE_USER, row.mechanism, row.identity),
+                  row.made.empty() ? too_long : row.made);
+        EXPECT_EQ(shown_for(user(row.mechanism, row.identity, 0)), row.displayed);
+        std::exit(testing::Test::HasFailure());
+    }
+    int status = -1;
+    EXPECT_GT(wait(&status), 0);
+    EXPECT_EQ(status, 0) << row.mechanism << " in " << row.locale;
+}
+
+// These run before the other tests.
 TEST(entries_DeathTest, are_converted_between_the_code_set_and_utf8) {
-    const std::string failed = PrintToString(error_of(26, 130)), no_set = PrintToString(error_of(26, 129));
-    // The code set; the locale; an entry's mechanism and identity, and what they are made and shown as.
-    const std::tuple<const char *, const char *, const char *, const char *, std::string, std::string> rows[] = {
+    const std::string failed = PrintToString(error_of(SEC_S_CODESET, msg::conversion_failed));
+    const std::string no_set = PrintToString(error_of(SEC_S_CODESET, msg::conversion_unavailable));
+    const char *const utf8 = "k\xc3\xa9/\xc3\xbf";
+    const conversion rows[] = {
         {nullptr, "C", "kdz", "plain", "kdz/plain", "kdz/plain"},
         {nullptr, "C", "kdz", "\xc3\xa9", failed, failed},
-        {nullptr, "C.UTF-8", "k\xc3\xa9", "\xc3\xbf", "k\xc3\xa9/\xc3\xbf", "k\xc3\xa9/\xc3\xbf"},
+        {nullptr, "C.UTF-8", "k\xc3\xa9", "\xc3\xbf", utf8, utf8},
         {nullptr, "C.UTF-8", "kdz", "a\xc3", failed, failed},
         {"ISO-8859-1", "C", "k\xc3\xa9", "\xc3\xbf", "k\xc3\x83\xc2\xa9/\xc3\x83\xc2\xbf", "k\xe9/\xff"},
         {"ISO-8859-1", "C", "abcdefghijklmn\xe9", "x", "abcdefghijklmn\xc3\xa9/x", failed},
-        {"ISO-8859-1", "C", "abcdefghijklmno\xe9", "x", "", failed}, // too long
+        {"ISO-8859-1", "C", "abcdefghijklmno\xe9", "x", "", failed},
         {"no-such-code-set", "C", "kdz", "plain", no_set, no_set},
     };
-    for (const auto &[code_set, locale, mechanism, identity, made, display] : rows) {
-        if (fork() == 0) {
-            claimed_code_set = code_set;
-            std::setlocale(LC_ALL, locale);
-            EXPECT_EQ(made_of(4, mechanism, identity), made.empty() ? refused(3, shown(mechanism)) : made);
-            EXPECT_EQ(shown_for(entry(4, mechanism, identity, 0)), display);
-            std::exit(HasFailure());
-        }
-        int status = -1;
-        EXPECT_TRUE(wait(&status) > 0 && status == 0) << mechanism << " in " << locale;
-    }
+    for (const conversion &row : rows)
+        expect_conversion(row);
 }
 
 } // namespace

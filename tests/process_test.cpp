@@ -2,8 +2,8 @@
 // library when a process forks, the child can use the library.
 #include "qzacl_trace.h"
 #include "support.h"
-#include <condition_variable>
-#include <mutex>
+
+#include <semaphore>
 #include <sys/wait.h>
 #include <thread>
 #include <unistd.h>
@@ -15,34 +15,24 @@ using namespace support;
 // One thread stops in the library with its lock held, until the process has forked or has to wait for the lock.
 struct stop_with_lock_held {
     void here() {
-        std::unique_lock lock(mutex);
-        is_holding = true;
-        changed.notify_all();
-        changed.wait_for(lock, std::chrono::milliseconds(200), [this] { return is_forked; });
+        is_holding.release();
+        [[maybe_unused]] const bool is_in_time = is_forked.try_acquire_for(std::chrono::milliseconds(200));
     }
-    void wait_for_holder() {
-        std::unique_lock lock(mutex);
-        changed.wait(lock, [this] { return is_holding; });
-    }
-    void tell_forked() {
-        const std::lock_guard lock(mutex);
-        is_forked = true;
-        changed.notify_all();
-    }
-    std::mutex mutex;
-    std::condition_variable changed;
-    bool is_holding = false, is_forked = false;
+    std::binary_semaphore is_holding{0};
+    std::binary_semaphore is_forked{0};
 };
 thread_local stop_with_lock_held *stop = nullptr;
 
-int sizes_asked = 0, names_asked = 0;
+int sizes_asked = 0;
+int names_asked = 0;
 
 } // namespace
 
 // The linker leads the libraries' calls here.
 extern "C" int __real_pthread_mutex_unlock(pthread_mutex_t *mutex);
 extern "C" int __wrap_pthread_mutex_unlock(pthread_mutex_t *mutex) {
-    if (stop_with_lock_held *held = std::exchange(stop, nullptr)) held->here();
+    if (stop_with_lock_held *held = std::exchange(stop, nullptr))
+        held->here();
     return __real_pthread_mutex_unlock(mutex);
 }
 extern "C" int __real_tr_get_size_1(std::uint32_t *size);
@@ -58,6 +48,12 @@ extern "C" int __wrap_tr_get_filename_1(char *name) {
 
 namespace {
 
+int status_of(pid_t child) {
+    int status = -1;
+    EXPECT_EQ(waitpid(child, &status, 0), child);
+    return status;
+}
+
 // The configuration is read once, so that each row has a process of its own.
 TEST(registration, asks_for_the_trace_file_when_times_are_traced) {
     const temporary_folder folder;
@@ -69,15 +65,14 @@ TEST(registration, asks_for_the_trace_file_when_times_are_traced) {
             acl__trace_register_component();
             _exit(sizes_asked == times && names_asked == times ? 0 : 1);
         }
-        int status = -1;
-        EXPECT_TRUE(waitpid(child, &status, 0) == child && status == 0) << levels;
+        EXPECT_EQ(status_of(child), 0) << levels;
     }
 }
 
 bool looks_up_a_handler() {
     const buffer acl(rich);
     std::uint32_t mask = 0;
-    return sec__single_acle_perm(&acl.acl, 0x84, "unix", nullptr, "al", &mask) == 0 && mask == 1;
+    return sec__single_acle_perm(&acl.acl, 0x84, "unix", nullptr, "al", &mask) == SEC_S_OK && mask == 1;
 }
 bool fetches_a_text() {
     cu_set_error_1(4, 0, "none.cat", 1, 1, "text");
@@ -100,16 +95,15 @@ TEST(fork, leaves_a_child_that_can_use_the_libraries) {
             stop = &held;
             use();
         });
-        held.wait_for_holder();
+        held.is_holding.acquire();
         const pid_t child = fork();
         if (child == 0) {
             alarm(10); // ends a child that waits for the holder, whom it does not have
             _exit(use() ? 0 : 1);
         }
-        held.tell_forked();
+        held.is_forked.release();
         holder.join();
-        int status = -1;
-        EXPECT_TRUE(waitpid(child, &status, 0) == child && status == 0) << status;
+        EXPECT_EQ(status_of(child), 0);
         EXPECT_TRUE(use());
     }
 }

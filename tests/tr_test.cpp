@@ -1,5 +1,6 @@
 // The trace facility. A process reads its configuration once, so whatever needs one runs in a child.
 #include "qz/tr.h"
+
 #include <fcntl.h>
 #include <filesystem>
 #include <fstream>
@@ -14,21 +15,26 @@
 namespace {
 
 using namespace std::string_literals;
-const std::vector<uint8_t> off = {0, 0, 0, 0}, on = {8, 0, 0, 255};
+namespace fs = std::filesystem;
+using levels = std::vector<uint8_t>;
+const levels off = {0, 0, 0, 0};
+const levels on = {8, 0, 0, 255};
 
 struct Trace : testing::Test {
-    ~Trace() override { std::filesystem::remove_all(folder); }
+    ~Trace() override { fs::remove_all(folder); }
     void in_child(const auto &body) const {
         setenv("QZ_TRACE_LEVELS", "C:On=8,Max=255", 1);
         setenv("QZ_TRACE_FILE", file.c_str(), 1);
-        if (fork() == 0) {
+        const pid_t child = fork();
+        if (child == 0) {
             body();
             std::exit(HasFailure());
         }
         int status = -1;
-        EXPECT_TRUE(wait(&status) > 0 && status == 0) << status;
+        EXPECT_EQ(waitpid(child, &status, 0), child);
+        EXPECT_EQ(status, 0);
     }
-    const std::vector<uint8_t> &enlist(const char *component = "C", int code = TR_OK) {
+    const levels &enlist(const char *component = "C", int code = TR_OK) {
         EXPECT_EQ(tr_register_component_1(component, level.data(), table, 4), code);
         return level;
     }
@@ -37,20 +43,21 @@ struct Trace : testing::Test {
         const std::regex head(R"(^."time":"\d{4}(-\d\d){2}T\d\d(:\d\d){2}\.\d{9}Z","pid":\d+,"tid":\d+,)");
         std::ifstream in(file);
         std::vector<std::string> all;
-        for (std::string line; std::getline(in, line);) all.push_back(std::regex_replace(line, head, "{"));
+        for (std::string line; std::getline(in, line);)
+            all.push_back(std::regex_replace(line, head, "{"));
         return all;
     }
     const tr_category_t table[4] = {{0, "On", 0}, {1, "Off", 0}, {2, nullptr, 0}, {3, "Max", 0}};
-    const std::string folder = mkdtemp((testing::TempDir() + "tr_test." + std::string(6, 'X')).data());
+    const std::string folder = mkdtemp((testing::TempDir() + "tr_test.XXXXXX").data());
     std::string file = folder + "/trace";
-    std::vector<uint8_t> level = {9, 9, 9, 9};
+    levels level = {9, 9, 9, 9};
 };
 
-TEST_F(Trace, LinesAreExactFromRegisteringUntilTheFileIsLost) {
+TEST_F(Trace, LinesAreExact) {
     in_child([&] {
         close(STDIN_FILENO);
         EXPECT_EQ(enlist("q\"\\"), off);
-        EXPECT_NE(access(file.c_str(), F_OK), 0); // since nothing is traced
+        EXPECT_FALSE(fs::exists(file)); // since nothing is traced
         EXPECT_EQ(tr_unregister_component_1("C"), TR_NOT_REGISTERED);
         EXPECT_EQ(tr_record_id_1("q\"\\", 2147483647), TR_OK);
         EXPECT_EQ(enlist(), on);
@@ -59,53 +66,68 @@ TEST_F(Trace, LinesAreExactFromRegisteringUntilTheFileIsLost) {
         EXPECT_EQ(tr_unregister_component_1("C"), TR_OK);
         EXPECT_EQ(level, off);
         EXPECT_EQ(tr_record_id_1("C", 1), TR_NOT_REGISTERED);
-        EXPECT_EQ(enlist(), on);
-        rlimit limit{std::filesystem::file_size(file) + 9, RLIM_INFINITY};
+    });
+    EXPECT_EQ(fs::status(file).permissions(), fs::perms{0600});
+    const std::string first = R"({"component":"q\"\\","id":2147483647,"items":[]})";
+    const std::string second =
+        R"({"component":"C","id":-3,"items":[{"len":4,"hex":"65225c00","text":"e\"\\"},)"
+        R"({"len":0,"hex":""},{"len":4,"hex":"61006200"},{"len":1,"hex":"00","text":""}]})";
+    EXPECT_THAT(lines(), testing::ElementsAre(first, second));
+}
+
+TEST_F(Trace, LinesComeUntilTheFileIsLost) {
+    in_child([&] {
+        enlist();
+        EXPECT_EQ(tr_record_id_1("C", 1), TR_OK);
+        rlimit limit{fs::file_size(file) + 9, RLIM_INFINITY};
         EXPECT_EQ(setrlimit(RLIMIT_FSIZE, &limit), 0);
         EXPECT_EQ(tr_record_id_1("C", 2), TR_FILE_ERROR);
-        limit.rlim_cur += 4000;
-        EXPECT_EQ(setrlimit(RLIMIT_FSIZE, &limit), 0);
-        EXPECT_EQ(tr_record_id_1("C", 8), TR_OK);
         limit.rlim_cur = RLIM_INFINITY;
         EXPECT_EQ(setrlimit(RLIMIT_FSIZE, &limit), 0);
+        EXPECT_EQ(tr_record_id_1("C", 3), TR_OK);
         closefrom(3); // as a daemon does, whose next file then takes the number
-        EXPECT_EQ(dup2(open((file + "2").c_str(), O_WRONLY | O_CREAT, 0600), 3), 3);
-        EXPECT_EQ(tr_record_id_1("C", 3), TR_NO_FILE);
-        EXPECT_EQ(lseek(3, 0, SEEK_END), 0);
+        const std::string next = file + "2";
+        EXPECT_EQ(open(next.c_str(), O_WRONLY | O_CREAT, 0600), 3);
+        EXPECT_EQ(tr_record_id_1("C", 4), TR_NO_FILE);
+        EXPECT_EQ(fs::file_size(next), 0u);
     });
-    const auto append = [&] {
+    EXPECT_EQ(lines().at(1), R"({"component":"C","id":3,"items":[]})");
+}
+
+TEST_F(Trace, LinesTellTheirTimeAndThread) {
+    const auto record = [&] {
         tm parts{};
-        std::string line;
         const time_t before = time(nullptr);
         EXPECT_EQ(tr_record_id_1("C", 9), TR_OK);
-        std::ifstream(file) >> line >> line >> line >> line >> line; // the last one
+        std::ifstream in(file);
+        std::string line;
+        std::getline(in, line);
+        std::getline(in, line);
         const std::string ids = std::to_string(getpid()) + ",\"tid\":" + std::to_string(gettid());
         EXPECT_THAT(line, testing::HasSubstr(",\"pid\":" + ids + ","));
         strptime(line.c_str(), "{\"time\":\"%Y-%m-%dT%H:%M:%S.", &parts);
-        EXPECT_TRUE(before <= timegm(&parts) && timegm(&parts) <= time(nullptr) + 1) << line; // whose clock is coarse
+        EXPECT_LE(before, timegm(&parts));
+        EXPECT_LE(timegm(&parts), time(nullptr) + 1); // whose clock is coarse
     };
     in_child([&] {
-        tr_record_id_1("C", enlist()[0]); // must not settle the ids of what its process forks
-        in_child([&] { std::thread(append).join(); });
+        enlist();
+        tr_record_id_1("C", 1); // must not settle the ids of what its process forks
+        in_child([&] { std::thread(record).join(); });
     });
-    EXPECT_EQ(std::filesystem::status(file).permissions(), std::filesystem::perms{0600});
-    const auto all = lines();
-    EXPECT_EQ(all.at(0), R"({"component":"q\"\\","id":2147483647,"items":[]})");
-    EXPECT_EQ(all.at(1), R"({"component":"C","id":-3,"items":[{"len":4,"hex":"65225c00","text":"e\"\\"},)"
-                         R"({"len":0,"hex":""},{"len":4,"hex":"61006200"},{"len":1,"hex":"00","text":""}]})");
-    EXPECT_EQ(all.at(2), R"({"component":"C","id":8,"items":[]})");
 }
 
 // From threads at once, around the size that needs no allocation and far beyond, while components fill the table.
 TEST_F(Trace, LinesAreWhole) {
     const std::string ids[] = {"1", "10", "100"}; // so that lines of every length come
-    std::vector<std::string> texts, wanted;
+    std::vector<std::string> texts;
+    std::vector<std::string> wanted;
     for (size_t size = 1250; size < 1000000; size = size < 1350 ? size + 1 : size * 100) {
-        texts.emplace_back(size, '3');
-        const std::string size_told = std::to_string(size + 1), hex(2 * size, '3');
+        const std::string &text = texts.emplace_back(size, '3');
+        const std::string hex(2 * size, '3');
+        const std::string item =
+            R"({"len":)" + std::to_string(size + 1) + R"(,"hex":")" + hex + R"(00","text":")" + text + "\"}";
         for (const std::string &id : ids)
-            wanted.push_back(R"({"component":"C","id":)" + id + R"(,"items":[{"len":)" + size_told + R"(,"hex":")" +
-                             hex + R"(00","text":")" + texts.back() + "\"}]}");
+            wanted.push_back(R"({"component":"C","id":)" + id + R"(,"items":[)" + item + "]}");
     }
     in_child([&] {
         enlist();
@@ -115,7 +137,8 @@ TEST_F(Trace, LinesAreWhole) {
                 for (const std::string &text : texts)
                     EXPECT_EQ(tr_record_data_1("C", std::stoi(id), 1, text.c_str(), text.size() + 1), TR_OK);
             });
-        for (int i = 1; i < TR_COMPONENT_LIMIT; ++i) enlist(std::to_string(i).c_str());
+        for (int i = 1; i < TR_COMPONENT_LIMIT; ++i)
+            enlist(std::to_string(i).c_str());
         EXPECT_EQ(enlist("one too many", TR_NO_MEMORY), off);
         for (const size_t size : {SIZE_MAX / 2 + 1, size_t{TR_LINE_LIMIT} / 2})
             EXPECT_EQ(tr_record_data_1("C", 3, 1, "", size), TR_TOO_LARGE);
@@ -124,33 +147,52 @@ TEST_F(Trace, LinesAreWhole) {
 }
 
 TEST_F(Trace, OnlyRegularFilesAreWrittenTo) {
-    const std::string link = folder + "/link", fifo = folder + "/fifo";
-    const std::string longest = folder + std::string(TR_FILENAME_SIZE - 2 - folder.size(), '/') + "t";
-    ASSERT_EQ(symlink("target", link.c_str()) | mkfifo(fifo.c_str(), 0600), 0);
-    for (const std::string &name : {longest, longest + "t", link, fifo, folder, "/dev/null"s, ""s}) {
-        const bool is_used = name.starts_with(longest);
-        const int code = is_used ? TR_OK : TR_NO_FILE;
+    const std::string link = folder + "/link";
+    const std::string fifo = folder + "/fifo";
+    const std::string too_long = folder + std::string(TR_FILENAME_SIZE, '/') + "t";
+    ASSERT_EQ(symlink("target", link.c_str()), 0);
+    ASSERT_EQ(mkfifo(fifo.c_str(), 0600), 0);
+    const int reader = open(fifo.c_str(), O_RDWR); // without whom it could not be opened
+    for (const std::string &name : {link, fifo, folder, "/dev/null"s, ""s}) {
         SCOPED_TRACE(file = name);
         in_child([&] {
-            EXPECT_GE(open(fifo.c_str(), O_RDWR), 0); // a reader, without whom it could not be opened
             char text[TR_FILENAME_SIZE] = "as it was";
             uint32_t size = 1;
             errno = 4711;
-            EXPECT_EQ(enlist(), is_used ? on : off);
-            EXPECT_EQ(tr_record_id_1("C", 1), code);
-            EXPECT_EQ(tr_get_filename_1(text), name == longest + "t" ? TR_TOO_LARGE : code);
+            EXPECT_EQ(enlist(), off);
+            EXPECT_EQ(tr_record_id_1("C", 1), TR_NO_FILE);
+            EXPECT_EQ(tr_get_filename_1(text), TR_NO_FILE);
+            EXPECT_STREQ(text, "as it was");
+            EXPECT_EQ(tr_get_size_1(&size), TR_NO_FILE);
+            EXPECT_EQ(size, 0u);
             EXPECT_EQ(errno, 4711);
+        });
+    }
+    close(reader);
+}
+
+TEST_F(Trace, TheFileTellsItsNameAndSize) {
+    const std::string longest = folder + std::string(TR_FILENAME_SIZE - 2 - folder.size(), '/') + "t";
+    for (const std::string &name : {longest, longest + "t"}) {
+        file = name;
+        in_child([&] {
+            char text[TR_FILENAME_SIZE] = "as it was";
+            uint32_t size = 1;
+            EXPECT_EQ(enlist(), on);
+            EXPECT_EQ(tr_get_filename_1(text), name == longest ? TR_OK : TR_TOO_LARGE);
             EXPECT_EQ(text, name == longest ? name : "as it was");
-            EXPECT_EQ(truncate(file.c_str(), name == longest ? 100 : off_t{1} << 33) == 0, is_used);
-            EXPECT_EQ(tr_get_size_1(&size), code);
-            EXPECT_EQ(size, name == longest ? 100 : is_used ? UINT32_MAX : 0);
+            fs::resize_file(file, 100);
+            EXPECT_EQ(tr_get_size_1(&size), TR_OK);
+            EXPECT_EQ(size, 100u);
+            fs::resize_file(file, uintmax_t{1} << 33);
+            EXPECT_EQ(tr_get_size_1(&size), TR_OK);
+            EXPECT_EQ(size, UINT32_MAX);
         });
     }
 }
 
 TEST_F(Trace, FilesOfOthersAreNotWrittenTo) {
     const std::tuple<const char *, bool, std::function<int()>> rows[] = {
-        {"as it was made", true, [] { return 0; }},
         {"readable", true, [&] { return chmod(file.c_str(), 0644); }},
         {"writable by its group, or by whom an ACL names", false, [&] { return chmod(file.c_str(), 0620); }},
         {"writable by others", false, [&] { return chmod(file.c_str(), 0602); }},
@@ -159,10 +201,11 @@ TEST_F(Trace, FilesOfOthersAreNotWrittenTo) {
     };
     for (const auto &[how, is_used, change] : rows) {
         SCOPED_TRACE(how);
-        std::filesystem::remove(file);
+        fs::remove(file);
         std::ofstream(file) << "before\n";
-        std::filesystem::permissions(file, std::filesystem::perms{0600});
-        if (change() != 0) continue; // only root gives files away
+        fs::permissions(file, fs::perms{0600});
+        if (change() != 0)
+            continue; // only root gives files away
         in_child([&, is_used = is_used] {
             EXPECT_EQ(enlist(), is_used ? on : off);
             EXPECT_EQ(tr_record_id_1("C", 1), is_used ? TR_OK : TR_NO_FILE);
@@ -173,12 +216,17 @@ TEST_F(Trace, FilesOfOthersAreNotWrittenTo) {
 
 TEST_F(Trace, BadParametersAreRefused) {
     for (const std::string &name : {""s, "a\n"s, "\xFF"s, std::string(64, 'n')})
-        EXPECT_EQ(enlist(name.c_str(), TR_BAD_PARAMETER), std::vector<uint8_t>(4, 9));
-    const auto bad = [](auto... c) { EXPECT_THAT((std::vector{c...}), testing::Each(TR_BAD_PARAMETER)); };
-    bad(tr_register_component_1(nullptr, level.data(), table, 1), tr_register_component_1("C", nullptr, table, 1),
-        tr_register_component_1("C", level.data(), nullptr, 1), tr_register_component_1("C", level.data(), table, -1),
-        tr_unregister_component_1(nullptr), tr_record_id_1(nullptr, 1), tr_record_data_1("C", 1, -1),
-        tr_get_size_1(nullptr), tr_get_filename_1(nullptr));
+        EXPECT_EQ(enlist(name.c_str(), TR_BAD_PARAMETER), levels(4, 9));
+    uint8_t *const own = level.data();
+    EXPECT_EQ(tr_register_component_1(nullptr, own, table, 1), TR_BAD_PARAMETER);
+    EXPECT_EQ(tr_register_component_1("C", nullptr, table, 1), TR_BAD_PARAMETER);
+    EXPECT_EQ(tr_register_component_1("C", own, nullptr, 1), TR_BAD_PARAMETER);
+    EXPECT_EQ(tr_register_component_1("C", own, table, -1), TR_BAD_PARAMETER);
+    EXPECT_EQ(tr_unregister_component_1(nullptr), TR_BAD_PARAMETER);
+    EXPECT_EQ(tr_record_id_1(nullptr, 1), TR_BAD_PARAMETER);
+    EXPECT_EQ(tr_record_data_1("C", 1, -1), TR_BAD_PARAMETER);
+    EXPECT_EQ(tr_get_size_1(nullptr), TR_BAD_PARAMETER);
+    EXPECT_EQ(tr_get_filename_1(nullptr), TR_BAD_PARAMETER);
 }
 
 } // namespace

@@ -1,6 +1,6 @@
 // Trees of more entries than the fuzzers' texts have, through the fuzzer of texts; what names a tree; and its limit.
-#include "../fuzz/fuzz.h"
 #include "faults.h"
+#include "fuzz.h"
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/entry_array.h"
 #include "qzacl_acl/entry_parser.h"
@@ -20,7 +20,8 @@ TEST(tree, holds_what_a_text_says) {
             // Of few letters, of all bytes, and behind a long prefix that they share.
             std::string name(round % 5 == 2 ? round % 60 : 0, 'z');
             for (auto left = 1 + below(round % 5 == 1 ? 150 : 6); left != 0; --left)
-                name += round % 5 == 1 ? static_cast<char>(33 + below(223)) : "aAbBzZ@[`{\x7f\x80\xff"[below(13)];
+                name +=
+                    round % 5 == 1 ? static_cast<char>(33 + below(223)) : "aAbBzZ@[`{\x7f\x80\xff"[below(13)];
             const std::string mechanism = round % 3 == 1 ? std::to_string(below(500)) : "unix";
             text += std::array{"u " + mechanism, "e " + mechanism, "g"s}[below(3)] + " " + name + " rw\n";
         }
@@ -33,7 +34,8 @@ TEST(tree, holds_what_a_text_says) {
 TEST(tree, is_named_by_its_topmost_entry) {
     const auto acle_of = [](int type, const char *name) {
         std::string mechanism = "unix";
-        for (unsigned bit = 0; bit < 4; ++bit) mechanism[bit] ^= (*name >> bit & 1) == 0 ? 0 : 0x20;
+        for (unsigned bit = 0; bit < 4; ++bit)
+            mechanism[bit] ^= (*name >> bit & 1) == 0 ? 0 : 0x20;
         return entry(type, mechanism, name, 1);
     };
     std::vector<std::tuple<int, std::string, std::string>> rows = {{4, "m f t c i p w", "m f c i t p w"}};
@@ -44,20 +46,20 @@ TEST(tree, is_named_by_its_topmost_entry) {
         sec_acltree_t *root = nullptr;
         for (const std::string &name : words(inserted)) {
             const sec_acle_t acle = acle_of(type, name.c_str());
-            EXPECT_EQ(faults::patiently([&] { return sec__add_acle_to_tree(1, &acle, &root); }), 0);
+            EXPECT_EQ(faults::patiently([&] { return sec__add_acle_to_tree(1, &acle, &root); }), SEC_S_OK);
         }
         const qz::owned_acltree owner(root);
         buffer most, refused;
-        EXPECT_EQ(sec__acltrees_to_acl(std::vector(65535, root), &most.acl), 0);
-        EXPECT_EQ(sec__acltrees_to_acl(std::vector(65536, root), &refused.acl), 6);
+        EXPECT_EQ(sec__acltrees_to_acl(std::vector(65535, root), &most.acl), SEC_S_OK);
+        EXPECT_EQ(sec__acltrees_to_acl(std::vector(65536, root), &refused.acl), SEC_S_NO_MEMORY);
         EXPECT_EQ(refused.bytes(), "");
         for (const std::string &name : words(topmost)) {
             const sec_acle_t acle = acle_of(type, name.c_str());
             qz::loose_subacl out;
-            EXPECT_EQ(sec__acltree_to_subacl(root, out), 0);
+            EXPECT_EQ(sec__acltree_to_subacl(root, out), SEC_S_OK);
             EXPECT_EQ(std::memcmp(out.data.get() + 10, acle.mechanism, 5), 0) << name;
-            EXPECT_EQ(sec__del_acle_from_tree(&acle, root), 0);
-            EXPECT_EQ(sec__del_acle_from_tree(&acle, root), 18);
+            EXPECT_EQ(sec__del_acle_from_tree(&acle, root), SEC_S_OK);
+            EXPECT_EQ(sec__del_acle_from_tree(&acle, root), SEC_S_ACLE_NOT_FOUND);
         }
     }
 }
@@ -89,8 +91,8 @@ TEST(tree, is_released_in_post_order) {
 // A tree points into the text that it is told of, as far as its places reach, and copies what stands elsewhere.
 TEST(tree, copies_what_it_cannot_point_to) {
     const std::string line = "u unix alice r\n";
-    const std::string alice = one(of_mechanism(SEC_ACLE_USER, "unix", 1, named(1, "alice")));
-    const std::string other = one(of_mechanism(SEC_ACLE_USER, "xxxx", 1, named(1, "xxxxx")));
+    const std::string alice = acl_bytes("u unix: alice 1");
+    const std::string other = acl_bytes("u xxxx: xxxxx 1");
     const std::size_t whole = line.size() + 1;
     const std::size_t out_of_reach = std::size_t{3} << 30;
     const std::tuple<std::size_t, std::string> rows[] = {{0, alice}, {whole, other}, {out_of_reach, alice}};
@@ -123,16 +125,17 @@ TEST(tree, takes_more_entries_after_it_was_compiled) {
             return sec__add_acle_to_tree(1, &acle, &root);
         };
         const auto name_of = [](int number) { return "common-" + std::to_string(1000 + number); };
-        for (int number = count; number != 0; --number) EXPECT_EQ(add(name_of(number)), SEC_S_OK);
+        for (int number = count; number != 0; --number)
+            EXPECT_EQ(add(name_of(number)), SEC_S_OK);
         const qz::owned_acltree owner(root);
         qz::loose_subacl first;
         EXPECT_EQ(sec__acltree_to_subacl(root, first), SEC_S_OK);
 
         EXPECT_EQ(add("common-0"), SEC_S_OK);
-        std::string entries = named(1, "common-0");
+        std::string entries = entry_bytes("common-0 1");
         for (int number = 1; number <= count; ++number) {
             EXPECT_EQ(add(name_of(number)), SEC_S_BAD_ACLE) << number;
-            entries += named(1, name_of(number));
+            entries += entry_bytes(name_of(number) + " 1");
         }
         qz::loose_subacl second;
         EXPECT_EQ(sec__acltree_to_subacl(root, second), SEC_S_OK);
@@ -147,12 +150,12 @@ TEST(tree, is_released_from_its_leaves_up) {
         sec_acltree_t *root = nullptr;
         for (const std::string &name : words(inserted)) {
             const sec_acle_t acle = entry(type, "sixteen-bytes-xx", name.c_str(), 1);
-            EXPECT_EQ(sec__add_acle_to_tree(1, &acle, &root), 0);
+            EXPECT_EQ(sec__add_acle_to_tree(1, &acle, &root), SEC_S_OK);
         }
         const std::string first(inserted, 1);
         sec_acle_t again = entry(type, "sixteen-bytes-xx", first.c_str(), 2);
         again.mechanism[16] = 'x'; // in place of the NUL, as a caller may fill the array
-        EXPECT_EQ(sec__add_acle_to_tree(0, &again, &root), 0);
+        EXPECT_EQ(sec__add_acle_to_tree(0, &again, &root), SEC_S_OK);
         sec__free_acltree(root);
     }
 }

@@ -16,7 +16,7 @@ from qzacl import Acl, Entry, Order, Requester, Who, to_mask
 
 SOURCE = Path(__file__).resolve().parents[3]
 SERVICE = SOURCE / "examples/service.acl"
-CASES = {SOURCE / "examples/service.cases": Order.CLOSEST, SOURCE / "tests/service_sum.cases": Order.SUM}
+CASES = SOURCE / "examples/service.cases"
 OWN = qzacl.PermissionSet([(1, "a"), (2, "b", "begin", "to begin"), (4, "b")])
 
 for mechanism in ("unix", "hba2"):
@@ -31,15 +31,14 @@ def requester_of(words):
     return Requester() if mechanism == "-" else Requester(mechanism, identity, tuple(group[1:] for group in groups))
 
 
-@pytest.mark.parametrize("path, order", CASES.items(), ids=lambda value: getattr(value, "name", value))
-def test_grants_what_the_cases_say(path, order):
+def test_grants_what_the_cases_say():
     acl = Acl.read(SERVICE)
-    cases = [line.partition("#")[0].split() for line in path.read_text().splitlines()]
+    cases = [line.partition("#")[0].split() for line in CASES.read_text().splitlines()]
     for *whom, letters, expected in filter(None, cases):
         requester, wanted = requester_of(whom), to_mask(letters)
-        answer = qzacl.decide(acl, requester, wanted, order)
+        answer = qzacl.decide(acl, requester, wanted)
         assert answer.allowed == (expected == "yes"), f"{whom}\n{answer.explain()}"
-        assert qzacl.granted(acl, requester, order) == answer.granted
+        assert qzacl.granted(acl, requester) == answer.granted
 
 
 def by_hand(acl, whom, order):
@@ -109,9 +108,10 @@ def test_identities_are_asked_in_their_stored_form():
 def test_handlers_know_hosts():
     matching = [("a@h.x", "h.x"), ("a@H.X", "h.x"), ("a@h.x", ".x"), ("a@.x", ".x"), ("a@b@h.x", "h.x")]
     others = [("a@h.x", "x"), ("a@hx", ".x"), ("h.x", "h.x"), ("a@b@h.x", "b@h.x"), ("a@", ""), ("a@h.x", ""), ("a@x", ".h.x")]
-    assert all(qzacl.domain(*row) for row in matching)
-    assert not any(qzacl.domain(*row) for row in others)
-    assert qzacl.exact("A@h", "a@H") and not qzacl.exact("a@h", "h")
+    assert [row for row in matching if not qzacl.domain(*row)] == []
+    assert [row for row in others if qzacl.domain(*row)] == []
+    assert qzacl.exact("A@h", "a@H")
+    assert not qzacl.exact("a@h", "h")
 
 
 def test_handlers_of_both_kinds(capsys):

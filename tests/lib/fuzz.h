@@ -1,6 +1,6 @@
 // What the fuzzers share: taking an input apart, and the conversions of the C library.
-#ifndef QZ_FUZZ_FUZZ_H
-#define QZ_FUZZ_FUZZ_H
+#ifndef QZ_TESTS_FUZZ_H
+#define QZ_TESTS_FUZZ_H
 #include <algorithm>
 #include <cstring>
 #include <gtest/gtest.h>
@@ -18,7 +18,8 @@ inline std::string_view input(const std::uint8_t *data, std::size_t size) {
 }
 // A choice: the place of the next byte among the letters, so that inputs can be written by hand.
 inline unsigned one_of(std::string_view letters, std::string_view &from) {
-    if (from.empty()) return 0;
+    if (from.empty())
+        return 0;
     const auto at = std::min(letters.find(from[0]), letters.size() + static_cast<unsigned char>(from[0]));
     from.remove_prefix(1);
     return static_cast<unsigned>(at % letters.size());
@@ -33,12 +34,16 @@ inline std::string line(std::string_view &from) {
 inline std::optional<std::string> recoded(const char *to, const char *from, std::string bytes) {
     const iconv_t converter = iconv_open(to, from);
     std::string made(8 * bytes.size() + 16, '\0');
-    char *in = bytes.data(), *out = made.data();
-    std::size_t left = bytes.size(), room = made.size();
+    char *in = bytes.data();
+    char *out = made.data();
+    std::size_t left = bytes.size();
+    std::size_t room = made.size();
     const bool is_whole = iconv(converter, &in, &left, &out, &room) == 0;
     const bool is_ended = iconv(converter, nullptr, nullptr, &out, &room) == 0;
     iconv_close(converter);
-    return is_whole && is_ended ? std::optional(made.substr(0, made.size() - room)) : std::nullopt;
+    if (!is_whole || !is_ended)
+        return std::nullopt;
+    return made.substr(0, made.size() - room);
 }
 
 } // namespace fuzz

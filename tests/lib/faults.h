@@ -20,28 +20,36 @@
 namespace faults {
 
 struct allocations_seen {
-    std::size_t count = 0, fails_at = 0; // from 1; 0 fails none
-    bool fails_on = false;               // also all behind that one
+    std::size_t count = 0;
+    std::size_t fails_at = 0; // from 1; 0 fails none
+    bool fails_on = false;    // also all behind that one
     std::ptrdiff_t live = 0;
     std::size_t refused = 0; // bytes that the last one to fail asked for
 };
 inline thread_local allocations_seen allocations; // of this thread
 
+// What a call is to do: nothing special, fall short of what was asked for, or fail with an errno value.
+constexpr int no_fault = 0;
 constexpr int short_transfer = -1;
+
 inline bool is_watching = false;
 inline std::vector<std::string> calls;
-inline std::string opened;                                 // the name that was last opened or is about to be
-inline std::string home;                                   // of every user, and what the database answers besides
-inline std::optional<std::pair<int, const char *>> answer; // a result, and the name; without it there is no such user
-inline std::function<int(std::size_t)> before; // told the place in `calls`; gives an errno value, short_transfer or 0
+inline std::string opened;                       // the name that was last opened or is about to be
+inline std::function<int(std::size_t)> fault_of; // told the place in `calls` of the one about to be made
+
+// What the user database answers instead: a result, and the user's name; without a name there is no such user.
+inline std::optional<std::pair<int, const char *>> answer;
+inline std::string home; // of every user
 
 inline int next(const char *name) {
-    if (!is_watching) return 0;
+    if (!is_watching)
+        return no_fault;
     is_watching = false; // what the test itself calls now is not looked at
     calls.emplace_back(name);
-    const int fault = before ? before(calls.size() - 1) : 0;
+    const int fault = fault_of ? fault_of(calls.size() - 1) : no_fault;
     is_watching = true;
-    errno = fault > 0 ? fault : errno;
+    if (fault > 0)
+        errno = fault;
     return fault;
 }
 
@@ -49,7 +57,7 @@ inline int next(const char *name) {
 template <class Call>
 auto watched(const std::function<int(std::size_t)> &fault, const Call &call) {
     calls.clear();
-    before = fault;
+    fault_of = fault;
     is_watching = true;
     auto result = call();
     is_watching = false;
@@ -60,23 +68,23 @@ auto watched(const std::function<int(std::size_t)> &fault, const Call &call) {
 template <class Step>
 int patiently(Step step) {
     for (std::size_t failing = 1;; ++failing) {
-        allocations = {0, failing};
+        allocations = {.fails_at = failing};
         const int result = step();
+        const bool is_refused = allocations.count >= failing;
         allocations = {};
-        if (result != 6 || failing == 1000) return result;
-        cu_error_t *error = nullptr;
-        const bool is_told = cu_get_error_1(&error) == CU_OK && error->message_id == 89;
-        cu_rel_error_1(error);
-        if (!is_told) return result;
+        if (result != CU_NO_MEMORY || !is_refused)
+            return result;
         cu_set_no_error_1();
     }
 }
 
 inline bool fails_now(std::size_t size) {
-    auto &all = allocations;
+    allocations_seen &all = allocations;
     ++all.count;
-    const bool fails = all.fails_at != 0 && (all.count == all.fails_at || (all.fails_on && all.count > all.fails_at));
-    if (fails) all.refused = size;
+    const bool is_behind = all.fails_on && all.count > all.fails_at;
+    const bool fails = all.fails_at != 0 && (all.count == all.fails_at || is_behind);
+    if (fails)
+        all.refused = size;
     return fails;
 }
 
@@ -89,28 +97,31 @@ inline void *counted(void *made) {
 
 // Of the names that a call has for the linker, with large files and late times or without, a C library may lack some;
 // the code under test uses one of them.
-#define QZ_WRAPPED(result, name, parameters)                                                                           \
-    [[gnu::weak]] result __real_##name parameters;                                                                     \
+#define QZ_WRAPPED(result, name, parameters)                                                                 \
+    [[gnu::weak]] result __real_##name parameters;                                                           \
     [[gnu::used]] inline result __wrap_##name parameters
 // A call that fails with -1, and one that may also fall short of what was asked for.
-#define QZ_WRAPPED_AS(called, name, parameters, arguments)                                                             \
+#define QZ_WRAPPED_AS(called, name, parameters, arguments)                                                   \
     QZ_WRAPPED(int, name, parameters) { return faults::next(called) > 0 ? -1 : __real_##name arguments; }
 #define QZ_WRAPPED_CALL(name, parameters, arguments) QZ_WRAPPED_AS(#name, name, parameters, arguments)
-#define QZ_WRAPPED_STATUS(name, parameters, arguments)                                                                 \
-    QZ_WRAPPED_AS(#name, name, parameters, arguments)                                                                  \
-    QZ_WRAPPED_AS(#name, name##64, parameters, arguments)                                                              \
+#define QZ_WRAPPED_STATUS(name, parameters, arguments)                                                       \
+    QZ_WRAPPED_AS(#name, name, parameters, arguments)                                                        \
+    QZ_WRAPPED_AS(#name, name##64, parameters, arguments)                                                    \
     QZ_WRAPPED_AS(#name, __##name##64_time64, parameters, arguments)
 // Opening, and what a fortified call without a mode becomes.
-#define QZ_WRAPPED_OPEN(name, fortified)                                                                               \
-    QZ_WRAPPED(int, name, (const char *path, int flags, mode_t mode)) {                                                \
-        if (faults::is_watching) faults::opened = path;                                                                \
-        return faults::next("open") > 0 ? -1 : __real_##name(path, flags, mode);                                       \
-    }                                                                                                                  \
-    [[gnu::used]] inline int __wrap_##fortified(const char *path, int flags) { return __wrap_##name(path, flags, 0); }
-#define QZ_WRAPPED_TRANSFER(name, memory)                                                                              \
-    QZ_WRAPPED(ssize_t, name, (int fd, memory bytes, size_t size)) {                                                   \
-        const int fault = faults::next(#name);                                                                         \
-        return fault > 0 ? -1 : __real_##name(fd, bytes, fault < 0 ? size - 1 : size);                                 \
+#define QZ_WRAPPED_OPEN(name, fortified)                                                                     \
+    QZ_WRAPPED(int, name, (const char *path, int flags, mode_t mode)) {                                      \
+        if (faults::is_watching)                                                                             \
+            faults::opened = path;                                                                           \
+        return faults::next("open") > 0 ? -1 : __real_##name(path, flags, mode);                             \
+    }                                                                                                        \
+    [[gnu::used]] inline int __wrap_##fortified(const char *path, int flags) {                               \
+        return __wrap_##name(path, flags, 0);                                                                \
+    }
+#define QZ_WRAPPED_TRANSFER(name, memory)                                                                    \
+    QZ_WRAPPED(ssize_t, name, (int fd, memory bytes, size_t size)) {                                         \
+        const int fault = faults::next(#name);                                                               \
+        return fault > 0 ? -1 : __real_##name(fd, bytes, fault < 0 ? size - 1 : size);                       \
     }
 
 extern "C" {
@@ -176,9 +187,12 @@ QZ_WRAPPED(int, getpwnam_r, (const char *name, passwd *entry, char *memory, size
     if (faults::answer) {
         entry->pw_name = const_cast<char *>(faults::answer->second);
         entry->pw_uid = 4242;
-        return *found = entry->pw_name == nullptr ? nullptr : entry, faults::answer->first;
+        *found = entry->pw_name == nullptr ? nullptr : entry;
+        return faults::answer->first;
     }
-    return fault > 0 ? (*found = nullptr, fault) : result;
+    if (fault > 0)
+        *found = nullptr;
+    return fault > 0 ? fault : result;
 }
 
 } // extern "C"
