@@ -32,7 +32,12 @@ struct verb {
 
 inline constexpr std::size_t any_number = static_cast<std::size_t>(-1);
 
+int ask(const call &call);
+int cache(const call &call);
+int diff(const call &call);
+int lint(const call &call);
 int show(const call &call);
+int test(const call &call);
 int who(const call &call);
 
 } // namespace qzacl
