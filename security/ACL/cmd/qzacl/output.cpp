@@ -23,22 +23,6 @@ bool is_control(std::string_view text, std::size_t at) {
     return byte < 0x20 || byte == 0x7f || (before == '\xc2' && byte >= 0x80 && byte < 0xa0);
 }
 
-void append_escaped(std::string &to, std::string_view text, bool keeps_line_feeds) {
-    constexpr char digits[] = "0123456789abcdef";
-    for (std::size_t at = 0; at < text.size(); ++at) {
-        const auto byte = static_cast<unsigned char>(text[at]);
-        if (!is_control(text, at) || (byte == '\n' && keeps_line_feeds)) {
-            to += text[at];
-            continue;
-        }
-        if (byte >= 0x80) {
-            to.pop_back();
-            to += "\\xc2";
-        }
-        to.append("\\x").append({digits[byte >> 4], digits[byte & 15]});
-    }
-}
-
 [[noreturn]] void end_quietly() {
     std::signal(SIGPIPE, SIG_DFL);
     std::raise(SIGPIPE);
@@ -46,6 +30,24 @@ void append_escaped(std::string &to, std::string_view text, bool keeps_line_feed
 }
 
 } // namespace
+
+std::string escaped(std::string_view text, bool keeps_line_feeds) {
+    constexpr char digits[] = "0123456789abcdef";
+    std::string shown;
+    for (std::size_t at = 0; at < text.size(); ++at) {
+        const auto byte = static_cast<unsigned char>(text[at]);
+        if (!is_control(text, at) || (byte == '\n' && keeps_line_feeds)) {
+            shown += text[at];
+            continue;
+        }
+        if (byte >= 0x80) {
+            shown.pop_back();
+            shown += "\\xc2";
+        }
+        shown.append("\\x").append({digits[byte >> 4], digits[byte & 15]});
+    }
+    return shown;
+}
 
 json json_text(std::string_view bytes) { return valid_utf8(bytes); }
 
@@ -61,7 +63,7 @@ output::output(bool is_json) : is_json_(is_json), is_terminal_(isatty(STDOUT_FIL
 
 void output::add(std::string_view text, bool keeps_line_feeds) {
     if (is_terminal_)
-        append_escaped(gathered_, text, keeps_line_feeds);
+        gathered_ += escaped(text, keeps_line_feeds);
     else
         gathered_ += text;
 }

@@ -17,6 +17,9 @@ json json_text(std::string_view bytes);
 // The same as it stands in a line of JSON, in its quotation marks, appended.
 void append_json_text(std::string &line, std::string_view bytes);
 
+// A text in which control bytes are shown as \xHH, but for line feeds where they are to stay.
+std::string escaped(std::string_view text, bool keeps_line_feeds);
+
 // Lines that are held back until all of them are known, without ever being moved to a larger place.
 class held_lines {
 public:

@@ -1,9 +1,11 @@
 // Messages on standard error.
 #include "trouble.h"
 
+#include "output.h"
 #include "qzacl_acl/dump.h"
 
 #include <cstdio>
+#include <unistd.h>
 
 namespace qzacl {
 
@@ -13,7 +15,8 @@ void print_recorded_error() {
 }
 
 void print_message(const std::string &text) {
-    std::fprintf(stderr, "qzacl: %s\n", text.c_str());
+    const bool is_terminal = isatty(STDERR_FILENO) != 0;
+    std::fprintf(stderr, "qzacl: %s\n", is_terminal ? escaped(text, false).c_str() : text.c_str());
     std::fflush(stderr);
 }
 
