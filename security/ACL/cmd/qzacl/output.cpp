@@ -1,0 +1,115 @@
+// What the verbs answer.
+#include "output.h"
+
+#include "trouble.h"
+#include "utf8.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <csignal>
+#include <cstring>
+#include <unistd.h>
+
+namespace qzacl {
+
+namespace {
+
+constexpr std::size_t enough_to_write = 1 << 18;
+
+// C0, DEL, and C1 as UTF-8 has them, which terminals obey as well.
+bool is_control(std::string_view text, std::size_t at) {
+    const auto byte = static_cast<unsigned char>(text[at]);
+    const auto before = at == 0 ? '\0' : text[at - 1];
+    return byte < 0x20 || byte == 0x7f || (before == '\xc2' && byte >= 0x80 && byte < 0xa0);
+}
+
+[[noreturn]] void end_quietly() {
+    std::signal(SIGPIPE, SIG_DFL);
+    std::raise(SIGPIPE);
+    _exit(failed);
+}
+
+} // namespace
+
+std::string escaped(std::string_view text, bool keeps_line_feeds) {
+    constexpr char digits[] = "0123456789abcdef";
+    std::string shown;
+    for (std::size_t at = 0; at < text.size(); ++at) {
+        const auto byte = static_cast<unsigned char>(text[at]);
+        if (!is_control(text, at) || (byte == '\n' && keeps_line_feeds)) {
+            shown += text[at];
+            continue;
+        }
+        if (byte >= 0x80) {
+            shown.pop_back();
+            shown += "\\xc2";
+        }
+        shown.append("\\x").append({digits[byte >> 4], digits[byte & 15]});
+    }
+    return shown;
+}
+
+json json_text(std::string_view bytes) { return valid_utf8(bytes); }
+
+void append_json_text(std::string &line, std::string_view bytes) {
+    const auto is_plain = [](char c) { return c >= ' ' && c <= '~' && c != '"' && c != '\\'; };
+    if (std::all_of(bytes.begin(), bytes.end(), is_plain))
+        line.append("\"").append(bytes).append("\"");
+    else
+        line += json_text(bytes).dump();
+}
+
+output::output(bool is_json) : is_json_(is_json), is_terminal_(isatty(STDOUT_FILENO) != 0) {}
+
+void output::add(std::string_view text, bool keeps_line_feeds) {
+    if (is_terminal_)
+        gathered_ += escaped(text, keeps_line_feeds);
+    else
+        gathered_ += text;
+}
+
+void output::line(std::string_view text) {
+    add(text, false);
+    gathered_ += '\n';
+    if (gathered_.size() >= enough_to_write)
+        flush();
+}
+
+void output::lines(std::string_view text) {
+    add(text, true);
+    if (gathered_.size() >= enough_to_write)
+        flush();
+}
+
+void output::lines(const held_lines &held) {
+    if (is_terminal_) {
+        for (const std::string &part : held.parts_)
+            lines(part);
+        return;
+    }
+    flush();
+    for (const std::string &part : held.parts_)
+        write_all(part);
+}
+
+void output::object(const json &object) { line(object.dump(-1, ' ', false, json::error_handler_t::replace)); }
+
+void output::flush() {
+    write_all(gathered_);
+    gathered_.clear();
+}
+
+void output::write_all(std::string_view bytes) {
+    while (!bytes.empty()) {
+        const ssize_t written = write(STDOUT_FILENO, bytes.data(), bytes.size());
+        if (written < 0 && errno == EINTR)
+            continue;
+        if (written < 0 && errno == EPIPE)
+            end_quietly();
+        if (written < 0)
+            throw trouble(std::string("standard output: ") + std::strerror(errno));
+        bytes.remove_prefix(static_cast<std::size_t>(written));
+    }
+}
+
+} // namespace qzacl

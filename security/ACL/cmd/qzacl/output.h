@@ -1,0 +1,69 @@
+// What the verbs answer: lines for people, or JSON, one object a line.
+#ifndef QZACL_OUTPUT_H
+#define QZACL_OUTPUT_H
+
+#include <deque>
+#include <nlohmann/json.hpp>
+#include <string>
+#include <string_view>
+
+namespace qzacl {
+
+// Keys stay in the order in which they were put in.
+using json = nlohmann::ordered_json;
+
+// A text as JSON can hold it: with U+FFFD for each byte that is no UTF-8.
+json json_text(std::string_view bytes);
+// The same as it stands in a line of JSON, in its quotation marks, appended.
+void append_json_text(std::string &line, std::string_view bytes);
+
+// A text in which control bytes are shown as \xHH, but for line feeds where they are to stay.
+std::string escaped(std::string_view text, bool keeps_line_feeds);
+
+// Lines that are held back until all of them are known, without ever being moved to a larger place.
+class held_lines {
+public:
+    // Where the next line is to be appended, with its line feed.
+    std::string &next() {
+        if (parts_.empty() || parts_.back().size() >= part_size)
+            parts_.emplace_back().reserve(part_size + part_size / 8);
+        return parts_.back();
+    }
+
+private:
+    friend class output;
+    static constexpr std::size_t part_size = 1 << 18;
+
+    std::deque<std::string> parts_;
+};
+
+// Standard output. On a terminal control bytes are shown as \xHH, so that no identity can move the cursor.
+class output {
+public:
+    explicit output(bool is_json);
+
+    bool is_json() const { return is_json_; }
+
+    // Prints a line, to which the line end is added.
+    void line(std::string_view text);
+    // Prints lines that end in line feeds.
+    void lines(std::string_view text);
+    void lines(const held_lines &held);
+    void object(const json &object);
+
+    // Writes what was gathered; called once more at the end. Throws trouble when it cannot be written. When
+    // nobody reads any more, the process ends as others do.
+    void flush();
+
+private:
+    void add(std::string_view text, bool keeps_line_feeds);
+    static void write_all(std::string_view bytes);
+
+    bool is_json_;
+    bool is_terminal_;
+    std::string gathered_;
+};
+
+} // namespace qzacl
+
+#endif
