@@ -13,27 +13,11 @@
 #include "qzacl_trace.h"
 #include "report.h"
 
-#include <cctype>
 #include <cstring>
 
 namespace {
 
 constexpr bool is_line_end(char c) { return c == '\n' || c == '\f' || c == '\r'; }
-constexpr bool is_blank(char c) { return c == ' ' || c == '\t' || c == '\v'; }
-
-// White space by the locale of the process. The class table is fetched once for a line, because one call for
-// each byte would cost more than all the rest of the parse.
-class space_class {
-public:
-#ifdef __GLIBC__
-    bool operator()(char c) const { return (table_[static_cast<unsigned char>(c)] & _ISspace) != 0; }
-
-private:
-    const unsigned short *table_ = *__ctype_b_loc();
-#else
-    bool operator()(char c) const { return std::isspace(static_cast<unsigned char>(c)) != 0; }
-#endif
-};
 
 // True when one of the eight bytes is a NUL or a line end. A byte of the difference is zero where it matches;
 // the borrow test may report a byte above a match, never miss one.
@@ -82,51 +66,26 @@ std::uint8_t type_of_letter(char letter) {
     }
 }
 
-struct token {
-    char *text = nullptr;
-    std::size_t length = 0;
-};
-
-// Cuts the tokens out of one line, ending each with a NUL in place.
-class line_tokens {
-public:
-    line_tokens(char *begin, char *end) : at_(begin), end_(end) {}
-
-    // False when only blanks and a comment are left.
-    bool next(token &out) {
-        while (at_ != end_ && is_blank(*at_))
-            ++at_;
-        if (at_ == end_ || *at_ == '#')
-            return false;
-        out.text = at_;
-        while (at_ != end_ && !is_space_(*at_))
-            ++at_;
-        out.length = static_cast<std::size_t>(at_ - out.text);
-        *at_ = '\0';
-        // A token that ended at the line end was the last one.
-        if (at_ != end_)
-            ++at_;
-        return true;
-    }
-
-private:
-    char *at_;
-    char *end_;
-    space_class is_space_;
-};
+// The next token, which is ended with a NUL in place.
+bool cut_token(qz::line_tokens &tokens, qz::token &out) {
+    if (!tokens.next(out))
+        return false;
+    out.text[out.length] = '\0';
+    return true;
+}
 
 // Fills the entry from the tokens of a line; a line without any leaves its type 0.
-int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, sec_acle_t &entry) {
-    token type;
-    if (!tokens.next(type))
+int parse_line(qz::line_tokens tokens, const sec_perm_set_t &set, int line, sec_acle_t &entry) {
+    qz::token type;
+    if (!cut_token(tokens, type))
         return SEC_S_OK;
     entry.type = type.length == 1 ? type_of_letter(type.text[0]) : std::uint8_t{0};
     if (entry.type == 0)
         return qz::report(SEC_S_BAD_ACL, qz::msg::bad_type_token, line, type.text);
 
     if (qz::has_mechanism(entry.type)) {
-        token mechanism;
-        if (!tokens.next(mechanism))
+        qz::token mechanism;
+        if (!cut_token(tokens, mechanism))
             return qz::report(SEC_S_BAD_ACL, qz::msg::tokens_missing, line);
         if (mechanism.length > qz::mechanism_max)
             return qz::report(SEC_S_BAD_ACL, qz::msg::mechanism_too_long, mechanism.text, line);
@@ -136,14 +95,14 @@ int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, sec_acle
         std::memcpy(entry.mechanism, mechanism.text, mechanism.length);
     }
     if (qz::has_identity(entry.type)) {
-        token identity;
-        if (!tokens.next(identity))
+        qz::token identity;
+        if (!cut_token(tokens, identity))
             return qz::report(SEC_S_BAD_ACL, qz::msg::tokens_missing, line);
         entry.identity = identity.text;
     }
 
-    token permissions;
-    if (!tokens.next(permissions))
+    qz::token permissions;
+    if (!cut_token(tokens, permissions))
         return SEC_S_OK;
     if (const int result = sec__translate_perms(permissions.text, &set, &entry.perm_mask);
         result != SEC_S_OK) {
@@ -152,8 +111,8 @@ int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, sec_acle
         qz::report(result, qz::msg::bad_permission_token, line, permissions.text);
         return result;
     }
-    token excess;
-    if (tokens.next(excess))
+    qz::token excess;
+    if (cut_token(tokens, excess))
         return qz::report(SEC_S_BAD_ACL, qz::msg::tokens_in_excess, line);
     return SEC_S_OK;
 }
@@ -179,7 +138,7 @@ int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size
             qz::trace_data(115, qz::number(*line), qz::number(length));
         result = qz::report(SEC_S_FILE_ERROR, qz::msg::line_too_long, shown_line);
     } else {
-        result = parse_line(line_tokens(begin, end), set == nullptr ? acl__default_perm_set : *set,
+        result = parse_line(qz::line_tokens(begin, end), set == nullptr ? acl__default_perm_set : *set,
                             shown_line, *entry);
         // A NUL that is not the text's own end hides whatever follows it.
         if (result == SEC_S_OK && ends_at_nul && *remaining != length) {

@@ -4,6 +4,7 @@
 
 #include "qz/acl.h"
 
+#include <cctype>
 #include <cstddef>
 #include <cstdint>
 
@@ -11,6 +12,55 @@ namespace qz {
 
 // The longest line that is accepted, its line end included.
 inline constexpr std::size_t line_length_max = 1096;
+
+// White space by the locale of the process. The class table is fetched once for a line, because one call for
+// each byte would cost more than all the rest of the parse.
+class space_class {
+public:
+#ifdef __GLIBC__
+    bool operator()(char c) const { return (table_[static_cast<unsigned char>(c)] & _ISspace) != 0; }
+
+private:
+    const unsigned short *table_ = *__ctype_b_loc();
+#else
+    bool operator()(char c) const { return std::isspace(static_cast<unsigned char>(c)) != 0; }
+#endif
+};
+
+// The tokens of one line, where they stand in it.
+struct token {
+    char *text = nullptr;
+    std::size_t length = 0;
+};
+
+class line_tokens {
+public:
+    // The line end, or the NUL that takes its place, stands at `end`.
+    line_tokens(char *begin, char *end) : at_(begin), end_(end) {}
+
+    // False when only blanks and a comment are left.
+    bool next(token &out) {
+        while (at_ != end_ && is_blank(*at_))
+            ++at_;
+        if (at_ == end_ || *at_ == '#')
+            return false;
+        out.text = at_;
+        while (at_ != end_ && !is_space_(*at_))
+            ++at_;
+        out.length = static_cast<std::size_t>(at_ - out.text);
+        // A token that ended at the line end was the last one.
+        if (at_ != end_)
+            ++at_;
+        return true;
+    }
+
+private:
+    static constexpr bool is_blank(char c) { return c == ' ' || c == '\t' || c == '\v'; }
+
+    char *at_;
+    char *end_;
+    space_class is_space_;
+};
 
 } // namespace qz
 
