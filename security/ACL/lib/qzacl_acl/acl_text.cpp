@@ -62,13 +62,31 @@ int read_cache_of(const vetted_file &text, const vetted_file &cache, const acl_f
     return open_and_read(cache, &text, use, bytes);
 }
 
+void acl_text::stand_before_first_line() {
+    cursor_ = bytes_.data.get();
+    remaining_ = bytes_.length + 1;
+    line_ = 1;
+}
+
+int acl_text::take(std::string_view bytes) {
+    bytes_ = {};
+    if (!bytes.empty()) {
+        bytes_.data = allocate<char>(bytes.size() + 1);
+        if (bytes_.data == nullptr)
+            return report_no_memory("acl_text::take", bytes.size() + 1);
+        bytes.copy(bytes_.data.get(), bytes.size());
+        bytes_.data[bytes.size()] = '\0';
+        bytes_.length = bytes.size();
+    }
+    stand_before_first_line();
+    return SEC_S_OK;
+}
+
 int acl_text::open(const vetted_file &file, const acl_file_use &use) {
     origin_.emplace(file.status);
     if (const int result = open_and_read(file, nullptr, use, bytes_); result != SEC_S_OK)
         return result;
-    cursor_ = bytes_.data.get();
-    remaining_ = bytes_.length + 1;
-    line_ = 1;
+    stand_before_first_line();
     return SEC_S_OK;
 }
 

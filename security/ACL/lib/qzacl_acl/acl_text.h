@@ -11,6 +11,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <optional>
+#include <string_view>
 
 namespace qz {
 
@@ -64,11 +65,19 @@ public:
     // Reads the file, and stands before its first line. Returns SEC_S_OK, SEC_S_FILE_ERROR or SEC_S_NO_MEMORY.
     int open(const vetted_file &file, const acl_file_use &use);
 
+    // Takes a copy of bytes that come from elsewhere, such as standard input, and stands before their first line.
+    // Returns SEC_S_OK or SEC_S_NO_MEMORY.
+    int take(std::string_view bytes);
+
     // Reads the next line into the entry, whose identity points into the text. A bad line does not keep those
     // that follow from being read.
     acl_line next(sec_acle_t &entry);
 
     bool is_empty() const { return bytes_.length == 0; }
+    // The text from the line that comes next on. Of the lines before it the reader has overwritten bytes.
+    std::string_view unread() const {
+        return cursor_ == nullptr ? std::string_view() : std::string_view(cursor_, remaining_ - 1);
+    }
     // The number of the line that comes next, from 1.
     std::uint32_t line() const { return line_; }
     // The code of the bad line that was read last.
@@ -77,6 +86,8 @@ public:
     const text_origin &origin() const { return *origin_; }
 
 private:
+    void stand_before_first_line();
+
     const sec_perm_set_t *set_;
     std::optional<text_origin> origin_;
     file_bytes bytes_;

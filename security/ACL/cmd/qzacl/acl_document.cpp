@@ -1,0 +1,200 @@
+// An ACL file as the verbs read it.
+#include "acl_document.h"
+
+#include "entry_words.h"
+#include "input.h"
+#include "qzacl_acl/buffer_format.h"
+#include "qzacl_acl/compile.h"
+#include "trouble.h"
+
+#include <cstring>
+#include <vector>
+
+namespace qzacl {
+
+namespace {
+
+constexpr qz::acl_file_use by_companion = {
+    .not_found = {SEC_S_BAD_FILENAME, qz::msg::bad_acl_file_name},
+    .not_private = {SEC_S_BAD_PERMISSION, qz::msg::acl_file_not_private},
+    .cannot_open = {SEC_S_FILE_ERROR, qz::msg::cannot_open_acl_file},
+    .takes_empty_of_anybody = false,
+    .is_traced = false,
+};
+
+// Counts line feeds ahead of the parser, which overwrites them.
+class feed_counter {
+public:
+    explicit feed_counter(std::string_view text) { find(text); }
+
+    // The line that the rest of the text begins with. A line of the parser holds one line feed at most.
+    std::size_t line_of(std::string_view rest) {
+        if (next_ != nullptr && rest.data() > next_) {
+            ++line_;
+            find(rest);
+        }
+        return line_;
+    }
+
+private:
+    void find(std::string_view rest) {
+        next_ =
+            rest.empty() ? nullptr : static_cast<const char *>(std::memchr(rest.data(), '\n', rest.size()));
+    }
+
+    const char *next_ = nullptr;
+    std::size_t line_ = 1;
+};
+
+void open(const std::string &file, qz::acl_text &text) {
+    if (file == standard_input)
+        return require(text.take(read_whole(file)));
+    qz::vetted_file vetted;
+    require(text.open_again_while_replaced([&] {
+        const int found = qz::vet_acl_file(file.c_str(), nullptr, by_companion, vetted);
+        return found != SEC_S_OK ? found : text.open(vetted, by_companion);
+    }));
+}
+
+bool is_buffer(std::string_view bytes) {
+    return !bytes.empty() && static_cast<std::uint8_t>(bytes[0]) == qz::format::buffer_type;
+}
+
+std::string_view text_in(qz::byte_span field) {
+    const char *text = qz::format::string_in(field);
+    return text == nullptr ? std::string_view() : text;
+}
+
+} // namespace
+
+acl_document::acl_document(const std::string &file, const permission_set &set, const reading &watched)
+    : file_(file), text_(set.get()) {
+    open(file, text_);
+    read(watched);
+}
+
+acl_document::acl_document(const std::string &file, std::string_view bytes, const permission_set &set,
+                           const reading &watched)
+    : file_(file), text_(set.get()) {
+    require(text_.take(bytes));
+    read(watched);
+}
+
+void acl_document::read(const reading &watched) {
+    if (is_buffer(text_.unread()))
+        return read_buffer(text_.unread(), watched);
+    if (watched.whole_text)
+        watched.whole_text(text_.unread());
+    read_lines(watched);
+}
+
+void acl_document::read_lines(const reading &watched) {
+    const std::string_view whole = text_.unread();
+    feed_counter feeds(whole);
+    bool is_sound = true;
+    sec_acle_t record = {};
+    for (;;) {
+        const std::size_t left = text_.unread().size();
+        const std::size_t line = feeds.line_of(text_.unread());
+        const qz::acl_line found = text_.next(record);
+        if (found == qz::acl_line::end)
+            break;
+        if (found == qz::acl_line::none)
+            continue;
+        int result = text_.failure();
+        if (found == qz::acl_line::entry)
+            result = sec__add_acle_to_trees(&record, trees_);
+        if (found == qz::acl_line::entry && result == SEC_S_OK) {
+            if (watched.entry) {
+                qz::entry_fields entry = fields_of(record);
+                entry.mechanism = kept(entry.mechanism);
+                watched.entry(entry, {line, whole.size() - left, whole.size() - text_.unread().size()});
+            }
+            continue;
+        }
+        print_recorded_error();
+        is_sound = false;
+        if (result == SEC_S_NO_MEMORY)
+            break;
+    }
+    if (!is_sound)
+        throw told_trouble();
+}
+
+void acl_document::read_buffer(std::string_view bytes, const reading &watched) {
+    auto copy = qz::acl::from_bytes(bytes.data(), bytes.size());
+    require(copy.code());
+    require(copy->to_host());
+    compiled_ = std::move(*copy);
+    if (watched.entry)
+        for_each_stored(compiled_, [&](const qz::entry_fields &entry) { watched.entry(entry, {}); });
+}
+
+std::string_view acl_document::kept(std::string_view mechanism) {
+    if (mechanism == last_mechanism_)
+        return last_mechanism_;
+    auto found = mechanisms_.find(mechanism);
+    if (found == mechanisms_.end())
+        found = mechanisms_.emplace(mechanism).first;
+    return last_mechanism_ = *found;
+}
+
+std::string acl_document::place(std::size_t line) const {
+    return line == 0 ? file_ : file_ + ":" + std::to_string(line);
+}
+
+std::span<sec_acltree_t *const> acl_document::trees() {
+    if (is_compiled() && !has_trees_of_buffer_) {
+        for_each_stored(compiled_, [&](const qz::entry_fields &entry) {
+            const sec_acle_t record = record_of(entry);
+            require(sec__add_acle_to_trees(&record, trees_));
+        });
+        has_trees_of_buffer_ = true;
+    }
+    return trees_.trees();
+}
+
+qz::acl acl_document::take_acl() {
+    if (is_compiled())
+        return std::move(compiled_);
+    sec_acl_buffer_t buffer = {};
+    if (!trees_.trees().empty())
+        require(sec__acltrees_to_acl(trees_.trees(), &buffer));
+    return qz::acl(buffer);
+}
+
+void acl_document::require_compilable() const {
+    std::uint64_t size = qz::format::header_size;
+    for (const sec_acltree_t *tree : trees_.trees())
+        size += qz::format::subacl_header_size + qz::mechanism_max + 1 + tree->packed_size();
+    if (trees_.trees().size() <= qz::format::subacls_max && size <= qz::format::buffer_max)
+        return;
+    // So close to the limits the compiler says whether they are kept, and if not, how.
+    sec_acl_buffer_t buffer = {};
+    const int result = sec__acltrees_to_acl(trees_.trees(), &buffer);
+    const qz::owned<void> owner(buffer.data);
+    require(result);
+}
+
+void for_each_stored(const qz::acl &acl, const std::function<void(const qz::entry_fields &)> &each) {
+    std::vector<qz::byte_span> subacls;
+    qz::format::subacl_walk walk(qz::format::bytes_of(*acl.get()));
+    while (walk.next() == qz::format::subacl_walk::step::found)
+        subacls.push_back(walk.bytes());
+    for (auto bytes = subacls.rbegin(); bytes != subacls.rend(); ++bytes) {
+        qz::byte_reader reader(*bytes);
+        qz::format::subacl head;
+        if (!qz::format::read(reader, head))
+            continue;
+        qz::format::entry entry;
+        for (std::uint32_t left = head.entry_count; left != 0 && qz::format::read(reader, entry); --left)
+            each({head.type, entry.perm_mask, text_in(head.mechanism), text_in(entry.identity)});
+    }
+}
+
+qz::entry_fields fields_of(const sec_acle_t &record) {
+    const char *identity = record.identity == nullptr ? "" : record.identity;
+    return {record.type, record.perm_mask, record.mechanism, identity};
+}
+
+} // namespace qzacl

@@ -1,0 +1,81 @@
+// An ACL file as the verbs read it: a text, line by line with the checker's own parser, or a compiled buffer.
+#ifndef QZACL_ACL_DOCUMENT_H
+#define QZACL_ACL_DOCUMENT_H
+
+#include "permission_set.h"
+#include "qz/service.hpp"
+#include "qzacl_acl/acl_text.h"
+#include "qzacl_acl/tree.h"
+
+#include <functional>
+#include <set>
+#include <span>
+#include <string>
+#include <string_view>
+
+namespace qzacl {
+
+// Where an entry stands in a text; all zeros in a compiled buffer.
+struct text_place {
+    std::size_t line = 0;  // from 1, by line feeds, as editors count
+    std::size_t begin = 0; // the byte at which its line begins, and the one behind its line end
+    std::size_t end = 0;
+};
+
+// Who looks on while a file is read. The texts of an entry live as long as the document and end in NUL.
+struct reading {
+    std::function<void(const qz::entry_fields &, const text_place &)> entry = {};
+    std::function<void(std::string_view)> whole_text = {}; // before its first line is read
+};
+
+class acl_document {
+public:
+    // Reads FILE, or standard input for "-". Whatever a check would say is printed, and all of it; then, or when
+    // the file cannot be read, told_trouble is thrown. Of a compiled buffer entries are handed out as a text
+    // would have them.
+    acl_document(const std::string &file, const permission_set &set, const reading &watched = {});
+
+    // The same of bytes that are at hand; `file` is their name in answers.
+    acl_document(const std::string &file, std::string_view bytes, const permission_set &set,
+                 const reading &watched = {});
+
+    const std::string &file() const { return file_; }
+    bool is_compiled() const { return !compiled_.bytes().empty(); }
+
+    // "FILE:LINE", or the file alone where the line is not known.
+    std::string place(std::size_t line) const;
+
+    // The entries in the trees that they compile from. Throws when those of a buffer make none.
+    std::span<sec_acltree_t *const> trees();
+
+    // What services ask: the buffer itself, or the compiled text; without bytes where there are no entries.
+    // Throws recorded_trouble.
+    qz::acl take_acl();
+
+    // Throws recorded_trouble when the text has more than a buffer can hold.
+    void require_compilable() const;
+
+private:
+    void read(const reading &watched);
+    void read_lines(const reading &watched);
+    void read_buffer(std::string_view bytes, const reading &watched);
+    std::string_view kept(std::string_view mechanism);
+
+    std::string file_;
+    qz::acl_text text_;
+    sec_acltree_array trees_;
+    qz::acl compiled_;
+    bool has_trees_of_buffer_ = false;
+    std::set<std::string, std::less<>> mechanisms_;
+    std::string_view last_mechanism_;
+};
+
+// Calls `each` with every entry of a sound buffer, sub-ACLs from last to first.
+void for_each_stored(const qz::acl &acl, const std::function<void(const qz::entry_fields &)> &each);
+
+// The fields of a record, whose texts end in NUL.
+qz::entry_fields fields_of(const sec_acle_t &record);
+
+} // namespace qzacl
+
+#endif

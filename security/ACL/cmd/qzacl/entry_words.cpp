@@ -1,0 +1,70 @@
+// Entries as the verbs show them.
+#include "entry_words.h"
+
+#include "trouble.h"
+
+namespace qzacl {
+
+namespace {
+
+char folded(char c) { return static_cast<char>(qz::detail::fold(c)); }
+
+json text_or_null(std::string_view text) { return text.empty() ? json() : json_text(text); }
+
+} // namespace
+
+std::string folded(std::string_view text) {
+    std::string made(text);
+    for (char &each : made)
+        each = folded(each);
+    return made;
+}
+
+std::string key_of(const qz::entry_fields &entry) {
+    std::string key(1, qz::type_letter(entry.type));
+    key += folded(entry.mechanism);
+    key += '\0';
+    key += folded(entry.identity);
+    return key;
+}
+
+void append_key(std::string &line, const qz::entry_fields &entry) {
+    line += qz::type_letter(entry.type);
+    if (!entry.mechanism.empty())
+        line += ' ';
+    for (const char each : entry.mechanism)
+        line += folded(each);
+    if (!entry.identity.empty())
+        line.append(" ").append(entry.identity);
+}
+
+void append_entry(std::string &line, const qz::entry_fields &entry, const permission_set &set) {
+    const std::string_view letters = set.letters_of(entry.permissions);
+    append_key(line, entry);
+    if (!letters.empty())
+        line.append(" ").append(letters);
+}
+
+void put_entry(json &object, const std::string &file, std::size_t line, const qz::entry_fields &entry,
+               const permission_set &set) {
+    object["file"] = json_text(file);
+    object["line"] = line != 0 ? json(line) : json();
+    object["type"] = std::string(1, qz::type_letter(entry.type));
+    object["mechanism"] = text_or_null(folded(entry.mechanism));
+    object["identity"] = text_or_null(entry.identity);
+    object["permissions"] = json_text(set.letters_of(entry.permissions));
+}
+
+sec_acle_t record_of(const qz::entry_fields &entry) {
+    sec_acle_t record = {};
+    if (entry.mechanism.size() >= sizeof record.mechanism)
+        throw trouble("a mechanism has more than 16 bytes");
+    entry.mechanism.copy(record.mechanism, sizeof record.mechanism - 1);
+    record.perm_mask = entry.permissions;
+    record.type = entry.type;
+    const bool has_identity = (entry.type & (SEC_ACLE_USER | SEC_ACLE_EXPANDED | SEC_ACLE_GROUP)) != 0;
+    record.identity = has_identity ? const_cast<char *>(entry.identity.data()) : nullptr;
+    return record;
+}
+
+} // namespace qzacl

@@ -1,0 +1,37 @@
+// Entries as the verbs show them.
+#ifndef QZACL_ENTRY_WORDS_H
+#define QZACL_ENTRY_WORDS_H
+
+#include "output.h"
+#include "permission_set.h"
+#include "qz/service.hpp"
+
+#include <string>
+#include <string_view>
+
+namespace qzacl {
+
+// The text with A to Z in lower case.
+std::string folded(std::string_view text);
+
+// Two entries of one key say something of the same party.
+std::string key_of(const qz::entry_fields &entry);
+
+// Appends "TYPE MECHANISM IDENTITY", as far as the entry has them.
+void append_key(std::string &line, const qz::entry_fields &entry);
+
+// Appends the key and the letters. Throws recorded_trouble for a bit without letter.
+void append_entry(std::string &line, const qz::entry_fields &entry, const permission_set &set);
+
+// Puts "file", "line", "type", "mechanism", "identity" and "permissions" into an object; null is what is empty but
+// permissions, and a line 0.
+void put_entry(json &object, const std::string &file, std::size_t line, const qz::entry_fields &entry,
+               const permission_set &set);
+
+// A record of the C interface that shows the fields, whose texts end in NUL. Throws trouble for a mechanism that
+// none can hold.
+sec_acle_t record_of(const qz::entry_fields &entry);
+
+} // namespace qzacl
+
+#endif

@@ -1,0 +1,37 @@
+// Files that are read whole.
+#include "input.h"
+
+#include "base/open_file.h"
+#include "trouble.h"
+
+#include <cerrno>
+#include <cstring>
+#include <unistd.h>
+
+namespace qzacl {
+
+std::string read_whole(const std::string &name) {
+    const auto fail = [&] { throw trouble(name + ": " + std::strerror(errno)); };
+    qz::descriptor opened;
+    int fd = STDIN_FILENO;
+    if (name != standard_input) {
+        opened = qz::open_file(name.c_str(), O_RDONLY);
+        if (!opened)
+            fail();
+        fd = opened.get();
+    }
+    std::string bytes;
+    constexpr std::size_t step = 1 << 18;
+    for (;;) {
+        const std::size_t before = bytes.size();
+        bytes.resize(before + step);
+        const ssize_t count = read(fd, bytes.data() + before, step);
+        if (count < 0 && errno != EINTR)
+            fail();
+        bytes.resize(before + (count > 0 ? static_cast<std::size_t>(count) : 0));
+        if (count == 0)
+            return bytes;
+    }
+}
+
+} // namespace qzacl

@@ -1,0 +1,79 @@
+// The command qzacl: asks, explains, compares and tests ACL files. From its arguments to its exit status.
+#include "cli.h"
+#include "trouble.h"
+
+#include <clocale>
+#include <fcntl.h>
+#include <new>
+#include <unistd.h>
+
+namespace {
+
+using namespace qzacl;
+
+constexpr verb verbs[] = {
+    {"who", "FILE LETTERS", "the entries that hold all the letters", "", 2, 2, 1, who},
+    {"show", "FILE", "the entries as a text, in stored order", "", 1, 1, 1, show},
+};
+
+// A file that is opened later must not become one of the standard streams. One that was closed stays useless, so
+// that whoever reads or writes it is told.
+void fill_standard_descriptors() {
+    for (int fd = open("/dev/null", O_RDWR); fd >= 0; fd = open("/dev/null", O_RDWR)) {
+        if (fd > STDERR_FILENO) {
+            close(fd);
+            return;
+        }
+        if (fd == STDERR_FILENO)
+            continue;
+        const int useless = open("/dev/null", fd == STDIN_FILENO ? O_WRONLY : O_RDONLY);
+        if (useless >= 0) {
+            dup2(useless, fd);
+            close(useless);
+        }
+    }
+}
+
+int run(const command_line &line) {
+    output out(line.is_json);
+    if (line.wants_help) {
+        out.lines(help_of(verbs, line.chosen));
+        out.flush();
+        return yes;
+    }
+    const permission_set permissions =
+        line.permissions ? permission_set(*line.permissions) : permission_set();
+    const int status = line.chosen->run({line, permissions, out});
+    out.flush();
+    return status;
+}
+
+// Tells what was thrown.
+void tell() {
+    try {
+        throw;
+    } catch (const told_trouble &) {
+        // Nothing is left to say.
+    } catch (const recorded_trouble &) {
+        print_recorded_error();
+    } catch (const wrong_use &found) {
+        print_message(std::string(found.what()) + "; see qzacl --help");
+    } catch (const std::bad_alloc &) {
+        print_message("out of memory");
+    } catch (const std::exception &found) {
+        print_message(found.what());
+    }
+}
+
+} // namespace
+
+int main(int argc, char *argv[]) {
+    fill_standard_descriptors();
+    std::setlocale(LC_ALL, "");
+    try {
+        return run(read_command_line(verbs, {argv + (argc > 0 ? 1 : 0), argv + argc}));
+    } catch (...) {
+        tell();
+        return failed;
+    }
+}

@@ -1,0 +1,90 @@
+// What the verbs answer.
+#include "output.h"
+
+#include "trouble.h"
+#include "utf8.h"
+
+#include <cerrno>
+#include <csignal>
+#include <cstring>
+#include <unistd.h>
+
+namespace qzacl {
+
+namespace {
+
+constexpr std::size_t enough_to_write = 1 << 18;
+
+// C0, DEL, and C1 as UTF-8 has them, which terminals obey as well.
+bool is_control(std::string_view text, std::size_t at) {
+    const auto byte = static_cast<unsigned char>(text[at]);
+    const auto before = at == 0 ? '\0' : text[at - 1];
+    return byte < 0x20 || byte == 0x7f || (before == '\xc2' && byte >= 0x80 && byte < 0xa0);
+}
+
+void append_escaped(std::string &to, std::string_view text, bool keeps_line_feeds) {
+    constexpr char digits[] = "0123456789abcdef";
+    for (std::size_t at = 0; at < text.size(); ++at) {
+        const auto byte = static_cast<unsigned char>(text[at]);
+        if (!is_control(text, at) || (byte == '\n' && keeps_line_feeds)) {
+            to += text[at];
+            continue;
+        }
+        if (byte >= 0x80) {
+            to.pop_back();
+            to += "\\xc2";
+        }
+        to.append("\\x").append({digits[byte >> 4], digits[byte & 15]});
+    }
+}
+
+[[noreturn]] void end_quietly() {
+    std::signal(SIGPIPE, SIG_DFL);
+    std::raise(SIGPIPE);
+    _exit(failed);
+}
+
+} // namespace
+
+json json_text(std::string_view bytes) { return valid_utf8(bytes); }
+
+output::output(bool is_json) : is_json_(is_json), is_terminal_(isatty(STDOUT_FILENO) != 0) {}
+
+void output::add(std::string_view text, bool keeps_line_feeds) {
+    if (is_terminal_)
+        append_escaped(gathered_, text, keeps_line_feeds);
+    else
+        gathered_ += text;
+}
+
+void output::line(std::string_view text) {
+    add(text, false);
+    gathered_ += '\n';
+    if (gathered_.size() >= enough_to_write)
+        flush();
+}
+
+void output::lines(std::string_view text) {
+    add(text, true);
+    if (gathered_.size() >= enough_to_write)
+        flush();
+}
+
+void output::object(const json &object) { line(object.dump(-1, ' ', false, json::error_handler_t::replace)); }
+
+void output::flush() {
+    std::string_view left = gathered_;
+    while (!left.empty()) {
+        const ssize_t written = write(STDOUT_FILENO, left.data(), left.size());
+        if (written < 0 && errno == EINTR)
+            continue;
+        if (written < 0 && errno == EPIPE)
+            end_quietly();
+        if (written < 0)
+            throw trouble(std::string("standard output: ") + std::strerror(errno));
+        left.remove_prefix(static_cast<std::size_t>(written));
+    }
+    gathered_.clear();
+}
+
+} // namespace qzacl

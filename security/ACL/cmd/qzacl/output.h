@@ -1,0 +1,44 @@
+// What the verbs answer: lines for people, or JSON, one object a line.
+#ifndef QZACL_OUTPUT_H
+#define QZACL_OUTPUT_H
+
+#include <nlohmann/json.hpp>
+#include <string>
+#include <string_view>
+
+namespace qzacl {
+
+// Keys stay in the order in which they were put in.
+using json = nlohmann::ordered_json;
+
+// A text as JSON can hold it: with U+FFFD for each byte that is no UTF-8.
+json json_text(std::string_view bytes);
+
+// Standard output. On a terminal control bytes are shown as \xHH, so that no identity can move the cursor.
+class output {
+public:
+    explicit output(bool is_json);
+
+    bool is_json() const { return is_json_; }
+
+    // Prints a line, to which the line end is added.
+    void line(std::string_view text);
+    // Prints lines that end in line feeds.
+    void lines(std::string_view text);
+    void object(const json &object);
+
+    // Writes what was gathered; called once more at the end. Throws trouble when it cannot be written. When
+    // nobody reads any more, the process ends as others do.
+    void flush();
+
+private:
+    void add(std::string_view text, bool keeps_line_feeds);
+
+    bool is_json_;
+    bool is_terminal_;
+    std::string gathered_;
+};
+
+} // namespace qzacl
+
+#endif

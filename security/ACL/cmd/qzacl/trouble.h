@@ -1,0 +1,43 @@
+// What ends a verb early; main() tells it and ends with the status of trouble.
+#ifndef QZACL_TROUBLE_H
+#define QZACL_TROUBLE_H
+
+#include <stdexcept>
+#include <string>
+
+namespace qzacl {
+
+// The exit statuses, as those of grep and diff.
+enum status : int { yes = 0, no = 1, failed = 2 };
+
+// Told as it stands.
+struct trouble : std::runtime_error {
+    using std::runtime_error::runtime_error;
+};
+
+// The command line says something that cannot be meant; told with the usage.
+struct wrong_use : trouble {
+    using trouble::trouble;
+};
+
+// The library recorded an error, which is told.
+struct recorded_trouble : std::exception {};
+
+// All was told already.
+struct told_trouble : std::exception {};
+
+// Throws when the library's operation failed.
+inline void require(int code) {
+    if (code != 0)
+        throw recorded_trouble();
+}
+
+// Prints the library's recorded error as qzaclfck does, with an empty line behind it.
+void print_recorded_error();
+
+// Prints a line of this command's own on standard error.
+void print_message(const std::string &text);
+
+} // namespace qzacl
+
+#endif

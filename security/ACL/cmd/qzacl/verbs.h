@@ -1,0 +1,40 @@
+// The verbs: what each takes and does.
+#ifndef QZACL_VERBS_H
+#define QZACL_VERBS_H
+
+#include "output.h"
+#include "permission_set.h"
+
+#include <cstddef>
+#include <string_view>
+
+namespace qzacl {
+
+struct command_line;
+
+// What a verb works with.
+struct call {
+    const command_line &line;
+    const permission_set &permissions;
+    output &out;
+};
+
+struct verb {
+    std::string_view name;
+    std::string_view usage; // its words and options
+    std::string_view purpose;
+    std::string_view options; // that it takes beside --json and --permissions, single blanks between
+    std::size_t least_words;
+    std::size_t most_words;
+    std::size_t files;            // of its first words how many may be "-"
+    int (*run)(const call &call); // gives the exit status
+};
+
+inline constexpr std::size_t any_number = static_cast<std::size_t>(-1);
+
+int show(const call &call);
+int who(const call &call);
+
+} // namespace qzacl
+
+#endif
