@@ -33,6 +33,9 @@ public:
         one_value(app_.add_option("-w", line.wanted));
         one_value(app_.add_option("--order", order_));
         add_list(app_, "--handler", line.handlers);
+        app_.add_flag("--check", line.checks)->disable_flag_override();
+        app_.add_flag("-s", line.compiles)->disable_flag_override();
+        one_value(app_.add_option("--wait", line.wait));
     }
 
     // Gives what is no option; behind "--", nothing is.
