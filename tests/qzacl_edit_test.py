@@ -1,0 +1,357 @@
+"""Edits ACL files with qzacl as an administrator does, and looks at every byte of what is left, also of edits that meet
+each other, lack rights or are killed. Usage: qzacl_edit_test.py BUILD_DIR [unittest arguments]."""
+import fcntl
+import itertools
+import json
+import os
+import pathlib
+import random
+import re
+import shutil
+import signal
+import subprocess
+import sys
+import unittest
+
+from command_test import (BUILD, ENTRIES, IS_ROOT, NOBODY, PLACE, SANITIZED, CommandCase, may_write, posix_acl, snapshot)
+
+os.environ["QZ_LIBRARY_DIR"] = str(BUILD / "lib")
+sys.path.insert(0, str(pathlib.Path(__file__).resolve().parent.parent / "bindings" / "python"))
+import qzacl  # noqa: E402  pylint: disable=wrong-import-position
+
+QZACL = PLACE.name + "/bin/qzacl"
+OLD = b"# staff\nu unix alice@h r # boss\ng ops rw\n"
+EDITS = [  # a text, the words of an edit, and the text that it makes
+    (OLD, "set u unix alice@h rw", OLD.replace(b" r #", b" rw #")),
+    (OLD, "set u unix bob@h r", OLD + b"u unix bob@h r\n"),
+    (OLD, "set g ops", OLD.replace(b"ops rw", b"ops ")),
+    (OLD, "remove g ops", OLD.replace(b"g ops rw\n", b"")),
+    (OLD, "remove u unix alice@h", OLD.replace(b"u unix alice@h r # boss\n", b"")),
+    (OLD, "remove G OPS", OLD.replace(b"g ops rw\n", b"")),
+    (OLD, "grant x g ops", OLD.replace(b"ops rw", b"ops rwx")),
+    (OLD, "grant xr g new", OLD + b"g new rx\n"),
+    (OLD, "revoke w g ops", OLD.replace(b"ops rw", b"ops r")),
+    (OLD, "revoke rwx u unix alice@h", OLD.replace(b" r #", b"  #")),
+    (b"", "set n r", b"n r\n"),
+    (b"o r", "set n r", b"o r\nn r\n"),
+    (b"o r", "set o w", b"o w"),
+    (b"o r", "remove o", b""),
+    (b"# c\r\nO\tr \t#\r\n\r\n", "grant w o", b"# c\r\nO\trw \t#\r\n\r\n"),
+    (b"o r\r\nn\r\n", "remove o", b"n\r\n"),
+    (b"o r\r\nn w", "set g ops r", b"o r\r\nn w\r\ng ops r\r\n"),
+    (b"o r\rn w", "remove n", b"o r\r"),
+    (b"o r\rn w", "set g ops r", b"o r\rn w\rg ops r\r"),
+    (b"o r\fn w", "set n", b"o r\fn "),
+    (b"n\t\t# none\n", "grant r n", b"n r\t\t# none\n"),
+    (b"o r\n\0n w\n", "set n r", b"o r\nn r\n\0n w\n"),
+    (b"\0rest", "set n r", b"n r\n\0rest"),
+    (b"g caf\xe9 r\n", "grant w g caf\xe9", b"g caf\xe9 rw\n"),
+    (b"u UNIX A@H r\n", "set U Unix a@h w", b"u UNIX A@H w\n"),
+    (b"", "set u unix a@FE80:0::1 r", b"u unix a@fe80::1 r\n"),
+    (b"", "set e HBA2 FE80:0::1 r", b"e hba2 fe80::1 r\n"),
+    (b"", "set u other a@FE80:0::1 r", b"u other a@FE80:0::1 r\n"),
+    (b"u unix a@fe80::1 r\n", "grant w u unix a@FE80:0::1", b"u unix a@fe80::1 rw\n"),
+    (b"u unix a@FE80:0::1 r\nu unix a@fe80::1 r\n", "grant w u unix a@FE80:0::1", b"u unix a@FE80:0::1 rw\nu unix a@fe80::1 r\n"),
+]
+UNCHANGED = [(OLD, "set g OPS wr"), (OLD, "grant r u unix alice@h"), (OLD, "revoke x g ops"), (OLD, "revoke r g none"),
+             (OLD, "remove o"), (b"n \n", "set n"), (b"u unix x r\n", "set u unix x r")]
+REFUSED = [  # a text, the words of an edit, and what is said
+    (b"n r\nbad\n", "set g ops r", "3417-179"), (b"n r\nn w\n", "remove n", "3417-174"), (OLD, "set g ops Z", "3417-146"),
+    (OLD, "grant Z g ops", "3417-146"), (OLD, "set u unix alice r", "host"), (OLD, "grant r e unix a@", "host"),
+    (OLD, "set g a\tb r", "word"), (OLD, "set g #a r", "word"), (OLD, "set g a\nn r", "word"), (OLD, "set x ops r", "begins with"),
+    (OLD, "set u unix", "missing"), (OLD, "remove g ops r", "too many"), (OLD, "set u 12345678901234567 a", "16 bytes"),
+    (OLD, "set g " + "a" * 1096, "3417-158"), (b"\x85\1", "set n r", "compiled"), (OLD, "revoke", "words"),
+    (OLD, "set -x n", "option"), (OLD, "set n r --wait=", "value"), (OLD, "set n r --wait -1", "wait"),
+]
+
+
+VERBS = ["set", "remove", "grant", "revoke"]
+
+
+def some_key(draw):
+    kind = draw.choice("uuegno")
+    identity = draw.choice(["alice@a", "Bob@B", "c@fe80::1", "d", "x\xe9"]) + ("@h" if kind == "u" else "")
+    return {"n": ["n"], "o": ["o"], "g": ["g", identity]}.get(kind, [kind, draw.choice(["unix", "Krb"]), identity])
+
+
+def some_letters(draw):
+    return "".join(draw.sample("rwcxCqledvsao", draw.randrange(4)))
+
+
+def some_text(draw):
+    """A text, and the keys of its entries: with comments, blank lines, blanks and line ends of all kinds."""
+    pieces, keys = [], {}
+    for _ in range(draw.randrange(9)):
+        end = draw.choice(["\n", "\n", "\r\n", "\r", "\f"])
+        pieces.append(draw.choice(["", "", "# a comment" + end, end, " \t" + end]))
+        key = some_key(draw)
+        if keys.setdefault(str(key).lower(), key) is key:
+            words = [*key, *([some_letters(draw)] if draw.random() < 0.8 else [])]
+            blanks = [draw.choice([" ", "\t", "  ", " \v"]) for _ in words]
+            line = "".join(map("".join, zip(words, blanks)))
+            pieces.append(draw.choice(["", " "]) + line + draw.choice(["", "# why", "#"]) + end)
+    text = "".join(pieces).encode("latin-1")
+    text = text if draw.random() < 0.7 else text.rstrip()
+    return text if draw.random() < 0.9 or not text.endswith(b"\n") else text + b"\0 rest", list(keys.values())
+
+
+def lines_of(text):
+    return re.findall(rb"[^\r\n\f]*(?:\r\n|[\r\n\f])|[^\r\n\f]+", text)
+
+
+def keeps_other_bytes(before, after, verb):
+    """Whether all that differs is one line, and of a line that was there before its letters alone."""
+    old, new = lines_of(before), lines_of(after)
+    if verb == "remove":
+        return old == new or any(old[:at] + old[at + 1:] == new for at in range(len(old)))
+    if len(old) != len(new):
+        read, added = before.partition(b"\0 rest")[0], after.partition(b"\0 rest")[0]
+        return added.startswith(read) and len(new) == len(old) + 1 and before[len(read):] == after[len(added):]
+    changed = [pair for pair in zip(old, new) if pair[0] != pair[1]]
+    return len(changed) <= 1 and all(differ_in_letters(*pair) for pair in changed)
+
+
+def differ_in_letters(old, new):
+    start = len(os.path.commonprefix([old, new]))
+    end = len(os.path.commonprefix([old[start:][::-1], new[start:][::-1]]))
+    pieces = [line[start:len(line) - end].strip() for line in (old, new)]
+    return all(re.fullmatch(b"[a-zC]*", piece) for piece in pieces)
+
+
+def changed_acl(text, verb, letters, key):
+    """What the library makes of the ACL when it is edited there."""
+    acl = qzacl.Acl.from_text(text)
+    kind = {"n": 1, "o": 2, "u": 4, "e": 8, "g": 16}[key[0].lower()]
+    mechanism = key[1].lower() if len(key) == 3 else ""
+    identity = key[-1].encode("latin-1").decode("utf-8", "surrogateescape") if len(key) > 1 else ""
+    wanted = qzacl.Entry(kind, qzacl.to_mask(letters), mechanism, identity)
+    held = next((each for each in acl if each[0] == kind and each[2].lower() == mechanism and
+                 each[3].lower() == identity.lower()), None)
+    mask = {"set": wanted[1], "grant": wanted[1] | (held[1] if held else 0),
+            "revoke": (held[1] if held else 0) & ~wanted[1]}.get(verb)
+    if verb in ("set", "grant") or (verb == "revoke" and held):
+        acl.add(wanted._replace(permissions=mask))
+    elif verb == "remove" and held:
+        acl.remove(held)
+    return acl
+
+
+class EditCase(CommandCase):
+    def qzacl(self, *words, text=b"", environment=(), tracer=(), **how):
+        """Gives the status and what was printed, on both streams together."""
+        command = [*tracer, QZACL, *[word.encode("latin-1") for word in words]]
+        kept = {name: value for name, value in os.environ.items() if name.endswith("SAN_OPTIONS")}
+        done = subprocess.run(command, cwd=self.dir, input=text, stdout=subprocess.PIPE, stderr=subprocess.STDOUT,
+                              env={**kept, "PATH": os.environ["PATH"], "LC_ALL": "C", **dict(environment)}, check=False,
+                              timeout=300, **how)
+        return done.returncode, done.stdout.decode("latin-1")
+
+    def read(self, name="a"):
+        return pathlib.Path(self.dir, name).read_bytes()
+
+    def edit_words(self, words):
+        """Of a row, with the file behind the verb."""
+        verb, *others = words.split(" ")
+        return [verb, "a", *others]
+
+    def expect_refused(self, said, *words, **how):
+        before = snapshot(self.dir)
+        status, printed = self.qzacl(*words, **how)
+        self.assertEqual((status, snapshot(self.dir)), (2, before), words)
+        self.assertIn(said, printed, words)
+
+
+class Edits(EditCase):
+    def test_changes(self):
+        for before, words, after in EDITS:
+            with self.subTest(before=before, words=words):
+                self.write("a", before)
+                status, diff = self.qzacl(*self.edit_words(words), "--check")
+                self.assertEqual((status, self.read(), os.listdir(self.dir)), (1, before, ["a"]))
+                self.assertEqual(self.patched(before, diff), after)
+                self.assertEqual(self.qzacl(*self.edit_words(words)), (0, "changed\n"))
+                self.assertEqual((self.read(), os.listdir(self.dir)), (after, ["a"]))
+                self.assertEqual(self.qzacl(*self.edit_words(words), "--json")[1], '{"file":"a","changed":false}\n')
+
+    def patched(self, before, diff):
+        """What patch makes of a text, if it takes the difference."""
+        if not shutil.which("patch"):
+            self.skipTest("there is no patch")
+        pathlib.Path(self.root, "patched").write_bytes(before)
+        command = ["patch", "-s", "--binary", "--posix", f"{self.root}/patched"]
+        subprocess.run(command, input=diff.encode("latin-1"), check=True)
+        made = pathlib.Path(self.root, "patched")
+        return made.read_bytes() if made.exists() else b""
+
+    def test_nothing_to_change(self):
+        for before, words in UNCHANGED:
+            with self.subTest(before=before, words=words):
+                self.write("a", before)
+                state = snapshot(self.dir)
+                self.assertEqual(self.qzacl(*self.edit_words(words), "--check"), (0, ""))
+                self.assertEqual(self.qzacl(*self.edit_words(words)), (0, "unchanged\n"))
+                self.assertEqual(snapshot(self.dir), state)
+
+    def test_refusals(self):
+        for before, words, said in REFUSED:
+            with self.subTest(words=words):
+                self.write("a", before)
+                self.expect_refused(said, *self.edit_words(words))
+        self.expect_refused("find", "set", "none", "n", "r")
+        self.expect_refused("only a file", "set", "-", "n", "r")
+        os.mkfifo(f"{self.dir}/pipe")
+        self.expect_refused("regular", "set", "pipe", "n", "r")
+
+    def test_json(self):
+        self.write("a", OLD)
+        for more, status in ((["--check"], 1), ([], 0)):
+            got = self.qzacl("--json", "set", "a", "n", "r", *more)
+            self.assertEqual((got[0], json.loads(got[1])), (status, {"file": "a", "changed": True}))
+
+    def test_what_a_grant_hides(self):
+        text = b"o rwx\ne unix .h rw\ne unix x.h rwxc\n"
+        for words, said in (("grant r u unix a@x.h", "a:2: e unix .h rw granted more"), ("grant rw u unix a@x.h", ""),
+                            ("grant r u unix a@other", "a:1: o rwx granted more"), ("grant r g ops", "a:1: o rwx"),
+                            ("grant r n", ""), ("set u unix a@x.h r", "")):
+            self.write("a", text)
+            printed = self.qzacl(*self.edit_words(words))[1].replace("changed\n", "")
+            self.assertIn(said, printed)
+            self.assertEqual(bool(printed), bool(said), words)
+
+    def test_letters_of_a_set(self):
+        self.write("set", "a 0x1 add\nz 2 zap\n")
+        self.write("a", "n z\n")
+        self.assertEqual(self.qzacl("--permissions", "set", "grant", "a", "a", "n"), (0, "changed\n"))
+        self.assertEqual(self.read(), b"n az\n")
+        self.expect_refused("3417-146", "set", "a", "n", "r", "--permissions", "set")
+
+    def test_any_text_and_change(self):
+        """Every byte is kept but those of one line, and the result says what the library's edit of the ACL gives."""
+        draw = random.Random(15)
+        for _ in range(20 if SANITIZED else 150):
+            text, entries = some_text(draw)
+            verb, letters, key = draw.choice(VERBS), some_letters(draw) or "r", draw.choice(entries + [some_key(draw)])
+            self.write("a", text)
+            words = {"set": ["a", *key, letters], "remove": ["a", *key]}.get(verb, ["a", letters, *key])
+            with self.subTest(text=text, verb=verb, words=words):
+                status, printed = self.qzacl(verb, *words)
+                self.assertEqual(status, 0, printed)
+                after = self.read()
+                self.assertEqual(printed.endswith("unchanged\n"), after == text)
+                self.assertTrue(keeps_other_bytes(text, after, verb), after)
+                self.assertTrue(qzacl.same(qzacl.Acl.from_text(after), changed_acl(text, verb, letters, key)), after)
+
+
+class Files(EditCase):
+    def test_protection_is_kept(self):
+        path = self.write("a", OLD, 0o640)
+        if IS_ROOT:
+            os.chown(path, 1234, 2345)
+        os.chmod(path, 0o2640)
+        attributes = {"user.origin": b"\0anything", ENTRIES: posix_acl(6)}
+        for name, value in attributes.items():
+            os.setxattr(path, name, value)
+        os.setxattr(self.dir, "system.posix_acl_default", posix_acl(7))
+        before = os.stat(path)
+        self.assertEqual(self.qzacl("remove", "a", "g", "ops"), (0, "changed\n"))
+        after = os.stat(path)
+        self.assertNotEqual(after.st_ino, before.st_ino)
+        kept = ("st_mode", "st_uid", "st_gid")
+        self.assertEqual([getattr(after, name) for name in kept], [getattr(before, name) for name in kept])
+        self.assertEqual({name: os.getxattr(path, name) for name in os.listxattr(path)}, attributes)
+
+    def test_entries_of_the_folder_are_not_inherited(self):
+        path = self.write("a", OLD, 0o600)
+        os.setxattr(self.dir, "system.posix_acl_default", posix_acl(7))
+        self.assertEqual(self.qzacl("remove", "a", "g", "ops"), (0, "changed\n"))
+        self.assertEqual((os.listxattr(path), os.stat(path).st_mode & 0o7777), ([], 0o600))
+
+    def test_links(self):
+        self.write("a", OLD)
+        os.mkdir(f"{self.dir}/below")
+        os.symlink("../a", f"{self.dir}/below/link")
+        self.assertEqual(self.qzacl("remove", "below/link", "g", "ops"), (0, "changed\n"))
+        self.assertEqual((os.readlink(f"{self.dir}/below/link"), os.listdir(f"{self.dir}/below")), ("../a", ["link"]))
+        self.assertNotIn(b"ops", self.read())
+        os.link(f"{self.dir}/a", f"{self.dir}/other")
+        self.expect_refused("several names", "set", "a", "n", "r")
+        self.expect_refused("several names", "set", "a", "n", "r", "--check")
+
+    @unittest.skipUnless(IS_ROOT, "takes root")
+    def test_without_rights(self):
+        self.write("a", OLD, 0o666)
+        self.expect_refused("Permission denied", "set", "a", "n", "r", user=NOBODY, group=NOBODY, extra_groups=[])
+        os.chmod(self.dir, 0o777)  # another's file would change its owner
+        self.expect_refused("Operation not permitted", "set", "a", "n", "r", user=NOBODY, group=NOBODY, extra_groups=[])
+
+    def test_output_that_cannot_be_written(self):
+        self.write("a", OLD)
+        for state in b"changed", b"unchanged":
+            with open("/dev/full", "wb") as full:
+                done = subprocess.run([QZACL, "set", "a", "n", "r"], cwd=self.dir, stdout=full, stderr=subprocess.PIPE,
+                                      check=False)
+            self.assertEqual((done.returncode, b"standard output" in done.stderr), (2, True), state)
+
+
+class Locks(EditCase):
+    def lock(self):
+        return os.open(f"{self.dir}/a.lock", os.O_RDWR | os.O_CREAT, 0o600)
+
+    def test_waiting(self):
+        self.write("a", OLD)
+        held = self.lock()
+        fcntl.flock(held, fcntl.LOCK_EX)
+        self.expect_refused("not free in time", "set", "a", "n", "r", "--wait", "0")
+        self.expect_refused("not free in time", "set", "a", "n", "r", "--wait=1")
+        self.assertEqual(self.qzacl("set", "a", "n", "r", "--check")[0], 1)
+        waiting = subprocess.Popen([QZACL, "set", "a", "n", "r"], cwd=self.dir, stdout=subprocess.PIPE)
+        self.assertRaises(subprocess.TimeoutExpired, waiting.wait, 0.2)
+        os.close(held)
+        self.assertEqual((waiting.communicate()[0], os.listdir(self.dir)), (b"changed\n", ["a"]))
+
+    def test_locks_that_are_none(self):
+        self.write("a", OLD)
+        self.write("b", "precious")
+        for make in os.symlink, os.link:
+            make(f"{self.dir}/b", f"{self.dir}/a.lock")
+            self.expect_refused("a.lock", "set", "a", "n", "r")
+            os.unlink(f"{self.dir}/a.lock")
+        os.mkfifo(f"{self.dir}/a.lock")
+        self.expect_refused("a.lock", "set", "a", "n", "r")
+
+    def test_many_at_once(self):
+        self.write("a", OLD)
+        for kind in "g", "o", "n":
+            names = [f"g{number}" for number in range(8)] if kind == "g" else list("rwcxqled")
+            words = [["set", "a", "g", name] if kind == "g" else ["grant", "a", name, kind] for name in names]
+            running = [subprocess.Popen([QZACL, *each], cwd=self.dir, stdout=subprocess.PIPE) for each in words]
+            self.assertEqual([each.communicate()[0] for each in running], [b"changed\n"] * 8)
+        lines = self.read().decode().split("\n")
+        self.assertLess({f"g g{number}" for number in range(8)}, set(lines))
+        self.assertIn("n rwcxqled", [line for line in lines if line.startswith("n")])
+        self.assertEqual(os.listdir(self.dir), ["a"])
+
+    @unittest.skipUnless(shutil.which("strace") and not SANITIZED, "takes strace")
+    def test_kill_at_each_step(self):
+        new = OLD + b"n r\n"
+        steps = ["openat", "flock", "read", "write", "fchown", "fchmod", "fsetxattr", "fsync", "renameat", "unlinkat", "close"]
+        killed = 0
+        for step, time in itertools.product(steps, range(1, 60)):
+            self.fresh()
+            os.setxattr(self.write("a", OLD), "user.origin", b"x")
+            status, _ = self.qzacl("set", "a", "n", "r", tracer=["strace", "-o", "/dev/null", "-e", f"trace={step}",
+                                                                 "-e", f"inject={step}:signal=KILL:when={time}"])
+            self.assertIn(self.read(), (OLD, new), (step, time))
+            self.assertLessEqual(set(os.listdir(self.dir)), {"a", "a.lock", ".a.qzacl"})
+            if status == 0:
+                break
+            killed += 1
+            # What is left behind hinders nobody, and goes.
+            self.assertEqual(self.qzacl("grant", "a", "w", "n")[0], 0)
+            self.assertEqual(os.listdir(self.dir), ["a"])
+            self.assertEqual(os.getxattr(f"{self.dir}/a", "user.origin"), b"x")
+        self.assertGreater(killed, len(steps))
+
+
+if __name__ == "__main__":
+    unittest.main(argv=sys.argv[1:])
