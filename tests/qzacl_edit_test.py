@@ -353,5 +353,94 @@ class Locks(EditCase):
         self.assertGreater(killed, len(steps))
 
 
+APPEND = "sh -c 'printf \"%s\\n\" \"$0\" >>\"$1\"' "  # what an administrator does in an editor: a line at the end
+MEANWHILE = "sh -c 'echo n x >>a; echo g staff r >>\"$0\"'"
+SESSIONS = [  # a text, the editor, the answers, the status, the text behind it, and what is said
+    (OLD, APPEND + "'n r'", "", 0, OLD + b"n r\n", "changed\n"),
+    (OLD, "true", "", 0, OLD, "unchanged\n"),
+    (OLD, "false", "", 2, OLD, "the editor failed"),
+    (OLD, "no-such-editor", "", 2, OLD, "the editor failed"),
+    (OLD, APPEND + "bad", "", 2, OLD, "3417-179"),
+    (OLD, APPEND + "bad", "d\n", 2, OLD, "What now?"),
+    (OLD, APPEND + "bad", "s\nd\n", 2, OLD, "+bad\n"),
+    (OLD, APPEND + "'n r'", "", 0, OLD + b"n r\n", "changed\n"),
+    (OLD, "sh -c 'grep bad \"$0\" && sed -i /bad/d \"$0\" || echo bad >>\"$0\"'", "e\n", 0, OLD, "unchanged\n"),
+    (b"bad\n", "sed -i 's/bad/n r/'", "", 0, b"n r\n", "changed\n"),
+    (b"bad\n", "true", "", 2, b"bad\n", "3417-179"),
+    (OLD, "sed -i s/^/\\\\x85/", "d\n", 2, OLD, "compiled"),
+    (OLD, MEANWHILE, "d\n", 2, OLD + b"n x\n", "changed while it was edited"),
+    (OLD, "sh -c 'grep -q staff \"$0\" || { echo n x >>a; echo g staff r >>\"$0\"; }'", "s\ne\n", 0,
+     OLD + b"g staff r\n", "-n x\n"),
+]
+
+
+class Sessions(EditCase):
+    def test_sessions(self):
+        for before, editor, answers, status, after, said in SESSIONS:
+            with self.subTest(editor=editor, answers=answers):
+                self.write("a", before)
+                temporary = os.path.join(self.root, "temporary")
+                os.makedirs(temporary, exist_ok=True)
+                environment = {"EDITOR": editor, "TMPDIR": temporary}
+                got, printed = self.qzacl("edit", "a", text=answers.encode(), environment=environment)
+                self.assertEqual((got, self.read(), os.listdir(self.dir)), (status, after, ["a"]), printed)
+                self.assertIn(said, printed)
+                self.assertEqual(os.listdir(temporary), [])
+
+    def test_visual_comes_first_and_nobody_else_looks_on(self):
+        self.write("a", OLD)
+        look = "sh -c 'stat -c %a:%n \"$0\" \"${0%/*}\"; ls *.lock'"
+        printed = self.qzacl("edit", "a", environment={"VISUAL": look, "EDITOR": "false", "TMPDIR": self.root})[1]
+        self.assertRegex(printed, "^600:.*/a\n700:")
+        self.assertRegex(printed, "cannot access")
+
+
+class Caches(EditCase):
+    def cache_of(self, *permissions):
+        """What the checker says of the file's cache."""
+        return self.qzacl("cache", "a", *permissions)
+
+    def test_cache_counts(self):
+        self.write("a", OLD)
+        self.assertEqual(self.qzacl("set", "a", "n", "r", "-s"), (0, "changed\n"))
+        self.assertEqual(self.cache_of()[0], 0)
+        os.unlink(f"{self.dir}/a.cacl")
+        self.assertEqual(self.qzacl("set", "a", "n", "r", "-s"), (0, "unchanged\n"))
+        self.assertEqual(self.cache_of()[0], 0)
+        self.assertEqual(self.qzacl("set", "a", "n", "w", "-s", "--check")[0], 1)
+        self.assertEqual(self.qzacl("edit", "a", "-s", environment={"EDITOR": APPEND + "'o r'"}), (0, "changed\n"))
+        self.assertEqual(self.cache_of()[0], 0)
+
+    def test_letters_of_a_set(self):
+        self.write("set", "a 1\nz 0x80000000\n")
+        self.write("a", "n a\n")
+        self.assertEqual(self.qzacl("set", "a", "n", "z", "-s", "--permissions", "set"), (0, "changed\n"))
+        self.assertEqual(self.cache_of("--permissions", "set")[0], 0)
+
+    def test_no_entries(self):
+        self.write("a", "n r\n#\n")
+        self.assertEqual(self.qzacl("set", "a", "n", "w", "-s"), (0, "changed\n"))
+        self.assertEqual(self.qzacl("remove", "a", "n", "-s"), (0, "changed\n"))
+        os.utime(f"{self.dir}/a.cacl", (4e9, 4e9))  # later than any text
+        self.assertEqual(self.qzacl("remove", "a", "n", "-s")[0], 2)
+
+    def test_cache_that_does_not_count(self):
+        self.write("a", OLD)
+        self.write("a.cacl", "x", 0o600)
+        status, printed = self.qzacl("set", "a", "n", "r", "-s")
+        self.assertEqual((status, self.read()), (2, OLD + b"n r\n"))
+        self.assertRegex(printed, "(?s)^changed\n3417-.*services do not read the cache")
+        os.unlink(f"{self.dir}/a.cacl")
+        os.utime(f"{self.dir}/a", (4e9, 4e9))
+        self.assertEqual(self.qzacl("set", "a", "n", "r", "-s")[0], 2)
+
+    def test_many_at_once(self):
+        self.write("a", OLD)
+        running = [subprocess.Popen([QZACL, "grant", "a", letter, "n", "-s"], cwd=self.dir, stdout=subprocess.PIPE)
+                   for letter in "rwcx"]
+        self.assertEqual([(each.communicate()[0], each.returncode) for each in running], [(b"changed\n", 0)] * 4)
+        self.assertEqual((self.cache_of()[0], self.read()), (0, OLD + b"n rwcx\n"))
+
+
 if __name__ == "__main__":
     unittest.main(argv=sys.argv[1:])

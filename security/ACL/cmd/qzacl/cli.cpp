@@ -149,7 +149,8 @@ std::string help_of(std::span<const verb> verbs, const verb *chosen) {
     if (chosen == nullptr)
         text.insert(0, "usage:\n");
     return text + "\nAlso with every verb: --json, and --permissions SET for letters of a service's own.\n"
-                  "FILE is a text, a compiled buffer, or \"-\" for standard input. See qzacl(1).\n";
+                  "FILE is a text, a compiled buffer, or \"-\" for standard input; of edits, a text. See "
+                  "qzacl(1).\n";
 }
 
 } // namespace qzacl

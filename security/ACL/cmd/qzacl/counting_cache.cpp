@@ -67,13 +67,17 @@ int write_cache(const char *path, const sec_acl_buffer_t &compiled, const qz::te
     return result;
 }
 
-bool is_read_by_services(const std::string &path, const sec_perm_set_t &set,
-                         const sec_acl_buffer_t &compiled) {
+// Of a text without entries there is no cache; nor may one that says anything be left that is read.
+bool is_what_services_read(const std::string &path, const sec_perm_set_t &set,
+                           const sec_acl_buffer_t &compiled) {
     sec_acl_buffer_t served = {};
     std::uint32_t flags = 0;
     const int result = sec_read_acl_file(path.c_str(), nullptr, &set, 0, &served, &flags);
     const qz::owned<void> owner(served.data);
-    return result == SEC_S_OK && (flags & SEC_READ_ACL_TEXT) == 0 && served.length == compiled.length &&
+    const bool is_text = (flags & SEC_READ_ACL_TEXT) != 0;
+    if (result != SEC_S_OK || compiled.length == 0)
+        return result == SEC_S_OK && is_text;
+    return !is_text && served.length == compiled.length &&
            std::memcmp(served.data, compiled.data, static_cast<std::size_t>(compiled.length)) == 0;
 }
 
@@ -87,15 +91,14 @@ outcome compile_once(const std::string &path, const sec_perm_set_t &set) {
     sec_acltree_array trees;
     if (opened != SEC_S_OK || (!text.is_empty() && read_trees(text, trees) != SEC_S_OK))
         return outcome::failed;
-    if (trees.trees().empty())
-        return outcome::counts;
+    const bool has_entries = !trees.trees().empty();
     sec_acl_buffer_t compiled = {};
-    if (sec__acltrees_to_acl(trees.trees(), &compiled) != SEC_S_OK)
+    if (has_entries && sec__acltrees_to_acl(trees.trees(), &compiled) != SEC_S_OK)
         return outcome::failed;
     const qz::owned<void> owner(compiled.data);
-    if (write_cache(file.path.text, compiled, text.origin()) != SEC_S_OK)
+    if (has_entries && write_cache(file.path.text, compiled, text.origin()) != SEC_S_OK)
         return outcome::failed;
-    return is_read_by_services(path, set, compiled) ? outcome::counts : outcome::does_not_count;
+    return is_what_services_read(path, set, compiled) ? outcome::counts : outcome::does_not_count;
 }
 
 bool same_text(const struct stat &one, const struct stat &other) {

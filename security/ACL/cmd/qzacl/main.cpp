@@ -14,6 +14,10 @@ using namespace qzacl;
 constexpr char edit_options[] = "--check -s --wait";
 
 constexpr verb verbs[] = {
+    {"ask",
+     "[-m MECH] [-g GROUP]... [-w LETTERS] [--order closest|sum] [--handler MECH=domain|exact|none]... FILE "
+     "[IDENTITY]",
+     "what a party would be granted, and why", "-m -g -w --order --handler", 1, 2, 1, ask},
     {"who", "FILE LETTERS", "the entries that hold all the letters", "", 2, 2, 1, who},
     {"set", "[--check] [-s] [--wait SECONDS] FILE ENTRY",
      "makes the entry what ENTRY says, adding it where it is not there", edit_options, 2, 5, 0, set},
@@ -26,6 +30,11 @@ constexpr verb verbs[] = {
     {"edit", "[-s] [--wait SECONDS] FILE", "opens the file in an editor and checks it before it counts",
      "-s --wait", 1, 1, 0, edit},
     {"show", "FILE", "the entries as a text, in stored order", "", 1, 1, 1, show},
+    {"diff", "A B", "what changes from one ACL to another", "", 2, 2, 2, diff},
+    {"cache", "FILE...", "what services read, and whether it is right", "", 1, any_number, any_number, cache},
+    {"test", "[--order closest|sum] [--handler MECH=domain|exact|none]... FILE CASES",
+     "whether an ACL grants what a file of cases says", "--order --handler", 2, 2, 2, test},
+    {"lint", "FILE...", "what a check lets through and nobody meant", "", 1, any_number, any_number, lint},
 };
 
 // A file that is opened later must not become one of the standard streams. One that was closed stays useless, so

@@ -32,12 +32,17 @@ struct verb {
 
 inline constexpr std::size_t any_number = static_cast<std::size_t>(-1);
 
+int ask(const call &call);
+int cache(const call &call);
+int diff(const call &call);
 int edit(const call &call);
 int grant(const call &call);
+int lint(const call &call);
 int remove(const call &call);
 int revoke(const call &call);
 int set(const call &call);
 int show(const call &call);
+int test(const call &call);
 int who(const call &call);
 
 } // namespace qzacl
