@@ -1,6 +1,8 @@
 // Compiles a text so that its cache counts.
 #include "counting_cache.h"
 
+#include "lock_file.h"
+
 #include "trouble.h"
 
 #include "base/owned.h"
@@ -9,10 +11,10 @@
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/tree.h"
 
-#include <csignal>
 #include <cstring>
 #include <ctime>
 #include <sys/stat.h>
+#include <thread>
 
 namespace qzacl {
 
@@ -28,16 +30,16 @@ constexpr qz::acl_file_use by_edit = {
 
 enum class outcome { counts, does_not_count, failed };
 
-// A cache counts when it is later than its text in whole seconds.
-void wait_until_later_than(const std::string &path) {
+// A cache counts when it is later than its text in whole seconds. Gives what is left of the one in which the text was
+// written, in nanoseconds; 0 when that is over.
+long rest_of_second(const std::string &path) {
+    constexpr long second = 1'000'000'000;
     struct stat text = {};
     timespec now = {};
-    while (stat(path.c_str(), &text) == 0 && clock_gettime(CLOCK_REALTIME_COARSE, &now) == 0 &&
-           text.st_mtim.tv_sec == now.tv_sec) {
-        constexpr long second = 1'000'000'000;
-        const timespec rest = {0, second - now.tv_nsec};
-        clock_nanosleep(CLOCK_REALTIME, 0, &rest, nullptr);
-    }
+    if (stat(path.c_str(), &text) != 0 || clock_gettime(CLOCK_REALTIME_COARSE, &now) != 0 ||
+        text.st_mtim.tv_sec != now.tv_sec)
+        return 0;
+    return second - now.tv_nsec;
 }
 
 int read_trees(qz::acl_text &text, sec_acltree_array &trees) {
@@ -53,18 +55,6 @@ int read_trees(qz::acl_text &text, sec_acltree_array &trees) {
         if (const int result = sec__add_acle_to_trees(&entry, trees); result != SEC_S_OK)
             return result;
     }
-}
-
-// A signal that ends the command would leave half a cache behind.
-int write_cache(const char *path, const sec_acl_buffer_t &compiled, const qz::text_origin &origin) {
-    constexpr int even_when_current = 1;
-    sigset_t all;
-    sigset_t before;
-    sigfillset(&all);
-    sigprocmask(SIG_BLOCK, &all, &before);
-    const int result = sec__cache_aclbuffer(path, &compiled, even_when_current, origin);
-    sigprocmask(SIG_SETMASK, &before, nullptr);
-    return result;
 }
 
 // Of a text without entries there is no cache; nor may one that says anything be left that is read.
@@ -91,41 +81,32 @@ outcome compile_once(const std::string &path, const sec_perm_set_t &set) {
     sec_acltree_array trees;
     if (opened != SEC_S_OK || (!text.is_empty() && read_trees(text, trees) != SEC_S_OK))
         return outcome::failed;
+    constexpr int even_when_current = 1;
     const bool has_entries = !trees.trees().empty();
     sec_acl_buffer_t compiled = {};
     if (has_entries && sec__acltrees_to_acl(trees.trees(), &compiled) != SEC_S_OK)
         return outcome::failed;
     const qz::owned<void> owner(compiled.data);
-    if (has_entries && write_cache(file.path.text, compiled, text.origin()) != SEC_S_OK)
+    if (has_entries &&
+        sec__cache_aclbuffer(file.path.text, &compiled, even_when_current, text.origin()) != SEC_S_OK)
         return outcome::failed;
     return is_what_services_read(path, set, compiled) ? outcome::counts : outcome::does_not_count;
 }
 
-bool same_text(const struct stat &one, const struct stat &other) {
-    return qz::same_file(one, other) && one.st_mtim.tv_sec == other.st_mtim.tv_sec &&
-           one.st_mtim.tv_nsec == other.st_mtim.tv_nsec;
-}
-
 } // namespace
 
-bool make_cache_count(const std::string &path, const permission_set &set) {
-    // Another edit may change the text while this one compiles it.
-    constexpr int most_attempts = 10;
-    for (int left = most_attempts;; --left) {
-        struct stat before = {};
-        struct stat after = {};
-        wait_until_later_than(path);
-        const bool is_there = stat(path.c_str(), &before) == 0;
-        const outcome found = compile_once(path, *set.get());
-        if (found == outcome::counts)
-            return true;
-        const bool has_changed = is_there && stat(path.c_str(), &after) == 0 && !same_text(before, after);
-        if (!has_changed || left == 1) {
-            if (found == outcome::failed)
-                print_recorded_error();
-            return false;
-        }
-        cu_set_no_error_1();
+bool make_cache_count(const edited_file &file, std::chrono::seconds wait, const permission_set &set) {
+    for (;;) {
+        // Other edits may go on meanwhile, of which each waits for its own cache.
+        while (const long rest = rest_of_second(file.path()))
+            std::this_thread::sleep_for(std::chrono::nanoseconds(rest));
+        const lock_file lock(file, wait);
+        if (rest_of_second(file.path()) != 0)
+            continue;
+        const outcome found = compile_once(file.path(), *set.get());
+        if (found == outcome::failed)
+            print_recorded_error();
+        return found == outcome::counts;
     }
 }
 

@@ -65,7 +65,7 @@ edited_file file_to_edit(const call &call) {
 int answer_edit(const call &call, const edited_file &file, bool has_changed) {
     say_whether_changed(call, has_changed);
     call.out.flush();
-    if (!call.line.compiles || make_cache_count(file.path(), call.permissions))
+    if (!call.line.compiles || make_cache_count(file, std::chrono::seconds(call.line.wait), call.permissions))
         return yes;
     print_message(file.path() + ": services do not read the cache, or it does not say what the text says");
     return failed;
