@@ -74,6 +74,15 @@ class Documents(unittest.TestCase):
             self.assertEqual(self.run_in_shell(command + "examples/mistakes.acl")[0], 37)
         self.assertTrue((self.dir / "examples/service.acl.cacl").exists())
 
+    @unittest.skipUnless((BUILD / "bin/qzacl").exists(), "qzacl is not built")
+    def test_edits_of_ansible_change_once(self):
+        command = re.search("cmd: (.*)", RECIPES["edit"])[1].replace("/etc/", "examples/")
+        for mode, status, shown in (("--check", 1, "+g operators  rw\n"), ("-s", 0, "changed\n"), ("--check", 0, ""),
+                                    ("-s", 0, "unchanged\n")):
+            got = self.run_in_shell(re.sub("{{.*?}}", mode, command))
+            self.assertEqual(got[0], status)
+            self.assertIn(shown, got[1])
+
     @unittest.skipUnless(shutil.which("git"), "there is no git")
     def test_commits(self):
         self.run_in_shell("git init repo; mv pre-commit repo/.git/hooks")

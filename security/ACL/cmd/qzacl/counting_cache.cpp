@@ -1,15 +1,13 @@
 // Compiles a text so that its cache counts.
 #include "counting_cache.h"
 
-#include "lock_file.h"
-
-#include "trouble.h"
-
 #include "base/owned.h"
+#include "lock_file.h"
 #include "qzacl_acl/acl_text.h"
 #include "qzacl_acl/cache_file.h"
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/tree.h"
+#include "trouble.h"
 
 #include <cstring>
 #include <ctime>

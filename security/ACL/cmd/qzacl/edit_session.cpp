@@ -2,6 +2,7 @@
 #include "edit_session.h"
 
 #include "lock_file.h"
+#include "output.h"
 #include "replaced_file.h"
 #include "text_edit.h"
 #include "unified_diff.h"
@@ -85,7 +86,7 @@ bool edit_session::asks_to_go_on(const std::string &text) const {
         case 'd':
             return false;
         case 's':
-            std::fputs(unified_diff(base_, text, file_.path()).c_str(), stderr);
+            std::fputs(shown_on(STDERR_FILENO, unified_diff(base_, text, file_.path())).c_str(), stderr);
             static_cast<void>(is_right(text));
             break;
         default:

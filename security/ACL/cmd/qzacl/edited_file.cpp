@@ -1,6 +1,7 @@
 // The file that an edit is about, found and read.
 #include "edited_file.h"
 
+#include "input.h"
 #include "qzacl_utils.h"
 
 #include <cerrno>
@@ -24,21 +25,6 @@ bool same_time(const timespec &one, const timespec &other) {
 } // namespace
 
 trouble system_failure(const std::string &what) { return trouble(what + ": " + strerror(errno)); }
-
-std::string read_all(int fd, const std::string &what) {
-    constexpr std::size_t step = 1 << 16;
-    std::string bytes;
-    for (;;) {
-        const std::size_t size = bytes.size();
-        bytes.resize(size + step);
-        const ssize_t count = ::read(fd, bytes.data() + size, step);
-        bytes.resize(size + (count > 0 ? static_cast<std::size_t>(count) : 0));
-        if (count < 0 && errno != EINTR)
-            throw system_failure("cannot read " + what);
-        if (count == 0)
-            return bytes;
-    }
-}
 
 void write_all(int fd, std::string_view bytes, const std::string &what) {
     while (!bytes.empty()) {
@@ -77,7 +63,7 @@ void edited_file::read() {
         throw trouble(path_ + " is no regular file");
     if (status_.st_nlink != 1)
         throw trouble(path_ + " has several names, of which a change would reach one only");
-    text_ = read_all(file_.get(), path_);
+    text_ = read_whole(file_.get(), path_);
 }
 
 bool edited_file::is_as_read() const {

@@ -15,8 +15,7 @@ namespace qzacl {
 // What could not be done, and why by errno.
 trouble system_failure(const std::string &what);
 
-// All bytes from a descriptor, and all bytes to one; `what` names it should that fail.
-std::string read_all(int fd, const std::string &what);
+// Writes all bytes; `what` names the file should that fail.
 void write_all(int fd, std::string_view bytes, const std::string &what);
 
 class edited_file {

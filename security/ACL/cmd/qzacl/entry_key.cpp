@@ -2,13 +2,12 @@
 #include "entry_key.h"
 
 #include "entry_words.h"
-#include "trouble.h"
-
 #include "libqz_cu/posix_fold.h"
 #include "qz/acl.h"
 #include "qz/cu.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/entry_parser.h"
+#include "trouble.h"
 
 #include <algorithm>
 #include <cctype>
@@ -44,22 +43,27 @@ struct release_acle {
 };
 
 // Bytes beyond ASCII decide nothing of what is refused or of how a host is stored, but the library would take them
-// to be in the code set of the locale. So an 'x' stands for each while it looks at the identity.
+// to be in the code set of the locale. So an 'x' stands for each while it looks at a text.
+std::string plain(std::string text) {
+    std::replace_if(
+        text.begin(), text.end(), [](char c) { return static_cast<unsigned char>(c) > 0x7f; }, 'x');
+    return text;
+}
+
 void find_stored_form(entry_key &key) {
     key.stored = key.identity;
     if (!qz::has_identity(key.type))
         return;
-    std::string plain = key.identity;
-    std::replace_if(
-        plain.begin(), plain.end(), [](char c) { return static_cast<unsigned char>(c) > 0x7f; }, 'x');
+    const std::string identity = plain(key.identity);
     sec_acle_t *made = nullptr;
-    key.is_refused = sec_create_acle(key.type, 0, key.mechanism.c_str(), plain.c_str(), &made) != SEC_S_OK;
+    key.is_refused =
+        sec_create_acle(key.type, 0, plain(key.mechanism).c_str(), identity.c_str(), &made) != SEC_S_OK;
     const std::unique_ptr<sec_acle_t, release_acle> owner(made);
     cu_set_no_error_1();
-    if (key.is_refused || plain == made->identity)
+    if (key.is_refused || identity == made->identity)
         return;
     // What stands before the host is the caller's.
-    const std::size_t at = plain.find('@');
+    const std::size_t at = identity.find('@');
     const std::size_t host = at == std::string::npos ? 0 : at + 1;
     key.stored.replace(host, std::string::npos, std::string_view(made->identity).substr(host));
 }

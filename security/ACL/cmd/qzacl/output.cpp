@@ -46,6 +46,14 @@ void append_escaped(std::string &to, std::string_view text, bool keeps_line_feed
 
 } // namespace
 
+std::string shown_on(int fd, std::string_view lines) {
+    if (isatty(fd) == 0)
+        return std::string(lines);
+    std::string shown;
+    append_escaped(shown, lines, true);
+    return shown;
+}
+
 json json_text(std::string_view bytes) { return valid_utf8(bytes); }
 
 output::output(bool is_json) : is_json_(is_json), is_terminal_(isatty(STDOUT_FILENO) != 0) {}

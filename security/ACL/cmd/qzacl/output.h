@@ -14,6 +14,9 @@ using json = nlohmann::ordered_json;
 // A text as JSON can hold it: with U+FFFD for each byte that is no UTF-8.
 json json_text(std::string_view bytes);
 
+// Lines as they are shown on a descriptor: as they are, or on a terminal with control bytes as \xHH.
+std::string shown_on(int fd, std::string_view lines);
+
 // Standard output. On a terminal control bytes are shown as \xHH, so that no identity can move the cursor.
 class output {
 public:

@@ -3,6 +3,7 @@
 
 #include "base/owned.h"
 #include "edited_file.h"
+#include "input.h"
 
 #include <cerrno>
 #include <csignal>
@@ -90,7 +91,7 @@ std::string private_copy::text() const {
     const qz::descriptor file(open(path_.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC));
     if (!file)
         throw system_failure("cannot open " + path_);
-    return read_all(file.get(), path_);
+    return read_whole(file.get(), path_);
 }
 
 } // namespace qzacl

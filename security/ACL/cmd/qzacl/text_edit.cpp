@@ -2,10 +2,9 @@
 #include "text_edit.h"
 
 #include "entry_words.h"
-#include "trouble.h"
-
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/entry_parser.h"
+#include "trouble.h"
 
 #include <algorithm>
 

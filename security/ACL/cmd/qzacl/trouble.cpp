@@ -1,9 +1,11 @@
 // Messages on standard error.
 #include "trouble.h"
 
+#include "output.h"
 #include "qzacl_acl/dump.h"
 
 #include <cstdio>
+#include <unistd.h>
 
 namespace qzacl {
 
@@ -13,7 +15,7 @@ void print_recorded_error() {
 }
 
 void print_message(const std::string &text) {
-    std::fprintf(stderr, "qzacl: %s\n", text.c_str());
+    std::fprintf(stderr, "qzacl: %s\n", shown_on(STDERR_FILENO, text).c_str());
     std::fflush(stderr);
 }
 
