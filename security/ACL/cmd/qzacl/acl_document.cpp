@@ -140,7 +140,9 @@ std::string_view acl_document::kept(std::string_view mechanism) {
 }
 
 std::string acl_document::place(std::size_t line) const {
-    return line == 0 ? file_ : file_ + ":" + std::to_string(line);
+    std::string text;
+    append_place(text, file_, line);
+    return text;
 }
 
 std::span<sec_acltree_t *const> acl_document::trees() {
@@ -190,6 +192,12 @@ void for_each_stored(const qz::acl &acl, const std::function<void(const qz::entr
         for (std::uint32_t left = head.entry_count; left != 0 && qz::format::read(reader, entry); --left)
             each({head.type, entry.perm_mask, text_in(head.mechanism), text_in(entry.identity)});
     }
+}
+
+void append_place(std::string &text, const std::string &file, std::size_t line) {
+    text += file;
+    if (line != 0)
+        append_number(text.append(":"), line);
 }
 
 qz::entry_fields fields_of(const sec_acle_t &record) {

@@ -73,6 +73,9 @@ private:
 // Calls `each` with every entry of a sound buffer, sub-ACLs from last to first.
 void for_each_stored(const qz::acl &acl, const std::function<void(const qz::entry_fields &)> &each);
 
+// Appends "FILE:LINE", or the file alone where the line is 0.
+void append_place(std::string &text, const std::string &file, std::size_t line);
+
 // The fields of a record, whose texts end in NUL.
 qz::entry_fields fields_of(const sec_acle_t &record);
 

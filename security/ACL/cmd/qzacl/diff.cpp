@@ -5,7 +5,6 @@
 #include "entry_words.h"
 #include "trouble.h"
 
-#include <algorithm>
 #include <unordered_map>
 #include <vector>
 
@@ -117,38 +116,55 @@ void compare_sorted(nodes before, nodes after, difference_list &found) {
     }
 }
 
-// Of the entries those that both sides have, in the order of this one, and told when the other lacks them.
-template <class Lacking>
-std::vector<std::string> common_of(nodes entries, nodes others, const Lacking &is_lacking) {
-    std::unordered_map<std::string, const sec_acle_t *> by_identity;
-    for (const sec_acle_t *other : others)
-        by_identity.emplace(folded(other->identity), other);
-    std::vector<std::string> common;
-    for (const sec_acle_t *entry : entries) {
-        const auto found = by_identity.find(folded(entry->identity));
-        if (is_lacking(*entry, found == by_identity.end() ? nullptr : found->second))
-            continue;
-        common.push_back(found->first);
+// Finds entries by identity.
+class identity_index {
+public:
+    explicit identity_index(nodes entries) {
+        places_.reserve(entries.size());
+        for (std::size_t place = 0; place < entries.size(); ++place)
+            places_.emplace(folded(entries[place]->identity), place);
     }
-    return common;
-}
 
-// Entries of which the first that matches decides.
+    // The place in the entries, or that behind them.
+    std::size_t find(const sec_acle_t &entry) const {
+        const auto found = places_.find(folded(entry.identity));
+        return found == places_.end() ? places_.size() : found->second;
+    }
+
+private:
+    std::unordered_map<std::string, std::size_t> places_;
+};
+
+// Entries of which the first that matches decides, so that their order is a difference.
 void compare_chains(nodes before, nodes after, difference_list &found) {
-    const auto in_before = common_of(before, after, [&](const sec_acle_t &entry, const sec_acle_t *other) {
-        if (other == nullptr)
-            found.remove(entry);
-        else
-            found.compare(entry, *other);
-        return other == nullptr;
-    });
-    const auto in_after = common_of(after, before, [&](const sec_acle_t &entry, const sec_acle_t *other) {
-        if (other == nullptr)
-            found.add(entry);
-        return other == nullptr;
-    });
-    if (in_before != in_after)
-        found.reorder((before.empty() ? after : before)[0]->mechanism);
+    const std::string mechanism = (before.empty() ? after : before)[0]->mechanism;
+    while (!before.empty() && !after.empty() &&
+           qz::detail::same_folded(before[0]->identity, after[0]->identity)) {
+        found.compare(*before[0], *after[0]);
+        before = before.subspan(1);
+        after = after.subspan(1);
+    }
+    const identity_index index(after);
+    std::vector<bool> is_in_both(after.size());
+    bool is_in_order = true;
+    std::size_t last = 0;
+    for (const sec_acle_t *entry : before) {
+        const std::size_t place = index.find(*entry);
+        if (place == after.size()) {
+            found.remove(*entry);
+            continue;
+        }
+        found.compare(*entry, *after[place]);
+        is_in_both[place] = true;
+        is_in_order = is_in_order && place >= last;
+        last = place;
+    }
+    for (std::size_t place = 0; place < after.size(); ++place) {
+        if (!is_in_both[place])
+            found.add(*after[place]);
+    }
+    if (!is_in_order)
+        found.reorder(mechanism.c_str());
 }
 
 void compare_trees(nodes before, nodes after, difference_list &found) {

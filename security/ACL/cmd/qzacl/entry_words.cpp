@@ -3,6 +3,9 @@
 
 #include "trouble.h"
 
+#include <charconv>
+#include <iterator>
+
 namespace qzacl {
 
 namespace {
@@ -30,10 +33,11 @@ std::string key_of(const qz::entry_fields &entry) {
 
 void append_key(std::string &line, const qz::entry_fields &entry) {
     line += qz::type_letter(entry.type);
-    if (!entry.mechanism.empty())
-        line += ' ';
-    for (const char each : entry.mechanism)
-        line += folded(each);
+    if (!entry.mechanism.empty()) {
+        line.append(" ").append(entry.mechanism);
+        for (std::size_t at = line.size() - entry.mechanism.size(); at < line.size(); ++at)
+            line[at] = folded(line[at]);
+    }
     if (!entry.identity.empty())
         line.append(" ").append(entry.identity);
 }
@@ -53,6 +57,34 @@ void put_entry(json &object, const std::string &file, std::size_t line, const qz
     object["mechanism"] = text_or_null(folded(entry.mechanism));
     object["identity"] = text_or_null(entry.identity);
     object["permissions"] = json_text(set.letters_of(entry.permissions));
+}
+
+void append_entry_json(std::string &line, const std::string &file, std::size_t number,
+                       const qz::entry_fields &entry, const permission_set &set) {
+    const auto append_text_or_null = [&](std::string_view text) {
+        if (text.empty())
+            line += "null";
+        else
+            append_json_text(line, text);
+    };
+    append_json_text(line.append("{\"file\":"), file);
+    line += ",\"line\":";
+    if (number != 0)
+        append_number(line, number);
+    else
+        line += "null";
+    line.append(",\"type\":\"").append(1, qz::type_letter(entry.type)).append("\",\"mechanism\":");
+    append_text_or_null(folded(entry.mechanism));
+    line += ",\"identity\":";
+    append_text_or_null(entry.identity);
+    append_json_text(line.append(",\"permissions\":"), set.letters_of(entry.permissions));
+    line += "}\n";
+}
+
+void append_number(std::string &line, std::size_t number) {
+    char digits[24];
+    const auto end = std::to_chars(std::begin(digits), std::end(digits), number).ptr;
+    line.append(digits, static_cast<std::size_t>(end - digits));
 }
 
 sec_acle_t record_of(const qz::entry_fields &entry) {

@@ -4,6 +4,7 @@
 #include "trouble.h"
 #include "utf8.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <csignal>
 #include <cstring>
@@ -56,6 +57,14 @@ std::string shown_on(int fd, std::string_view lines) {
 
 json json_text(std::string_view bytes) { return valid_utf8(bytes); }
 
+void append_json_text(std::string &line, std::string_view bytes) {
+    const auto is_plain = [](char c) { return c >= ' ' && c <= '~' && c != '"' && c != '\\'; };
+    if (std::all_of(bytes.begin(), bytes.end(), is_plain))
+        line.append("\"").append(bytes).append("\"");
+    else
+        line += json_text(bytes).dump();
+}
+
 output::output(bool is_json) : is_json_(is_json), is_terminal_(isatty(STDOUT_FILENO) != 0) {}
 
 void output::add(std::string_view text, bool keeps_line_feeds) {
@@ -78,21 +87,35 @@ void output::lines(std::string_view text) {
         flush();
 }
 
+void output::lines(const held_lines &held) {
+    if (is_terminal_) {
+        for (const std::string &part : held.parts_)
+            lines(part);
+        return;
+    }
+    flush();
+    for (const std::string &part : held.parts_)
+        write_all(part);
+}
+
 void output::object(const json &object) { line(object.dump(-1, ' ', false, json::error_handler_t::replace)); }
 
 void output::flush() {
-    std::string_view left = gathered_;
-    while (!left.empty()) {
-        const ssize_t written = write(STDOUT_FILENO, left.data(), left.size());
+    write_all(gathered_);
+    gathered_.clear();
+}
+
+void output::write_all(std::string_view bytes) {
+    while (!bytes.empty()) {
+        const ssize_t written = write(STDOUT_FILENO, bytes.data(), bytes.size());
         if (written < 0 && errno == EINTR)
             continue;
         if (written < 0 && errno == EPIPE)
             end_quietly();
         if (written < 0)
             throw trouble(std::string("standard output: ") + std::strerror(errno));
-        left.remove_prefix(static_cast<std::size_t>(written));
+        bytes.remove_prefix(static_cast<std::size_t>(written));
     }
-    gathered_.clear();
 }
 
 } // namespace qzacl

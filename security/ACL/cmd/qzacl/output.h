@@ -2,6 +2,7 @@
 #ifndef QZACL_OUTPUT_H
 #define QZACL_OUTPUT_H
 
+#include <deque>
 #include <nlohmann/json.hpp>
 #include <string>
 #include <string_view>
@@ -13,6 +14,25 @@ using json = nlohmann::ordered_json;
 
 // A text as JSON can hold it: with U+FFFD for each byte that is no UTF-8.
 json json_text(std::string_view bytes);
+// The same as it stands in a line of JSON, in its quotation marks, appended.
+void append_json_text(std::string &line, std::string_view bytes);
+
+// Lines that are held back until all of them are known, without ever being moved to a larger place.
+class held_lines {
+public:
+    // Where the next line is to be appended, with its line feed.
+    std::string &next() {
+        if (parts_.empty() || parts_.back().size() >= part_size)
+            parts_.emplace_back().reserve(part_size + part_size / 8);
+        return parts_.back();
+    }
+
+private:
+    friend class output;
+    static constexpr std::size_t part_size = 1 << 18;
+
+    std::deque<std::string> parts_;
+};
 
 // Lines as they are shown on a descriptor: as they are, or on a terminal with control bytes as \xHH.
 std::string shown_on(int fd, std::string_view lines);
@@ -28,6 +48,7 @@ public:
     void line(std::string_view text);
     // Prints lines that end in line feeds.
     void lines(std::string_view text);
+    void lines(const held_lines &held);
     void object(const json &object);
 
     // Writes what was gathered; called once more at the end. Throws trouble when it cannot be written. When
@@ -36,6 +57,7 @@ public:
 
 private:
     void add(std::string_view text, bool keeps_line_feeds);
+    static void write_all(std::string_view bytes);
 
     bool is_json_;
     bool is_terminal_;

@@ -10,59 +10,60 @@ namespace qzacl {
 
 namespace {
 
-// Throws unless the line of an entry leads back to it.
-void require_readable(const qz::entry_fields &entry, const std::string &line, const permission_set &set) {
-    const std::string letters(set.letters_of(entry.permissions));
-    std::uint32_t back = 0;
-    if (!letters.empty())
-        back = set.mask_of(letters);
-    const bool is_sound = line.size() + 1 <= qz::line_length_max && back == entry.permissions &&
-                          (letters.empty() || qz::detail::is_word(letters));
-    const bool has_mechanism = (entry.type & (SEC_ACLE_USER | SEC_ACLE_EXPANDED)) != 0;
-    const bool has_identity = has_mechanism || entry.type == SEC_ACLE_GROUP;
-    if (!is_sound || (has_mechanism && !qz::detail::is_word(entry.mechanism)) ||
-        (has_identity && !qz::detail::is_word(entry.identity)))
-        throw trouble("no line can hold the entry: " + line);
-}
+// Whether lines lead back to the entries that they show.
+class line_checker {
+public:
+    // The words of an entry that was read from a text are words.
+    line_checker(const permission_set &set, bool is_of_text) : set_(set), is_of_text_(is_of_text) {}
 
-template <class Each>
-void for_each_entry(acl_document &document, const Each &each) {
-    for (const sec_acltree_t *tree : document.trees()) {
-        for (const sec_acle_t *record : nodes_of(*tree))
-            each(fields_of(*record));
+    void require_readable(const qz::entry_fields &entry, std::string_view line) {
+        const bool has_mechanism = (entry.type & (SEC_ACLE_USER | SEC_ACLE_EXPANDED)) != 0;
+        const bool has_identity = has_mechanism || entry.type == SEC_ACLE_GROUP;
+        const bool has_words = is_of_text_ || ((!has_mechanism || qz::detail::is_word(entry.mechanism)) &&
+                                               (!has_identity || qz::detail::is_word(entry.identity)));
+        if (!has_words || line.size() + 1 > qz::line_length_max || !leads_back(entry.permissions))
+            throw trouble("no line can hold the entry: " + std::string(line));
     }
-}
 
-int show_json(const call &call) {
-    entry_lines lines;
-    acl_document document(call.line.words[0], call.permissions, lines.watched());
-    std::vector<json> objects;
-    std::string line;
-    for_each_entry(document, [&](const qz::entry_fields &entry) {
-        line.clear();
-        append_entry(line, entry, call.permissions);
-        require_readable(entry, line, call.permissions);
-        put_entry(objects.emplace_back(), document.file(), lines.line_of(entry), entry, call.permissions);
-    });
-    for (const json &each : objects)
-        call.out.object(each);
-    return yes;
-}
+private:
+    // Letters that two permissions share do not lead back to the second one.
+    bool leads_back(std::uint32_t mask) {
+        if (mask == 0 || mask == last_mask_)
+            return true;
+        const std::string letters(set_.letters_of(mask));
+        if (!qz::detail::is_word(letters) || set_.mask_of(letters) != mask)
+            return false;
+        last_mask_ = mask;
+        return true;
+    }
+
+    const permission_set &set_;
+    bool is_of_text_;
+    std::uint32_t last_mask_ = 0;
+};
 
 } // namespace
 
 int show(const call &call) {
-    if (call.out.is_json())
-        return show_json(call);
-    acl_document document(call.line.words[0], call.permissions);
-    std::string text;
-    std::string line;
-    for_each_entry(document, [&](const qz::entry_fields &entry) {
-        line.clear();
-        append_entry(line, entry, call.permissions);
-        require_readable(entry, line, call.permissions);
-        text.append(line).append("\n");
-    });
+    entry_lines numbers;
+    const bool is_json = call.out.is_json();
+    acl_document document(call.line.words[0], call.permissions, is_json ? numbers.watched() : reading());
+    line_checker checker(call.permissions, !document.is_compiled());
+    held_lines text; // until all of it is known to be readable
+    std::string words;
+    for (const sec_acltree_t *tree : document.trees()) {
+        for (const sec_acle_t *record : nodes_of(*tree)) {
+            const qz::entry_fields entry = fields_of(*record);
+            words.clear();
+            append_entry(words, entry, call.permissions);
+            checker.require_readable(entry, words);
+            if (is_json)
+                append_entry_json(text.next(), document.file(), numbers.line_of(entry), entry,
+                                  call.permissions);
+            else
+                text.next().append(words).append("\n");
+        }
+    }
     call.out.lines(text);
     return yes;
 }

@@ -4,43 +4,30 @@
 #include "entry_words.h"
 #include "trouble.h"
 
-#include <vector>
-
 namespace qzacl {
 
-namespace {
-
-struct holder {
-    qz::entry_fields entry;
-    std::size_t line;
-};
-
-} // namespace
-
 int who(const call &call) {
+    const std::string &file = call.line.words[0];
     const std::uint32_t wanted = call.permissions.mask_of(call.line.words[1]);
-    std::vector<holder> holders;
+    held_lines found; // until the whole file is known to be sound
+    bool is_empty = true;
     reading watched;
     watched.entry = [&](const qz::entry_fields &entry, const text_place &place) {
-        if ((entry.permissions & wanted) == wanted)
-            holders.push_back({entry, place.line});
-    };
-    // Kept until the whole file is known to be sound.
-    const acl_document document(call.line.words[0], call.permissions, watched);
-    std::string shown;
-    for (const holder &each : holders) {
+        if ((entry.permissions & wanted) != wanted)
+            return;
+        is_empty = false;
+        std::string &lines = found.next();
         if (call.out.is_json()) {
-            json object;
-            put_entry(object, document.file(), each.line, each.entry, call.permissions);
-            call.out.object(object);
-            continue;
+            append_entry_json(lines, file, place.line, entry, call.permissions);
+            return;
         }
-        shown = document.place(each.line);
-        shown += ": ";
-        append_entry(shown, each.entry, call.permissions);
-        call.out.line(shown);
-    }
-    return holders.empty() ? no : yes;
+        append_place(lines, file, place.line);
+        append_entry(lines.append(": "), entry, call.permissions);
+        lines += '\n';
+    };
+    const acl_document document(file, call.permissions, watched);
+    call.out.lines(found);
+    return is_empty ? no : yes;
 }
 
 } // namespace qzacl
