@@ -1,13 +1,20 @@
 # What is installed beside programs, libraries and headers, and the archives that CPack makes. The components are
-# command (what users of qzaclfck have), library (what services run with) and development.
+# command (what users of the commands have), library (what services run with) and development.
 set(QZ_ZSH_COMPLETIONS site-functions CACHE STRING
   "Folder below share/zsh for the completions: site-functions, or on Debian vendor-completions")
 
-install(FILES completions/qzaclfck.bash DESTINATION ${CMAKE_INSTALL_DATADIR}/bash-completion/completions
-  RENAME qzaclfck COMPONENT command)
-install(FILES completions/_qzaclfck DESTINATION ${CMAKE_INSTALL_DATADIR}/zsh/${QZ_ZSH_COMPLETIONS} COMPONENT command)
-install(FILES completions/qzaclfck.fish DESTINATION ${CMAKE_INSTALL_DATADIR}/fish/vendor_completions.d
-  COMPONENT command)
+set(commands qzaclfck)
+if(QZ_COMPANION)
+  list(APPEND commands qzacl)
+endif()
+foreach(command IN LISTS commands)
+  install(FILES completions/${command}.bash DESTINATION ${CMAKE_INSTALL_DATADIR}/bash-completion/completions
+    RENAME ${command} COMPONENT command)
+  install(FILES completions/_${command} DESTINATION ${CMAKE_INSTALL_DATADIR}/zsh/${QZ_ZSH_COMPLETIONS}
+    COMPONENT command)
+  install(FILES completions/${command}.fish DESTINATION ${CMAKE_INSTALL_DATADIR}/fish/vendor_completions.d
+    COMPONENT command)
+endforeach()
 # The documents, without links among each other: what a link leads to may be compressed there, in another package, or
 # not installed at all. Its text is the name of the file.
 file(GLOB documents RELATIVE ${PROJECT_SOURCE_DIR} CONFIGURE_DEPENDS docs/*.md)

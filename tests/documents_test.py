@@ -13,7 +13,8 @@ from pathlib import Path
 
 BUILD, SOURCE, WRITE = Path(sys.argv.pop(1)).resolve(), Path(__file__).resolve().parent.parent, "--write" in sys.argv
 DOCS = {path: path.read_text() for path in (SOURCE / name for name in (
-    "README.md", "docs/recipes.md", "docs/tracing.md", "docs/man/qzaclfck.1", "docs/man/qzacl.5", "docs/man/qzcacl.5"))}
+    "README.md", "docs/recipes.md", "docs/tracing.md", "docs/man/qzaclfck.1", "docs/man/qzacl.1",
+    "docs/man/qzacl.5", "docs/man/qzcacl.5"))}
 RECIPES = dict(re.findall(r"<!-- recipe: (.*?) -->\n```\w*\n(.*?)```\n", "".join(DOCS.values()), re.S))
 # A command and what it prints, in Markdown and in a manual page; and how the command is written there.
 OUTPUT = re.compile(r"(<!-- output: (.*?) -->\n```\n)((?s:.*?))(?=```\n)")
@@ -74,7 +75,6 @@ class Documents(unittest.TestCase):
             self.assertEqual(self.run_in_shell(command + "examples/mistakes.acl")[0], 37)
         self.assertTrue((self.dir / "examples/service.acl.cacl").exists())
 
-    @unittest.skipUnless((BUILD / "bin/qzacl").exists(), "qzacl is not built")
     def test_edits_of_ansible_change_once(self):
         command = re.search("cmd: (.*)", RECIPES["edit"])[1].replace("/etc/", "examples/")
         for mode, status, shown in (("--check", 1, "+g operators  rw\n"), ("-s", 0, "changed\n"), ("--check", 0, ""),
@@ -82,6 +82,17 @@ class Documents(unittest.TestCase):
             got = self.run_in_shell(re.sub("{{.*?}}", mode, command))
             self.assertEqual(got[0], status)
             self.assertIn(shown, got[1])
+
+    def test_cases_that_must_hold(self):
+        self.assertEqual(self.run_in_shell("gate examples/service.acl"), (0, "23 passed, 0 failed\n"))
+        self.assertEqual(self.run_in_shell("sed -i /^o/d examples/service.acl; gate examples/service.acl")[0], 1)
+
+    def test_one_file_on_many_hosts(self):
+        (self.dir / "ssh").write_text("#!/bin/sh\ntest $1 = same || echo g new r\ntac examples/service.acl\n")
+        (self.dir / "ssh").chmod(0o755)
+        (self.dir / "compare").write_text(RECIPES["compare"].replace("/etc/", "examples/"))
+        self.run_in_shell("sed -i '/^e hba2 node02/d' examples/service.acl")
+        self.assertEqual(self.run_in_shell("compare same other"), (0, "other: + g new r\n"))
 
     @unittest.skipUnless(shutil.which("git"), "there is no git")
     def test_commits(self):
