@@ -15,18 +15,20 @@ _qzacl() {
     case $verb in
     ask) options="-g -m -w --handler --order $options" ;;
     test) options="--handler --order $options" ;;
+    grant | remove | revoke | set) options="-s --check --wait $options" ;;
+    edit) options="-s --wait $options" ;;
     esac
     case $previous in
     --order) values='closest sum' ;;
     --handler) values='hba2=domain hba2=exact hba2=none unix=domain unix=exact unix=none' ;;
     -m) values='hba2 unix' ;;
     -g) mapfile -t COMPREPLY < <(compgen -g -- "$current") && return ;;
-    -w) COMPREPLY=() && return ;;
+    -w | --wait) COMPREPLY=() && return ;;
     *)
         if [[ $current == -* ]]; then
             values=$options
         elif [[ ! $verb && $previous != --permissions ]]; then
-            values='ask cache diff lint show test who'
+            values='ask cache diff edit grant lint remove revoke set show test who'
         fi
         ;;
     esac

@@ -147,6 +147,14 @@ class Documents(unittest.TestCase):
         for text, shown in (r"u unix a@b r\nu unix a@b r\n", "shown\n"), (r"o r\n", ""), ("", ""):
             self.assertEqual(self.run_in_shell(f"printf '{text}' >service.acl; ./snippet"), (0, shown), text)
 
+    def test_edits_of_ansible_change_once(self):
+        command = re.search("cmd: (.*)", RECIPES["edit"])[1].replace("/etc/", "examples/")
+        for mode, status, shown in (("--check", 1, "+g operators  rw\n"), ("-s", 0, "changed\n"), ("--check", 0, ""),
+                                    ("-s", 0, "unchanged\n")):
+            got = self.run_in_shell(re.sub("{{.*?}}", mode, command))
+            self.assertEqual(got[0], status)
+            self.assertIn(shown, got[1])
+
     def test_cases_that_must_hold(self):
         self.assertEqual(self.run_in_shell("gate examples/service.acl"), (0, "23 passed, 0 failed\n"))
         self.assertEqual(self.run_in_shell("sed -i /^o/d examples/service.acl; gate examples/service.acl")[0], 1)

@@ -184,21 +184,23 @@ class Interface(unittest.TestCase):
 
     def test_shells_complete_the_verbs_of_the_companion(self):
         listed = run(BUILD / "bin/qzacl", "--help")
-        verbs = set(re.findall(r"(?m)^  qzacl (\w+)", listed))
-        options = set(re.findall(r"(?<=[ [])-{1,2}\w+", listed)) | {"--help"}
+        usages = dict(re.findall(r"(?m)^  qzacl (\w+) (.*)", listed))
+        verbs, common = set(usages), {"--help", "--json", "--permissions"}
+        options = {verb: set(re.findall(r"(?<=[ [])-{1,2}\w+", usage)) | common for verb, usage in usages.items()}
         self.assertIn("ask", verbs)
         if shutil.which("bash"):
             shell = *COMPLETIONS["qzaclfck.bash"][:-1], BASH.replace("_qzaclfck", "_qzacl")
             script = SOURCE / "completions/qzacl.bash"
             self.assertEqual(set(run(*shell, script, "qzacl s").split()), {each for each in verbs if each[0] == "s"})
-            self.assertEqual(set(run(*shell, script, "qzacl --json ask -").split()), options)
+            for verb in verbs:
+                self.assertEqual(set(run(*shell, script, f"qzacl --json {verb} -").split()), options[verb], verb)
             self.assertEqual(run(*shell, script, "qzacl ask mist", cwd=SOURCE / "examples"), "mistakes.acl\n")
         if shutil.which("fish"):
             answer = run(*COMPLETIONS["qzaclfck.fish"], SOURCE / "completions/qzacl.fish", "qzacl ")
             self.assertEqual({word.split("\t")[0] for word in answer.splitlines()}, verbs)
         if shutil.which("zsh"):
             asked = run("zsh", "-fc", '_arguments() { print -l -- $@ }; . "$0"', SOURCE / "completions/_qzacl")
-            self.assertEqual(set(re.findall(r"(?m)^(?:\(- \*\)|\*)?(-[\w-]+)\[", asked)), options | {"-h"})
+            self.assertEqual(set(re.findall(r"(?m)^(?:\(- \*\)|\*)?(-[\w-]+)\[", asked)), set().union({"-h"}, *options.values()))
 
     def test_shells_complete_what_the_usage_message_lists(self):
         usage = set(re.findall(r"(?<![\w-])-\w\b", run(COMMAND, "-h").split("\n\n")[0]))

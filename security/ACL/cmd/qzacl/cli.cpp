@@ -33,6 +33,9 @@ public:
         one_value(app_.add_option("-w", line.wanted));
         one_value(app_.add_option("--order", order_));
         add_list(app_, "--handler", line.handlers);
+        app_.add_flag("--check", line.checks)->disable_flag_override();
+        app_.add_flag("-s", line.compiles)->disable_flag_override();
+        one_value(app_.add_option("--wait", line.wait));
     }
 
     // Gives what is no option; behind "--", nothing is.
@@ -146,7 +149,8 @@ std::string help_of(std::span<const verb> verbs, const verb *chosen) {
     if (chosen == nullptr)
         text.insert(0, "usage:\n");
     return text + "\nAlso with every verb: --json, and --permissions SET for letters of a service's own.\n"
-                  "FILE is a text, a compiled buffer, or \"-\" for standard input. See qzacl(1).\n";
+                  "FILE is a text, a compiled buffer, or \"-\" for standard input; of edits, a text. See "
+                  "qzacl(1).\n";
 }
 
 } // namespace qzacl

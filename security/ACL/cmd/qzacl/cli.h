@@ -23,6 +23,11 @@ struct command_line {
     std::optional<std::string> wanted;
     bool takes_sum = false;
     std::vector<std::string> handlers; // MECH=domain|exact|none
+
+    // Of edits.
+    bool checks = false;   // what would change
+    bool compiles = false; // so that the cache counts
+    unsigned wait = 10;    // seconds for the lock
 };
 
 // Reads the arguments behind the command's name. Throws wrong_use for what cannot be meant.

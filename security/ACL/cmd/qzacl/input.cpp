@@ -10,16 +10,22 @@
 
 namespace qzacl {
 
+namespace {
+
+[[noreturn]] void fail(const std::string &name) { throw trouble(name + ": " + std::strerror(errno)); }
+
+} // namespace
+
 std::string read_whole(const std::string &name) {
-    const auto fail = [&] { throw trouble(name + ": " + std::strerror(errno)); };
-    qz::descriptor opened;
-    int fd = STDIN_FILENO;
-    if (name != standard_input) {
-        opened = qz::open_file(name.c_str(), O_RDONLY);
-        if (!opened)
-            fail();
-        fd = opened.get();
-    }
+    if (name == standard_input)
+        return read_whole(STDIN_FILENO, name);
+    const qz::descriptor opened = qz::open_file(name.c_str(), O_RDONLY);
+    if (!opened)
+        fail(name);
+    return read_whole(opened.get(), name);
+}
+
+std::string read_whole(int fd, const std::string &name) {
     std::string bytes;
     constexpr std::size_t step = 1 << 18;
     for (;;) {
@@ -27,7 +33,7 @@ std::string read_whole(const std::string &name) {
         bytes.resize(before + step);
         const ssize_t count = read(fd, bytes.data() + before, step);
         if (count < 0 && errno != EINTR)
-            fail();
+            fail(name);
         bytes.resize(before + (count > 0 ? static_cast<std::size_t>(count) : 0));
         if (count == 0)
             return bytes;

@@ -11,12 +11,24 @@ namespace {
 
 using namespace qzacl;
 
+constexpr char edit_options[] = "--check -s --wait";
+
 constexpr verb verbs[] = {
     {"ask",
      "[-m MECH] [-g GROUP]... [-w LETTERS] [--order closest|sum] [--handler MECH=domain|exact|none]... FILE "
      "[IDENTITY]",
      "what a party would be granted, and why", "-m -g -w --order --handler", 1, 2, 1, ask},
     {"who", "FILE LETTERS", "the entries that hold all the letters", "", 2, 2, 1, who},
+    {"set", "[--check] [-s] [--wait SECONDS] FILE ENTRY",
+     "makes the entry what ENTRY says, adding it where it is not there", edit_options, 2, 5, 0, set},
+    {"remove", "[--check] [-s] [--wait SECONDS] FILE KEY", "takes the entry out", edit_options, 2, 4, 0,
+     remove},
+    {"grant", "[--check] [-s] [--wait SECONDS] FILE LETTERS KEY",
+     "adds letters to the entry, or adds the entry", edit_options, 3, 5, 0, grant},
+    {"revoke", "[--check] [-s] [--wait SECONDS] FILE LETTERS KEY", "takes letters away from the entry",
+     edit_options, 3, 5, 0, revoke},
+    {"edit", "[-s] [--wait SECONDS] FILE", "opens the file in an editor and checks it before it counts",
+     "-s --wait", 1, 1, 0, edit},
     {"show", "FILE", "the entries as a text, in stored order", "", 1, 1, 1, show},
     {"diff", "A B", "what changes from one ACL to another", "", 2, 2, 2, diff},
     {"cache", "FILE...", "what services read, and whether it is right", "", 1, any_number, any_number, cache},

@@ -49,6 +49,10 @@ std::string escaped(std::string_view text, bool keeps_line_feeds) {
     return shown;
 }
 
+std::string shown_on(int fd, std::string_view lines) {
+    return isatty(fd) == 0 ? std::string(lines) : escaped(lines, true);
+}
+
 json json_text(std::string_view bytes) { return valid_utf8(bytes); }
 
 void append_json_text(std::string &line, std::string_view bytes) {

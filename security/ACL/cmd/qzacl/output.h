@@ -37,6 +37,9 @@ private:
     std::deque<std::string> parts_;
 };
 
+// Lines as they are shown on a descriptor: as they are, or on a terminal with control bytes as \xHH.
+std::string shown_on(int fd, std::string_view lines);
+
 // Standard output. On a terminal control bytes are shown as \xHH, so that no identity can move the cursor.
 class output {
 public:

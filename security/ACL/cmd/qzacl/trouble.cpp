@@ -15,8 +15,7 @@ void print_recorded_error() {
 }
 
 void print_message(const std::string &text) {
-    const bool is_terminal = isatty(STDERR_FILENO) != 0;
-    std::fprintf(stderr, "qzacl: %s\n", is_terminal ? escaped(text, false).c_str() : text.c_str());
+    std::fprintf(stderr, "qzacl: %s\n", shown_on(STDERR_FILENO, text).c_str());
     std::fflush(stderr);
 }
 

@@ -10,33 +10,18 @@
 #include "libqz_cu/posix_fold.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/identity_order.h"
+#include "qzacl_acl/line_words.h"
 #include "qzacl_acl/permission.h"
 #include "report.h"
 #include "trace_points.h"
 
 #include <algorithm>
 #include <bit>
-#include <cctype>
 #include <cstring>
 
 namespace {
 
 constexpr bool is_line_end(char c) { return c == '\n' || c == '\f' || c == '\r'; }
-constexpr bool is_blank(char c) { return c == ' ' || c == '\t' || c == '\v'; }
-
-// White space by the locale of the process. The class table is fetched once for a line, because one call for
-// each byte would cost more than all the rest of the parse.
-class space_class {
-public:
-#ifdef __GLIBC__
-    bool operator()(char c) const { return (table_[static_cast<unsigned char>(c)] & _ISspace) != 0; }
-
-private:
-    const unsigned short *table_ = *__ctype_b_loc();
-#else
-    bool operator()(char c) const { return std::isspace(static_cast<unsigned char>(c)) != 0; }
-#endif
-};
 
 constexpr std::uint64_t in_each_byte(unsigned char value) {
     return value * std::uint64_t{0x0101010101010101};
@@ -101,7 +86,7 @@ public:
 
     // False when only blanks and a comment are left.
     bool next(token &out) {
-        while (at_ != end_ && is_blank(*at_))
+        while (at_ != end_ && qz::is_blank(*at_))
             ++at_;
         if (at_ == end_ || *at_ == '#')
             return false;
@@ -128,7 +113,7 @@ private:
     char *at_;
     char *end_;
     const char *limit_;
-    space_class is_space_;
+    qz::space_class is_space_;
 };
 
 // Fills the entry from the tokens of a line; a line without any leaves its type 0.

@@ -1,0 +1,110 @@
+// Compiles a text so that its cache counts.
+#include "counting_cache.h"
+
+#include "base/owned.h"
+#include "lock_file.h"
+#include "qzacl_acl/acl_text.h"
+#include "qzacl_acl/cache_file.h"
+#include "qzacl_acl/compile.h"
+#include "qzacl_acl/trees.h"
+#include "trouble.h"
+
+#include <cstring>
+#include <ctime>
+#include <sys/stat.h>
+#include <thread>
+
+namespace qzacl {
+
+namespace {
+
+constexpr qz::acl_file_use by_edit = {
+    .not_found = {SEC_S_BAD_FILENAME, qz::msg::bad_acl_file_name},
+    .not_private = {SEC_S_BAD_PERMISSION, qz::msg::acl_file_not_private},
+    .cannot_open = {SEC_S_FILE_ERROR, qz::msg::cannot_open_acl_file},
+    .takes_empty_of_anybody = false,
+    .is_traced = false,
+};
+
+enum class outcome { counts, does_not_count, failed };
+
+// A cache counts when it is later than its text in whole seconds. Gives what is left of the one in which the text was
+// written, in nanoseconds; 0 when that is over.
+long rest_of_second(const std::string &path) {
+    constexpr long second = 1'000'000'000;
+    struct stat text = {};
+    timespec now = {};
+    if (stat(path.c_str(), &text) != 0 || clock_gettime(CLOCK_REALTIME_COARSE, &now) != 0 ||
+        text.st_mtim.tv_sec != now.tv_sec)
+        return 0;
+    return second - now.tv_nsec;
+}
+
+int read_trees(qz::acl_text &text, sec_acltree_array &trees) {
+    qz::parsed_acle entry;
+    for (;;) {
+        const qz::acl_line line = text.next(entry);
+        if (line == qz::acl_line::end)
+            return SEC_S_OK;
+        if (line == qz::acl_line::bad)
+            return text.failure();
+        if (line == qz::acl_line::none)
+            continue;
+        if (const int result = trees.add(qz::view_of(entry)); result != SEC_S_OK)
+            return result;
+    }
+}
+
+// Of a text without entries there is no cache; nor may one that says anything be left that is read.
+bool is_what_services_read(const std::string &path, const sec_perm_set_t &set,
+                           const sec_acl_buffer_t &compiled) {
+    sec_acl_buffer_t served = {};
+    std::uint32_t flags = 0;
+    const int result = sec_read_acl_file(path.c_str(), nullptr, &set, 0, &served, &flags);
+    const qz::owned<void> owner(served.data);
+    const bool is_text = (flags & SEC_READ_ACL_TEXT) != 0;
+    if (result != SEC_S_OK || compiled.length == 0)
+        return result == SEC_S_OK && is_text;
+    return !is_text && served.length == compiled.length &&
+           std::memcmp(served.data, compiled.data, static_cast<std::size_t>(compiled.length)) == 0;
+}
+
+outcome compile_once(const std::string &path, const sec_perm_set_t &set) {
+    qz::vetted_file file;
+    qz::acl_text text(&set);
+    const int opened = text.open_again_while_replaced([&] {
+        const int result = qz::vet_acl_file(path.c_str(), nullptr, by_edit, file);
+        return result != SEC_S_OK ? result : text.open(file, by_edit);
+    });
+    sec_acltree_array trees(text.all());
+    if (opened != SEC_S_OK || (!text.is_empty() && read_trees(text, trees) != SEC_S_OK))
+        return outcome::failed;
+    const bool has_entries = !trees.trees().empty();
+    sec_acl_buffer_t compiled = {};
+    if (has_entries && sec__acltrees_to_acl(trees.trees(), &compiled) != SEC_S_OK)
+        return outcome::failed;
+    const qz::owned<void> owner(compiled.data);
+    if (has_entries && sec__cache_aclbuffer(file.path.text, &compiled, qz::cache_rewriting::always,
+                                            text.origin()) != SEC_S_OK)
+        return outcome::failed;
+    return is_what_services_read(path, set, compiled) ? outcome::counts : outcome::does_not_count;
+}
+
+} // namespace
+
+bool make_cache_count(const edited_file &file, std::chrono::seconds wait, const permission_set &set) {
+    for (;;) {
+        // Other edits may go on meanwhile, of which each waits for its own cache.
+        while (const long rest = rest_of_second(file.path()))
+            std::this_thread::sleep_for(std::chrono::nanoseconds(rest));
+        const lock_file lock(file, wait);
+        if (rest_of_second(file.path()) != 0)
+            continue;
+        const outcome found = compile_once(file.path(), *set.get());
+        if (found == outcome::failed)
+            print_recorded_error();
+        return found == outcome::counts;
+    }
+}
+
+} // namespace qzacl

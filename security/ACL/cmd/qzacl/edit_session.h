@@ -1,0 +1,36 @@
+// An editor on an ACL file: nothing that has mistakes takes its place, and nobody else's change is lost.
+#ifndef QZACL_EDIT_SESSION_H
+#define QZACL_EDIT_SESSION_H
+
+#include "edited_file.h"
+#include "permission_set.h"
+#include "private_copy.h"
+
+#include <chrono>
+#include <string>
+
+namespace qzacl {
+
+class edit_session {
+public:
+    edit_session(edited_file &file, const permission_set &set, std::chrono::seconds wait); // throws trouble
+
+    // Runs the editor until what it left is written, or is given up, which throws trouble. False when the text
+    // is as it was.
+    bool run();
+
+private:
+    bool is_right(const std::string &text) const;
+    bool write(const std::string &text);
+    bool asks_to_go_on(const std::string &text) const;
+
+    edited_file &file_;
+    const permission_set &set_;
+    std::chrono::seconds wait_;
+    std::string base_; // the text that a change is made of
+    private_copy copy_;
+};
+
+} // namespace qzacl
+
+#endif

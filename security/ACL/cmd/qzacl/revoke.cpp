@@ -1,0 +1,8 @@
+// revoke: letters less for an entry.
+#include "edit_answer.h"
+
+namespace qzacl {
+
+int revoke(const call &call) { return change_entry(call, change_of_letters(call, edit_action::revoke)); }
+
+} // namespace qzacl
