@@ -58,8 +58,8 @@ int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
                       : is_string ? shown(each, given.values[at].text)
                                   : shown(each, given.values[at].number);
         }
-        std::vector<char> made(qz::cu::format_text(text.c_str(), given, nullptr));
-        EXPECT_EQ(qz::cu::format_text(text.c_str(), given, made.data()), made.size());
+        std::vector<char> made(qz::cu::format_text(text.c_str(), given, nullptr, 0));
+        EXPECT_EQ(qz::cu::format_text(text.c_str(), given, made.data(), made.size()), made.size());
         EXPECT_EQ(std::string(made.begin(), made.end()), wanted + '\0');
     }
     return 0;
