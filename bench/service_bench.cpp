@@ -18,6 +18,7 @@
 #include <ctime>
 #include <fcntl.h>
 #include <memory>
+#include <pthread.h>
 #include <string>
 #include <strings.h>
 #include <sys/stat.h>
@@ -210,6 +211,55 @@ void bench_groups(benchmark::State &state, const buffer &held) {
     }
 }
 
+// ---- Decisions through a handler, and in several threads on one buffer ----
+
+// As plain as one can be: it accepts what is the same.
+int is_same(const char *requested, const char *entry) { return std::strcmp(requested, entry); }
+
+// Expanded entries of a mechanism with a handler, which is called for each up to the one that matches.
+buffer handled_buffer(const std::string &path) {
+    require(sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, mechanism, is_same) == SEC_S_OK,
+            "cannot register");
+    return std::make_shared<compiled>(path);
+}
+
+void bench_last_by_handler(benchmark::State &state, const buffer &held) {
+    const std::string identity = identity_of(held->entry(held->count - 1));
+    std::uint32_t mask = 0;
+    for (auto _ : state) {
+        const int result =
+            sec__single_acle_perm(&held->acl, SEC_ACLE_EXPANDED, mechanism, nullptr, identity.c_str(), &mask);
+        benchmark::DoNotOptimize(mask);
+        if (result != SEC_S_OK) {
+            state.SkipWithError("unexpected result");
+            break;
+        }
+    }
+}
+
+// What a decision with a handler does under the library's lock is less than this.
+void bench_lock(benchmark::State &state) {
+    static pthread_mutex_t lock = PTHREAD_MUTEX_INITIALIZER;
+    for (auto _ : state) {
+        pthread_mutex_lock(&lock);
+        pthread_mutex_unlock(&lock);
+    }
+}
+
+void add_threads(const std::string &users, const std::string &expanded) {
+    const auto held = std::make_shared<compiled>(users);
+    const auto handled = handled_buffer(expanded);
+    const std::string identity = respelled(held->entry(held->count / 2));
+    benchmark::RegisterBenchmark("handler/10", bench_last_by_handler, handled);
+    benchmark::RegisterBenchmark("threads", bench_decision, held, identity, SEC_S_OK)
+        ->ThreadRange(1, 2)
+        ->UseRealTime();
+    benchmark::RegisterBenchmark("handler_threads", bench_last_by_handler, handled)
+        ->ThreadRange(1, 2)
+        ->UseRealTime();
+    benchmark::RegisterBenchmark("lock", bench_lock)->ThreadRange(1, 2)->UseRealTime();
+}
+
 // ---- Edits ----
 
 double thread_seconds() {
@@ -239,6 +289,16 @@ void bench_edit(benchmark::State &state, const buffer &held, bool times_adding) 
         }
         state.SetIterationTime(times_adding ? between - start : end - between);
     }
+}
+
+void add_edits(const std::string &family, const std::string &path) {
+    const auto held = std::make_shared<compiled>(path);
+    const auto add = [&](const std::string &what, bool times_adding) {
+        const std::string name = what + "/" + family + "/100000";
+        benchmark::RegisterBenchmark(name.c_str(), bench_edit, held, times_adding)->UseManualTime();
+    };
+    add("adding", true);
+    add("deleting", false);
 }
 
 // ---- Reads ----
@@ -351,7 +411,7 @@ void add_all(const std::string &folder) {
     };
     const auto is_there = [](const std::string &path) { return access(path.c_str(), R_OK) == 0; };
     for (const char *family : {"rand", "prefixed"}) {
-        for (const std::uint32_t count : {10u, 100u, 1000u, 100000u}) {
+        for (const std::uint32_t count : {10u, 100u, 1000u, 10000u, 100000u}) {
             const std::string path = file(family, "u", count);
             if (is_there(path))
                 add_decisions(family, count, path);
@@ -359,10 +419,13 @@ void add_all(const std::string &folder) {
     }
     if (const std::string path = file("rand", "g", 1000); is_there(path))
         benchmark::RegisterBenchmark("groups/1000", bench_groups, std::make_shared<compiled>(path));
-    if (const std::string path = file("rand", "u", 100000); is_there(path)) {
-        const auto held = std::make_shared<compiled>(path);
-        benchmark::RegisterBenchmark("adding/100000", bench_edit, held, true)->UseManualTime();
-        benchmark::RegisterBenchmark("deleting/100000", bench_edit, held, false)->UseManualTime();
+    if (const std::string users = file("rand", "u", 10), expanded = file("rand", "e", 10);
+        is_there(users) && is_there(expanded))
+        add_threads(users, expanded);
+    for (const char *family : {"rand", "prefixed"}) {
+        const std::string path = file(family, "u", 100000);
+        if (is_there(path))
+            add_edits(family, path);
     }
     for (const std::uint32_t count : {1000u, 100000u, 1000000u}) {
         const std::string path = file("rand", "u", count);
@@ -371,7 +434,10 @@ void add_all(const std::string &folder) {
     }
 #ifdef QZ_BENCH_LIBACL
     benchmark::RegisterBenchmark("posix_parse/1000", bench_posix_parse, 1000);
-    benchmark::RegisterBenchmark("posix_look_up/1000", bench_posix_look_up, 1000);
+    for (const std::uint32_t count : {10u, 100u, 1000u, 10000u}) {
+        const std::string name = "posix_look_up/" + std::to_string(count);
+        benchmark::RegisterBenchmark(name.c_str(), bench_posix_look_up, count);
+    }
 #endif
 }
 
