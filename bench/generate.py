@@ -3,7 +3,7 @@
 
 One file for every order and type that is asked for, named FAMILY-ORDER-TYPE-LINES.acl in the folder. Besides the
 entry types u, e and g there are: bad (lines of which each has one of four mistakes), mech (user entries whose
-mechanisms all differ), and doas and sudoers (as many rules of those programs).
+mechanisms all differ), doas and sudoers (as many rules of those programs), and posix (entries for setfacl).
 """
 import argparse
 import random
@@ -13,7 +13,8 @@ from pathlib import Path
 FAMILIES = ("rand", "prefixed")
 ORDERS = ("random", "sorted", "reversed", "bothends", "tworuns")
 PERMISSIONS = ("r", "rw", "rwx", "", "q", "rl")
-# Every kind of line is filled in with a name and permissions.
+FIRST_USER = 100_000
+# Every kind of line is filled in with a name, permissions, its place, the name in lower case, and a user number.
 LINES = {
     "u": ("u unix {0} {1}\n",),
     "e": ("e unix {0} {1}\n",),
@@ -22,6 +23,7 @@ LINES = {
     "bad": ("u unix\n", "x unix {0} {1}\n", "u unix {0} z\n", "u unix {0} r more\n"),
     "doas": ("permit {3} as root\n",),
     "sudoers": ("{3} ALL=(ALL) ALL\n",),
+    "posix": ("user:{4}:r-x\n",),
 }
 
 
@@ -62,10 +64,11 @@ def in_order(names, order):
 
 
 def text(names, kind, source):
-    templates, permissions = LINES[kind], source.randbytes(len(names))
+    templates, chosen = LINES[kind], source.randbytes(len(names))
+    permissions = [PERMISSIONS[value % len(PERMISSIONS)] for value in chosen]
     return "".join(
-        templates[at % len(templates)].format(name, PERMISSIONS[value % len(PERMISSIONS)], at, name.lower())
-        for at, (name, value) in enumerate(zip(names, permissions))
+        templates[at % len(templates)].format(name, letters, at, name.lower(), FIRST_USER + at)
+        for at, (name, letters) in enumerate(zip(names, permissions))
     )
 
 

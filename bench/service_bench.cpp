@@ -4,131 +4,30 @@
 // usage: service_bench FOLDER [--benchmark_...]
 //
 // The folder holds files of generate.py; a size or family without its file is not measured.
+#include "plain_walks.h"
+#include "posix_acls.h"
 #include "qz/acl.h"
-#include "qzacl_acl/buffer_format.h"
 
 #include <benchmark/benchmark.h>
 
-#include <algorithm>
-#include <array>
-#include <cctype>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <ctime>
 #include <fcntl.h>
 #include <memory>
+#include <pthread.h>
 #include <string>
 #include <strings.h>
 #include <sys/stat.h>
 #include <unistd.h>
 #include <vector>
 
-#ifdef QZ_BENCH_LIBACL
-#include <acl/libacl.h>
-#include <sys/acl.h>
-#endif
-
 namespace {
 
-namespace format = qz::format;
+using namespace measured;
 
 constexpr char mechanism[] = "unix";
-
-[[noreturn]] void give_up(const std::string &what) {
-    std::fprintf(stderr, "service_bench: %s\n", what.c_str());
-    std::exit(EXIT_FAILURE);
-}
-
-void require(bool holds, const std::string &what) {
-    if (!holds)
-        give_up(what);
-}
-
-// ---- Buffers, and the plainest ways through them ----
-
-template <class Number>
-Number load(const unsigned char *at) {
-    Number value;
-    std::memcpy(&value, at, sizeof value);
-    return value;
-}
-
-const unsigned char *behind(const unsigned char *entry) {
-    return entry + format::entry_fixed_size + load<std::uint16_t>(entry + format::entry_length_offset);
-}
-
-const char *identity_of(const unsigned char *entry) {
-    return reinterpret_cast<const char *>(entry + format::entry_fixed_size);
-}
-
-// The compiled form of a file whose entries all have one key.
-class compiled {
-public:
-    explicit compiled(const std::string &path) {
-        require(sec_read_acl_file(path.c_str(), nullptr, nullptr, SEC_READ_ACL_TEXT, &acl, nullptr) ==
-                    SEC_S_OK,
-                "cannot read " + path);
-        qz::byte_reader reader(format::bytes_of(acl));
-        format::header header;
-        format::subacl head;
-        require(format::read(reader, header) && format::read(reader, head), path + " is empty");
-        first = reader.position();
-        count = head.entry_count;
-    }
-    compiled(const compiled &) = delete;
-    compiled &operator=(const compiled &) = delete;
-    ~compiled() { sec_release_acl(&acl); }
-
-    const unsigned char *entry(std::uint32_t number) const {
-        const unsigned char *at = first;
-        for (; number != 0; --number)
-            at = behind(at);
-        return at;
-    }
-
-    sec_acl_buffer_t acl = {};
-    const unsigned char *first = nullptr;
-    std::uint32_t count = 0;
-};
-
-// An identity as a requester may spell it: the same in the other letter case.
-std::string respelled(const unsigned char *entry) {
-    std::string text = identity_of(entry);
-    std::transform(text.begin(), text.end(), text.begin(), [](unsigned char c) {
-        return static_cast<char>(std::islower(c) != 0 ? std::toupper(c) : std::tolower(c));
-    });
-    return text;
-}
-
-constexpr std::array<unsigned char, 256> fold_table = [] {
-    std::array<unsigned char, 256> table{};
-    for (unsigned byte = 0; byte < table.size(); ++byte)
-        table[byte] = static_cast<unsigned char>(byte >= 'A' && byte <= 'Z' ? byte + ('a' - 'A') : byte);
-    return table;
-}();
-
-int compare_by_table(const char *a, const char *b) {
-    for (;; ++a, ++b) {
-        const int left = fold_table[static_cast<unsigned char>(*a)];
-        const int right = fold_table[static_cast<unsigned char>(*b)];
-        if (left != right || left == 0)
-            return left - right;
-    }
-}
-
-// The permissions of the identity, found by comparing with entry after entry; no bound is checked.
-template <class Compare>
-std::uint32_t scan(const unsigned char *entry, std::uint32_t count, const char *wanted, Compare compare) {
-    for (; count != 0; --count, entry = behind(entry)) {
-        const int order = compare(wanted, identity_of(entry));
-        if (order == 0)
-            return load<std::uint32_t>(entry + format::entry_mask_offset);
-        if (order < 0)
-            break;
-    }
-    return 0;
-}
 
 // ---- Decisions ----
 
@@ -210,6 +109,55 @@ void bench_groups(benchmark::State &state, const buffer &held) {
     }
 }
 
+// ---- Decisions through a handler, and in several threads on one buffer ----
+
+// As plain as one can be: it accepts what is the same.
+int is_same(const char *requested, const char *entry) { return std::strcmp(requested, entry); }
+
+// Expanded entries of a mechanism with a handler, which is called for each up to the one that matches.
+buffer handled_buffer(const std::string &path) {
+    require(sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, mechanism, is_same) == SEC_S_OK,
+            "cannot register");
+    return std::make_shared<compiled>(path);
+}
+
+void bench_last_by_handler(benchmark::State &state, const buffer &held) {
+    const std::string identity = identity_of(held->entry(held->count - 1));
+    std::uint32_t mask = 0;
+    for (auto _ : state) {
+        const int result =
+            sec__single_acle_perm(&held->acl, SEC_ACLE_EXPANDED, mechanism, nullptr, identity.c_str(), &mask);
+        benchmark::DoNotOptimize(mask);
+        if (result != SEC_S_OK) {
+            state.SkipWithError("unexpected result");
+            break;
+        }
+    }
+}
+
+// What a decision with a handler does under the library's lock is less than this.
+void bench_lock(benchmark::State &state) {
+    static pthread_mutex_t lock = PTHREAD_MUTEX_INITIALIZER;
+    for (auto _ : state) {
+        pthread_mutex_lock(&lock);
+        pthread_mutex_unlock(&lock);
+    }
+}
+
+void add_threads(const std::string &users, const std::string &expanded) {
+    const auto held = std::make_shared<compiled>(users);
+    const auto handled = handled_buffer(expanded);
+    const std::string identity = respelled(held->entry(held->count / 2));
+    benchmark::RegisterBenchmark("handler/10", bench_last_by_handler, handled);
+    benchmark::RegisterBenchmark("threads", bench_decision, held, identity, SEC_S_OK)
+        ->ThreadRange(1, 2)
+        ->UseRealTime();
+    benchmark::RegisterBenchmark("handler_threads", bench_last_by_handler, handled)
+        ->ThreadRange(1, 2)
+        ->UseRealTime();
+    benchmark::RegisterBenchmark("lock", bench_lock)->ThreadRange(1, 2)->UseRealTime();
+}
+
 // ---- Edits ----
 
 double thread_seconds() {
@@ -239,6 +187,16 @@ void bench_edit(benchmark::State &state, const buffer &held, bool times_adding) 
         }
         state.SetIterationTime(times_adding ? between - start : end - between);
     }
+}
+
+void add_edits(const std::string &family, const std::string &path) {
+    const auto held = std::make_shared<compiled>(path);
+    const auto add = [&](const std::string &what, bool times_adding) {
+        const std::string name = what + "/" + family + "/100000";
+        benchmark::RegisterBenchmark(name.c_str(), bench_edit, held, times_adding)->UseManualTime();
+    };
+    add("adding", true);
+    add("deleting", false);
 }
 
 // ---- Reads ----
@@ -292,57 +250,6 @@ void add_reads(std::uint32_t count, const std::string &path) {
     add("plain_read", bench_plain_read, path + ".cacl");
 }
 
-// ---- POSIX ACLs: the parse of a text and the look-up of a user by number ----
-
-#ifdef QZ_BENCH_LIBACL
-
-std::string posix_acl_text(std::uint32_t count) {
-    std::string text = "user::rwx\ngroup::r-x\nother::---\nmask::rwx\n";
-    for (std::uint32_t number = 0; number < count; ++number)
-        text += "user:" + std::to_string(100000 + number) + ":r-x\n";
-    return text;
-}
-
-void bench_posix_parse(benchmark::State &state, std::uint32_t count) {
-    const std::string text = posix_acl_text(count);
-    for (auto _ : state) {
-        acl_t acl = acl_from_text(text.c_str());
-        if (acl == nullptr) {
-            state.SkipWithError("refused");
-            break;
-        }
-        acl_free(acl);
-    }
-}
-
-bool grants(acl_t acl, uid_t user) {
-    acl_entry_t entry = nullptr;
-    for (int id = ACL_FIRST_ENTRY; acl_get_entry(acl, id, &entry) == 1; id = ACL_NEXT_ENTRY) {
-        acl_tag_t tag = 0;
-        if (acl_get_tag_type(entry, &tag) != 0 || tag != ACL_USER)
-            continue;
-        void *held = acl_get_qualifier(entry);
-        const bool is_match = held != nullptr && *static_cast<uid_t *>(held) == user;
-        acl_free(held);
-        if (is_match) {
-            acl_permset_t permissions = nullptr;
-            return acl_get_permset(entry, &permissions) == 0 && acl_get_perm(permissions, ACL_READ) == 1;
-        }
-    }
-    return false;
-}
-
-void bench_posix_look_up(benchmark::State &state, std::uint32_t count) {
-    acl_t acl = acl_from_text(posix_acl_text(count).c_str());
-    for (auto _ : state) {
-        if (!grants(acl, 100000 + count / 2))
-            state.SkipWithError("not granted");
-    }
-    acl_free(acl);
-}
-
-#endif
-
 // ---- What is there to be measured ----
 
 void add_all(const std::string &folder) {
@@ -351,7 +258,7 @@ void add_all(const std::string &folder) {
     };
     const auto is_there = [](const std::string &path) { return access(path.c_str(), R_OK) == 0; };
     for (const char *family : {"rand", "prefixed"}) {
-        for (const std::uint32_t count : {10u, 100u, 1000u, 100000u}) {
+        for (const std::uint32_t count : {10u, 100u, 1000u, 10000u, 100000u}) {
             const std::string path = file(family, "u", count);
             if (is_there(path))
                 add_decisions(family, count, path);
@@ -359,10 +266,13 @@ void add_all(const std::string &folder) {
     }
     if (const std::string path = file("rand", "g", 1000); is_there(path))
         benchmark::RegisterBenchmark("groups/1000", bench_groups, std::make_shared<compiled>(path));
-    if (const std::string path = file("rand", "u", 100000); is_there(path)) {
-        const auto held = std::make_shared<compiled>(path);
-        benchmark::RegisterBenchmark("adding/100000", bench_edit, held, true)->UseManualTime();
-        benchmark::RegisterBenchmark("deleting/100000", bench_edit, held, false)->UseManualTime();
+    if (const std::string users = file("rand", "u", 10), expanded = file("rand", "e", 10);
+        is_there(users) && is_there(expanded))
+        add_threads(users, expanded);
+    for (const char *family : {"rand", "prefixed"}) {
+        const std::string path = file(family, "u", 100000);
+        if (is_there(path))
+            add_edits(family, path);
     }
     for (const std::uint32_t count : {1000u, 100000u, 1000000u}) {
         const std::string path = file("rand", "u", count);
@@ -371,7 +281,10 @@ void add_all(const std::string &folder) {
     }
 #ifdef QZ_BENCH_LIBACL
     benchmark::RegisterBenchmark("posix_parse/1000", bench_posix_parse, 1000);
-    benchmark::RegisterBenchmark("posix_look_up/1000", bench_posix_look_up, 1000);
+    for (const std::uint32_t count : {10u, 100u, 1000u, 10000u}) {
+        const std::string name = "posix_look_up/" + std::to_string(count);
+        benchmark::RegisterBenchmark(name.c_str(), bench_posix_look_up, count);
+    }
 #endif
 }
 

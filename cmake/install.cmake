@@ -21,7 +21,7 @@ file(GLOB documents RELATIVE ${PROJECT_SOURCE_DIR} CONFIGURE_DEPENDS docs/*.md)
 foreach(document IN ITEMS README.md CHANGELOG.md SECURITY.md LISTS documents)
   set_property(DIRECTORY APPEND PROPERTY CMAKE_CONFIGURE_DEPENDS ${document})
   file(READ ${document} text)
-  string(REGEX REPLACE "\\[([^]]*)\\]\\([^):]*\\)" "\\1" text "${text}")
+  string(REGEX REPLACE "!?\\[([^]]*)\\]\\([^):]*\\)" "\\1" text "${text}")
   file(WRITE ${PROJECT_BINARY_DIR}/share/doc/${document} "${text}")
 endforeach()
 install(FILES ${PROJECT_BINARY_DIR}/share/doc/README.md ${PROJECT_BINARY_DIR}/share/doc/CHANGELOG.md

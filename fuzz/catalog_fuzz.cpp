@@ -71,8 +71,8 @@ int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
         std::string wanted;
         for (const std::smatch &each : pieces(text))
             wanted += expanded(each, given, is_string);
-        std::vector<char> made(qz::cu::format_text(text.c_str(), given, nullptr));
-        EXPECT_EQ(qz::cu::format_text(text.c_str(), given, made.data()), made.size());
+        std::vector<char> made(qz::cu::format_text(text.c_str(), given, nullptr, 0));
+        EXPECT_EQ(qz::cu::format_text(text.c_str(), given, made.data(), made.size()), made.size());
         EXPECT_EQ(std::string(made.begin(), made.end()), wanted + '\0');
     }
     return 0;

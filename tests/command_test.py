@@ -16,6 +16,7 @@ import struct
 import subprocess
 import sys
 import tempfile
+import time
 import unittest
 
 BUILD = pathlib.Path(sys.argv[1]).resolve()
@@ -225,6 +226,48 @@ class Command(CommandCase):
         with reader, writer:
             self.expect(["-v", "-f", "a"], 0, "", child=lambda: os.dup2(writer.fileno(), 2))
             self.assertEqual(reader.recv(1 << 20).decode(), entry("n", "") + entry("o", "") + entry("g", "", "a"))
+
+    @unittest.skipUnless(os.path.exists("/proc/self/io"), "the system does not count writes")
+    def test_failures_are_flushed_one_by_one_on_a_terminal_only(self):
+        self.write("a", "x\nn r\ny\no w\n")
+        terminal, writer = os.openpty()
+        self.addCleanup(os.close, terminal)
+        with open(writer, "wb") as shown, open(os.path.join(self.root, "log"), "wb") as log:
+            for stream, options, writes in ((shown, "-c", 2), (shown, "-cv", 3), (log, "-cvs", 2)):
+                with self.subTest(stream=stream.name, options=options):
+                    command = [COMMAND, options, "-f", "a"]
+                    with subprocess.Popen(command, cwd=self.dir, stderr=stream, env={"LC_ALL": "C"}) as child:
+                        os.waitid(os.P_PID, child.pid, os.WEXITED | os.WNOWAIT)
+                        counts = pathlib.Path(f"/proc/{child.pid}/io").read_text("ascii")
+                    self.assertIn(f"\nsyscw: {writes}\n", counts)
+        told = [message(165, 1, "x"), entry("n", "r"), message(165, 3, "y"), entry("o", "w"), message(162)]
+        self.assertEqual(pathlib.Path(log.name).read_text("latin-1"), "".join(told))
+
+    def test_a_signal_loses_nothing_that_was_gathered(self):
+        """It ends the command behind a line, with everything up to there in the pipe; ignored, it ends nothing."""
+        count = 5000
+        self.write("a", "x\n" * count)
+        told = "".join(message(165, number, "x") for number in range(1, count + 1))
+        for number in (signal.SIGHUP, signal.SIGINT, signal.SIGQUIT, signal.SIGTERM):
+            for action, status in ((signal.SIG_DFL, -number), (signal.SIG_IGN, 0)):
+                command, child = [COMMAND, "-c", "-f", "a"], lambda: signal.signal(number, action)
+                with self.subTest(number, action=action), subprocess.Popen(
+                        command, cwd=self.dir, stderr=subprocess.PIPE, env={"LC_ALL": "C"}, preexec_fn=child) as done:
+                    first = done.stderr.read(1)  # more than the pipe takes is left
+                    done.send_signal(number)
+                    printed = (first + done.stderr.read()).decode("latin-1")
+                    self.assertEqual(done.wait(), status)
+                    self.assertTrue(told.startswith(printed) and printed.endswith("\n\n"))
+                    self.assertEqual(len(printed) == len(told), action == signal.SIG_IGN)
+
+    def test_a_second_signal_ends_what_nobody_reads(self):
+        self.write("a", "x\n" * 5000)
+        with subprocess.Popen([COMMAND, "-c", "-f", "a"], cwd=self.dir, stderr=subprocess.PIPE) as child:
+            child.stderr.read(1)
+            while child.poll() is None:
+                child.terminate()
+                time.sleep(0.01)
+            self.assertEqual(child.returncode, -signal.SIGTERM)
 
     @unittest.skipIf(SANITIZED, "the sanitizers need much memory")
     def test_little_memory(self):

@@ -203,10 +203,16 @@ int cu_get_errmsg_1(const cu_error_t *error, char **text) {
     const kept_errno kept;
     const recorded_error &from = record_of(error);
     const char *shown = from.present ? text_of(from) : "";
-    char *made = static_cast<char *>(std::malloc(format_text(shown, from.given, nullptr)));
+    // Most texts fit in here, and are made only once.
+    char room[1024];
+    const std::size_t size = format_text(shown, from.given, room, sizeof room);
+    char *made = static_cast<char *>(std::malloc(size));
     if (made == nullptr)
         return CU_NO_MEMORY;
-    format_text(shown, from.given, made);
+    if (size <= sizeof room)
+        std::memcpy(made, room, size);
+    else
+        format_text(shown, from.given, made, size);
     *text = made;
     return CU_OK;
 }

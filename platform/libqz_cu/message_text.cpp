@@ -41,19 +41,19 @@ bool read_conversion(const char *percent, conversion &found) {
     return true;
 }
 
-// Adds up what a text comes to and, when there is a place, writes it there.
+// Adds up what a text comes to, and writes of it the parts that end within the room.
 class sink {
 public:
-    explicit sink(char *out) : out_(out) {}
+    sink(char *out, std::size_t room) : out_(out), room_(room) {}
 
     void put(const char *bytes, std::size_t count) {
-        if (out_ != nullptr && count != 0)
+        if (has_room(count))
             std::memcpy(out_ + length_, bytes, count);
         length_ += count;
     }
 
     void fill(char byte, std::size_t count) {
-        if (out_ != nullptr && count != 0)
+        if (has_room(count))
             std::memset(out_ + length_, byte, count);
         length_ += count;
     }
@@ -61,7 +61,12 @@ public:
     std::size_t length() const { return length_; }
 
 private:
+    bool has_room(std::size_t count) const {
+        return count != 0 && length_ <= room_ && count <= room_ - length_;
+    }
+
     char *out_;
+    std::size_t room_;
     std::size_t length_ = 0;
 };
 
@@ -171,8 +176,8 @@ bool has_conversions_of(const char *text, const char *default_text) {
     return true;
 }
 
-std::size_t format_text(const char *text, const arguments &given, char *out) {
-    sink to(out);
+std::size_t format_text(const char *text, const arguments &given, char *out, std::size_t room) {
+    sink to(out, room);
     conversion next;
     for (;;) {
         const char *percent = std::strchr(text, '%');

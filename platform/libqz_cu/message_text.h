@@ -30,9 +30,9 @@ void find_arguments(const char *text, arguments &found);
 // Whether a text holds exactly the conversions of the default text, in any order, and is well formed besides.
 bool has_conversions_of(const char *text, const char *default_text);
 
-// Writes the text with the arguments put in and a final NUL to `out`, which holds what an earlier call
-// without a place to write returned: the number of bytes, the NUL included.
-std::size_t format_text(const char *text, const arguments &given, char *out);
+// Writes the text with the arguments put in and a final NUL to `out`, and returns the bytes of that. Where
+// there is less room, nothing is written beyond it, and what was written is of no use.
+std::size_t format_text(const char *text, const arguments &given, char *out, std::size_t room);
 
 } // namespace qz::cu
 

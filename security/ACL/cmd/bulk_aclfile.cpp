@@ -12,6 +12,9 @@
 #include "report.h"
 
 #include <csignal>
+#include <cstdio>
+#include <iterator>
+#include <unistd.h>
 
 namespace {
 
@@ -49,14 +52,73 @@ void warn_of_skipped_cache(unsigned flags) {
     aclfck__print_error();
 }
 
+// Prints the current error and an empty line, sooner or later.
+void print_recorded_error() {
+    if (!qz::print_recorded(stderr, "\n")) {
+        spare_memory.reset();
+        static_cast<void>(qz::print_recorded(stderr, "\n"));
+    }
+}
+
+volatile std::sig_atomic_t noted_signal = 0;
+
+// Prints the failures of lines. A terminal shows each at once; for a file or a pipe they are gathered, since a
+// write costs more than the check of a line. From the first gathered one on, a signal that ends the command
+// does so behind the line at hand, when everything is printed; a second one ends it as it comes.
+class line_failures {
+public:
+    explicit line_failures(bool may_gather) : may_gather_(may_gather && isatty(STDERR_FILENO) == 0) {}
+    line_failures(const line_failures &) = delete;
+    line_failures &operator=(const line_failures &) = delete;
+    ~line_failures() {
+        std::fflush(stderr);
+        for (std::size_t i = 0; is_waiting_ && i != count; ++i)
+            sigaction(ending_signals[i], &before_[i], nullptr);
+        if (noted_signal != 0)
+            std::raise(noted_signal);
+    }
+
+    void print() {
+        if (!may_gather_)
+            return aclfck__print_error();
+        if (!is_waiting_)
+            note_signals();
+        print_recorded_error();
+    }
+
+    static bool must_end() { return noted_signal != 0; }
+
+private:
+    static constexpr int ending_signals[] = {SIGHUP, SIGINT, SIGQUIT, SIGTERM};
+    static constexpr std::size_t count = std::size(ending_signals);
+
+    void note_signals() {
+        struct sigaction noting = {};
+        noting.sa_handler = [](int signal) { noted_signal = signal; };
+        // What is written goes on where it was interrupted.
+        noting.sa_flags = SA_RESTART | SA_RESETHAND;
+        for (std::size_t i = 0; i != count; ++i) {
+            sigaction(ending_signals[i], nullptr, &before_[i]);
+            if (before_[i].sa_handler == SIG_DFL)
+                sigaction(ending_signals[i], &noting, nullptr);
+        }
+        is_waiting_ = true;
+    }
+
+    const bool may_gather_;
+    bool is_waiting_ = false;
+    struct sigaction before_[count] = {};
+};
+
 // Collects the entries of every line. Returns the failure that ends the check; failures that are passed over
 // clear `is_clean` instead.
 int read_entries(qz::acl_text &text, unsigned flags, sec_acltree_array &trees, bool &is_clean) {
     const bool goes_on = (flags & ACLFCK_OPT_CONTINUE) != 0;
     const bool is_verbose = (flags & ACLFCK_OPT_VERBOSE) != 0;
     const bool may_wait = !goes_on && !is_verbose;
+    line_failures failures(goes_on);
     qz::parsed_acle entry;
-    for (;;) {
+    while (!line_failures::must_end()) {
         const qz::acl_line line = text.next(entry);
         if (line == qz::acl_line::none)
             continue;
@@ -77,11 +139,12 @@ int read_entries(qz::acl_text &text, unsigned flags, sec_acltree_array &trees, b
             return SEC_S_OK;
         if (result == SEC_S_OK)
             continue;
-        aclfck__print_error();
+        failures.print();
         if (!may_go_on)
             return result;
         is_clean = false;
     }
+    return SEC_S_OK;
 }
 
 // Holds back every signal that can be, so that one that ends the command neither leaves half a cache nor the
@@ -147,9 +210,6 @@ void aclfck__keep_spare_memory() {
 }
 
 void aclfck__print_error() {
-    if (!qz::print_recorded(stderr, "\n")) {
-        spare_memory.reset();
-        static_cast<void>(qz::print_recorded(stderr, "\n"));
-    }
+    print_recorded_error();
     std::fflush(stderr);
 }

@@ -10,7 +10,8 @@ enum : unsigned {
     ACLFCK_OPT_HELP = 16,
 };
 
-// Checks the file, printing each failure on standard error when it happens. `username` may be null; of the
+// Checks the file, printing each failure on standard error: on a terminal when it happens, otherwise those of lines
+// gathered. `username` may be null; of the
 // flags, compile, continue and verbose have an effect. Returns the exit status of the command.
 int aclfck__bulk_aclfile(const char *aclfname, const char *username, unsigned flags);
 

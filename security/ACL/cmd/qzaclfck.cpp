@@ -164,7 +164,7 @@ int main(int argc, char *argv[]) {
     fill_standard_descriptors();
     aclfck__keep_spare_memory();
     std::setlocale(LC_ALL, "");
-    // Entry lines are gathered; every failure is flushed when it is printed, and the rest at the end.
+    // Entry lines are gathered, and failures of lines where nobody watches; other messages are flushed at once.
     static char stream_buffer[1 << 16];
     std::setvbuf(stderr, stream_buffer, _IOFBF, sizeof stream_buffer);
 
