@@ -96,7 +96,7 @@ private:
         struct sigaction noting = {};
         noting.sa_handler = [](int signal) { noted_signal = signal; };
         // What is written goes on where it was interrupted.
-        noting.sa_flags = SA_RESTART | SA_RESETHAND;
+        noting.sa_flags = static_cast<int>(SA_RESTART | SA_RESETHAND);
         for (std::size_t i = 0; i != count; ++i) {
             sigaction(ending_signals[i], nullptr, &before_[i]);
             if (before_[i].sa_handler == SIG_DFL)
