@@ -2,7 +2,7 @@
 #include "qzacl_acl/buffer.h"
 
 #include "base/owned.h"
-#include "libqz_cu/posix_fold.h"
+#include "base/posix_fold.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_trace.h"
