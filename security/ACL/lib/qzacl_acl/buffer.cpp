@@ -71,10 +71,9 @@ int sec_release_acl(sec_acl_buffer_t *acl) {
     return result;
 }
 
-int sec__find_subacl(const sec_acl_buffer_t *acl, std::uint8_t type, const char *mechanism,
-                     const unsigned char **subacl) {
-    *subacl = nullptr;
-    qz::format::subacl_walk walk(qz::format::bytes_of(*acl));
+qz::stored_subacl sec__find_subacl(const sec_acl_buffer_t *acl, std::uint8_t type, const char *mechanism) {
+    const qz::byte_span bytes = qz::format::bytes_of(*acl);
+    qz::format::subacl_walk walk(bytes);
     while (walk.next() == qz::format::subacl_walk::step::found) {
         if (walk.current().type != type)
             continue;
@@ -83,8 +82,7 @@ int sec__find_subacl(const sec_acl_buffer_t *acl, std::uint8_t type, const char 
             if (held == nullptr || qz::fold_compare(held, mechanism) != 0)
                 continue;
         }
-        *subacl = walk.bytes().data();
-        break;
+        return {true, bytes.size() - walk.left(), walk.current(), walk.entries()};
     }
-    return SEC_S_OK;
+    return {};
 }

@@ -103,25 +103,16 @@ int finish_deletion(sec_acl_buffer_t &acl) {
                           : qz::report_no_memory(delete_function, static_cast<std::size_t>(acl.length));
 }
 
-// The sub-ACL that an edit is about, as it stands in the buffer.
-struct stored_subacl {
-    const unsigned char *start = nullptr; // null when the key has none
-    std::size_t offset = 0;               // of the sub-ACL, or where a new one goes
-    format::subacl head;
-};
-
-int find(const sec_acl_buffer_t &acl, const sec_acle_t &acle, stored_subacl &out) {
-    if (const int result = sec__find_subacl(&acl, acle.type, acle.mechanism, &out.start); result != SEC_S_OK)
-        return result;
-    if (out.start == nullptr)
-        return SEC_S_OK;
-    const qz::byte_span bytes = format::bytes_from(acl, out.start);
-    qz::byte_reader reader(bytes);
-    out.offset = static_cast<std::size_t>(acl.length) - bytes.size();
-    // The bytes that the edit replaces must all be there.
-    if (!format::read(reader, out.head) || out.head.length > bytes.size())
+// Finds the sub-ACL that an edit is about. The bytes that the edit replaces must all be there.
+int find_edited(const sec_acl_buffer_t &acl, const sec_acle_t &acle, qz::stored_subacl &out) {
+    out = sec__find_subacl(&acl, acle.type, acle.mechanism);
+    if (out.is_there && out.head.length > static_cast<std::size_t>(acl.length) - out.offset)
         return qz::report_corrupt(__LINE__);
     return SEC_S_OK;
+}
+
+qz::byte_span bytes_from(const sec_acl_buffer_t &acl, std::size_t offset) {
+    return format::bytes_of(acl).subspan(offset);
 }
 
 // Where an identity stands, or would stand, among packed entries.
@@ -138,9 +129,9 @@ bool has_sorted_form(const format::subacl &head) {
     return head.type == SEC_ACLE_GROUP && head.mechanism_length == 0;
 }
 
-// Passes by entries that are clearly what compiling gives, each behind the one before it: up to where the wanted
+// Skips entries that are clearly what compiling gives, each behind the one before it: up to where the wanted
 // identity may stand, or all of them once its place is known. `previous` is the identity before the next entry.
-void pass_ascending(const qz::wanted_identity &wanted, bool is_placed, qz::byte_span &previous,
+void skip_ascending(const qz::wanted_identity &wanted, bool is_placed, qz::byte_span &previous,
                     format::entry_walk &walk) {
     constexpr std::size_t block_size = qz::identity_block::size;
     if (walk.left == 0 || previous.size() + walk.entries.left() < block_size)
@@ -149,7 +140,7 @@ void pass_ascending(const qz::wanted_identity &wanted, bool is_placed, qz::byte_
     qz::identity_block before(previous.data());
     std::size_t before_size = previous.size();
     const unsigned char *last = previous.data();
-    format::pass_entries(walk, block_size, [&](std::uint8_t version, qz::byte_span identity) {
+    format::skip_entries_while(walk, block_size, [&](std::uint8_t version, qz::byte_span identity) {
         const qz::identity_block block(identity.data());
         // Behind the NUL of the one before stand other fields, which say nothing of the order.
         if (version != format::entry_version || !qz::ends_exactly(identity) || !before.sorts_before(block) ||
@@ -196,7 +187,7 @@ bool find_packed(qz::byte_span subacl, const format::subacl &head, const char *i
         }
         previous = entry.identity;
         --walk.left;
-        pass_ascending(wanted, is_placed, previous, walk);
+        skip_ascending(wanted, is_placed, previous, walk);
     }
     if (!is_placed)
         place = {subacl.size() - walk.entries.left(), 0};
@@ -212,14 +203,14 @@ bool may_edit_packed(const sec_acle_t &acle, const sec_acl_buffer_t &acl) {
     return qz::has_identity(acle.type) && place >= bytes.size() && !qz::traces(qz::trace_category::api);
 }
 
-void store_subacl_size(const sec_acl_buffer_t &acl, const stored_subacl &stored, std::size_t length,
+void store_subacl_size(const sec_acl_buffer_t &acl, const qz::stored_subacl &stored, std::size_t length,
                        std::uint32_t count) {
     qz::store_field(writable(acl), stored.offset, static_cast<std::uint32_t>(length));
     qz::store_field(writable(acl), stored.offset + format::subacl_count_offset, count);
 }
 
 // Adds to packed entries. The identity is known to fit the format.
-int add_packed(const sec_acle_t &acle, int report_duplicates, const stored_subacl &stored,
+int add_packed(const sec_acle_t &acle, int report_duplicates, const qz::stored_subacl &stored,
                const packed_place &place, sec_acl_buffer_t &acl) {
     if (place.size != 0) {
         if (report_duplicates != 0)
@@ -241,9 +232,9 @@ int add_packed(const sec_acle_t &acle, int report_duplicates, const stored_subac
 }
 
 // Puts what a changed tree compiled to in the place of the stored sub-ACL, or where a new one goes.
-int splice(const qz::loose_subacl &compiled, const stored_subacl &stored, const char *function,
+int splice(const qz::loose_subacl &compiled, const qz::stored_subacl &stored, const char *function,
            sec_acl_buffer_t &acl) {
-    const bool is_new = stored.start == nullptr;
+    const bool is_new = !stored.is_there;
     const std::size_t count = subacl_count(acl);
     if (is_new && count == format::subacls_max)
         return qz::report_no_memory(function, static_cast<std::size_t>(acl.length) + compiled.length);
@@ -259,11 +250,11 @@ int splice(const qz::loose_subacl &compiled, const stored_subacl &stored, const 
     return SEC_S_OK;
 }
 
-int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_subacl &stored,
+int add_by_tree(const sec_acle_t &acle, int report_duplicates, const qz::stored_subacl &stored,
                 sec_acl_buffer_t &acl) {
     sec_acltree_t *root = nullptr;
-    if (stored.start != nullptr) {
-        const int result = sec__subacl_to_acltree(format::bytes_from(acl, stored.start), &root);
+    if (stored.is_there) {
+        const int result = sec__subacl_to_acltree(bytes_from(acl, stored.offset), &root);
         if (result != SEC_S_OK)
             return result;
     }
@@ -287,15 +278,15 @@ int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_suba
 }
 
 int add_to_buffer(const sec_acle_t &acle, int report_duplicates, sec_acl_buffer_t &acl) {
-    stored_subacl stored;
-    if (const int result = find(acl, acle, stored); result != SEC_S_OK)
+    qz::stored_subacl stored;
+    if (const int result = find_edited(acl, acle, stored); result != SEC_S_OK)
         return result;
-    if (stored.start == nullptr && !format::find_end(format::bytes_of(acl), stored.offset))
+    if (!stored.is_there && !format::find_end(format::bytes_of(acl), stored.offset))
         return qz::report_corrupt(__LINE__);
     packed_place place;
-    if (stored.start != nullptr && may_edit_packed(acle, acl) &&
-        std::strlen(acle.identity) <= format::identity_max &&
-        find_packed({stored.start, stored.head.length}, stored.head, acle.identity, place))
+    if (stored.is_there && may_edit_packed(acle, acl) && std::strlen(acle.identity) <= format::identity_max &&
+        find_packed(bytes_from(acl, stored.offset).first(stored.head.length), stored.head, acle.identity,
+                    place))
         return add_packed(acle, report_duplicates, stored, place, acl);
     return add_by_tree(acle, report_duplicates, stored, acl);
 }
@@ -326,7 +317,7 @@ int add_checked(const sec_acle_t *acle, int report_duplicates, sec_acl_buffer_t 
     return result;
 }
 
-int delete_packed(const stored_subacl &stored, const packed_place &place, sec_acl_buffer_t &acl) {
+int delete_packed(const qz::stored_subacl &stored, const packed_place &place, sec_acl_buffer_t &acl) {
     const bool is_last = stored.head.entry_count == 1;
     const std::size_t offset = is_last ? stored.offset : stored.offset + place.offset;
     const std::size_t size = is_last ? stored.head.length : place.size;
@@ -339,9 +330,9 @@ int delete_packed(const stored_subacl &stored, const packed_place &place, sec_ac
     return finish_deletion(acl);
 }
 
-int delete_by_tree(const sec_acle_t &acle, const stored_subacl &stored, sec_acl_buffer_t &acl) {
+int delete_by_tree(const sec_acle_t &acle, const qz::stored_subacl &stored, sec_acl_buffer_t &acl) {
     sec_acltree_t *root = nullptr;
-    int result = sec__subacl_to_acltree(format::bytes_from(acl, stored.start), &root);
+    int result = sec__subacl_to_acltree(bytes_from(acl, stored.offset), &root);
     if (result != SEC_S_OK)
         return result;
     const qz::owned_acltree tree(root);
@@ -368,14 +359,14 @@ int delete_checked(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
     if (const int result = check_header(*acl); result != SEC_S_OK)
         return result;
 
-    stored_subacl stored;
-    if (const int result = find(*acl, *acle, stored); result != SEC_S_OK)
+    qz::stored_subacl stored;
+    if (const int result = find_edited(*acl, *acle, stored); result != SEC_S_OK)
         return result;
-    if (stored.start == nullptr)
+    if (!stored.is_there)
         return sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, qz::view_of(*acle));
     packed_place place;
-    if (may_edit_packed(*acle, *acl) &&
-        find_packed({stored.start, stored.head.length}, stored.head, acle->identity, place))
+    if (may_edit_packed(*acle, *acl) && find_packed(bytes_from(*acl, stored.offset).first(stored.head.length),
+                                                    stored.head, acle->identity, place))
         return place.size == 0 ? sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, qz::view_of(*acle))
                                : delete_packed(stored, place, *acl);
     return delete_by_tree(*acle, stored, *acl);

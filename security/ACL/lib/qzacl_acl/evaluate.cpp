@@ -28,17 +28,6 @@ int check_buffer(const sec_acl_buffer_t &acl) {
     return bytes.size() < format::header_size ? qz::report_corrupt(__LINE__) : SEC_S_OK;
 }
 
-// Looks up the sub-ACL and reads its header. Inline, so that the reader stays in registers.
-[[gnu::always_inline]] inline bool find(const sec_acl_buffer_t &acl, std::uint8_t type, const char *mechanism,
-                                        format::subacl &head, qz::byte_reader &entries) {
-    const unsigned char *start = nullptr;
-    sec__find_subacl(&acl, type, mechanism, &start);
-    if (start == nullptr)
-        return false;
-    entries = qz::byte_reader(format::bytes_from(acl, start));
-    return format::read(entries, head);
-}
-
 struct single_request {
     std::uint8_t type_argument;
     const char *mechanism;
@@ -98,11 +87,10 @@ int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler
     return no_match(request, request.identity);
 }
 
-// Passes by the entries that sort before the wanted identity, all but those whose order is not clear at first
-// sight.
-[[gnu::noinline]] void pass_by(const qz::wanted_identity &wanted, format::entry_walk &walk) {
+// Skips the entries that sort before the wanted identity, all but those whose order is not clear at first sight.
+[[gnu::noinline]] void skip_before(const qz::wanted_identity &wanted, format::entry_walk &walk) {
     const qz::wanted_identity held_in_registers = wanted; // a copy, which nothing else can change meanwhile
-    format::pass_entries(walk, qz::identity_block::size, [&](std::uint8_t, qz::byte_span identity) {
+    format::skip_entries_while(walk, qz::identity_block::size, [&](std::uint8_t, qz::byte_span identity) {
         return held_in_registers.is_clearly_behind(qz::identity_block(identity.data()));
     });
 }
@@ -112,7 +100,7 @@ int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler
 qz::identity_order compare_next(const qz::wanted_identity &wanted, format::entry_walk &walk,
                                 format::entry &entry) {
     for (;;) {
-        pass_by(wanted, walk);
+        skip_before(wanted, walk);
         if (walk.left == 0)
             return qz::identity_order::behind;
         qz::byte_reader next = walk.entries;
@@ -160,10 +148,12 @@ int evaluate_single(const sec_acl_buffer_t *acl, single_request &request, const 
     }
     *mask = 0;
 
-    format::subacl head;
-    qz::byte_reader entries;
-    if (!find(*acl, type, subacl_mechanism == nullptr ? request.mechanism : subacl_mechanism, head, entries))
+    const qz::stored_subacl found =
+        sec__find_subacl(acl, type, subacl_mechanism == nullptr ? request.mechanism : subacl_mechanism);
+    if (!found.is_there)
         return no_match(request, "");
+    const format::subacl &head = found.head;
+    const qz::byte_reader entries = found.entries;
     if (qz::is_single_type(type))
         return evaluate_single_entry(request, head, entries, *mask);
 
@@ -232,9 +222,8 @@ int evaluate_groups(const sec_acl_buffer_t *acl, std::int32_t count, const sec_g
     *mask = 0;
     if (count == 0)
         return SEC_S_OK;
-    format::subacl head;
-    qz::byte_reader entries;
-    if (!find(*acl, SEC_ACLE_GROUP, nullptr, head, entries) || count < 0)
+    const qz::stored_subacl found = sec__find_subacl(acl, SEC_ACLE_GROUP, nullptr);
+    if (!found.is_there || count < 0)
         return no_group();
 
     std::uint32_t granted = 0;
@@ -244,7 +233,8 @@ int evaluate_groups(const sec_acl_buffer_t *acl, std::int32_t count, const sec_g
         if (groups[index].name != nullptr)
             batch.add(groups[index].name);
         if (batch.is_full() || index == count - 1) {
-            if (const int result = batch.evaluate(head, entries, granted, is_found); result != SEC_S_OK)
+            if (const int result = batch.evaluate(found.head, found.entries, granted, is_found);
+                result != SEC_S_OK)
                 return result;
         }
     }
