@@ -1,5 +1,24 @@
-// Access decisions: which permissions a compiled ACL grants one party, or the groups of one. The buffer is
-// read in place, nothing is allocated but what recording a long identity takes, and the one lock is held only while a handler is looked up.
+// Access decisions: which permissions a compiled ACL grants one party, or the groups of one.
+//
+//   permissions of one party:
+//       the sub-ACL is the first one of the type and, for user and expanded entries, of the mechanism
+//       no sub-ACL:                          nothing matches
+//       unauthenticated or any other:        its one entry matches
+//       expanded, and no handler known:      nothing matches
+//       for each entry, in the order stored:
+//           order = handler(wanted, entry)   for expanded entries, and for users where it is asked for and known
+//                 = wanted <=> entry         else, without regard to case
+//           order is equal:                  the entry matches
+//           order is less, not expanded:     nothing matches; what follows sorts behind, too
+//       nothing matches
+//
+//   permissions of groups:
+//       each group as one party, without a handler; the masks of all that match, joined
+//
+// The order of the entries is taken as it is stored: one that is not ascending hides entries.
+//
+// The buffer is read in place. Nothing is allocated but what recording a long identity takes, and the one lock is held
+// only while a handler is looked up.
 #include "qzacl_acl/buffer.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/entry.h"
