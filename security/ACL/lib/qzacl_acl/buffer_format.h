@@ -215,15 +215,11 @@ public:
             return step::corrupt;
         is_started_ = true;
         --left_;
-        entries_ = next_;
-        return read(entries_, current_) ? step::found : step::corrupt;
+        byte_reader head = next_;
+        return read(head, current_) ? step::found : step::corrupt;
     }
 
     const subacl &current() const { return current_; }
-    // Stands before the first entry of the current sub-ACL, and reaches to the end of the buffer.
-    const byte_reader &entries() const { return entries_; }
-    // The bytes of the buffer from the start of the current sub-ACL on.
-    std::size_t left() const { return next_.left(); }
     // The bytes that the current sub-ACL may take: up to where the next one starts, and for the last up to
     // the end of the buffer. So however sub-ACLs are made to overlap, walking over all their entries takes no
     // more than the bytes can hold.
@@ -234,7 +230,6 @@ public:
 
 private:
     byte_reader next_;
-    byte_reader entries_;
     subacl current_;
     std::size_t left_ = 0;
     bool is_started_ = false;

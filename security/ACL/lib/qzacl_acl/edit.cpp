@@ -55,7 +55,7 @@ int check_header(const sec_acl_buffer_t &acl) {
 
 // Finds the sub-ACL that an edit is about. The bytes that the edit replaces must all be there.
 int find_edited(const sec_acl_buffer_t &acl, const sec_acle_t &acle, qz::stored_subacl &out) {
-    out = sec__find_subacl(&acl, acle.type, acle.mechanism);
+    out = qz::find_subacl(acl, acle.type, acle.mechanism);
     if (out.is_there && out.head.length > static_cast<std::size_t>(acl.length) - out.offset)
         return qz::report_corrupt(__LINE__);
     return SEC_S_OK;

@@ -167,12 +167,11 @@ int evaluate_single(const sec_acl_buffer_t *acl, single_request &request, const 
     }
     *mask = 0;
 
-    const qz::stored_subacl found =
-        sec__find_subacl(acl, type, subacl_mechanism == nullptr ? request.mechanism : subacl_mechanism);
-    if (!found.is_there)
+    format::subacl head;
+    qz::byte_reader entries;
+    if (!qz::find_subacl(*acl, type, subacl_mechanism == nullptr ? request.mechanism : subacl_mechanism, head,
+                         entries))
         return no_match(request, "");
-    const format::subacl &head = found.head;
-    const qz::byte_reader entries = found.entries;
     if (qz::is_single_type(type))
         return evaluate_single_entry(request, head, entries, *mask);
 
@@ -241,8 +240,9 @@ int evaluate_groups(const sec_acl_buffer_t *acl, std::int32_t count, const sec_g
     *mask = 0;
     if (count == 0)
         return SEC_S_OK;
-    const qz::stored_subacl found = sec__find_subacl(acl, SEC_ACLE_GROUP, nullptr);
-    if (!found.is_there || count < 0)
+    format::subacl head;
+    qz::byte_reader entries;
+    if (!qz::find_subacl(*acl, SEC_ACLE_GROUP, nullptr, head, entries) || count < 0)
         return no_group();
 
     std::uint32_t granted = 0;
@@ -252,8 +252,7 @@ int evaluate_groups(const sec_acl_buffer_t *acl, std::int32_t count, const sec_g
         if (groups[index].name != nullptr)
             batch.add(groups[index].name);
         if (batch.is_full() || index == count - 1) {
-            if (const int result = batch.evaluate(found.head, found.entries, granted, is_found);
-                result != SEC_S_OK)
+            if (const int result = batch.evaluate(head, entries, granted, is_found); result != SEC_S_OK)
                 return result;
         }
     }

@@ -58,7 +58,7 @@ int append_first_of(const sec_acl_buffer_t &acl, std::uint8_t type, const char *
     const qz::byte_span bytes = format::bytes_of(acl);
     if (is_cut_short(bytes))
         return qz::report_corrupt(__LINE__);
-    const qz::stored_subacl found = sec__find_subacl(&acl, type, mechanism);
+    const qz::stored_subacl found = qz::find_subacl(acl, type, mechanism);
     return found.is_there ? append_subacl(bytes.subspan(found.offset), list) : SEC_S_OK;
 }
 
