@@ -34,10 +34,11 @@ void skip_ascending(const wanted_identity &wanted, bool is_placed, byte_span &pr
     format::skip_entries_while(walk, block_size, [&](std::uint8_t version, byte_span identity) {
         const identity_block block(identity.data());
         // Behind the NUL of the one before stand other fields, which say nothing of the order.
-        if (version != format::entry_version || !ends_exactly(identity) || !before.sorts_before(block) ||
-            before.differs_at(block) >= before_size)
+        if (version != format::entry_version || !before.sorts_before_within(before_size, block))
             return false;
         if (!is_placed && !held_in_registers.is_clearly_behind(block))
+            return false;
+        if (!ends_exactly(identity))
             return false;
         before = block;
         before_size = identity.size();

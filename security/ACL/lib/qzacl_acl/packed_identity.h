@@ -95,21 +95,22 @@ public:
         return mine < others;
     }
 
-    // The place of the first byte that differs; `size` where all are equal.
-    unsigned differs_at(const identity_block &other) const {
+    // True when this block sorts before the other, and one of its first `count` bytes shows it.
+    bool sorts_before_within(std::size_t count, const identity_block &other) const {
         const std::uint64_t front = first() ^ other.first();
         if (front != 0)
-            return static_cast<unsigned>(std::countl_zero(front)) / 8;
-        return 8 + static_cast<unsigned>(std::countl_zero(second() ^ other.second())) / 8;
+            return first() < other.first() && static_cast<unsigned>(std::countl_zero(front)) / 8 < count;
+        const std::uint64_t back = second() ^ other.second();
+        return second() < other.second() && 8 + static_cast<unsigned>(std::countl_zero(back)) / 8 < count;
     }
 };
 
-// The place of the first NUL among the sixteen bytes of a block; at least sixteen where there is none.
+// The place of the first NUL among the sixteen bytes of a block; sixteen where there is none.
 inline unsigned nul_in_block(const unsigned char *bytes) {
 #ifdef __x86_64__
     const __m128i raw = _mm_loadu_si128(reinterpret_cast<const __m128i *>(bytes));
     const int nuls = _mm_movemask_epi8(_mm_cmpeq_epi8(raw, _mm_setzero_si128()));
-    return static_cast<unsigned>(std::countr_zero(static_cast<unsigned>(nuls)));
+    return static_cast<unsigned>(std::countr_zero(static_cast<unsigned>(nuls) | 1U << identity_block::size));
 #else
     const unsigned nul = bytes_before_nul(load8(bytes));
     return nul < word_size ? nul : nul + bytes_before_nul(load8(bytes + word_size));
@@ -117,11 +118,14 @@ inline unsigned nul_in_block(const unsigned char *bytes) {
 }
 
 // True when the string of a field of which a whole block may be read ends where the field does. Most end within
-// the block, and a call for each would cost more than all the rest of a walk.
+// two blocks, and a call for each would cost more than all the rest of a walk.
 inline bool ends_exactly(byte_span field) {
-    const std::size_t nul = nul_in_block(field.data());
-    if (nul < identity_block::size)
+    constexpr std::size_t size = identity_block::size;
+    if (const std::size_t nul = nul_in_block(field.data()); nul != size) [[likely]]
         return nul + 1 == field.size();
+    // The block that ends with the field: no NUL is before it.
+    if (field.size() > size && field.size() <= 2 * size)
+        return nul_in_block(field.data() + field.size() - size) == size - 1;
     return format::holds_exact_string(field);
 }
 
