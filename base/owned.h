@@ -3,8 +3,10 @@
 #define QZ_OWNED_H
 
 #include <cstddef>
+#include <cstdint>
 #include <cstdlib>
 #include <memory>
+#include <type_traits>
 #include <unistd.h>
 #include <utility>
 

@@ -1,7 +1,7 @@
 // The platform utility library: errors and their texts, catalogs that are not there, letter case, clock, and what
 // threads share. What texts and code sets convert to is left to the fuzzers.
+#include "base/posix_fold.h"
 #include "faults.h"
-#include "libqz_cu/posix_fold.h"
 #include "qz/cu.h"
 
 #include <gtest/gtest.h>

@@ -1,5 +1,5 @@
 // The clock: a counter of nanoseconds, which the kernel lets us read without a system call, as a time.
-#include "libqz_cu/wide_product.h"
+#include "base/wide_product.h"
 #include "qz/cu.h"
 
 #include <cstdint>

@@ -1,8 +1,10 @@
 // Code-set conversion over the system's iconv. A handle is only ever read; what a conversion changes, the
 // system's converter with its shift state, each thread has of its own for each handle.
+#include "base/owned.h"
+#include "base/posix_fold.h"
 #include "base/uncancelled.h"
+#include "base/utf8.h"
 #include "libqz_cu/kept_errno.h"
-#include "libqz_cu/posix_fold.h"
 #include "qz/cu.h"
 
 #include <algorithm>
@@ -10,6 +12,7 @@
 #include <cstring>
 #include <iconv.h>
 #include <pthread.h>
+#include <string_view>
 
 struct cu_iconv {
     pthread_key_t converters; // of the threads; unused when both code sets are UTF-8
@@ -28,86 +31,47 @@ using qz::cu::kept_errno;
 const iconv_t no_converter = reinterpret_cast<iconv_t>(-1);
 constexpr std::size_t failed = static_cast<std::size_t>(-1);
 
-// A block that is given back unless somebody takes it.
-class owned_block {
-public:
-    owned_block() = default;
-    ~owned_block() { std::free(bytes_); }
-    owned_block(const owned_block &) = delete;
-    owned_block &operator=(const owned_block &) = delete;
-
-    char *get() const { return static_cast<char *>(bytes_); }
+struct result {
+    qz::owned<char[]> block;
+    std::size_t length = 0;
 
     // On failure the block stays as it was. No bytes are a block too, so that null always means failure.
-    bool resize(std::size_t size) {
-        void *moved = std::realloc(bytes_, size != 0 ? size : 1);
-        if (moved == nullptr)
-            return false;
-        bytes_ = moved;
-        return true;
-    }
-
-    char *take() {
-        char *taken = get();
-        bytes_ = nullptr;
-        return taken;
-    }
-
-private:
-    void *bytes_ = nullptr;
-};
-
-struct result {
-    owned_block block;
-    std::size_t length = 0;
+    bool resize(std::size_t size) { return qz::reallocate(block, std::max<std::size_t>(size, 1)); }
 };
 
 bool is_ascii(const char *in, std::size_t length) {
     std::uint64_t seen = 0;
-    for (; length >= 8; in += 8, length -= 8)
+    for (; length >= qz::word_size; in += qz::word_size, length -= qz::word_size)
         seen |= qz::load8(in);
     for (; length != 0; ++in, --length)
         seen |= static_cast<unsigned char>(*in);
-    return (seen & 0x8080808080808080) == 0;
+    return (seen & qz::in_each_byte(0x80)) == 0;
 }
 
 // Characters above U+FFFF are the ones that begin with such a byte in UTF-8.
 bool leaves_bmp(unsigned char lead) { return lead >= 0xf0; }
 
-// Whether bytes are UTF-8: no longer forms than needed, no surrogates, nothing above U+10FFFF. The system's
-// converters let the last pass.
-bool is_valid_utf8(const char *in, std::size_t left) {
-    while (left != 0) {
-        const auto lead = static_cast<unsigned char>(*in);
-        const std::size_t more = lead < 0x80 ? 0 : lead < 0xe0 ? 1 : lead < 0xf0 ? 2 : 3;
-        if ((lead >= 0x80 && lead < 0xc2) || lead > 0xf4 || more >= left)
+// The system's converters let surrogates, longer forms and what is above U+10FFFF pass.
+bool is_valid_utf8(std::string_view bytes) {
+    for (std::uint32_t point = 0; !bytes.empty();) {
+        if (!qz::take_utf8(bytes, point))
             return false;
-        for (std::size_t i = 1; i <= more; ++i) {
-            const auto byte = static_cast<unsigned char>(in[i]);
-            const bool second = i == 1;
-            const unsigned lowest = second && lead == 0xe0 ? 0xa0 : second && lead == 0xf0 ? 0x90 : 0x80;
-            const unsigned highest = second && lead == 0xed ? 0x9f : second && lead == 0xf4 ? 0x8f : 0xbf;
-            if (byte < lowest || byte > highest)
-                return false;
-        }
-        in += more + 1;
-        left -= more + 1;
     }
     return true;
 }
 
-int copy(const char *in, std::size_t length, result &out) {
-    if (!out.block.resize(length))
+int copy_unchanged(const char *in, std::size_t length, result &out) {
+    if (!out.resize(length))
         return CU_ICONV_NO_MEMORY;
     std::memcpy(out.block.get(), in, length);
     out.length = length;
     return CU_OK;
 }
 
-int convert(iconv_t converter, const char *in, std::size_t in_left, result &out) {
+int run_converter(iconv_t converter, const char *in, std::size_t in_left, result &out) {
     // Most conversions keep the length or lose some; the others grow the block as they go.
     std::size_t size = in_left + 16;
-    if (size < in_left || !out.block.resize(size))
+    if (size < in_left || !out.resize(size))
         return CU_ICONV_NO_MEMORY;
     // An earlier conversion may have failed amid a shift.
     iconv(converter, nullptr, nullptr, nullptr, nullptr);
@@ -128,14 +92,14 @@ int convert(iconv_t converter, const char *in, std::size_t in_left, result &out)
         } else if (errno != E2BIG) {
             return CU_INTERNAL;
         } else {
-            if (size > SIZE_MAX / 2 || !out.block.resize(size * 2))
+            if (size > SIZE_MAX / 2 || !out.resize(size * 2))
                 return CU_ICONV_NO_MEMORY;
             size *= 2;
         }
     }
     // Should the smaller block be refused, the larger one serves.
     if (out.length != size)
-        out.block.resize(out.length);
+        out.resize(out.length);
     return CU_OK;
 }
 
@@ -182,7 +146,7 @@ int examine(cu_iconv &handle) {
     if (const int code = converter_of(handle, converter); code != CU_OK)
         return code;
     result out;
-    const int code = convert(converter, probe.bytes, sizeof probe.bytes, out);
+    const int code = run_converter(converter, probe.bytes, sizeof probe.bytes, out);
     if (code == CU_ICONV_NO_MEMORY)
         return code;
     handle.ascii_as_it_is = code == CU_OK && out.length == sizeof probe.bytes &&
@@ -196,21 +160,21 @@ bool is_utf8(const char *codeset) {
 
 // Whether the handle lets the UTF-8 of a conversion, be it what goes in or what comes out, pass.
 bool allows(const cu_iconv &handle, const char *utf8, std::size_t length) {
-    return (handle.unmodified || is_valid_utf8(utf8, length)) &&
+    return (handle.unmodified || is_valid_utf8({utf8, length})) &&
            !(handle.bmp_only && std::any_of(utf8, utf8 + length, leaves_bmp));
 }
 
 int convert_for(const cu_iconv &handle, const char *in, std::size_t length, result &out) {
     if (handle.ascii_as_it_is && is_ascii(in, length))
-        return copy(in, length, out);
+        return copy_unchanged(in, length, out);
     if ((handle.from_utf8 || handle.utf8_alone) && !allows(handle, in, length))
         return CU_ICONV_UNCONVERTIBLE;
     if (handle.utf8_alone)
-        return copy(in, length, out);
+        return copy_unchanged(in, length, out);
     iconv_t converter;
     int code = converter_of(handle, converter);
     if (code == CU_OK)
-        code = convert(converter, in, length, out);
+        code = run_converter(converter, in, length, out);
     if (code == CU_OK && !handle.from_utf8 && !allows(handle, out.block.get(), out.length))
         return CU_ICONV_UNCONVERTIBLE;
     // The code set was there when the handle was opened.
@@ -230,11 +194,10 @@ int cu_iconv_open_1(const char *codeset, uint32_t flags, cu_iconv_t *handle) {
     const kept_errno kept;
     const qz::uncancelled until_all_is_closed;
     const std::size_t length = std::strlen(codeset);
-    owned_block block;
-    if (!block.resize(sizeof(cu_iconv) + length))
+    qz::owned<cu_iconv> made(static_cast<cu_iconv *>(std::malloc(sizeof(cu_iconv) + length)));
+    if (made == nullptr)
         return CU_ICONV_NO_MEMORY;
     const bool utf8_alone = is_utf8(codeset);
-    auto *made = reinterpret_cast<cu_iconv *>(block.get());
     *made = {.converters = {},
              .from_utf8 = (flags & CU_ICONV_FROM_UTF8) != 0,
              .utf8_alone = utf8_alone,
@@ -253,8 +216,7 @@ int cu_iconv_open_1(const char *codeset, uint32_t flags, cu_iconv_t *handle) {
             return code;
         }
     }
-    *handle = made;
-    block.take();
+    *handle = made.release();
     return CU_OK;
 }
 
@@ -267,7 +229,7 @@ int cu_iconv_str_1(cu_iconv_t handle, uint32_t options, const char *in, const si
     result made;
     const int code = convert_for(*handle, in, *in_length, made);
     if (code == CU_OK) {
-        *out = made.block.take();
+        *out = made.block.release();
         *out_length = made.length;
     }
     return code;

@@ -1,5 +1,5 @@
 // Strings by the rules of the POSIX locale, as calls.
-#include "libqz_cu/posix_fold.h"
+#include "base/posix_fold.h"
 #include "qz/cu.h"
 
 int cu_strcasecmp_posix_1(const char *a, const char *b) { return qz::fold_compare(a, b); }

@@ -1,6 +1,7 @@
 // The public operations: they check arguments and keep the caller's thread undisturbed.
 #include "qz/tr.h"
 
+#include "base/owned.h"
 #include "base/uncancelled.h"
 #include "libqz_tr/line.h"
 #include "libqz_tr/registry.h"
@@ -10,9 +11,7 @@
 #include <array>
 #include <cerrno>
 #include <cstdarg>
-#include <cstdlib>
 #include <cstring>
-#include <memory>
 #include <unistd.h>
 
 namespace {
@@ -33,10 +32,6 @@ public:
 private:
     int errno_ = errno;
     qz::uncancelled uncancelled_;
-};
-
-struct free_memory {
-    void operator()(char *memory) const { std::free(memory); }
 };
 
 // What a line says besides its items, so that it can be formed twice alike.
@@ -67,7 +62,7 @@ int record(const record_head &head, int count, va_list items, va_list items_agai
         return TR_TOO_LARGE;
     if (line.fits())
         return trace_file::append(line.text());
-    const std::unique_ptr<char, free_memory> memory(static_cast<char *>(std::malloc(line.size())));
+    const auto memory = qz::allocate<char>(line.size());
     if (memory == nullptr)
         return TR_NO_MEMORY;
     trace_line large{{memory.get(), line.size()}};

@@ -2,12 +2,12 @@
 // place, and writes to it such that nothing which befalls the file reaches the traced program.
 #include "libqz_tr/trace_file.h"
 
+#include "base/limited_write.h"
 #include "base/open_file.h"
 #include "libqz_tr/environment.h"
 #include "qz/tr.h"
 
 #include <cerrno>
-#include <csignal>
 #include <fcntl.h>
 #include <pthread.h>
 #include <sys/resource.h>
@@ -51,32 +51,14 @@ bool is_ours(struct stat &status) {
            status.st_ino == inode;
 }
 
-ssize_t write_once(std::string_view line) {
+using write_function = ssize_t(int fd, const void *bytes, std::size_t count);
+
+bool write_line(write_function *write_some, std::string_view line) {
     ssize_t written = 0;
     do {
-        written = write(descriptor, line.data(), line.size());
+        written = write_some(descriptor, line.data(), line.size());
     } while (written < 0 && errno == EINTR);
-    return written;
-}
-
-// Under a file size limit a write may raise SIGXFSZ, which ends a program that does not expect it. The signal
-// is held back during the write, and taken away if this write raised it.
-ssize_t write_under_limit(std::string_view line) {
-    sigset_t limit_signal;
-    sigset_t before;
-    sigset_t pending;
-    sigemptyset(&limit_signal);
-    sigaddset(&limit_signal, SIGXFSZ);
-    pthread_sigmask(SIG_BLOCK, &limit_signal, &before);
-    sigpending(&pending);
-    const ssize_t written = write_once(line);
-    if (written < 0 && errno == EFBIG && sigismember(&pending, SIGXFSZ) == 0) {
-        const timespec at_once{};
-        while (sigtimedwait(&limit_signal, nullptr, &at_once) < 0 && errno == EINTR) {
-        }
-    }
-    pthread_sigmask(SIG_SETMASK, &before, nullptr);
-    return written;
+    return written >= 0 && static_cast<std::size_t>(written) == line.size();
 }
 
 } // namespace
@@ -96,13 +78,10 @@ int append(std::string_view line) {
     if (!is_ours(status))
         return TR_NO_FILE;
     rlimit limit{};
-    ssize_t written = -1;
-    if (getrlimit(RLIMIT_FSIZE, &limit) != 0 || limit.rlim_cur == RLIM_INFINITY) {
-        written = write_once(line);
-    } else if (static_cast<rlim_t>(status.st_size) + line.size() <= limit.rlim_cur) {
-        written = write_under_limit(line);
-    }
-    return written >= 0 && static_cast<std::size_t>(written) == line.size() ? TR_OK : TR_FILE_ERROR;
+    const bool is_limited = getrlimit(RLIMIT_FSIZE, &limit) == 0 && limit.rlim_cur != RLIM_INFINITY;
+    if (is_limited && static_cast<rlim_t>(status.st_size) + line.size() > limit.rlim_cur)
+        return TR_FILE_ERROR;
+    return write_line(is_limited ? limited_write : write, line) ? TR_OK : TR_FILE_ERROR;
 }
 
 } // namespace qz::tr::trace_file

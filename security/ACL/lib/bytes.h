@@ -1,5 +1,5 @@
-// The one reader of bytes that somebody else made and the one writer of ours. Every step of the reader is
-// checked as "wanted is at most what is left"; nothing adds two lengths and hopes.
+// The one reader of bytes that somebody else made and the one writer of ours. All of them step through byte_cursor,
+// which checks that what is wanted is at most what is left; nothing adds two lengths and hopes.
 #ifndef QZ_BYTES_H
 #define QZ_BYTES_H
 
@@ -13,111 +13,99 @@ namespace qz {
 
 using byte_span = std::span<const unsigned char>;
 
-// Walks over a span. A step that does not fit takes nothing and returns false.
-class byte_reader {
+// Steps over bytes from their start to their end. A step that does not fit takes nothing and returns false.
+template <class Byte>
+class byte_cursor {
 public:
-    byte_reader() = default;
-    explicit byte_reader(byte_span bytes) : at_(bytes.data()), end_(bytes.data() + bytes.size()) {}
+    byte_cursor() = default;
+    explicit byte_cursor(std::span<Byte> bytes) : at_(bytes.data()), end_(bytes.data() + bytes.size()) {}
 
     std::size_t left() const { return static_cast<std::size_t>(end_ - at_); }
-    const unsigned char *position() const { return at_; }
+    Byte *position() const { return at_; }
 
-    bool skip(std::size_t count) {
+    // Steps over bytes and hands out where they start.
+    bool take(std::size_t count, Byte *&start) {
         if (count > left())
             return false;
+        start = at_;
         at_ += count;
         return true;
     }
 
+    bool skip(std::size_t count) {
+        Byte *skipped = nullptr;
+        return take(count, skipped);
+    }
+
+private:
+    Byte *at_ = nullptr;
+    Byte *end_ = nullptr;
+};
+
+class byte_reader : public byte_cursor<const unsigned char> {
+public:
+    using byte_cursor::byte_cursor;
+
     bool bytes(std::size_t count, byte_span &out) {
-        if (count > left())
+        const unsigned char *start = nullptr;
+        if (!take(count, start))
             return false;
-        out = byte_span(at_, count);
-        at_ += count;
+        out = byte_span(start, count);
         return true;
     }
 
     // An unsigned field in host byte order, at any address.
     template <class Field>
     bool field(Field &out) {
-        if (sizeof(Field) > left())
+        const unsigned char *start = nullptr;
+        if (!take(sizeof(Field), start))
             return false;
-        std::memcpy(&out, at_, sizeof(Field));
-        at_ += sizeof(Field);
+        std::memcpy(&out, start, sizeof(Field));
         return true;
     }
-
-private:
-    const unsigned char *at_ = nullptr;
-    const unsigned char *end_ = nullptr;
 };
 
-// A field in host byte order at an offset that the format fixes, inside bytes that were read as one piece.
-template <class Field>
-Field load_field(byte_span bytes, std::size_t offset) {
-    Field value = 0;
-    if (offset <= bytes.size() && sizeof(Field) <= bytes.size() - offset)
-        std::memcpy(&value, bytes.data() + offset, sizeof value);
-    return value;
-}
-
 // Walks over bytes of the other byte order, turning each field it is asked for into host order in place.
-class byte_swapper {
+class byte_swapper : public byte_cursor<unsigned char> {
 public:
-    explicit byte_swapper(std::span<unsigned char> bytes)
-        : at_(bytes.data()), end_(bytes.data() + bytes.size()) {}
-
-    const unsigned char *position() const { return at_; }
-
-    bool skip(std::size_t count) {
-        if (count > static_cast<std::size_t>(end_ - at_))
-            return false;
-        at_ += count;
-        return true;
-    }
+    using byte_cursor::byte_cursor;
 
     // A byte, which has no order.
     bool byte(std::uint8_t &out) {
-        if (at_ == end_)
+        unsigned char *start = nullptr;
+        if (!take(sizeof out, start))
             return false;
-        out = *at_++;
+        out = *start;
         return true;
     }
 
     // Swaps a field and hands out its value in host order.
     template <class Field>
     bool swap(Field &out) {
-        if (sizeof(Field) > static_cast<std::size_t>(end_ - at_))
+        unsigned char *start = nullptr;
+        if (!take(sizeof(Field), start))
             return false;
-        std::reverse(at_, at_ + sizeof(Field));
-        std::memcpy(&out, at_, sizeof(Field));
-        at_ += sizeof(Field);
+        std::reverse(start, start + sizeof(Field));
+        std::memcpy(&out, start, sizeof(Field));
         return true;
     }
-
-private:
-    unsigned char *at_;
-    unsigned char *end_;
 };
 
 // Fills memory that was measured beforehand; what would not fit is not written and makes the writer failed.
 class byte_writer {
 public:
-    explicit byte_writer(std::span<unsigned char> memory)
-        : at_(memory.data()), end_(memory.data() + memory.size()) {}
+    explicit byte_writer(std::span<unsigned char> memory) : free_(memory) {}
 
-    std::size_t left() const { return static_cast<std::size_t>(end_ - at_); }
+    std::size_t left() const { return free_.left(); }
     // True when exactly the measured size was written.
-    bool is_full() const { return !failed_ && at_ == end_; }
+    bool is_full() const { return !failed_ && free_.left() == 0; }
 
     void bytes(const void *source, std::size_t count) {
-        if (count > left()) {
+        unsigned char *start = nullptr;
+        if (!free_.take(count, start))
             failed_ = true;
-            return;
-        }
-        if (count != 0) // what is absent has no address
-            std::memcpy(at_, source, count);
-        at_ += count;
+        else if (count != 0) // what is absent has no address
+            std::memcpy(start, source, count);
     }
 
     template <class Field>
@@ -126,17 +114,32 @@ public:
     }
 
 private:
-    unsigned char *at_;
-    unsigned char *end_;
+    byte_cursor<unsigned char> free_;
     bool failed_ = false;
 };
 
-// A field in host byte order at an offset that was found by a reader or fixed by the format, over bytes that
-// are held writable.
+// Where a field is whose offset a reader found or the format fixes. One out of bounds is a fault of the code that
+// computed it: the process ends, since to go on would be to decide by bytes that nobody wrote.
+template <class Field, class Byte>
+Byte *proven_place(std::span<Byte> bytes, std::size_t offset) {
+    byte_cursor<Byte> cursor(bytes);
+    Byte *place = nullptr;
+    if (!cursor.skip(offset) || !cursor.take(sizeof(Field), place))
+        __builtin_trap();
+    return place;
+}
+
+// A field in host byte order at a proven offset.
+template <class Field>
+Field load_field(byte_span bytes, std::size_t offset) {
+    Field value;
+    std::memcpy(&value, proven_place<Field>(bytes, offset), sizeof value);
+    return value;
+}
+
 template <class Field>
 void store_field(std::span<unsigned char> bytes, std::size_t offset, Field value) {
-    if (offset <= bytes.size() && sizeof(Field) <= bytes.size() - offset)
-        std::memcpy(bytes.data() + offset, &value, sizeof value);
+    std::memcpy(proven_place<Field>(bytes, offset), &value, sizeof value);
 }
 
 } // namespace qz

@@ -1,8 +1,8 @@
 // Whom an entry is about, from the words of a command line.
 #include "entry_key.h"
 
+#include "base/posix_fold.h"
 #include "entry_words.h"
-#include "libqz_cu/posix_fold.h"
 #include "qz/acl.h"
 #include "qz/cu.h"
 #include "qzacl_acl/entry.h"

@@ -2,7 +2,7 @@
 #include "qzacl_acl/buffer.h"
 
 #include "base/owned.h"
-#include "libqz_cu/posix_fold.h"
+#include "base/posix_fold.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/entry.h"
 #include "report.h"
@@ -38,6 +38,17 @@ int release_checked(sec_acl_buffer_t *acl) {
     return SEC_S_OK;
 }
 
+// True when a sub-ACL's field holds the mechanism, in any letter case.
+bool holds_mechanism(qz::byte_span field, const char *mechanism) {
+    for (std::size_t index = 0; index < field.size(); ++index) {
+        if (qz::fold(field[index]) != qz::fold(static_cast<unsigned char>(mechanism[index])))
+            return false;
+        if (field[index] == '\0')
+            return true;
+    }
+    return false;
+}
+
 } // namespace
 
 int sec_create_empty_acl(sec_acl_buffer_t *acl) {
@@ -66,15 +77,11 @@ int sec__find_subacl(const sec_acl_buffer_t *acl, std::uint8_t type, const char 
     *subacl = nullptr;
     qz::format::subacl_walk walk(qz::format::bytes_of(*acl));
     while (walk.next() == qz::format::subacl_walk::step::found) {
-        if (walk.current().type != type)
-            continue;
-        if (qz::has_mechanism(type)) {
-            const char *held = qz::format::string_in(walk.current().mechanism);
-            if (held == nullptr || qz::fold_compare(held, mechanism) != 0)
-                continue;
+        const qz::format::subacl &head = walk.current();
+        if (head.type == type && (!qz::has_mechanism(type) || holds_mechanism(head.mechanism, mechanism))) {
+            *subacl = walk.bytes().data();
+            break;
         }
-        *subacl = walk.bytes().data();
-        break;
     }
     return SEC_S_OK;
 }

@@ -89,12 +89,6 @@ inline byte_span bytes_of(const sec_acl_buffer_t &acl) {
     return {static_cast<const unsigned char *>(acl.data), static_cast<std::size_t>(acl.length)};
 }
 
-// The bytes of a descriptor from a place inside them on.
-inline byte_span bytes_from(const sec_acl_buffer_t &acl, const unsigned char *place) {
-    const byte_span bytes = bytes_of(acl);
-    return bytes.subspan(static_cast<std::size_t>(place - bytes.data()));
-}
-
 inline bool read(byte_reader &reader, header &out) {
     return reader.field(out.type) && reader.field(out.version) && reader.field(out.order) &&
            reader.field(out.subacl_count);
@@ -154,13 +148,13 @@ struct entry_walk {
     std::uint32_t left = 0;
 };
 
-// Steps over entries while `passes` says so of their version and identity, of which `readable` bytes may be read
+// Steps over entries while `is_passed` says so of their version and identity, of which `readable` bytes may be read
 // even if it is shorter. Stops as well before an entry that reaches beyond the end, whose field does not end in
 // NUL, or that has fewer bytes behind it than another one would take with the readable bytes of its identity:
 // those, and so the last ones of a buffer, are left to the checked reader. This is the loop that a decision
 // spends its time in, so each step makes do with one test for where the bytes end and one for the field.
-template <class Passes>
-void pass_entries(entry_walk &walk, std::size_t readable, const Passes &passes) {
+template <class Passed>
+void skip_entries_while(entry_walk &walk, std::size_t readable, const Passed &is_passed) {
     if (walk.entries.left() < entry_fixed_size + readable)
         return;
     const unsigned char *const start = walk.entries.position();
@@ -179,7 +173,7 @@ void pass_entries(entry_walk &walk, std::size_t readable, const Passes &passes) 
         const std::size_t size = length;
         if (size == 0 || number_of(identity) + size > last || identity[size - 1] != '\0')
             break;
-        if (!passes(*at, byte_span(identity, size)))
+        if (!is_passed(*at, byte_span(identity, size)))
             break;
         at = identity + size;
     }
@@ -191,7 +185,7 @@ void pass_entries(entry_walk &walk, std::size_t readable, const Passes &passes) 
 inline bool skip_entries(byte_reader &reader, std::uint32_t count) {
     entry_walk walk{reader, count};
     for (;;) {
-        pass_entries(walk, 0, [](std::uint8_t, byte_span) { return true; });
+        skip_entries_while(walk, 0, [](std::uint8_t, byte_span) { return true; });
         reader = walk.entries;
         if (walk.left == 0)
             return true;

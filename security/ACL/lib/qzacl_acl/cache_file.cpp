@@ -1,6 +1,7 @@
 // The cached form of an ACL file: the compiled buffer beside it, owned and protected like it.
 #include "qzacl_acl/cache_file.h"
 
+#include "base/limited_write.h"
 #include "base/open_file.h"
 #include "base/owned.h"
 #include "qzacl_acl/posix_acl.h"
@@ -9,12 +10,10 @@
 #include "trace_points.h"
 
 #include <cerrno>
-#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <fcntl.h>
-#include <pthread.h>
 #include <sys/stat.h>
 
 namespace {
@@ -78,29 +77,6 @@ qz::descriptor create_temporary(const char *aclfname, qz::path_buffer &name) {
             return file;
     }
     return {};
-}
-
-// One write. Past a file size limit it fails like on a full disk: the signal that would end the process, and
-// leave half a cache behind, is held back and taken away again.
-ssize_t write_once(int fd, const sec_acl_buffer_t &acl) {
-    sigset_t limit_signal;
-    sigset_t before;
-    sigset_t pending;
-    sigemptyset(&limit_signal);
-    sigaddset(&limit_signal, SIGXFSZ);
-    pthread_sigmask(SIG_BLOCK, &limit_signal, &before);
-    sigpending(&pending);
-    errno = 0;
-    const ssize_t count = write(fd, acl.data, static_cast<std::size_t>(acl.length));
-    const int error = errno;
-    if (error == EFBIG && sigismember(&pending, SIGXFSZ) == 0) {
-        const timespec at_once = {};
-        while (sigtimedwait(&limit_signal, nullptr, &at_once) < 0 && errno == EINTR) {
-        }
-    }
-    pthread_sigmask(SIG_SETMASK, &before, nullptr);
-    errno = error;
-    return count;
 }
 
 int cannot_write(ssize_t count, const sec_acl_buffer_t &acl) {
@@ -202,7 +178,8 @@ int cache_writer::write_and_rename(const sec_acl_buffer_t &acl) {
 // Has the bytes on disk before the file gets its final name; that takes long, so all that may fail comes before.
 int cache_writer::fill(int fd, const sec_acl_buffer_t &acl) const {
     const timespec times[2] = {origin_.time, origin_.time};
-    const ssize_t count = write_once(fd, acl);
+    errno = 0; // a write that is cut short sets none
+    const ssize_t count = qz::limited_write(fd, acl.data, static_cast<std::size_t>(acl.length));
     if (count != acl.length || futimens(fd, times) != 0)
         return cannot_write(count, acl);
     if (const int result = protect(fd); result != SEC_S_OK)

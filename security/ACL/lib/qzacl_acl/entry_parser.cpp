@@ -7,7 +7,8 @@
 // Blanks separate tokens; '#' where a token would start begins a comment.
 #include "qzacl_acl/entry_parser.h"
 
-#include "libqz_cu/posix_fold.h"
+#include "base/posix_fold.h"
+#include "base/words.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/identity_order.h"
 #include "qzacl_acl/line_words.h"
@@ -23,17 +24,13 @@ namespace {
 
 constexpr bool is_line_end(char c) { return c == '\n' || c == '\f' || c == '\r'; }
 
-constexpr std::uint64_t in_each_byte(unsigned char value) {
-    return value * std::uint64_t{0x0101010101010101};
-}
-
 // The first byte at or after `at` that ends what is looked for. One that does lies before `limit`. Eight bytes at a
 // time are tested for any that may end it, as `may_end` says with their high bits, the first byte being the lowest.
 // It may name more of them behind one that does end it, but miss none.
 template <class MayEnd, class Ends>
 char *find_end(char *at, const char *limit, const MayEnd &may_end, const Ends &ends) {
-    for (; limit - at >= static_cast<std::ptrdiff_t>(qz::identity_word_size); at += qz::identity_word_size) {
-        for (auto some = may_end(qz::first_byte_lowest(at)); some != 0; some &= some - 1) {
+    for (; limit - at >= static_cast<std::ptrdiff_t>(qz::word_size); at += qz::word_size) {
+        for (auto some = may_end(qz::first_byte_lowest(qz::load8(at))); some != 0; some &= some - 1) {
             char *const found = at + std::countr_zero(some) / 8;
             if (ends(*found))
                 return found;
@@ -47,7 +44,7 @@ char *find_end(char *at, const char *limit, const MayEnd &may_end, const Ends &e
 // The first line end or NUL.
 char *find_line_end(char *at, const char *limit) {
     const auto is_low = [](std::uint64_t word) { // below 14
-        return (word - in_each_byte(14)) & ~word & in_each_byte(0x80);
+        return (word - qz::in_each_byte(14)) & ~word & qz::in_each_byte(0x80);
     };
     return find_end(at, limit, is_low, [](char c) { return c == '\0' || is_line_end(c); });
 }
@@ -104,7 +101,7 @@ private:
     // White space or the end of the line, which is a line end or a NUL.
     char *find_token_end() const {
         const auto is_no_sign = [](std::uint64_t word) { // a blank, a control character or beyond ASCII
-            return ((word - in_each_byte(' ' + 1)) | word) & in_each_byte(0x80);
+            return ((word - qz::in_each_byte(' ' + 1)) | word) & qz::in_each_byte(0x80);
         };
         return find_end(at_, limit_, is_no_sign,
                         [this](char c) { return c == '\0' || is_line_end(c) || is_space_(c); });

@@ -1,5 +1,24 @@
-// Access decisions: which permissions a compiled ACL grants one party, or the groups of one. The buffer is
-// read in place, nothing is allocated but what recording a long identity takes, and the one lock is held only while a handler is looked up.
+// Access decisions: which permissions a compiled ACL grants one party, or the groups of one.
+//
+//   permissions of one party:
+//       the sub-ACL is the first one of the type and, for user and expanded entries, of the mechanism
+//       no sub-ACL:                          nothing matches
+//       unauthenticated or any other:        its one entry matches
+//       expanded, and no handler known:      nothing matches
+//       for each entry, in the order stored:
+//           order = handler(wanted, entry)   for expanded entries, and for users where it is asked for and known
+//                 = wanted <=> entry         else, without regard to case
+//           order is equal:                  the entry matches
+//           order is less, not expanded:     nothing matches; what follows sorts behind, too
+//       nothing matches
+//
+//   permissions of groups:
+//       each group as one party, without a handler; the masks of all that match, joined
+//
+// The order of the entries is taken as it is stored: one that is not ascending hides entries.
+//
+// The buffer is read in place. Nothing is allocated but what recording a long identity takes, and the one lock is held
+// only while a handler is looked up.
 #include "qzacl_acl/buffer.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/entry.h"
@@ -26,17 +45,6 @@ int check_buffer(const sec_acl_buffer_t &acl) {
     if (bytes.size() > format::order_offset && bytes[format::order_offset] != format::host_order)
         return qz::report(SEC_S_BAD_ACL, qz::msg::wrong_byte_order);
     return bytes.size() < format::header_size ? qz::report_corrupt(__LINE__) : SEC_S_OK;
-}
-
-// Looks up the sub-ACL and reads its header. Inline, so that the reader stays in registers.
-[[gnu::always_inline]] inline bool find(const sec_acl_buffer_t &acl, std::uint8_t type, const char *mechanism,
-                                        format::subacl &head, qz::byte_reader &entries) {
-    const unsigned char *start = nullptr;
-    sec__find_subacl(&acl, type, mechanism, &start);
-    if (start == nullptr)
-        return false;
-    entries = qz::byte_reader(format::bytes_from(acl, start));
-    return format::read(entries, head);
 }
 
 struct single_request {
@@ -98,11 +106,10 @@ int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler
     return no_match(request, request.identity);
 }
 
-// Passes by the entries that sort before the wanted identity, all but those whose order is not clear at first
-// sight.
-[[gnu::noinline]] void pass_by(const qz::wanted_identity &wanted, format::entry_walk &walk) {
+// Skips the entries that sort before the wanted identity, all but those whose order is not clear at first sight.
+[[gnu::noinline]] void skip_before(const qz::wanted_identity &wanted, format::entry_walk &walk) {
     const qz::wanted_identity held_in_registers = wanted; // a copy, which nothing else can change meanwhile
-    format::pass_entries(walk, qz::identity_block::size, [&](std::uint8_t, qz::byte_span identity) {
+    format::skip_entries_while(walk, qz::identity_block::size, [&](std::uint8_t, qz::byte_span identity) {
         return held_in_registers.is_clearly_behind(qz::identity_block(identity.data()));
     });
 }
@@ -112,7 +119,7 @@ int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler
 qz::identity_order compare_next(const qz::wanted_identity &wanted, format::entry_walk &walk,
                                 format::entry &entry) {
     for (;;) {
-        pass_by(wanted, walk);
+        skip_before(wanted, walk);
         if (walk.left == 0)
             return qz::identity_order::behind;
         qz::byte_reader next = walk.entries;
@@ -162,7 +169,8 @@ int evaluate_single(const sec_acl_buffer_t *acl, single_request &request, const 
 
     format::subacl head;
     qz::byte_reader entries;
-    if (!find(*acl, type, subacl_mechanism == nullptr ? request.mechanism : subacl_mechanism, head, entries))
+    if (!qz::find_subacl(*acl, type, subacl_mechanism == nullptr ? request.mechanism : subacl_mechanism, head,
+                         entries))
         return no_match(request, "");
     if (qz::is_single_type(type))
         return evaluate_single_entry(request, head, entries, *mask);
@@ -234,7 +242,7 @@ int evaluate_groups(const sec_acl_buffer_t *acl, std::int32_t count, const sec_g
         return SEC_S_OK;
     format::subacl head;
     qz::byte_reader entries;
-    if (!find(*acl, SEC_ACLE_GROUP, nullptr, head, entries) || count < 0)
+    if (!qz::find_subacl(*acl, SEC_ACLE_GROUP, nullptr, head, entries) || count < 0)
         return no_group();
 
     std::uint32_t granted = 0;

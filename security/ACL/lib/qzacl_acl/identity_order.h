@@ -5,8 +5,9 @@
 #ifndef QZACL_IDENTITY_ORDER_H
 #define QZACL_IDENTITY_ORDER_H
 
-#include "libqz_cu/posix_fold.h"
-#include "libqz_cu/wide_product.h"
+#include "base/posix_fold.h"
+#include "base/wide_product.h"
+#include "base/words.h"
 
 #include <bit>
 #include <cstddef>
@@ -14,26 +15,13 @@
 
 namespace qz {
 
-inline constexpr std::size_t identity_word_size = sizeof(std::uint64_t);
-
-// Eight bytes of an identity as a number of which the first byte is the lowest.
-inline std::uint64_t first_byte_lowest(const char *at) {
-    const std::uint64_t word = load8(at);
-    return std::endian::native == std::endian::little ? word : __builtin_bswap64(word);
-}
-
-// The high bit of the lowest byte that is zero; 0 when none is. Bits above that one are cut off, where a borrow
-// may have set some that mean nothing.
-constexpr std::uint64_t lowest_nul(std::uint64_t word) {
-    const std::uint64_t nuls = (word - 0x0101010101010101) & ~word & 0x8080808080808080;
-    return nuls & (~nuls + 1);
-}
+inline constexpr std::size_t identity_word_size = word_size;
 
 // The first eight bytes of an identity, folded, as a number that compares as they do: the first byte is the highest,
 // and zeros stand from the NUL on.
 inline std::uint64_t ordered_word(const char *identity) {
-    const std::uint64_t word = first_byte_lowest(identity);
-    return __builtin_bswap64(fold8(word & (lowest_nul(word) - 1)));
+    const std::uint64_t word = first_byte_lowest(load8(identity));
+    return __builtin_bswap64(fold8(word & (lowest_zero(word) - 1)));
 }
 
 // True when the identity ends among the eight bytes of its ordered word.
@@ -42,7 +30,7 @@ constexpr bool ends_within(std::uint64_t ordered) { return (ordered & 0xff) == 0
 // The number of bytes before the NUL.
 inline std::size_t identity_length(const char *identity) {
     for (std::size_t length = 0;; length += identity_word_size) {
-        const std::uint64_t nul = lowest_nul(first_byte_lowest(identity + length));
+        const std::uint64_t nul = lowest_zero(first_byte_lowest(load8(identity + length)));
         if (nul != 0)
             return length + static_cast<std::size_t>(std::countr_zero(nul)) / 8;
     }

@@ -12,7 +12,7 @@ namespace {
 namespace format = qz::format;
 
 // Appends the entries of the sub-ACL at the start of the bytes.
-int append(qz::byte_span bytes, sec_aclelist_t &list) {
+int append_subacl(qz::byte_span bytes, sec_aclelist_t &list) {
     sec_acltree_t *root = nullptr;
     const int result = sec__subacl_to_acltree(bytes, &root);
     const qz::owned_acltree tree(root);
@@ -32,7 +32,7 @@ bool is_cut_short(qz::byte_span bytes) { return !bytes.empty() && bytes.size() <
 
 // Lists the sub-ACLs that are wanted, in the order in which they stand.
 template <class Wanted>
-int append_all(const sec_acl_buffer_t &acl, sec_aclelist_t &list, const Wanted &is_wanted) {
+int append_wanted(const sec_acl_buffer_t &acl, sec_aclelist_t &list, const Wanted &is_wanted) {
     const qz::byte_span bytes = format::bytes_of(acl);
     if (is_cut_short(bytes))
         return qz::report_corrupt(__LINE__);
@@ -48,18 +48,18 @@ int append_all(const sec_acl_buffer_t &acl, sec_aclelist_t &list, const Wanted &
         }
         if (!is_wanted(walk.current()))
             continue;
-        if (const int result = append(walk.bytes(), list); result != SEC_S_OK)
+        if (const int result = append_subacl(walk.bytes(), list); result != SEC_S_OK)
             return result;
     }
 }
 
-int append_one(const sec_acl_buffer_t &acl, std::uint8_t type, const char *mechanism, sec_aclelist_t &list) {
-    if (is_cut_short(format::bytes_of(acl)))
+int append_first_of(const sec_acl_buffer_t &acl, std::uint8_t type, const char *mechanism,
+                    sec_aclelist_t &list) {
+    const qz::byte_span bytes = format::bytes_of(acl);
+    if (is_cut_short(bytes))
         return qz::report_corrupt(__LINE__);
-    const unsigned char *subacl = nullptr;
-    if (const int result = sec__find_subacl(&acl, type, mechanism, &subacl); result != SEC_S_OK)
-        return result;
-    return subacl == nullptr ? SEC_S_OK : append(format::bytes_from(acl, subacl), list);
+    const qz::stored_subacl found = qz::find_subacl(acl, type, mechanism);
+    return found.is_there ? append_subacl(bytes.subspan(found.offset), list) : SEC_S_OK;
 }
 
 // A list that could not be completed is released, and holds nothing.
@@ -77,7 +77,7 @@ int list_checked(const sec_acl_buffer_t *acl, sec_aclelist_t *list) {
     if (!is_acl(*acl))
         return qz::report(SEC_S_BAD_ACL, qz::msg::not_an_acl_buffer);
     *list = {};
-    return kept_if_whole(append_all(*acl, *list, [](const format::subacl &) { return true; }), list);
+    return kept_if_whole(append_wanted(*acl, *list, [](const format::subacl &) { return true; }), list);
 }
 
 int list_by_type_checked(const sec_acl_buffer_t *acl, std::uint8_t type, const char *mechanism,
@@ -99,8 +99,8 @@ int list_by_type_checked(const sec_acl_buffer_t *acl, std::uint8_t type, const c
     *list = {};
     return kept_if_whole(
         qz::has_mechanism(type) && mechanism == nullptr
-            ? append_all(*acl, *list, [type](const format::subacl &head) { return head.type == type; })
-            : append_one(*acl, type, mechanism, *list),
+            ? append_wanted(*acl, *list, [type](const format::subacl &head) { return head.type == type; })
+            : append_first_of(*acl, type, mechanism, *list),
         list);
 }
 

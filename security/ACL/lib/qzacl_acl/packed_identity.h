@@ -3,8 +3,9 @@
 #ifndef QZACL_PACKED_IDENTITY_H
 #define QZACL_PACKED_IDENTITY_H
 
+#include "base/posix_fold.h"
+#include "base/words.h"
 #include "bytes.h"
-#include "libqz_cu/posix_fold.h"
 #include "qzacl_acl/buffer_format.h"
 
 #include <algorithm>
@@ -40,7 +41,7 @@ public:
             if (length > 8)
                 high = load8(text + length - 8) >> (8 * (size - length));
         } else if (length >= 4) {
-            low = load4(text) | load4(text + length - 4) << (8 * (length - 4));
+            low = load4(text) | std::uint64_t{load4(text + length - 4)} << (8 * (length - 4));
         } else {
             for (std::size_t index = 0; index < length; ++index)
                 low |= std::uint64_t{static_cast<unsigned char>(text[index])} << (8 * index);
@@ -61,22 +62,15 @@ private:
         bytes_ = _mm_or_si128(raw, _mm_and_si128(is_upper, _mm_set1_epi8('a' - 'A')));
     }
 
-    static std::uint64_t load4(const char *at) {
-        std::uint32_t word = 0;
-        std::memcpy(&word, at, sizeof word);
-        return word;
-    }
-
     static std::uint64_t ordered(long long word) {
-        return __builtin_bswap64(static_cast<std::uint64_t>(word));
+        return first_byte_highest(static_cast<std::uint64_t>(word));
     }
 
     __m128i bytes_;
 #else
     explicit identity_block(const unsigned char *bytes) {
-        const char *at = reinterpret_cast<const char *>(bytes);
-        words_[0] = fold8(load8(at));
-        words_[1] = fold8(load8(at + 8));
+        words_[0] = fold8(load8(bytes));
+        words_[1] = fold8(load8(bytes + word_size));
     }
 
     static identity_block of_string(const char *text) {
@@ -85,14 +79,10 @@ private:
         return identity_block(padded);
     }
 
-    std::uint64_t first() const { return ordered(words_[0]); }
-    std::uint64_t second() const { return ordered(words_[1]); }
+    std::uint64_t first() const { return first_byte_highest(words_[0]); }
+    std::uint64_t second() const { return first_byte_highest(words_[1]); }
 
 private:
-    static std::uint64_t ordered(std::uint64_t word) {
-        return std::endian::native == std::endian::little ? __builtin_bswap64(word) : word;
-    }
-
     std::uint64_t words_[2];
 #endif
 
@@ -105,44 +95,37 @@ public:
         return mine < others;
     }
 
-    // The place of the first byte that differs; `size` where all are equal.
-    unsigned differs_at(const identity_block &other) const {
+    // True when this block sorts before the other, and one of its first `count` bytes shows it.
+    bool sorts_before_within(std::size_t count, const identity_block &other) const {
         const std::uint64_t front = first() ^ other.first();
         if (front != 0)
-            return static_cast<unsigned>(std::countl_zero(front)) / 8;
-        return 8 + static_cast<unsigned>(std::countl_zero(second() ^ other.second())) / 8;
+            return first() < other.first() && static_cast<unsigned>(std::countl_zero(front)) / 8 < count;
+        const std::uint64_t back = second() ^ other.second();
+        return second() < other.second() && 8 + static_cast<unsigned>(std::countl_zero(back)) / 8 < count;
     }
 };
 
-// The place of the first NUL among the eight bytes of a word; eight where there is none.
-constexpr unsigned nul_in_word(std::uint64_t word) {
-    // Sums that cannot carry from one byte into another, where a NUL might be seen that is none.
-    constexpr std::uint64_t low_bits = 0x7f7f7f7f7f7f7f7f;
-    const std::uint64_t nuls = ~(((word & low_bits) + low_bits) | word | low_bits);
-    return static_cast<unsigned>(std::endian::native == std::endian::little ? std::countr_zero(nuls)
-                                                                            : std::countl_zero(nuls)) /
-           8;
-}
-
-// The place of the first NUL among the sixteen bytes of a block; at least sixteen where there is none.
+// The place of the first NUL among the sixteen bytes of a block; sixteen where there is none.
 inline unsigned nul_in_block(const unsigned char *bytes) {
 #ifdef __x86_64__
     const __m128i raw = _mm_loadu_si128(reinterpret_cast<const __m128i *>(bytes));
     const int nuls = _mm_movemask_epi8(_mm_cmpeq_epi8(raw, _mm_setzero_si128()));
-    return static_cast<unsigned>(std::countr_zero(static_cast<unsigned>(nuls)));
+    return static_cast<unsigned>(std::countr_zero(static_cast<unsigned>(nuls) | 1U << identity_block::size));
 #else
-    const char *const at = reinterpret_cast<const char *>(bytes);
-    const unsigned nul = nul_in_word(load8(at));
-    return nul < sizeof(std::uint64_t) ? nul : nul + nul_in_word(load8(at + sizeof(std::uint64_t)));
+    const unsigned nul = bytes_before_nul(load8(bytes));
+    return nul < word_size ? nul : nul + bytes_before_nul(load8(bytes + word_size));
 #endif
 }
 
 // True when the string of a field of which a whole block may be read ends where the field does. Most end within
-// the block, and a call for each would cost more than all the rest of a walk.
+// two blocks, and a call for each would cost more than all the rest of a walk.
 inline bool ends_exactly(byte_span field) {
-    const std::size_t nul = nul_in_block(field.data());
-    if (nul < identity_block::size)
+    constexpr std::size_t size = identity_block::size;
+    if (const std::size_t nul = nul_in_block(field.data()); nul != size) [[likely]]
         return nul + 1 == field.size();
+    // The block that ends with the field: no NUL is before it.
+    if (field.size() > size && field.size() <= 2 * size)
+        return nul_in_block(field.data() + field.size() - size) == size - 1;
     return format::holds_exact_string(field);
 }
 

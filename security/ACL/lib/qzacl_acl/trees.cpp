@@ -1,7 +1,7 @@
 // The trees of one ACL, and finding the one of an entry's key among them.
 #include "qzacl_acl/trees.h"
 
-#include "libqz_cu/posix_fold.h"
+#include "base/posix_fold.h"
 #include "qzacl_trace.h"
 #include "report.h"
 

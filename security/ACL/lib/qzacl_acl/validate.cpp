@@ -94,11 +94,12 @@ int check_entry(qz::byte_reader &reader, std::uint8_t type) {
     return SEC_S_OK;
 }
 
-// Passes by sound entries with identities, save for those close to the end.
-void pass_sound_entries(format::entry_walk &walk) {
-    format::pass_entries(walk, qz::identity_block::size, [](std::uint8_t version, qz::byte_span identity) {
-        return version == format::entry_version && qz::ends_exactly(identity);
-    });
+// Skips sound entries with identities, save for those close to the end.
+void skip_sound_entries(format::entry_walk &walk) {
+    format::skip_entries_while(walk, qz::identity_block::size,
+                               [](std::uint8_t version, qz::byte_span identity) {
+                                   return version == format::entry_version && qz::ends_exactly(identity);
+                               });
 }
 
 // Checks the entries of one sub-ACL. A faulty one ends its walk, with the reader standing before it.
@@ -106,7 +107,7 @@ int check_entries(qz::byte_reader &reader, const format::subacl &head) {
     format::entry_walk walk{reader, head.entry_count};
     for (;;) {
         if (qz::has_identity(head.type))
-            pass_sound_entries(walk);
+            skip_sound_entries(walk);
         reader = walk.entries;
         if (walk.left == 0)
             return SEC_S_OK;
@@ -132,7 +133,7 @@ private:
     std::uint32_t length_ = 0;
 };
 
-int convert(std::span<unsigned char> bytes) {
+int convert_to_host(std::span<unsigned char> bytes) {
     qz::byte_swapper swapper(bytes);
     std::uint16_t subacl_count = 0;
     if (!swapper.skip(format::count_offset) || !swapper.swap(subacl_count))
@@ -181,7 +182,7 @@ int convert_checked(int check, sec_acl_buffer_t *acl) {
         return check != 0 ? sec__check_acl_buffer(acl) : SEC_S_OK;
     }
     qz::trace(qz::point::converting_to_host_order);
-    return convert({static_cast<unsigned char *>(acl->data), bytes.size()});
+    return convert_to_host({static_cast<unsigned char *>(acl->data), bytes.size()});
 }
 
 } // namespace

@@ -1,6 +1,6 @@
 // Products of 128 bits, also where the compiler has no numbers that wide.
-#ifndef QZ_CU_WIDE_PRODUCT_H
-#define QZ_CU_WIDE_PRODUCT_H
+#ifndef QZ_WIDE_PRODUCT_H
+#define QZ_WIDE_PRODUCT_H
 
 #include <cstdint>
 

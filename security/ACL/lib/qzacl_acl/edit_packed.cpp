@@ -1,0 +1,144 @@
+// The proof that entries are as compiling gives them, and the changes that it allows.
+#include "qzacl_acl/edit_packed.h"
+
+#include "qzacl_acl/acle_report.h"
+#include "qzacl_acl/packed_identity.h"
+#include "qzacl_acl/splice.h"
+#include "qzacl_trace.h"
+#include "report.h"
+
+#include <cstring>
+
+namespace qz {
+namespace {
+
+bool has_sorted_form(const format::subacl &head) {
+    if (head.entry_count == 0)
+        return false;
+    if (head.type == SEC_ACLE_USER)
+        return format::holds_exact_string(head.mechanism) && head.mechanism.size() <= mechanism_max + 1;
+    return head.type == SEC_ACLE_GROUP && head.mechanism_length == 0;
+}
+
+// Skips entries that are clearly what compiling gives, each behind the one before it: up to where the wanted
+// identity may stand, or all of them once its place is known. `previous` is the identity before the next entry.
+void skip_ascending(const wanted_identity &wanted, bool is_placed, byte_span &previous,
+                    format::entry_walk &walk) {
+    constexpr std::size_t block_size = identity_block::size;
+    if (walk.left == 0 || previous.size() + walk.entries.left() < block_size)
+        return;
+    const wanted_identity held_in_registers = wanted; // a copy, which nothing else can change meanwhile
+    identity_block before(previous.data());
+    std::size_t before_size = previous.size();
+    const unsigned char *last = previous.data();
+    format::skip_entries_while(walk, block_size, [&](std::uint8_t version, byte_span identity) {
+        const identity_block block(identity.data());
+        // Behind the NUL of the one before stand other fields, which say nothing of the order.
+        if (version != format::entry_version || !before.sorts_before_within(before_size, block))
+            return false;
+        if (!is_placed && !held_in_registers.is_clearly_behind(block))
+            return false;
+        if (!ends_exactly(identity))
+            return false;
+        before = block;
+        before_size = identity.size();
+        last = identity.data();
+        return true;
+    });
+    previous = {last, before_size};
+}
+
+// Looks for an identity in a user or group sub-ACL. False unless the bytes are exactly what compiling a tree
+// of these entries gives: only then does changing one entry's bytes give what the plain way would.
+bool find_sorted(byte_span subacl, const format::subacl &head, const char *identity, packed_place &place) {
+    if (!has_sorted_form(head))
+        return false;
+    const wanted_identity wanted(identity);
+    format::entry_walk walk{byte_reader(subacl), head.entry_count};
+    if (!walk.entries.skip(format::subacl_header_size + head.mechanism_length))
+        return false;
+    byte_span previous;
+    bool is_placed = false;
+    while (walk.left != 0) {
+        const std::size_t offset = subacl.size() - walk.entries.left();
+        format::entry entry;
+        if (!format::read(walk.entries, entry) || entry.version != format::entry_version ||
+            !format::holds_exact_string(entry.identity))
+            return false;
+        if (!previous.empty() &&
+            fold_compare(format::string_in(previous), format::string_in(entry.identity)) >= 0)
+            return false;
+        const identity_order order = is_placed ? identity_order::behind : wanted.compare(entry.identity);
+        if (order != identity_order::behind) {
+            is_placed = true;
+            place = {offset,
+                     order == identity_order::same ? format::entry_fixed_size + entry.identity.size() : 0};
+        }
+        previous = entry.identity;
+        --walk.left;
+        skip_ascending(wanted, is_placed, previous, walk);
+    }
+    if (!is_placed)
+        place = {subacl.size() - walk.entries.left(), 0};
+    return walk.entries.left() == 0;
+}
+
+// Traces show each entry of the tree that the plain way makes. And an identity that lies in the buffer
+// itself, as the ones that handlers are shown do, would move while it is being added.
+bool may_edit_packed(const sec_acle_t &acle, const sec_acl_buffer_t &acl) {
+    const byte_span bytes = format::bytes_of(acl);
+    const auto place =
+        reinterpret_cast<std::uintptr_t>(acle.identity) - reinterpret_cast<std::uintptr_t>(bytes.data());
+    return has_identity(acle.type) && place >= bytes.size() && !traces(trace_category::api);
+}
+
+void store_subacl_size(const sec_acl_buffer_t &acl, const stored_subacl &stored, std::size_t length,
+                       std::uint32_t count) {
+    store_field(writable_bytes(acl), stored.offset, static_cast<std::uint32_t>(length));
+    store_field(writable_bytes(acl), stored.offset + format::subacl_count_offset, count);
+}
+
+} // namespace
+
+bool find_packed(const sec_acl_buffer_t &acl, const stored_subacl &stored, const sec_acle_t &acle,
+                 packed_place &place) {
+    return may_edit_packed(acle, acl) &&
+           find_sorted(format::bytes_of(acl).subspan(stored.offset, stored.head.length), stored.head,
+                       acle.identity, place);
+}
+
+int add_packed(const sec_acle_t &acle, int report_duplicates, const stored_subacl &stored,
+               const packed_place &place, sec_acl_buffer_t &acl) {
+    if (place.size != 0) {
+        if (report_duplicates != 0)
+            return sec__report_duplicate(view_of(acle));
+        store_field(writable_bytes(acl), stored.offset + place.offset + format::entry_mask_offset,
+                    acle.perm_mask);
+        sec__trace_replacement(view_of(acle));
+        return SEC_S_OK;
+    }
+    const std::size_t identity_size = std::strlen(acle.identity) + 1;
+    const std::size_t size = format::entry_fixed_size + identity_size;
+    const std::size_t offset = stored.offset + place.offset;
+    if (const int result = resize_part(acl, offset, 0, size, edit_function::adding); result != SEC_S_OK)
+        return result;
+    byte_writer writer(writable_bytes(acl).subspan(offset, size));
+    format::write_entry(writer, acle.perm_mask, acle.identity, identity_size);
+    store_subacl_size(acl, stored, stored.head.length + size, stored.head.entry_count + 1);
+    return SEC_S_OK;
+}
+
+int delete_packed(const stored_subacl &stored, const packed_place &place, sec_acl_buffer_t &acl) {
+    const bool is_last = stored.head.entry_count == 1;
+    const std::size_t offset = is_last ? stored.offset : stored.offset + place.offset;
+    const std::size_t size = is_last ? stored.head.length : place.size;
+    const std::size_t count = subacl_count(acl);
+    static_cast<void>(resize_part(acl, offset, size, 0, edit_function::deleting)); // it does not grow
+    if (is_last)
+        set_subacl_count(acl, count - 1);
+    else
+        store_subacl_size(acl, stored, stored.head.length - size, stored.head.entry_count - 1);
+    return finish_deletion(acl);
+}
+
+} // namespace qz
