@@ -46,7 +46,8 @@ TEST(BytesDeathTest, WrongOffsetsEndTheProcess) {
     four_bytes bytes = {};
     for (const std::size_t offset : {std::size_t{3}, std::size_t{5}, SIZE_MAX}) {
         EXPECT_DEATH(qz::load_field<std::uint16_t>(bytes, offset), "") << offset;
-        EXPECT_DEATH(qz::store_field(std::span<unsigned char>(bytes), offset, std::uint16_t{1}), "") << offset;
+        EXPECT_DEATH(qz::store_field(std::span<unsigned char>(bytes), offset, std::uint16_t{1}), "")
+            << offset;
     }
 }
 

@@ -16,24 +16,25 @@
 #include <iterator>
 #include <unistd.h>
 
+using namespace qz;
+
 namespace {
 
 // Given back when there is none left to say so.
-qz::owned<void> spare_memory;
+owned<void> spare_memory;
 
-constexpr qz::acl_file_use by_command = {
-    .not_found = {SEC_S_BAD_FILENAME, qz::msg::bad_acl_file_name},
-    .not_private = {SEC_S_BAD_PERMISSION, qz::msg::acl_file_not_private},
-    .cannot_open = {SEC_S_FILE_ERROR, qz::msg::cannot_open_acl_file},
+constexpr acl_file_use by_command = {
+    .not_found = {SEC_S_BAD_FILENAME, msg::bad_acl_file_name},
+    .not_private = {SEC_S_BAD_PERMISSION, msg::acl_file_not_private},
+    .cannot_open = {SEC_S_FILE_ERROR, msg::cannot_open_acl_file},
     .takes_empty_of_anybody = false,
     .is_traced = false,
 };
 
 // Finds and vets the file, and opens its text.
-int aclfck__get_aclfile(const char *aclfname, const char *username, qz::vetted_file &file,
-                        qz::acl_text &text) {
+int aclfck__get_aclfile(const char *aclfname, const char *username, vetted_file &file, acl_text &text) {
     return text.open_again_while_replaced([&] {
-        const int result = qz::vet_acl_file(aclfname, username, by_command, file);
+        const int result = vet_acl_file(aclfname, username, by_command, file);
         return result != SEC_S_OK ? result : text.open(file, by_command);
     });
 }
@@ -48,15 +49,15 @@ int printed(int code) {
 void warn_of_skipped_cache(unsigned flags) {
     if ((flags & ACLFCK_OPT_COMPILE) == 0)
         return;
-    qz::report(SEC_S_ADVISORY, qz::msg::cache_skipped_after_errors);
+    report(SEC_S_ADVISORY, msg::cache_skipped_after_errors);
     aclfck__print_error();
 }
 
 // Prints the current error and an empty line, sooner or later.
 void print_recorded_error() {
-    if (!qz::print_recorded(stderr, "\n")) {
+    if (!print_recorded(stderr, "\n")) {
         spare_memory.reset();
-        static_cast<void>(qz::print_recorded(stderr, "\n"));
+        static_cast<void>(print_recorded(stderr, "\n"));
     }
 }
 
@@ -112,30 +113,30 @@ private:
 
 // Collects the entries of every line. Returns the failure that ends the check; failures that are passed over
 // clear `is_clean` instead.
-int read_entries(qz::acl_text &text, unsigned flags, sec_acltree_array &trees, bool &is_clean) {
+int read_entries(acl_text &text, unsigned flags, sec_acltree_array &trees, bool &is_clean) {
     const bool goes_on = (flags & ACLFCK_OPT_CONTINUE) != 0;
     const bool is_verbose = (flags & ACLFCK_OPT_VERBOSE) != 0;
     const bool may_wait = !goes_on && !is_verbose;
     line_failures failures(goes_on);
-    qz::parsed_acle entry;
+    parsed_acle entry;
     while (!line_failures::must_end()) {
-        const qz::acl_line line = text.next(entry);
-        if (line == qz::acl_line::none)
+        const acl_line line = text.next(entry);
+        if (line == acl_line::none)
             continue;
         int result = SEC_S_OK;
         bool may_go_on = goes_on;
-        if (line == qz::acl_line::entry) {
+        if (line == acl_line::entry) {
             if (is_verbose) {
-                const sec_acle_t shown = qz::record_of(entry);
+                const sec_acle_t shown = record_of(entry);
                 sec__dump_acle(&shown, nullptr, "");
             }
-            const qz::acle_view acle = qz::view_of(entry);
+            const acle_view acle = view_of(entry);
             result = may_wait ? trees.add_soon(acle) : trees.add(acle);
             may_go_on = goes_on && result == SEC_S_BAD_ACLE;
         } else {
-            result = trees.settle(line == qz::acl_line::bad ? text.failure() : SEC_S_OK);
+            result = trees.settle(line == acl_line::bad ? text.failure() : SEC_S_OK);
         }
-        if (result == SEC_S_OK && line == qz::acl_line::end)
+        if (result == SEC_S_OK && line == acl_line::end)
             return SEC_S_OK;
         if (result == SEC_S_OK)
             continue;
@@ -164,26 +165,25 @@ private:
     sigset_t before_ = {};
 };
 
-int compile_and_cache(const qz::vetted_file &file, const sec_acltree_array &trees,
-                      const qz::text_origin &origin) {
+int compile_and_cache(const vetted_file &file, const sec_acltree_array &trees, const text_origin &origin) {
     sec_acl_buffer_t buffer = {};
     if (const int result = sec__acltrees_to_acl(trees.trees(), &buffer); result != SEC_S_OK)
         return result;
-    const qz::owned<void> buffer_owner(buffer.data);
+    const owned<void> buffer_owner(buffer.data);
     const held_signals until_cache_is_whole;
-    return sec__cache_aclbuffer(file.path.text, &buffer, qz::cache_rewriting::always, origin);
+    return sec__cache_aclbuffer(file.path.text, &buffer, cache_rewriting::always, origin);
 }
 
 } // namespace
 
 int aclfck__bulk_aclfile(const char *aclfname, const char *username, unsigned flags) {
-    qz::vetted_file file;
-    qz::acl_text text(&acl__default_perm_set);
+    vetted_file file;
+    acl_text text(&acl__default_perm_set);
     if (const int result = aclfck__get_aclfile(aclfname, username, file, text); result != SEC_S_OK)
         return printed(result);
     if (text.is_empty()) {
         if ((flags & ACLFCK_OPT_VERBOSE) != 0) {
-            qz::report(SEC_S_ADVISORY, qz::msg::acl_file_empty, file.path.text);
+            report(SEC_S_ADVISORY, msg::acl_file_empty, file.path.text);
             aclfck__print_error();
         }
         return SEC_S_OK;

@@ -10,6 +10,8 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+using namespace qz;
+
 namespace {
 
 char *aclfname;
@@ -32,19 +34,19 @@ struct option_state {
 
 void set_flag(option_state &state, unsigned flag, const char *option) {
     if ((state.flags & flag) != 0)
-        state.fail(qz::report(SEC_S_BAD_PARAMETER, qz::msg::option_repeated, option));
+        state.fail(report(SEC_S_BAD_PARAMETER, msg::option_repeated, option));
     else
         state.flags |= flag;
 }
 
 void set_name(option_state &state, char *&name, const char *option) {
     if (name != nullptr) {
-        state.fail(qz::report(SEC_S_BAD_PARAMETER, qz::msg::option_repeated, option));
+        state.fail(report(SEC_S_BAD_PARAMETER, msg::option_repeated, option));
         return;
     }
     name = strdup(optarg);
     if (name == nullptr)
-        state.fail(qz::report_no_memory("main", std::strlen(optarg) + 1));
+        state.fail(report_no_memory("main", std::strlen(optarg) + 1));
 }
 
 // The next option, also behind operands, where not every C library looks for more: the '-' has it hand operands out.
@@ -95,21 +97,21 @@ option_state read_options(int argc, char *argv[]) {
             set_flag(state, ACLFCK_OPT_VERBOSE, "-v");
             break;
         default:
-            state.fail(qz::report(SEC_S_BAD_PARAMETER, qz::msg::option_incorrect));
+            state.fail(report(SEC_S_BAD_PARAMETER, msg::option_incorrect));
             break;
         }
     }
 }
 
 int print_usage() {
-    const int status = qz::report(SEC_S_BAD_PARAMETER, qz::msg::usage);
+    const int status = report(SEC_S_BAD_PARAMETER, msg::usage);
     aclfck__print_error();
     return status;
 }
 
 int finish_without_check(const option_state &state) {
     if (!state.has_error) {
-        qz::report(SEC_S_BAD_PARAMETER, qz::msg::help);
+        report(SEC_S_BAD_PARAMETER, msg::help);
         aclfck__print_error();
         return EXIT_SUCCESS;
     }
@@ -120,14 +122,14 @@ int finish_without_check(const option_state &state) {
 }
 
 void warn_not_implemented() {
-    qz::report(SEC_S_WARNING, qz::msg::stream_not_implemented);
+    report(SEC_S_WARNING, msg::stream_not_implemented);
     aclfck__print_error();
     cu_set_no_error_1();
 }
 
 int check(unsigned flags) {
     if (aclfname == nullptr) {
-        qz::report(SEC_S_BAD_PARAMETER, qz::msg::file_option_missing);
+        report(SEC_S_BAD_PARAMETER, msg::file_option_missing);
         aclfck__print_error();
         return print_usage();
     }
@@ -141,7 +143,7 @@ int check(unsigned flags) {
     }
     if (username != nullptr && (flags & ACLFCK_OPT_COMPILE) != 0) {
         flags &= ~unsigned{ACLFCK_OPT_COMPILE};
-        qz::report(SEC_S_ADVISORY, qz::msg::compile_option_ignored);
+        report(SEC_S_ADVISORY, msg::compile_option_ignored);
         aclfck__print_error();
         cu_set_no_error_1();
     }

@@ -3,14 +3,16 @@
 
 #include "trace_points.h"
 
-std::uint8_t acl__trace_detail_levels[qz::trace_category_count] = {};
+using namespace qz;
+
+std::uint8_t acl__trace_detail_levels[trace_category_count] = {};
 pthread_once_t acl__trace_register_once = PTHREAD_ONCE_INIT;
 bool acl__trace_is_registered = false;
 cu_timeinfo_t timeinfo = {};
 
 namespace {
 
-constexpr tr_category_t acl__trace_categories[qz::trace_category_count] = {
+constexpr tr_category_t acl__trace_categories[trace_category_count] = {
     {0, "Errors", 0}, {1, "Info", 0}, {2, "API", 0}, {3, "Buffer", 0}, {4, "Perf", 0},
 };
 
@@ -32,8 +34,8 @@ int acl__trace_register_component() {
     // Whoever reached the first trace point must find its recorded error as it left it.
     cu_error_t *error = nullptr;
     const int saved = cu_get_error_1(&error);
-    const int result = tr_register_component_1(qz::trace_component, acl__trace_detail_levels,
-                                               acl__trace_categories, qz::trace_category_count);
+    const int result = tr_register_component_1(trace_component, acl__trace_detail_levels,
+                                               acl__trace_categories, trace_category_count);
     if (saved == 0) {
         static_cast<void>(cu_pset_error_1(error));
         cu_rel_error_1(error);
@@ -41,16 +43,16 @@ int acl__trace_register_component() {
     static_cast<void>(cu_get_procspeed_1(&timeinfo));
 
     const std::uint32_t level = __atomic_load_n(
-        &acl__trace_detail_levels[static_cast<std::size_t>(qz::trace_category::perf)], __ATOMIC_RELAXED);
+        &acl__trace_detail_levels[static_cast<std::size_t>(trace_category::perf)], __ATOMIC_RELAXED);
     if (perf_level_is_recorded(level)) {
         ask_about_trace_file();
-        qz::point::registered.record(level);
+        point::registered.record(level);
     }
     __atomic_store_n(&acl__trace_is_registered, true, __ATOMIC_RELEASE);
     return result;
 }
 
-int acl__trace_unregister_component() { return tr_unregister_component_1(qz::trace_component); }
+int acl__trace_unregister_component() { return tr_unregister_component_1(trace_component); }
 
 namespace qz {
 

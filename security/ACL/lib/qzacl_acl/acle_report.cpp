@@ -1,21 +1,22 @@
 // What trees and packed sub-ACLs tell alike of an entry that they hold already, or do not hold.
 #include "qzacl_acl/acle_report.h"
 
-#include "trace_points.h"
 #include "report.h"
+#include "trace_points.h"
 
-int sec__report_duplicate(const qz::acle_view &acle) {
-    const int letter = qz::type_letter(acle.type);
-    if (qz::is_single_type(acle.type))
-        return qz::report(SEC_S_BAD_ACLE, qz::msg::duplicate_single_acle, letter);
+using namespace qz;
+
+int sec__report_duplicate(const acle_view &acle) {
+    const int letter = type_letter(acle.type);
+    if (is_single_type(acle.type))
+        return report(SEC_S_BAD_ACLE, msg::duplicate_single_acle, letter);
     if (acle.type == SEC_ACLE_GROUP)
-        return qz::report(SEC_S_BAD_ACLE, qz::msg::duplicate_group, letter, acle.identity.data());
-    return qz::report(SEC_S_BAD_ACLE, qz::msg::duplicate_acle, letter, acle.mechanism.data(),
-                      acle.identity.data());
+        return report(SEC_S_BAD_ACLE, msg::duplicate_group, letter, acle.identity.data());
+    return report(SEC_S_BAD_ACLE, msg::duplicate_acle, letter, acle.mechanism.data(), acle.identity.data());
 }
 
-void sec__trace_replacement(const qz::acle_view &acle) {
-    if (!qz::traces(qz::point::entry_replaced))
+void sec__trace_replacement(const acle_view &acle) {
+    if (!traces(point::entry_replaced))
         return;
     const char *type = "group";
     switch (acle.type) {
@@ -35,12 +36,11 @@ void sec__trace_replacement(const qz::acle_view &acle) {
         break;
     }
     constexpr std::string_view none = "<none>";
-    qz::point::entry_replaced.record(type, qz::is_single_type(acle.type) ? none : acle.mechanism,
-                                     acle.type == SEC_ACLE_USER ? acle.identity : none);
+    point::entry_replaced.record(type, is_single_type(acle.type) ? none : acle.mechanism,
+                                 acle.type == SEC_ACLE_USER ? acle.identity : none);
 }
 
-int sec__acle_not_found(int code, const qz::acle_view &acle) {
-    return qz::report(code, qz::msg::acle_not_found, acle.type,
-                      qz::has_mechanism(acle.type) ? acle.mechanism.data() : "",
-                      qz::has_identity(acle.type) ? acle.identity.data() : "");
+int sec__acle_not_found(int code, const acle_view &acle) {
+    return report(code, msg::acle_not_found, acle.type, has_mechanism(acle.type) ? acle.mechanism.data() : "",
+                  has_identity(acle.type) ? acle.identity.data() : "");
 }

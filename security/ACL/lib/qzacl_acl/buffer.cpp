@@ -8,20 +8,22 @@
 #include "report.h"
 #include "trace_points.h"
 
+using namespace qz;
+
 namespace {
 
 int read_checked(int length, const void *data, sec_acl_buffer_t *acl) {
     constexpr const char *function = "sec_read_acl_from_data";
     if (length < 1)
-        return qz::report_bad_parameter(function, 1, length);
+        return report_bad_parameter(function, 1, length);
     if (data == nullptr)
-        return qz::report_bad_parameter(function, 2, 0);
+        return report_bad_parameter(function, 2, 0);
     if (acl == nullptr)
-        return qz::report_bad_parameter(function, 3, 0);
+        return report_bad_parameter(function, 3, 0);
     const auto size = static_cast<std::size_t>(length);
-    auto copy = qz::allocate<unsigned char>(size);
+    auto copy = allocate<unsigned char>(size);
     if (copy == nullptr)
-        return qz::report_no_memory(function, size);
+        return report_no_memory(function, size);
     std::memcpy(copy.get(), data, size);
     *acl = {length, copy.release()};
     return SEC_S_OK;
@@ -31,17 +33,17 @@ int release_checked(sec_acl_buffer_t *acl) {
     if (acl == nullptr || acl->data == nullptr)
         return SEC_S_OK;
     // Memory that is held has a first byte, whatever the length says.
-    if (*static_cast<const unsigned char *>(acl->data) != qz::format::buffer_type)
-        return qz::report(SEC_S_BAD_ACL, qz::msg::acl_corrupted);
+    if (*static_cast<const unsigned char *>(acl->data) != format::buffer_type)
+        return report(SEC_S_BAD_ACL, msg::acl_corrupted);
     std::free(acl->data);
     *acl = {};
     return SEC_S_OK;
 }
 
 // True when a sub-ACL's field holds the mechanism, in any letter case.
-bool holds_mechanism(qz::byte_span field, const char *mechanism) {
+bool holds_mechanism(byte_span field, const char *mechanism) {
     for (std::size_t index = 0; index < field.size(); ++index) {
-        if (qz::fold(field[index]) != qz::fold(static_cast<unsigned char>(mechanism[index])))
+        if (fold(field[index]) != fold(static_cast<unsigned char>(mechanism[index])))
             return false;
         if (field[index] == '\0')
             return true;
@@ -54,31 +56,31 @@ bool holds_mechanism(qz::byte_span field, const char *mechanism) {
 int sec_create_empty_acl(sec_acl_buffer_t *acl) {
     constexpr const char *function = "sec_create_empty_acl";
     if (acl == nullptr)
-        return qz::report_bad_parameter(function, 1, 0);
-    acl->data = std::malloc(sizeof qz::format::empty_acl);
+        return report_bad_parameter(function, 1, 0);
+    acl->data = std::malloc(sizeof format::empty_acl);
     if (acl->data == nullptr)
-        return qz::report_no_memory(function, sizeof qz::format::empty_acl);
-    std::memcpy(acl->data, qz::format::empty_acl, sizeof qz::format::empty_acl);
-    acl->length = sizeof qz::format::empty_acl;
+        return report_no_memory(function, sizeof format::empty_acl);
+    std::memcpy(acl->data, format::empty_acl, sizeof format::empty_acl);
+    acl->length = sizeof format::empty_acl;
     return SEC_S_OK;
 }
 
 int sec_read_acl_from_data(int length, const void *data, sec_acl_buffer_t *acl) {
-    return qz::run(qz::operation::read_acl_from_data, std::tie(length, data, acl),
-                   [&] { return read_checked(length, data, acl); });
+    return run(operation::read_acl_from_data, std::tie(length, data, acl),
+               [&] { return read_checked(length, data, acl); });
 }
 
 int sec_release_acl(sec_acl_buffer_t *acl) {
-    return qz::run(qz::operation::release_acl, std::tie(acl), [&] { return release_checked(acl); });
+    return run(operation::release_acl, std::tie(acl), [&] { return release_checked(acl); });
 }
 
 int sec__find_subacl(const sec_acl_buffer_t *acl, std::uint8_t type, const char *mechanism,
                      const unsigned char **subacl) {
     *subacl = nullptr;
-    qz::format::subacl_walk walk(qz::format::bytes_of(*acl));
-    while (walk.next() == qz::format::subacl_walk::step::found) {
-        const qz::format::subacl &head = walk.current();
-        if (head.type == type && (!qz::has_mechanism(type) || holds_mechanism(head.mechanism, mechanism))) {
+    format::subacl_walk walk(format::bytes_of(*acl));
+    while (walk.next() == format::subacl_walk::step::found) {
+        const format::subacl &head = walk.current();
+        if (head.type == type && (!has_mechanism(type) || holds_mechanism(head.mechanism, mechanism))) {
             *subacl = walk.bytes().data();
             break;
         }

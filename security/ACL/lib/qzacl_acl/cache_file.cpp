@@ -16,20 +16,22 @@
 #include <fcntl.h>
 #include <sys/stat.h>
 
+using namespace qz;
+
 namespace {
 
 // A file under a name that this call made. It is removed at the end of the scope unless it was kept, and only
 // while the name still leads to the file that is held open.
 class made_file {
 public:
-    made_file(const char *name, qz::descriptor file) : name_(name), file_(std::move(file)) {}
+    made_file(const char *name, descriptor file) : name_(name), file_(std::move(file)) {}
     made_file(const made_file &) = delete;
     made_file &operator=(const made_file &) = delete;
     ~made_file() {
         struct stat held = {};
         struct stat named = {};
         if (!is_kept_ && file_ && fstat(file_.get(), &held) == 0 && lstat(name_, &named) == 0 &&
-            qz::same_file(held, named))
+            same_file(held, named))
             unlink(name_);
     }
 
@@ -39,29 +41,27 @@ public:
 
 private:
     const char *name_;
-    qz::descriptor file_;
+    descriptor file_;
     bool is_kept_ = false;
 };
 
-int cannot_open(const char *name) {
-    return qz::report(SEC_S_FILE_ERROR, qz::msg::cannot_open_for_writing, name);
-}
+int cannot_open(const char *name) { return report(SEC_S_FILE_ERROR, msg::cannot_open_for_writing, name); }
 
 int cannot_protect(const char *cache_name, const struct stat &text) {
-    const auto bits = static_cast<int>(text.st_mode & qz::permission_bits);
-    return qz::report(SEC_S_FILE_ERROR, qz::msg::cannot_set_mode, cache_name, bits);
+    const auto bits = static_cast<int>(text.st_mode & permission_bits);
+    return report(SEC_S_FILE_ERROR, msg::cannot_set_mode, cache_name, bits);
 }
 
 // Creates the temporary file under the ACL file's name, a '.', and groups of four digits, one more for each
 // name that is taken. On failure `name` is the one that could not be had.
-qz::descriptor create_temporary(const char *aclfname, qz::path_buffer &name) {
+descriptor create_temporary(const char *aclfname, path_buffer &name) {
     constexpr std::size_t digits = 4;
     std::size_t length = std::strlen(aclfname);
     std::memcpy(name.text, aclfname, length);
     name.text[length++] = '.';
     name.text[length] = '\0';
-    while (length + digits <= qz::path_max) {
-        auto state = static_cast<unsigned>(qz::read_counter() >> 32);
+    while (length + digits <= path_max) {
+        auto state = static_cast<unsigned>(read_counter() >> 32);
         const unsigned drawn = static_cast<unsigned>(rand_r(&state)) & 0xffff;
         std::snprintf(name.text + length, digits + 1, "%04x", drawn);
         length += digits;
@@ -71,7 +71,7 @@ qz::descriptor create_temporary(const char *aclfname, qz::path_buffer &name) {
             continue;
         if (errno != ENOENT)
             return {};
-        qz::descriptor file = qz::open_file(name.text, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW);
+        descriptor file = open_file(name.text, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW);
         // Somebody may have taken the name since, or a link that leads nowhere stands under it.
         if (file || errno != EEXIST)
             return file;
@@ -80,69 +80,68 @@ qz::descriptor create_temporary(const char *aclfname, qz::path_buffer &name) {
 }
 
 int cannot_write(ssize_t count, const sec_acl_buffer_t &acl) {
-    return qz::report(SEC_S_FILE_ERROR, qz::msg::short_write, static_cast<int>(count), acl.length, errno);
+    return report(SEC_S_FILE_ERROR, msg::short_write, static_cast<int>(count), acl.length, errno);
 }
 
 // Writes one cache, step by step. Each step returns SEC_S_OK, or what the operation ends with.
 class cache_writer {
 public:
-    cache_writer(const char *aclfname, const qz::text_origin &origin)
-        : aclfname_(aclfname), origin_(origin) {}
+    cache_writer(const char *aclfname, const text_origin &origin) : aclfname_(aclfname), origin_(origin) {}
 
     int name_cache();
     int examine_text() { return text_.examine(aclfname_, origin_); }
-    int examine_cache(qz::cache_rewriting rewriting);
+    int examine_cache(cache_rewriting rewriting);
     int replace(const sec_acl_buffer_t &acl);
 
 private:
-    qz::descriptor open_cache() const;
+    descriptor open_cache() const;
     int vet_opened_cache(int fd) const;
     int write_and_rename(const sec_acl_buffer_t &acl);
     int fill(int fd, const sec_acl_buffer_t &acl) const;
     int protect(int fd) const;
 
     const char *aclfname_;
-    const qz::text_origin &origin_;
-    qz::path_buffer cache_name_;
-    qz::path_buffer temporary_name_;
-    qz::text_protection text_;
+    const text_origin &origin_;
+    path_buffer cache_name_;
+    path_buffer temporary_name_;
+    text_protection text_;
     struct stat cache_ = {};
     bool is_new_ = false;
 };
 
 int cache_writer::name_cache() {
     const std::size_t length = std::strlen(aclfname_);
-    if (length < qz::uncached_path_length && qz::make_cache_name(aclfname_, cache_name_))
+    if (length < uncached_path_length && make_cache_name(aclfname_, cache_name_))
         return SEC_S_OK;
-    qz::trace(qz::point::name_too_long_for_cache, aclfname_, qz::shown_size(length));
-    return qz::report(SEC_S_FILE_ERROR, qz::msg::name_too_long_for_cache, aclfname_);
+    trace(point::name_too_long_for_cache, aclfname_, shown_size(length));
+    return report(SEC_S_FILE_ERROR, msg::name_too_long_for_cache, aclfname_);
 }
 
-int cache_writer::examine_cache(qz::cache_rewriting rewriting) {
+int cache_writer::examine_cache(cache_rewriting rewriting) {
     is_new_ = stat(cache_name_.text, &cache_) != 0;
     if (is_new_) {
         if (errno != ENOENT)
-            return qz::query_failed(cache_name_.text, "stat()", aclfname_, errno);
-        qz::trace(qz::point::cache_is_new, cache_name_.text);
+            return query_failed(cache_name_.text, "stat()", aclfname_, errno);
+        trace(point::cache_is_new, cache_name_.text);
         return SEC_S_OK;
     }
     if (const int result = text_.vet_cache(aclfname_, cache_name_.text, cache_); result != SEC_S_OK)
         return result;
-    if (rewriting == qz::cache_rewriting::unless_current && text_.status.st_mtime < cache_.st_mtime)
+    if (rewriting == cache_rewriting::unless_current && text_.status.st_mtime < cache_.st_mtime)
         return SEC_S_ADVISORY;
     return SEC_S_OK;
 }
 
-qz::descriptor cache_writer::open_cache() const {
+descriptor cache_writer::open_cache() const {
     if (!is_new_)
-        return qz::open_vetted(cache_name_.text, O_WRONLY, cache_);
-    return qz::open_file(cache_name_.text, O_WRONLY | O_CREAT | O_EXCL);
+        return open_vetted(cache_name_.text, O_WRONLY, cache_);
+    return open_file(cache_name_.text, O_WRONLY | O_CREAT | O_EXCL);
 }
 
 // Of a cache that is new, the empty file that holds its name until it is complete.
 int cache_writer::vet_opened_cache(int fd) const {
     if (is_new_)
-        return qz::remove_posix_acl(fd) ? SEC_S_OK : cannot_protect(cache_name_.text, text_.status);
+        return remove_posix_acl(fd) ? SEC_S_OK : cannot_protect(cache_name_.text, text_.status);
     return text_.vet_opened_cache(aclfname_, cache_name_.text, fd);
 }
 
@@ -154,7 +153,7 @@ int cache_writer::replace(const sec_acl_buffer_t &acl) {
         placeholder.keep();
     int result = vet_opened_cache(placeholder.fd());
     if (result == SEC_S_OK)
-        result = acl__lock_acl_file(cache_name_.text, placeholder.fd(), qz::lock_purpose::replacing);
+        result = acl__lock_acl_file(cache_name_.text, placeholder.fd(), lock_purpose::replacing);
     if (result == SEC_S_OK)
         result = write_and_rename(acl);
     if (result == SEC_S_OK)
@@ -169,8 +168,7 @@ int cache_writer::write_and_rename(const sec_acl_buffer_t &acl) {
     if (const int result = fill(temporary.fd(), acl); result != SEC_S_OK)
         return result;
     if (rename(temporary_name_.text, cache_name_.text) != 0)
-        return qz::report(SEC_S_FILE_ERROR, qz::msg::cannot_rename_cache, temporary_name_.text,
-                          cache_name_.text);
+        return report(SEC_S_FILE_ERROR, msg::cannot_rename_cache, temporary_name_.text, cache_name_.text);
     temporary.keep();
     return SEC_S_OK;
 }
@@ -179,7 +177,7 @@ int cache_writer::write_and_rename(const sec_acl_buffer_t &acl) {
 int cache_writer::fill(int fd, const sec_acl_buffer_t &acl) const {
     const timespec times[2] = {origin_.time, origin_.time};
     errno = 0; // a write that is cut short sets none
-    const ssize_t count = qz::limited_write(fd, acl.data, static_cast<std::size_t>(acl.length));
+    const ssize_t count = limited_write(fd, acl.data, static_cast<std::size_t>(acl.length));
     if (count != acl.length || futimens(fd, times) != 0)
         return cannot_write(count, acl);
     if (const int result = protect(fd); result != SEC_S_OK)
@@ -191,25 +189,25 @@ int cache_writer::fill(int fd, const sec_acl_buffer_t &acl) const {
 // entries inherited from the folder go and while it changes hands. The mode comes last, since giving a file away
 // clears bits of it; its group bits are those of the entries' mask already.
 int cache_writer::protect(int fd) const {
-    if (!qz::remove_posix_acl(fd))
+    if (!remove_posix_acl(fd))
         return cannot_protect(cache_name_.text, text_.status);
     if (fchown(fd, text_.status.st_uid, text_.status.st_gid) != 0) {
         char user_id[16];
         std::snprintf(user_id, sizeof user_id, "%u", static_cast<unsigned>(text_.status.st_uid));
-        return qz::report(SEC_S_FILE_ERROR, qz::msg::cannot_set_owner, cache_name_.text, user_id,
-                          static_cast<int>(text_.status.st_gid));
+        return report(SEC_S_FILE_ERROR, msg::cannot_set_owner, cache_name_.text, user_id,
+                      static_cast<int>(text_.status.st_gid));
     }
-    if (!text_.entries.give_to(fd) || fchmod(fd, text_.status.st_mode & qz::permission_bits) != 0)
+    if (!text_.entries.give_to(fd) || fchmod(fd, text_.status.st_mode & permission_bits) != 0)
         return cannot_protect(cache_name_.text, text_.status);
     return SEC_S_OK;
 }
 
 } // namespace
 
-int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, qz::cache_rewriting rewriting,
-                         const qz::text_origin &origin) {
+int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, cache_rewriting rewriting,
+                         const text_origin &origin) {
     if (acl->length == 0) {
-        qz::trace(qz::point::nothing_to_cache, aclfname);
+        trace(point::nothing_to_cache, aclfname);
         return SEC_S_ADVISORY;
     }
     cache_writer writer(aclfname, origin);

@@ -8,6 +8,8 @@
 
 #include <cerrno>
 
+using namespace qz;
+
 namespace {
 
 bool has_same_owner(const struct stat &text, const struct stat &cache) {
@@ -15,7 +17,7 @@ bool has_same_owner(const struct stat &text, const struct stat &cache) {
 }
 
 bool has_same_permissions(const struct stat &text, const struct stat &cache) {
-    return ((text.st_mode ^ cache.st_mode) & qz::permission_bits) == 0;
+    return ((text.st_mode ^ cache.st_mode) & permission_bits) == 0;
 }
 
 // True when the name still leads to the file that was examined, which is protected as it was then; else errno is
@@ -25,33 +27,32 @@ bool is_unchanged(const char *path, const struct stat &examined) {
     if (stat(path, &now) != 0)
         return false;
     errno = ESTALE;
-    return qz::same_file(now, examined) && has_same_owner(now, examined) && now.st_mode == examined.st_mode;
+    return same_file(now, examined) && has_same_owner(now, examined) && now.st_mode == examined.st_mode;
 }
 
 // True when the text says what was read, or is so late that a cache of what was read is not believed: who copies an
 // old file over it may keep its number, and gives it the old time.
-bool is_text_of(const struct stat &status, const qz::text_origin &origin) {
-    return qz::same_file(status, origin.file) && S_ISREG(status.st_mode) &&
+bool is_text_of(const struct stat &status, const text_origin &origin) {
+    return same_file(status, origin.file) && S_ISREG(status.st_mode) &&
            (status.st_mtime == origin.file.st_mtime || status.st_mtime >= origin.time.tv_sec);
 }
 
 int owner_differs(const char *aclfname, const char *cache_name, const struct stat &text,
                   const struct stat &cache) {
-    qz::trace(qz::point::cache_owner_differs, cache_name, cache.st_uid, cache.st_gid, text.st_uid,
-              text.st_gid);
-    return qz::report(SEC_S_FILE_ERROR, qz::msg::cache_owner_differs, aclfname);
+    trace(point::cache_owner_differs, cache_name, cache.st_uid, cache.st_gid, text.st_uid, text.st_gid);
+    return report(SEC_S_FILE_ERROR, msg::cache_owner_differs, aclfname);
 }
 
 int mode_differs(const char *aclfname, const char *cache_name, const struct stat &text,
                  const struct stat &cache) {
-    qz::trace(qz::point::cache_mode_differs, cache_name, cache.st_mode & qz::permission_bits,
-              text.st_mode & qz::permission_bits);
-    return qz::report(SEC_S_FILE_ERROR, qz::msg::cache_mode_differs, aclfname);
+    trace(point::cache_mode_differs, cache_name, cache.st_mode & permission_bits,
+          text.st_mode & permission_bits);
+    return report(SEC_S_FILE_ERROR, msg::cache_mode_differs, aclfname);
 }
 
-void trace_unlike(const qz::vetted_file &text, const qz::vetted_file &cache) {
-    qz::trace(qz::point::cache_unlike_text, text.path.text, text.status.st_uid, text.status.st_gid,
-              cache.status.st_uid, cache.status.st_gid, text.status.st_mode, cache.status.st_mode);
+void trace_unlike(const vetted_file &text, const vetted_file &cache) {
+    trace(point::cache_unlike_text, text.path.text, text.status.st_uid, text.status.st_gid,
+          cache.status.st_uid, cache.status.st_gid, text.status.st_mode, cache.status.st_mode);
 }
 
 } // namespace

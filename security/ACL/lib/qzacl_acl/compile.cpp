@@ -6,9 +6,9 @@
 #include "qzacl_trace.h"
 #include "report.h"
 
-namespace {
+using namespace qz;
 
-namespace format = qz::format;
+namespace {
 
 // What a tree becomes: its header, measured before anything is allocated.
 struct measured_subacl {
@@ -17,76 +17,76 @@ struct measured_subacl {
 };
 
 int measure(const sec_acltree_t &tree, measured_subacl &out) {
-    if (qz::has_identity(tree.type()) && tree.has_overlong_identity())
-        return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_lacks_key, tree.type());
+    if (has_identity(tree.type()) && tree.has_overlong_identity())
+        return report(SEC_S_BAD_ACLE, msg::acle_lacks_key, tree.type());
 
     out.tree = &tree;
     out.head.type = tree.type();
     out.head.entry_count = tree.held_count();
-    if (qz::has_mechanism(tree.type())) {
+    if (has_mechanism(tree.type())) {
         const std::string_view mechanism = tree.compiled_mechanism();
         out.head.mechanism = {reinterpret_cast<const unsigned char *>(mechanism.data()),
                               mechanism.size() + 1};
     }
     const std::uint64_t length = format::subacl_header_size + out.head.mechanism.size() + tree.packed_size();
     if (length > format::buffer_max)
-        return qz::report_no_memory("sec__add_acle_to_subacl", length);
+        return report_no_memory("sec__add_acle_to_subacl", length);
     out.head.length = static_cast<std::uint32_t>(length);
     return SEC_S_OK;
 }
 
-void write(qz::byte_writer &writer, const measured_subacl &subacl) {
+void write(byte_writer &writer, const measured_subacl &subacl) {
     // The identities lie in the order of insertion; fetching ahead hides most of the jumps between them.
     constexpr std::size_t ahead = 12;
     format::write_subacl_header(writer, subacl.head);
-    const bool has_identity = qz::has_identity(subacl.head.type);
+    const bool carries_identity = has_identity(subacl.head.type);
     const sec_acltree_t &tree = *subacl.tree;
-    const std::span<const qz::small_entry> entries = tree.in_order();
+    const std::span<const small_entry> entries = tree.in_order();
     for (std::size_t index = 0; index < entries.size(); ++index) {
         if (index + ahead < entries.size())
             __builtin_prefetch(tree.identity(entries[index + ahead]));
-        const qz::small_entry &entry = entries[index];
+        const small_entry &entry = entries[index];
         const char *const identity = tree.identity(entry);
         if (entry.is_deleted == 0)
             format::write_entry(writer, entry.perm_mask, identity,
-                                has_identity ? qz::identity_length(identity) + 1 : 0);
+                                carries_identity ? identity_length(identity) + 1 : 0);
     }
 }
 
 bool has_entries(const sec_acltree_t *root) { return root != nullptr && root->held_count() != 0; }
 
 // The parts of an expanded entry that all entries of a sub-ACL share.
-int common_part(const format::subacl &head, qz::acle_view &acle) {
+int common_part(const format::subacl &head, acle_view &acle) {
     acle = {.type = head.type};
-    if (!qz::is_acle_type(head.type))
-        return qz::report_corrupt(__LINE__);
-    if (!qz::has_mechanism(head.type))
+    if (!is_acle_type(head.type))
+        return report_corrupt(__LINE__);
+    if (!has_mechanism(head.type))
         return SEC_S_OK;
     const std::string_view mechanism = format::text_in(head.mechanism);
     const std::size_t length = mechanism.data() == nullptr ? head.mechanism.size() : mechanism.size();
-    if (length > qz::mechanism_max)
-        return qz::report(SEC_S_BAD_ACL, qz::msg::bad_mechanism_length, qz::shown_size(head.mechanism.size()),
-                          qz::acl_source, __LINE__);
+    if (length > mechanism_max)
+        return report(SEC_S_BAD_ACL, msg::bad_mechanism_length, shown_size(head.mechanism.size()), acl_source,
+                      __LINE__);
     if (mechanism.data() == nullptr)
-        return qz::report_corrupt(__LINE__);
+        return report_corrupt(__LINE__);
     acle.mechanism = mechanism;
     return SEC_S_OK;
 }
 
-int expand(qz::byte_reader reader, const format::subacl &head, sec_acltree_t **root) {
-    const bool is_traced = qz::traces(qz::trace_category::api);
-    qz::acle_view acle;
+int expand(byte_reader reader, const format::subacl &head, sec_acltree_t **root) {
+    const bool is_traced = traces(trace_category::api);
+    acle_view acle;
     if (const int result = common_part(head, acle); result != SEC_S_OK)
         return result;
     for (std::uint32_t left = head.entry_count; left != 0; --left) {
         format::entry entry;
         if (!format::read(reader, entry))
-            return qz::report_corrupt(__LINE__);
+            return report_corrupt(__LINE__);
         acle.perm_mask = entry.perm_mask;
-        if (qz::has_identity(head.type)) {
+        if (has_identity(head.type)) {
             acle.identity = format::text_in(entry.identity);
             if (acle.identity.data() == nullptr)
-                return qz::report_corrupt(__LINE__);
+                return report_corrupt(__LINE__);
         }
         if (const int result = sec__add_acle_to_tree(0, acle, root); result != SEC_S_OK)
             return result;
@@ -98,20 +98,20 @@ int expand(qz::byte_reader reader, const format::subacl &head, sec_acltree_t **r
 
 } // namespace
 
-int sec__acltree_to_subacl(const sec_acltree_t *root, qz::loose_subacl &out) {
+int sec__acltree_to_subacl(const sec_acltree_t *root, loose_subacl &out) {
     out = {};
     if (!has_entries(root))
         return SEC_S_OK;
     measured_subacl subacl;
     if (const int result = measure(*root, subacl); result != SEC_S_OK)
         return result;
-    auto memory = qz::allocate<unsigned char>(subacl.head.length);
+    auto memory = allocate<unsigned char>(subacl.head.length);
     if (memory == nullptr)
-        return qz::report_no_memory("sec__add_acle_to_subacl", subacl.head.length);
-    qz::byte_writer writer({memory.get(), subacl.head.length});
+        return report_no_memory("sec__add_acle_to_subacl", subacl.head.length);
+    byte_writer writer({memory.get(), subacl.head.length});
     write(writer, subacl);
     if (!writer.is_full())
-        return qz::report_corrupt(__LINE__);
+        return report_corrupt(__LINE__);
     out = {std::move(memory), subacl.head.length};
     return SEC_S_OK;
 }
@@ -130,13 +130,13 @@ int sec__acltrees_to_acl(std::span<sec_acltree_t *const> trees, sec_acl_buffer_t
             return result;
         size += subacl.head.length;
         if (++count > format::subacls_max || size > format::buffer_max)
-            return qz::report_no_memory(function, size);
+            return report_no_memory(function, size);
     }
     const auto whole = static_cast<std::size_t>(size);
-    auto memory = qz::allocate<unsigned char>(whole);
+    auto memory = allocate<unsigned char>(whole);
     if (memory == nullptr)
-        return qz::report_no_memory(function, size);
-    qz::byte_writer writer({memory.get(), whole});
+        return report_no_memory(function, size);
+    byte_writer writer({memory.get(), whole});
     format::write_header(writer, static_cast<std::uint16_t>(count));
     for (std::size_t index = trees.size(); index > 0; --index) {
         const sec_acltree_t *tree = trees[index - 1];
@@ -148,19 +148,19 @@ int sec__acltrees_to_acl(std::span<sec_acltree_t *const> trees, sec_acl_buffer_t
         write(writer, subacl);
     }
     if (!writer.is_full())
-        return qz::report_corrupt(__LINE__);
+        return report_corrupt(__LINE__);
     *acl = {static_cast<std::int32_t>(size), memory.release()};
     return SEC_S_OK;
 }
 
-int sec__subacl_to_acltree(qz::byte_span bytes, sec_acltree_t **root) {
+int sec__subacl_to_acltree(byte_span bytes, sec_acltree_t **root) {
     *root = nullptr;
-    qz::byte_reader reader(bytes);
+    byte_reader reader(bytes);
     format::subacl head;
     if (!format::read(reader, head))
-        return qz::report_corrupt(__LINE__);
-    if (qz::is_single_type(head.type) && head.entry_count > 1)
-        return qz::report(SEC_S_BAD_ACL, qz::msg::single_acle_repeated);
+        return report_corrupt(__LINE__);
+    if (is_single_type(head.type) && head.entry_count > 1)
+        return report(SEC_S_BAD_ACL, msg::single_acle_repeated);
     const int result = expand(reader, head, root);
     if (result != SEC_S_OK) {
         sec__free_acltree(*root);
@@ -179,12 +179,12 @@ int sec__acltree_to_aclelist(sec_acltree_t *root, sec_aclelist_t *list) {
                       ? nullptr
                       : static_cast<sec_acle_t **>(std::realloc(static_cast<void *>(list->acles), size));
     if (acles == nullptr)
-        return qz::report_no_memory(function, size);
+        return report_no_memory(function, size);
     list->acles = acles;
-    for (qz::small_entry &entry : root->in_order()) {
+    for (small_entry &entry : root->in_order()) {
         if (entry.is_deleted != 0)
             continue;
-        const qz::acle_view held = root->view(entry);
+        const acle_view held = root->view(entry);
         sec_acle_t *made = nullptr;
         const int result = sec__create_acle(held.type, held.perm_mask, held.mechanism.data(),
                                             held.identity.data(), 0, &made);

@@ -12,32 +12,32 @@
 
 #include <algorithm>
 
-namespace {
+using namespace qz;
 
-namespace format = qz::format;
+namespace {
 
 constexpr char as_it_stands[] = "";
 constexpr char with_empty_line[] = "\n";
 
 void print_and_clear(std::FILE *stream, const char *ending) {
-    const qz::uncancelled until_all_is_released;
-    static_cast<void>(qz::print_recorded(stream, ending));
+    const uncancelled until_all_is_released;
+    static_cast<void>(print_recorded(stream, ending));
     cu_set_no_error_1();
 }
 
-void dump_subacl(qz::byte_span bytes, const char *indentation) {
-    qz::byte_reader reader(bytes);
+void dump_subacl(byte_span bytes, const char *indentation) {
+    byte_reader reader(bytes);
     format::subacl head;
     const char *mechanism = nullptr;
     if (format::read(reader, head))
-        mechanism = qz::has_mechanism(head.type) ? format::string_in(head.mechanism) : "";
+        mechanism = has_mechanism(head.type) ? format::string_in(head.mechanism) : "";
     if (mechanism == nullptr) {
-        qz::report_corrupt(__LINE__);
+        report_corrupt(__LINE__);
         print_and_clear(stdout, as_it_stands);
         return;
     }
-    qz::report(SEC_S_ADVISORY, qz::msg::dump_subacl, indentation, indentation, qz::shown_size(head.length),
-               head.type, mechanism, qz::shown_size(head.entry_count));
+    report(SEC_S_ADVISORY, msg::dump_subacl, indentation, indentation, shown_size(head.length), head.type,
+           mechanism, shown_size(head.entry_count));
     print_and_clear(stderr, with_empty_line);
 
     sec_acltree_t *tree = nullptr;
@@ -60,21 +60,21 @@ void sec__dump_acle(const sec_acle_t *acle, const sec_perm_set_t *set, const cha
         indentation = "";
     char *mechanism = nullptr;
     char *identity = nullptr;
-    char permissions[qz::permission_text_size];
+    char permissions[permission_text_size];
     int result = sec_display_acle_id(acle, &mechanism, &identity);
-    const qz::owned<char> mechanism_owner(mechanism);
-    const qz::owned<char> identity_owner(identity);
+    const owned<char> mechanism_owner(mechanism);
+    const owned<char> identity_owner(identity);
     if (result == SEC_S_OK)
         result = sec_translate_bitmask(acle->perm_mask, set, permissions);
     if (result == SEC_S_OK) {
-        const int letter = qz::type_letter(acle->type);
-        if (qz::has_mechanism(acle->type))
-            qz::report(SEC_S_ADVISORY, qz::msg::dump_mechanism_acle, indentation, letter, mechanism, identity,
-                       permissions);
+        const int letter = type_letter(acle->type);
+        if (has_mechanism(acle->type))
+            report(SEC_S_ADVISORY, msg::dump_mechanism_acle, indentation, letter, mechanism, identity,
+                   permissions);
         else if (acle->type == SEC_ACLE_GROUP)
-            qz::report(SEC_S_ADVISORY, qz::msg::dump_group_acle, indentation, letter, identity, permissions);
+            report(SEC_S_ADVISORY, msg::dump_group_acle, indentation, letter, identity, permissions);
         else
-            qz::report(SEC_S_ADVISORY, qz::msg::dump_single_acle, indentation, letter, permissions);
+            report(SEC_S_ADVISORY, msg::dump_single_acle, indentation, letter, permissions);
     }
     // Either the entry's line, or the message that says why there is none.
     print_and_clear(stderr, as_it_stands);
@@ -83,7 +83,7 @@ void sec__dump_acle(const sec_acle_t *acle, const sec_perm_set_t *set, const cha
 void sec__dump_acltree(const sec_acltree_t *node, const char *indentation) {
     if (node == nullptr)
         return;
-    for (const qz::small_entry &entry : node->in_order()) {
+    for (const small_entry &entry : node->in_order()) {
         const sec_acle_t shown = node->record(entry);
         if (entry.is_deleted == 0)
             sec__dump_acle(&shown, nullptr, indentation);
@@ -96,7 +96,7 @@ void sec__dump_subacl(const void *subacl, const char *indentation) {
     // The caller vouches for the header; all else must lie within the length that stands in it.
     const auto *start = static_cast<const unsigned char *>(subacl);
     std::uint32_t length = 0;
-    qz::byte_reader(qz::byte_span(start, format::subacl_header_size)).field(length);
+    byte_reader(byte_span(start, format::subacl_header_size)).field(length);
     dump_subacl({start, std::max<std::size_t>(length, format::subacl_header_size)},
                 indentation == nullptr ? "" : indentation);
 }
@@ -104,17 +104,17 @@ void sec__dump_subacl(const void *subacl, const char *indentation) {
 void sec__dump_acl(const sec_acl_buffer_t *acl) {
     if (acl == nullptr || acl->length == 0 || acl->data == nullptr)
         return;
-    const qz::byte_span bytes = format::bytes_of(*acl);
-    qz::byte_reader reader(bytes);
+    const byte_span bytes = format::bytes_of(*acl);
+    byte_reader reader(bytes);
     format::header head;
     if (!format::read(reader, head) || head.type != format::buffer_type) {
-        qz::report(SEC_S_ADVISORY, qz::msg::dump_not_valid);
+        report(SEC_S_ADVISORY, msg::dump_not_valid);
         print_and_clear(stderr, with_empty_line);
         return;
     }
     char length[16];
     std::snprintf(length, sizeof length, "%d", acl->length);
-    qz::report(SEC_S_ADVISORY, qz::msg::dump_descriptor, length, head.version, head.order, head.subacl_count);
+    report(SEC_S_ADVISORY, msg::dump_descriptor, length, head.version, head.order, head.subacl_count);
     print_and_clear(stderr, as_it_stands);
 
     format::subacl_walk walk(bytes);
@@ -122,7 +122,7 @@ void sec__dump_acl(const sec_acl_buffer_t *acl) {
     for (; step == format::subacl_walk::step::found; step = walk.next())
         dump_subacl(walk.bytes(), "\t");
     if (step == format::subacl_walk::step::corrupt) {
-        qz::report_corrupt(__LINE__);
+        report_corrupt(__LINE__);
         print_and_clear(stdout, as_it_stands);
     }
 }

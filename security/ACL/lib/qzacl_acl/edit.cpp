@@ -15,29 +15,29 @@
 #include "report.h"
 #include "trace_points.h"
 
+using namespace qz;
+
 namespace {
 
-namespace format = qz::format;
-
-constexpr const char *add_function = qz::edit_function::adding;
-constexpr const char *delete_function = qz::edit_function::deleting;
+constexpr const char *add_function = edit_function::adding;
+constexpr const char *delete_function = edit_function::deleting;
 
 int check_entry(const sec_acle_t &acle) {
-    if (!qz::is_acle_type(acle.type))
-        return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_type_unknown, acle.type);
-    const bool lacks_identity = qz::has_identity(acle.type) && acle.identity == nullptr;
+    if (!is_acle_type(acle.type))
+        return report(SEC_S_BAD_ACLE, msg::acle_type_unknown, acle.type);
+    const bool lacks_identity = has_identity(acle.type) && acle.identity == nullptr;
     const std::size_t mechanism_length = strnlen(acle.mechanism, sizeof acle.mechanism);
     const bool lacks_mechanism =
-        qz::has_mechanism(acle.type) && (mechanism_length == 0 || mechanism_length > qz::mechanism_max);
+        has_mechanism(acle.type) && (mechanism_length == 0 || mechanism_length > mechanism_max);
     if (lacks_identity || lacks_mechanism)
-        return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_lacks_key, acle.type);
+        return report(SEC_S_BAD_ACLE, msg::acle_lacks_key, acle.type);
     return SEC_S_OK;
 }
 
 int check_header(const sec_acl_buffer_t &acl) {
     // What of the header the length does not cover counts as wrong in no way of its own, but as bytes that
     // are missing.
-    qz::byte_reader reader(format::bytes_of(acl));
+    byte_reader reader(format::bytes_of(acl));
     std::uint8_t type = format::buffer_type;
     std::uint8_t version = format::buffer_version;
     std::uint8_t order = format::host_order;
@@ -45,42 +45,42 @@ int check_header(const sec_acl_buffer_t &acl) {
     const bool is_whole =
         reader.field(type) && reader.field(version) && reader.field(order) && reader.field(subacl_count);
     if (type != format::buffer_type)
-        return qz::report(SEC_S_BAD_ACL, qz::msg::second_argument_not_acl);
+        return report(SEC_S_BAD_ACL, msg::second_argument_not_acl);
     if (version != format::buffer_version)
-        return qz::report(SEC_S_BAD_ACL, qz::msg::buffer_version_unsupported);
+        return report(SEC_S_BAD_ACL, msg::buffer_version_unsupported);
     if (order != format::host_order)
-        return qz::report(SEC_S_BAD_ACL, qz::msg::wrong_byte_order);
-    return is_whole ? SEC_S_OK : qz::report_corrupt(__LINE__);
+        return report(SEC_S_BAD_ACL, msg::wrong_byte_order);
+    return is_whole ? SEC_S_OK : report_corrupt(__LINE__);
 }
 
 // Finds the sub-ACL that an edit is about. The bytes that the edit replaces must all be there.
-int find_edited(const sec_acl_buffer_t &acl, const sec_acle_t &acle, qz::stored_subacl &out) {
-    out = qz::find_subacl(acl, acle.type, acle.mechanism);
+int find_edited(const sec_acl_buffer_t &acl, const sec_acle_t &acle, stored_subacl &out) {
+    out = find_subacl(acl, acle.type, acle.mechanism);
     if (out.is_there && out.head.length > static_cast<std::size_t>(acl.length) - out.offset)
-        return qz::report_corrupt(__LINE__);
+        return report_corrupt(__LINE__);
     return SEC_S_OK;
 }
 
 // Puts what a changed tree compiled to in the place of the stored sub-ACL, or where a new one goes.
-int replace_subacl(const qz::loose_subacl &compiled, const qz::stored_subacl &stored, const char *function,
+int replace_subacl(const loose_subacl &compiled, const stored_subacl &stored, const char *function,
                    sec_acl_buffer_t &acl) {
     const bool is_new = !stored.is_there;
-    const std::size_t count = qz::subacl_count(acl);
+    const std::size_t count = subacl_count(acl);
     if (is_new && count == format::subacls_max)
-        return qz::report_no_memory(function, static_cast<std::size_t>(acl.length) + compiled.length);
-    const int result = qz::resize_part(acl, stored.offset, stored.head.length, compiled.length, function);
+        return report_no_memory(function, static_cast<std::size_t>(acl.length) + compiled.length);
+    const int result = resize_part(acl, stored.offset, stored.head.length, compiled.length, function);
     if (result != SEC_S_OK)
         return result;
-    qz::byte_writer writer(qz::writable_bytes(acl).subspan(stored.offset, compiled.length));
+    byte_writer writer(writable_bytes(acl).subspan(stored.offset, compiled.length));
     writer.bytes(compiled.data.get(), compiled.length);
     if (is_new)
-        qz::set_subacl_count(acl, count + 1);
+        set_subacl_count(acl, count + 1);
     else if (compiled.length == 0)
-        qz::set_subacl_count(acl, count - 1);
+        set_subacl_count(acl, count - 1);
     return SEC_S_OK;
 }
 
-int add_by_tree(const sec_acle_t &acle, int report_duplicates, const qz::stored_subacl &stored,
+int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_subacl &stored,
                 sec_acl_buffer_t &acl) {
     sec_acltree_t *root = nullptr;
     if (stored.is_there) {
@@ -89,42 +89,41 @@ int add_by_tree(const sec_acle_t &acle, int report_duplicates, const qz::stored_
             return result;
     }
     int result = sec__add_acle_to_tree(report_duplicates, &acle, &root);
-    const qz::owned_acltree tree(root);
-    qz::loose_subacl compiled;
+    const owned_acltree tree(root);
+    loose_subacl compiled;
     if (result == SEC_S_OK)
         result = sec__acltree_to_subacl(root, compiled);
     if (result != SEC_S_OK)
         return result;
     if (compiled.length == 0)
-        return qz::report(SEC_S_INTERNAL, qz::msg::internal_failure, qz::acl_source, __LINE__,
-                          SEC_S_INTERNAL);
+        return report(SEC_S_INTERNAL, msg::internal_failure, acl_source, __LINE__, SEC_S_INTERNAL);
     // Entries with equal identities may have become one; an entry that was added is no failure for want of
     // less memory.
     const std::int32_t old_length = acl.length;
     const int replaced = replace_subacl(compiled, stored, add_function, acl);
     if (replaced == SEC_S_OK && acl.length < old_length)
-        static_cast<void>(qz::give_back(acl));
+        static_cast<void>(give_back(acl));
     return replaced;
 }
 
 int add_to_buffer(const sec_acle_t &acle, int report_duplicates, sec_acl_buffer_t &acl) {
-    qz::stored_subacl stored;
+    stored_subacl stored;
     if (const int result = find_edited(acl, acle, stored); result != SEC_S_OK)
         return result;
     if (!stored.is_there && !format::find_end(format::bytes_of(acl), stored.offset))
-        return qz::report_corrupt(__LINE__);
-    qz::packed_place place;
-    if (stored.is_there && qz::find_packed(acl, stored, acle, place) &&
+        return report_corrupt(__LINE__);
+    packed_place place;
+    if (stored.is_there && find_packed(acl, stored, acle, place) &&
         std::strlen(acle.identity) <= format::identity_max)
-        return qz::add_packed(acle, report_duplicates, stored, place, acl);
+        return add_packed(acle, report_duplicates, stored, place, acl);
     return add_by_tree(acle, report_duplicates, stored, acl);
 }
 
 int add_checked(const sec_acle_t *acle, int report_duplicates, sec_acl_buffer_t *acl) {
     if (acle == nullptr)
-        return qz::report_bad_parameter(add_function, 1, 0);
+        return report_bad_parameter(add_function, 1, 0);
     if (acl == nullptr)
-        return qz::report_bad_parameter(add_function, 2, 0);
+        return report_bad_parameter(add_function, 2, 0);
     if (const int result = check_entry(*acle); result != SEC_S_OK)
         return result;
     if (acl->data != nullptr) {
@@ -132,9 +131,9 @@ int add_checked(const sec_acle_t *acle, int report_duplicates, sec_acl_buffer_t 
         return result == SEC_S_OK ? add_to_buffer(*acle, report_duplicates, *acl) : result;
     }
 
-    auto memory = qz::allocate<unsigned char>(format::header_size);
+    auto memory = allocate<unsigned char>(format::header_size);
     if (memory == nullptr)
-        return qz::report_no_memory(add_function, format::header_size);
+        return report_no_memory(add_function, format::header_size);
     std::memcpy(memory.get(), format::empty_acl, format::header_size);
     sec_acl_buffer_t made = {format::header_size, memory.release()};
     const int result = add_to_buffer(*acle, report_duplicates, made);
@@ -146,50 +145,50 @@ int add_checked(const sec_acle_t *acle, int report_duplicates, sec_acl_buffer_t 
     return result;
 }
 
-int delete_by_tree(const sec_acle_t &acle, const qz::stored_subacl &stored, sec_acl_buffer_t &acl) {
+int delete_by_tree(const sec_acle_t &acle, const stored_subacl &stored, sec_acl_buffer_t &acl) {
     sec_acltree_t *root = nullptr;
     int result = sec__subacl_to_acltree(format::bytes_of(acl).subspan(stored.offset), &root);
     if (result != SEC_S_OK)
         return result;
-    const qz::owned_acltree tree(root);
+    const owned_acltree tree(root);
     if (root == nullptr)
-        return sec__acle_not_found(SEC_S_BAD_ACLE, qz::view_of(acle));
+        return sec__acle_not_found(SEC_S_BAD_ACLE, view_of(acle));
     result = sec__del_acle_from_tree(&acle, root);
-    qz::loose_subacl compiled;
+    loose_subacl compiled;
     if (result == SEC_S_OK)
         result = sec__acltree_to_subacl(root, compiled);
     if (result == SEC_S_OK)
         result = replace_subacl(compiled, stored, delete_function, acl);
-    return result == SEC_S_OK ? qz::finish_deletion(acl) : result;
+    return result == SEC_S_OK ? finish_deletion(acl) : result;
 }
 
 int delete_checked(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
     if (acle == nullptr)
-        return qz::report_bad_parameter(delete_function, 1, 0);
+        return report_bad_parameter(delete_function, 1, 0);
     if (acl == nullptr)
-        return qz::report_bad_parameter(delete_function, 2, 0);
+        return report_bad_parameter(delete_function, 2, 0);
     if (const int result = check_entry(*acle); result != SEC_S_OK)
         return result;
     if (acl->length == 0 || acl->data == nullptr)
-        return qz::report(SEC_S_BAD_ACL, qz::msg::acl_corrupted);
+        return report(SEC_S_BAD_ACL, msg::acl_corrupted);
     if (const int result = check_header(*acl); result != SEC_S_OK)
         return result;
 
-    qz::stored_subacl stored;
+    stored_subacl stored;
     if (const int result = find_edited(*acl, *acle, stored); result != SEC_S_OK)
         return result;
     if (!stored.is_there)
-        return sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, qz::view_of(*acle));
-    qz::packed_place place;
-    if (qz::find_packed(*acl, stored, *acle, place))
-        return place.size == 0 ? sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, qz::view_of(*acle))
-                               : qz::delete_packed(stored, place, *acl);
+        return sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, view_of(*acle));
+    packed_place place;
+    if (find_packed(*acl, stored, *acle, place))
+        return place.size == 0 ? sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, view_of(*acle))
+                               : delete_packed(stored, place, *acl);
     return delete_by_tree(*acle, stored, *acl);
 }
 
 int sec__add_acle_to_acl(int report_duplicates, const sec_acle_t *acle, sec_acl_buffer_t *acl) {
-    return qz::run(qz::operation::add_acle_to_acl, std::tie(acle, acl),
-                   [&] { return add_checked(acle, report_duplicates, acl); });
+    return run(operation::add_acle_to_acl, std::tie(acle, acl),
+               [&] { return add_checked(acle, report_duplicates, acl); });
 }
 
 } // namespace
@@ -203,6 +202,5 @@ int sec_add_acle_to_acl2(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
 }
 
 int sec_del_acle_from_acl(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
-    return qz::run(qz::operation::del_acle_from_acl, std::tie(acle, acl),
-                   [&] { return delete_checked(acle, acl); });
+    return run(operation::del_acle_from_acl, std::tie(acle, acl), [&] { return delete_checked(acle, acl); });
 }

@@ -9,9 +9,11 @@
 #include <arpa/inet.h>
 #include <cstring>
 
+using namespace qz;
+
 namespace {
 
-using text = qz::owned<char>;
+using text = owned<char>;
 
 // The mechanisms whose identities end in a host, whose address is brought into one form.
 bool names_hosts(const char *mechanism) {
@@ -38,8 +40,8 @@ int set_mechanism(sec_acle_t &acle, const char *mechanism, bool convert) {
     const char *source = convert ? utf8.get() : mechanism;
     const std::size_t length = std::strlen(source);
     // A mnemonic that fitted before its conversion may have grown.
-    if (length > qz::mechanism_max)
-        return qz::report_bad_parameter("sec_create_acle", 3, qz::shown_pointer(mechanism));
+    if (length > mechanism_max)
+        return report_bad_parameter("sec_create_acle", 3, shown_pointer(mechanism));
     std::memcpy(acle.mechanism, source, length + 1);
     return SEC_S_OK;
 }
@@ -52,14 +54,14 @@ int set_identity(sec_acle_t &acle, const char *identity, bool convert) {
     } else {
         made.reset(strdup(identity));
         if (made == nullptr)
-            return qz::report_no_memory("sec__create_acle", std::strlen(identity) + 1);
+            return report_no_memory("sec__create_acle", std::strlen(identity) + 1);
     }
     acle.identity = made.release();
     return SEC_S_OK;
 }
 
 int bad_identity(const char *identity) {
-    return qz::report_bad_parameter("sec_create_acle", 4, qz::shown_pointer(identity));
+    return report_bad_parameter("sec_create_acle", 4, shown_pointer(identity));
 }
 
 // Creates an entry of a mechanism that names hosts: an IPv6 address behind the '@' is written in its one
@@ -81,9 +83,9 @@ int create_with_host(std::uint8_t type, std::uint32_t perm_mask, const char *mec
     static_cast<void>(cu_ipaddr_ntop_1(&address, formatted));
     const auto prefix = static_cast<std::size_t>(host - identity);
     const std::size_t size = prefix + std::strlen(formatted) + 1;
-    const qz::owned<char[]> normalised = qz::allocate<char>(size);
+    const owned<char[]> normalised = allocate<char>(size);
     if (normalised == nullptr)
-        return qz::report_no_memory("sec_create_acle", size);
+        return report_no_memory("sec_create_acle", size);
     std::memcpy(normalised.get(), identity, prefix);
     std::memcpy(normalised.get() + prefix, formatted, size - prefix);
     return sec__create_acle(type, perm_mask, mechanism, normalised.get(), 1, acle);
@@ -93,18 +95,18 @@ int create_checked(std::uint8_t type, std::uint32_t perm_mask, const char *mecha
                    sec_acle_t **acle) {
     if (acle != nullptr)
         *acle = nullptr;
-    if (!qz::is_acle_type(type))
-        return qz::report_bad_parameter("sec_create_acle", 1, type);
-    if (qz::has_mechanism(type)) {
-        const std::size_t length = mechanism == nullptr ? 0 : strnlen(mechanism, qz::mechanism_max + 1);
-        if (length == 0 || length > qz::mechanism_max)
-            return qz::report_bad_parameter("sec_create_acle", 3, qz::shown_pointer(mechanism));
+    if (!is_acle_type(type))
+        return report_bad_parameter("sec_create_acle", 1, type);
+    if (has_mechanism(type)) {
+        const std::size_t length = mechanism == nullptr ? 0 : strnlen(mechanism, mechanism_max + 1);
+        if (length == 0 || length > mechanism_max)
+            return report_bad_parameter("sec_create_acle", 3, shown_pointer(mechanism));
     }
-    if (qz::has_identity(type) && (identity == nullptr || *identity == '\0'))
+    if (has_identity(type) && (identity == nullptr || *identity == '\0'))
         return bad_identity(identity);
     if (acle == nullptr)
-        return qz::report_bad_parameter("sec_create_acle", 5, 0);
-    if (qz::has_mechanism(type) && names_hosts(mechanism))
+        return report_bad_parameter("sec_create_acle", 5, 0);
+    if (has_mechanism(type) && names_hosts(mechanism))
         return create_with_host(type, perm_mask, mechanism, identity, acle);
     return sec__create_acle(type, perm_mask, mechanism, identity, 1, acle);
 }
@@ -116,22 +118,22 @@ int display_checked(const sec_acle_t *acle, char **mechanism, char **identity) {
     if (identity != nullptr)
         *identity = nullptr;
     if (acle == nullptr)
-        return qz::report_bad_parameter(function, 1, 0);
+        return report_bad_parameter(function, 1, 0);
     if (mechanism == nullptr)
-        return qz::report_bad_parameter(function, 2, 0);
+        return report_bad_parameter(function, 2, 0);
     if (identity == nullptr)
-        return qz::report_bad_parameter(function, 3, 0);
+        return report_bad_parameter(function, 3, 0);
 
-    if (qz::is_single_type(acle->type))
+    if (is_single_type(acle->type))
         return SEC_S_OK;
-    if (!qz::has_identity(acle->type))
-        return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_type_not_displayable, acle->type);
+    if (!has_identity(acle->type))
+        return report(SEC_S_BAD_ACLE, msg::acle_type_not_displayable, acle->type);
     const bool has_name = acle->identity != nullptr && acle->identity[0] != '\0';
-    if (!has_name || (qz::has_mechanism(acle->type) && acle->mechanism[0] == '\0'))
-        return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_incomplete);
+    if (!has_name || (has_mechanism(acle->type) && acle->mechanism[0] == '\0'))
+        return report(SEC_S_BAD_ACLE, msg::acle_incomplete);
 
     text shown_mechanism;
-    if (qz::has_mechanism(acle->type)) {
+    if (has_mechanism(acle->type)) {
         const int result = converted(acl__convert_from_utf8, acle->mechanism, shown_mechanism);
         if (result != SEC_S_OK)
             return result;
@@ -158,16 +160,16 @@ int sec__create_acle(std::uint8_t type, std::uint32_t perm_mask, const char *mec
                      int convert, sec_acle_t **acle) {
     *acle = nullptr;
     // Its identity comes last; and an entry that nobody gets is none whose release is told.
-    qz::owned<sec_acle_t> made(static_cast<sec_acle_t *>(std::calloc(1, sizeof(sec_acle_t))));
+    owned<sec_acle_t> made(static_cast<sec_acle_t *>(std::calloc(1, sizeof(sec_acle_t))));
     if (made == nullptr)
-        return qz::report_no_memory("sec__create_acle", sizeof(sec_acle_t));
+        return report_no_memory("sec__create_acle", sizeof(sec_acle_t));
     made->perm_mask = perm_mask;
     made->type = type;
-    if (qz::has_mechanism(type)) {
+    if (has_mechanism(type)) {
         if (const int result = set_mechanism(*made, mechanism, convert != 0); result != SEC_S_OK)
             return result;
     }
-    if (qz::has_identity(type)) {
+    if (has_identity(type)) {
         if (const int result = set_identity(*made, identity, convert != 0); result != SEC_S_OK)
             return result;
     }
@@ -177,24 +179,24 @@ int sec__create_acle(std::uint8_t type, std::uint32_t perm_mask, const char *mec
 
 int sec_create_acle(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
                     sec_acle_t **acle) {
-    return qz::run(qz::operation::create_acle, std::tie(type, perm_mask, mechanism, identity, acle),
-                   [&] { return create_checked(type, perm_mask, mechanism, identity, acle); });
+    return run(operation::create_acle, std::tie(type, perm_mask, mechanism, identity, acle),
+               [&] { return create_checked(type, perm_mask, mechanism, identity, acle); });
 }
 
 int sec_display_acle_id(const sec_acle_t *acle, char **mechanism, char **identity) {
-    return qz::run(
-        qz::operation::display_acle_id, std::tie(acle, mechanism, identity),
+    return run(
+        operation::display_acle_id, std::tie(acle, mechanism, identity),
         [&] { return display_checked(acle, mechanism, identity); },
         [&] { return std::tie(*mechanism, *identity); });
 }
 
 void sec__trace_release(const sec_acle_t *acle) {
-    qz::run(qz::operation::release_acle, std::tie(acle), [] { return SEC_S_OK; });
+    run(operation::release_acle, std::tie(acle), [] { return SEC_S_OK; });
 }
 
-void sec__trace_release(const void *place, const qz::acle_view &acle) {
-    const qz::traced::acle shown(place, acle.type, acle.perm_mask, acle.mechanism, acle.identity);
-    qz::run(qz::operation::release_acle, std::tie(shown), [] { return SEC_S_OK; });
+void sec__trace_release(const void *place, const acle_view &acle) {
+    const traced::acle shown(place, acle.type, acle.perm_mask, acle.mechanism, acle.identity);
+    run(operation::release_acle, std::tie(shown), [] { return SEC_S_OK; });
 }
 
 void sec_release_acle(sec_acle_t *acle) {
@@ -206,7 +208,7 @@ void sec_release_acle(sec_acle_t *acle) {
 }
 
 void sec_release_aclelist(sec_aclelist_t *list) {
-    qz::run(qz::operation::release_aclelist, std::tie(list), [&] {
+    run(operation::release_aclelist, std::tie(list), [&] {
         if (list != nullptr && list->count != 0 && list->acles != nullptr)
             release_entries(*list);
         return SEC_S_OK;

@@ -20,6 +20,8 @@
 #include <bit>
 #include <cstring>
 
+using namespace qz;
+
 namespace {
 
 constexpr bool is_line_end(char c) { return c == '\n' || c == '\f' || c == '\r'; }
@@ -29,8 +31,8 @@ constexpr bool is_line_end(char c) { return c == '\n' || c == '\f' || c == '\r';
 // It may name more of them behind one that does end it, but miss none.
 template <class MayEnd, class Ends>
 char *find_end(char *at, const char *limit, const MayEnd &may_end, const Ends &ends) {
-    for (; limit - at >= static_cast<std::ptrdiff_t>(qz::word_size); at += qz::word_size) {
-        for (auto some = may_end(qz::first_byte_lowest(qz::load8(at))); some != 0; some &= some - 1) {
+    for (; limit - at >= static_cast<std::ptrdiff_t>(word_size); at += word_size) {
+        for (auto some = may_end(first_byte_lowest(load8(at))); some != 0; some &= some - 1) {
             char *const found = at + std::countr_zero(some) / 8;
             if (ends(*found))
                 return found;
@@ -44,7 +46,7 @@ char *find_end(char *at, const char *limit, const MayEnd &may_end, const Ends &e
 // The first line end or NUL.
 char *find_line_end(char *at, const char *limit) {
     const auto is_low = [](std::uint64_t word) { // below 14
-        return (word - qz::in_each_byte(14)) & ~word & qz::in_each_byte(0x80);
+        return (word - in_each_byte(14)) & ~word & in_each_byte(0x80);
     };
     return find_end(at, limit, is_low, [](char c) { return c == '\0' || is_line_end(c); });
 }
@@ -83,7 +85,7 @@ public:
 
     // False when only blanks and a comment are left.
     bool next(token &out) {
-        while (at_ != end_ && qz::is_blank(*at_))
+        while (at_ != end_ && is_blank(*at_))
             ++at_;
         if (at_ == end_ || *at_ == '#')
             return false;
@@ -101,7 +103,7 @@ private:
     // White space or the end of the line, which is a line end or a NUL.
     char *find_token_end() const {
         const auto is_no_sign = [](std::uint64_t word) { // a blank, a control character or beyond ASCII
-            return ((word - qz::in_each_byte(' ' + 1)) | word) & qz::in_each_byte(0x80);
+            return ((word - in_each_byte(' ' + 1)) | word) & in_each_byte(0x80);
         };
         return find_end(at_, limit_, is_no_sign,
                         [this](char c) { return c == '\0' || is_line_end(c) || is_space_(c); });
@@ -110,33 +112,33 @@ private:
     char *at_;
     char *end_;
     const char *limit_;
-    qz::space_class is_space_;
+    space_class is_space_;
 };
 
 // Fills the entry from the tokens of a line; a line without any leaves its type 0.
-int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, qz::parsed_acle &entry) {
+int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, parsed_acle &entry) {
     token type;
     if (!tokens.next(type))
         return SEC_S_OK;
     entry.type = type.length == 1 ? type_of_letter(type.text[0]) : std::uint8_t{0};
     if (entry.type == 0)
-        return qz::report(SEC_S_BAD_ACL, qz::msg::bad_type_token, line, type.text);
+        return report(SEC_S_BAD_ACL, msg::bad_type_token, line, type.text);
 
-    if (qz::has_mechanism(entry.type)) {
+    if (has_mechanism(entry.type)) {
         token mechanism;
         if (!tokens.next(mechanism))
-            return qz::report(SEC_S_BAD_ACL, qz::msg::tokens_missing, line);
-        if (mechanism.length > qz::mechanism_max)
-            return qz::report(SEC_S_BAD_ACL, qz::msg::mechanism_too_long, mechanism.text, line);
+            return report(SEC_S_BAD_ACL, msg::tokens_missing, line);
+        if (mechanism.length > mechanism_max)
+            return report(SEC_S_BAD_ACL, msg::mechanism_too_long, mechanism.text, line);
         for (std::size_t index = 0; index < mechanism.length; ++index)
             mechanism.text[index] =
-                static_cast<char>(qz::fold(static_cast<unsigned char>(mechanism.text[index])));
+                static_cast<char>(fold(static_cast<unsigned char>(mechanism.text[index])));
         entry.mechanism = {mechanism.text, mechanism.length};
     }
-    if (qz::has_identity(entry.type)) {
+    if (has_identity(entry.type)) {
         token identity;
         if (!tokens.next(identity))
-            return qz::report(SEC_S_BAD_ACL, qz::msg::tokens_missing, line);
+            return report(SEC_S_BAD_ACL, msg::tokens_missing, line);
         entry.identity = {identity.text, identity.length};
     }
 
@@ -147,12 +149,12 @@ int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, qz::pars
         result != SEC_S_OK) {
         // The message about the letter gives way to the one that names the line.
         cu_set_no_error_1();
-        qz::report(result, qz::msg::bad_permission_token, line, permissions.text);
+        report(result, msg::bad_permission_token, line, permissions.text);
         return result;
     }
     token excess;
     if (tokens.next(excess))
-        return qz::report(SEC_S_BAD_ACL, qz::msg::tokens_in_excess, line);
+        return report(SEC_S_BAD_ACL, msg::tokens_in_excess, line);
     return SEC_S_OK;
 }
 
@@ -169,7 +171,7 @@ sec_acle_t record_of(const parsed_acle &entry) {
 } // namespace qz
 
 int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size_t *remaining,
-                             std::uint32_t *line, qz::parsed_acle *entry) {
+                             std::uint32_t *line, parsed_acle *entry) {
     constexpr int line_consumed = 1;
     *entry = {};
     char *begin = *cursor;
@@ -183,9 +185,9 @@ int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size
     const auto shown_line = static_cast<int>(*line);
 
     int result = SEC_S_OK;
-    if (length > qz::line_length_max) {
-        qz::trace(qz::point::line_too_long, *line, length);
-        result = qz::report(SEC_S_FILE_ERROR, qz::msg::line_too_long, shown_line);
+    if (length > line_length_max) {
+        trace(point::line_too_long, *line, length);
+        result = report(SEC_S_FILE_ERROR, msg::line_too_long, shown_line);
     } else {
         result = parse_line(line_tokens(begin, end, limit), set == nullptr ? acl__default_perm_set : *set,
                             shown_line, *entry);
@@ -193,7 +195,7 @@ int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size
         if (result == SEC_S_OK && ends_at_nul && *remaining != length) {
             *cursor = nullptr;
             ++*line;
-            return qz::report(SEC_S_BAD_ACL, qz::msg::line_corrupted, shown_line);
+            return report(SEC_S_BAD_ACL, msg::line_corrupted, shown_line);
         }
     }
     *cursor = ends_at_nul ? nullptr : end + 1;
@@ -204,8 +206,8 @@ int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size
 
 int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size_t *remaining,
                              std::uint32_t *line, sec_acle_t *entry) {
-    qz::parsed_acle parsed;
+    parsed_acle parsed;
     const int result = sec__read_acle_from_text(set, cursor, remaining, line, &parsed);
-    *entry = qz::record_of(parsed);
+    *entry = record_of(parsed);
     return result;
 }

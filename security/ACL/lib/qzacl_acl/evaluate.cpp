@@ -31,20 +31,20 @@
 #include <algorithm>
 #include <array>
 
-namespace {
+using namespace qz;
 
-namespace format = qz::format;
+namespace {
 
 constexpr unsigned type_bits = 0x1f;
 
 int check_buffer(const sec_acl_buffer_t &acl) {
-    const qz::byte_span bytes = format::bytes_of(acl);
+    const byte_span bytes = format::bytes_of(acl);
     if (bytes.size() < format::order_offset || bytes[0] != format::buffer_type ||
         bytes[1] != format::buffer_version)
-        return qz::report(SEC_S_BAD_ACL, qz::msg::not_an_acl_buffer);
+        return report(SEC_S_BAD_ACL, msg::not_an_acl_buffer);
     if (bytes.size() > format::order_offset && bytes[format::order_offset] != format::host_order)
-        return qz::report(SEC_S_BAD_ACL, qz::msg::wrong_byte_order);
-    return bytes.size() < format::header_size ? qz::report_corrupt(__LINE__) : SEC_S_OK;
+        return report(SEC_S_BAD_ACL, msg::wrong_byte_order);
+    return bytes.size() < format::header_size ? report_corrupt(__LINE__) : SEC_S_OK;
 }
 
 struct single_request {
@@ -58,19 +58,19 @@ struct single_request {
 };
 
 int no_match(const single_request &request, const char *identity) {
-    return qz::report(SEC_S_BAD_ACLE, qz::msg::no_matching_acle, request.type_argument,
-                      request.mechanism == nullptr ? "" : request.mechanism, identity);
+    return report(SEC_S_BAD_ACLE, msg::no_matching_acle, request.type_argument,
+                  request.mechanism == nullptr ? "" : request.mechanism, identity);
 }
 
-int evaluate_single_entry(const single_request &request, const format::subacl &head, qz::byte_reader entries,
+int evaluate_single_entry(const single_request &request, const format::subacl &head, byte_reader entries,
                           std::uint32_t &mask) {
     if (head.entry_count > 1)
-        return qz::report(SEC_S_BAD_ACL, qz::msg::more_than_one_acle, qz::acl_source, __LINE__);
+        return report(SEC_S_BAD_ACL, msg::more_than_one_acle, acl_source, __LINE__);
     if (head.entry_count == 0)
         return no_match(request, "");
     format::entry entry;
     if (!format::read(entries, entry))
-        return qz::report_corrupt(__LINE__);
+        return report_corrupt(__LINE__);
     mask = entry.perm_mask;
     return SEC_S_OK;
 }
@@ -86,14 +86,14 @@ sec_id_compare_fn find_handler(std::uint32_t kind, const char *mechanism) {
 // Asks a handler about each entry in turn. Whatever the handler recorded about an entry that does not match
 // is its own affair and is cleared.
 int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler, bool is_sorted,
-                        const format::subacl &head, qz::byte_reader entries, std::uint32_t &mask) {
+                        const format::subacl &head, byte_reader entries, std::uint32_t &mask) {
     for (std::uint32_t left = head.entry_count; left != 0; --left) {
         format::entry entry;
         if (!format::read(entries, entry))
-            return qz::report_corrupt(__LINE__);
+            return report_corrupt(__LINE__);
         const char *identity = format::string_in(entry.identity);
         if (identity == nullptr)
-            return qz::report_corrupt(__LINE__);
+            return report_corrupt(__LINE__);
         const int order = handler(request.identity, identity);
         if (order == 0) {
             mask = entry.perm_mask;
@@ -107,41 +107,40 @@ int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler
 }
 
 // Skips the entries that sort before the wanted identity, all but those whose order is not clear at first sight.
-[[gnu::noinline]] void skip_before(const qz::wanted_identity &wanted, format::entry_walk &walk) {
-    const qz::wanted_identity held_in_registers = wanted; // a copy, which nothing else can change meanwhile
-    format::skip_entries_while(walk, qz::identity_block::size, [&](std::uint8_t, qz::byte_span identity) {
-        return held_in_registers.is_clearly_behind(qz::identity_block(identity.data()));
+[[gnu::noinline]] void skip_before(const wanted_identity &wanted, format::entry_walk &walk) {
+    const wanted_identity held_in_registers = wanted; // a copy, which nothing else can change meanwhile
+    format::skip_entries_while(walk, identity_block::size, [&](std::uint8_t, byte_span identity) {
+        return held_in_registers.is_clearly_behind(identity_block(identity.data()));
     });
 }
 
 // Compares the wanted identity with the entries from the next one on, up to the one that decides about it,
 // before which the walk then stands. When none is left the wanted identity sorts behind all.
-qz::identity_order compare_next(const qz::wanted_identity &wanted, format::entry_walk &walk,
-                                format::entry &entry) {
+identity_order compare_next(const wanted_identity &wanted, format::entry_walk &walk, format::entry &entry) {
     for (;;) {
         skip_before(wanted, walk);
         if (walk.left == 0)
-            return qz::identity_order::behind;
-        qz::byte_reader next = walk.entries;
+            return identity_order::behind;
+        byte_reader next = walk.entries;
         if (!format::read(next, entry))
-            return qz::identity_order::unknown;
-        const qz::identity_order order = wanted.compare(entry.identity);
-        if (order != qz::identity_order::behind)
+            return identity_order::unknown;
+        const identity_order order = wanted.compare(entry.identity);
+        if (order != identity_order::behind)
             return order;
         walk = {next, walk.left - 1};
     }
 }
 
-int evaluate_user(const single_request &request, const format::subacl &head, qz::byte_reader entries,
+int evaluate_user(const single_request &request, const format::subacl &head, byte_reader entries,
                   std::uint32_t &mask) {
     format::entry_walk walk{entries, head.entry_count};
     format::entry entry;
-    switch (compare_next(qz::wanted_identity(request.identity), walk, entry)) {
-    case qz::identity_order::same:
+    switch (compare_next(wanted_identity(request.identity), walk, entry)) {
+    case identity_order::same:
         mask = entry.perm_mask;
         return SEC_S_OK;
-    case qz::identity_order::unknown:
-        return qz::report_corrupt(__LINE__);
+    case identity_order::unknown:
+        return report_corrupt(__LINE__);
     default:
         return no_match(request, request.identity);
     }
@@ -151,28 +150,28 @@ int evaluate_single(const sec_acl_buffer_t *acl, single_request &request, const 
                     std::uint32_t *mask) {
     constexpr const char *function = "sec__single_acle_perm";
     if (acl == nullptr)
-        return qz::report_bad_parameter(function, 1, 0);
+        return report_bad_parameter(function, 1, 0);
     if (mask == nullptr)
-        return qz::report_bad_parameter(function, 5, 0);
+        return report_bad_parameter(function, 5, 0);
     if (const int result = check_buffer(*acl); result != SEC_S_OK)
         return result;
     const std::uint8_t type = request.type();
-    if (!qz::is_single_type(type) && !qz::has_mechanism(type))
-        return qz::report(SEC_S_BAD_PARAMETER, qz::msg::type_not_evaluated, request.type_argument);
-    if (qz::has_mechanism(type)) {
+    if (!is_single_type(type) && !has_mechanism(type))
+        return report(SEC_S_BAD_PARAMETER, msg::type_not_evaluated, request.type_argument);
+    if (has_mechanism(type)) {
         if (request.mechanism == nullptr || *request.mechanism == '\0')
-            return qz::report(SEC_S_BAD_PARAMETER, qz::msg::mechanism_required);
+            return report(SEC_S_BAD_PARAMETER, msg::mechanism_required);
         if (request.identity == nullptr || *request.identity == '\0')
-            return qz::report(SEC_S_BAD_PARAMETER, qz::msg::identity_required);
+            return report(SEC_S_BAD_PARAMETER, msg::identity_required);
     }
     *mask = 0;
 
     format::subacl head;
-    qz::byte_reader entries;
-    if (!qz::find_subacl(*acl, type, subacl_mechanism == nullptr ? request.mechanism : subacl_mechanism, head,
-                         entries))
+    byte_reader entries;
+    if (!find_subacl(*acl, type, subacl_mechanism == nullptr ? request.mechanism : subacl_mechanism, head,
+                     entries))
         return no_match(request, "");
-    if (qz::is_single_type(type))
+    if (is_single_type(type))
         return evaluate_single_entry(request, head, entries, *mask);
 
     sec_id_compare_fn handler = nullptr;
@@ -201,16 +200,16 @@ public:
     void add(const char *name) { names_[count_++] = name; }
     bool is_full() const { return count_ == capacity; }
 
-    int evaluate(const format::subacl &head, qz::byte_reader entries, std::uint32_t &mask, bool &is_found) {
+    int evaluate(const format::subacl &head, byte_reader entries, std::uint32_t &mask, bool &is_found) {
         std::sort(names_.begin(), names_.begin() + count_,
                   [](const char *a, const char *b) { return cu_strcasecmp_posix_1(a, b) < 0; });
         format::entry_walk walk{entries, head.entry_count};
         for (std::size_t index = 0; index < count_ && walk.left != 0; ++index) {
             format::entry entry;
-            const auto order = compare_next(qz::wanted_identity(names_[index]), walk, entry);
-            if (order == qz::identity_order::unknown)
-                return qz::report_corrupt(__LINE__);
-            if (order == qz::identity_order::same) {
+            const auto order = compare_next(wanted_identity(names_[index]), walk, entry);
+            if (order == identity_order::unknown)
+                return report_corrupt(__LINE__);
+            if (order == identity_order::same) {
                 mask |= entry.perm_mask;
                 is_found = true;
             }
@@ -224,25 +223,25 @@ private:
     std::size_t count_ = 0;
 };
 
-int no_group() { return qz::report(SEC_S_BAD_ACLE, qz::msg::no_matching_acle, SEC_ACLE_GROUP, "", ""); }
+int no_group() { return report(SEC_S_BAD_ACLE, msg::no_matching_acle, SEC_ACLE_GROUP, "", ""); }
 
 int evaluate_groups(const sec_acl_buffer_t *acl, std::int32_t count, const sec_group_ref_t *groups,
                     std::uint32_t *mask) {
     constexpr const char *function = "sec__group_acles_perm";
     if (acl == nullptr)
-        return qz::report_bad_parameter(function, 1, 0);
+        return report_bad_parameter(function, 1, 0);
     if (count != 0 && groups == nullptr)
-        return qz::report_bad_parameter(function, 3, 0);
+        return report_bad_parameter(function, 3, 0);
     if (mask == nullptr)
-        return qz::report_bad_parameter(function, 4, 0);
+        return report_bad_parameter(function, 4, 0);
     if (const int result = check_buffer(*acl); result != SEC_S_OK)
         return result;
     *mask = 0;
     if (count == 0)
         return SEC_S_OK;
     format::subacl head;
-    qz::byte_reader entries;
-    if (!qz::find_subacl(*acl, SEC_ACLE_GROUP, nullptr, head, entries) || count < 0)
+    byte_reader entries;
+    if (!find_subacl(*acl, SEC_ACLE_GROUP, nullptr, head, entries) || count < 0)
         return no_group();
 
     std::uint32_t granted = 0;
@@ -266,11 +265,11 @@ int evaluate_groups(const sec_acl_buffer_t *acl, std::int32_t count, const sec_g
 
 int sec__single_acle_perm(const sec_acl_buffer_t *acl, std::uint8_t type, const char *mechanism,
                           const char *subacl_mechanism, const char *identity, std::uint32_t *mask) {
-    return qz::run(
-        qz::operation::single_acle_perm, std::tie(acl, type, mechanism, identity, mask),
+    return run(
+        operation::single_acle_perm, std::tie(acl, type, mechanism, identity, mask),
         [&] {
             pthread_once(&acl__init_once_block, acl__state_init);
-            const qz::trace_timer<qz::point::deciding> timer;
+            const trace_timer<point::deciding> timer;
             single_request request{type, mechanism, identity};
             const int result = evaluate_single(acl, request, subacl_mechanism, mask);
             timer.stop(request.walked, type, mechanism, identity);
@@ -281,11 +280,11 @@ int sec__single_acle_perm(const sec_acl_buffer_t *acl, std::uint8_t type, const 
 
 int sec__group_acles_perm(const sec_acl_buffer_t *acl, std::int32_t count, const sec_group_ref_t *groups,
                           std::uint32_t *mask) {
-    return qz::run(
-        qz::operation::group_acles_perm, std::tie(acl, count, groups, mask),
+    return run(
+        operation::group_acles_perm, std::tie(acl, count, groups, mask),
         [&] {
             pthread_once(&acl__init_once_block, acl__state_init);
-            const qz::trace_timer<qz::point::deciding_for_groups> timer;
+            const trace_timer<point::deciding_for_groups> timer;
             const int result = evaluate_groups(acl, count, groups, mask);
             timer.stop();
             return result;

@@ -10,13 +10,15 @@
 
 #include <cstring>
 
+using namespace qz;
+
 namespace {
 
 // Callers know the registration's messages by this name.
 constexpr char function[] = "acl__register_id_handler";
 
 int report_lock_failure(int line, int error) {
-    return qz::report(SEC_S_INTERNAL, qz::msg::state_lock_failed, qz::acl_source, line, error);
+    return report(SEC_S_INTERNAL, msg::state_lock_failed, acl_source, line, error);
 }
 
 // Appends one registration; the lock is held.
@@ -25,7 +27,7 @@ int append(std::uint32_t kind, const char *mechanism, std::size_t length, sec_id
     const std::size_t size = (count + 1) * sizeof(sec_id_handler_t);
     auto *grown = static_cast<sec_id_handler_t *>(std::realloc(acl__state.handlers, size));
     if (grown == nullptr)
-        return qz::report_no_memory(function, size);
+        return report_no_memory(function, size);
     grown[count] = {};
     grown[count].kind = kind;
     std::memcpy(grown[count].mechanism, mechanism, length);
@@ -37,14 +39,14 @@ int append(std::uint32_t kind, const char *mechanism, std::size_t length, sec_id
 
 int register_checked(std::uint32_t kind, const char *mechanism, sec_id_compare_fn handler) {
     if (kind != SEC_ID_HANDLER_EXPANDED && kind != SEC_ID_HANDLER_USER)
-        return qz::report_bad_parameter(function, 1, static_cast<int>(kind));
+        return report_bad_parameter(function, 1, static_cast<int>(kind));
     if (mechanism == nullptr)
-        return qz::report_bad_parameter(function, 2, 0);
+        return report_bad_parameter(function, 2, 0);
     if (handler == nullptr)
-        return qz::report_bad_parameter(function, 3, 0);
-    const std::size_t length = strnlen(mechanism, qz::mechanism_max + 1);
-    if (length == 0 || length > qz::mechanism_max)
-        return qz::report(SEC_S_BAD_PARAMETER, qz::msg::bad_handler_mechanism);
+        return report_bad_parameter(function, 3, 0);
+    const std::size_t length = strnlen(mechanism, mechanism_max + 1);
+    if (length == 0 || length > mechanism_max)
+        return report(SEC_S_BAD_PARAMETER, msg::bad_handler_mechanism);
 
     if (const int error = pthread_mutex_lock(&acl__state.lock); error != 0)
         return report_lock_failure(__LINE__, error);
@@ -57,15 +59,15 @@ int register_checked(std::uint32_t kind, const char *mechanism, sec_id_compare_f
 } // namespace
 
 int sec__register_id_handler(std::uint32_t kind, const char *mechanism, sec_id_compare_fn handler) {
-    const qz::uncancelled until_unlocked;
-    return qz::run(qz::operation::register_id_handler, std::tie(kind, mechanism, handler), [&] {
+    const uncancelled until_unlocked;
+    return run(operation::register_id_handler, std::tie(kind, mechanism, handler), [&] {
         pthread_once(&acl__init_once_block, acl__state_init);
         return register_checked(kind, mechanism, handler);
     });
 }
 
 int sec__get_id_handler(std::uint32_t kind, const char *mechanism, sec_id_compare_fn *handler) {
-    const qz::uncancelled until_unlocked;
+    const uncancelled until_unlocked;
     *handler = nullptr;
     if (const int error = pthread_mutex_lock(&acl__state.lock); error != 0)
         return report_lock_failure(__LINE__, error);

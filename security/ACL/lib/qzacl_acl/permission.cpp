@@ -6,6 +6,8 @@
 
 #include <bit>
 
+using namespace qz;
+
 extern "C" constinit const sec_perm_template_t acl__default_perm_list[13] = {
     {0x1, 'r', "read", "general purpose read operation"},
     {0x2, 'w', "write", "general purpose write operation"},
@@ -25,7 +27,7 @@ extern "C" constinit const sec_perm_template_t acl__default_perm_list[13] = {
 extern "C" constinit const sec_perm_set_t acl__default_perm_set = {13, acl__default_perm_list};
 
 int sec__translate_perms(const char *text, const sec_perm_set_t *set, std::uint32_t *mask) {
-    const auto templates = qz::templates_of(*set);
+    const auto templates = templates_of(*set);
     for (; *text != '\0'; ++text) {
         const sec_perm_template_t *match = nullptr;
         for (const sec_perm_template_t &candidate : templates) {
@@ -35,14 +37,14 @@ int sec__translate_perms(const char *text, const sec_perm_set_t *set, std::uint3
             }
         }
         if (match == nullptr)
-            return qz::report(SEC_S_BAD_PERMISSION, qz::msg::no_template_for_letter, *text);
+            return report(SEC_S_BAD_PERMISSION, msg::no_template_for_letter, *text);
         *mask |= match->bit;
     }
     return SEC_S_OK;
 }
 
 int sec__translate_bitmask(std::uint32_t mask, const sec_perm_set_t *set, char *out) {
-    const auto templates = qz::templates_of(*set);
+    const auto templates = templates_of(*set);
     for (; mask != 0; mask &= mask - 1) {
         const std::uint32_t bit = std::uint32_t{1} << std::countr_zero(mask);
         const sec_perm_template_t *match = nullptr;
@@ -53,7 +55,7 @@ int sec__translate_bitmask(std::uint32_t mask, const sec_perm_set_t *set, char *
             }
         }
         if (match == nullptr)
-            return qz::report(SEC_S_BAD_PERMISSION, qz::msg::no_template_for_bit, static_cast<int>(bit));
+            return report(SEC_S_BAD_PERMISSION, msg::no_template_for_bit, static_cast<int>(bit));
         *out++ = match->letter;
     }
     *out = '\0';
@@ -61,11 +63,11 @@ int sec__translate_bitmask(std::uint32_t mask, const sec_perm_set_t *set, char *
 }
 
 int sec_translate_perms(const char *text, const sec_perm_set_t *set, std::uint32_t *mask) {
-    return qz::run(
-        qz::operation::translate_perms, std::tie(text, set, mask),
+    return run(
+        operation::translate_perms, std::tie(text, set, mask),
         [&] {
             if (mask == nullptr)
-                return qz::report_bad_parameter("sec_translate_perms", 3, 0);
+                return report_bad_parameter("sec_translate_perms", 3, 0);
             *mask = 0;
             if (text == nullptr)
                 return SEC_S_OK;
@@ -78,12 +80,12 @@ int sec_translate_bitmask(std::uint32_t mask, const sec_perm_set_t *set, char *o
     // Before the entry point, whose record shows the output.
     if (out != nullptr)
         out[0] = '\0';
-    return qz::run(
-        qz::operation::translate_bitmask, std::tie(mask, set, out),
+    return run(
+        operation::translate_bitmask, std::tie(mask, set, out),
         [&] {
             // The name in this message differs from the operation's; callers match on it as it stands.
             if (out == nullptr)
-                return qz::report_bad_parameter("sec_translate_mask", 3, 0);
+                return report_bad_parameter("sec_translate_mask", 3, 0);
             if (mask == 0)
                 return SEC_S_OK;
             return sec__translate_bitmask(mask, set == nullptr ? &acl__default_perm_set : set, out);

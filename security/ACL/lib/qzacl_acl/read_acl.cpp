@@ -12,21 +12,23 @@
 #include "report.h"
 #include "trace_points.h"
 
+using namespace qz;
+
 namespace {
 
-constexpr qz::acl_file_use by_library = {
-    .not_found = {SEC_S_FILE_ERROR, qz::msg::bad_file_name},
-    .not_private = {SEC_S_BAD_PERMISSION, qz::msg::file_not_private},
-    .cannot_open = {SEC_S_FILE_ERROR, qz::msg::cannot_open_file},
+constexpr acl_file_use by_library = {
+    .not_found = {SEC_S_FILE_ERROR, msg::bad_file_name},
+    .not_private = {SEC_S_BAD_PERMISSION, msg::file_not_private},
+    .cannot_open = {SEC_S_FILE_ERROR, msg::cannot_open_file},
     .takes_empty_of_anybody = true,
     .is_traced = true,
 };
 
 // Brings the bytes of a cache into host order and checks them, also those that had to be converted.
 int convert_and_check(sec_acl_buffer_t &acl) {
-    const qz::byte_span bytes = qz::format::bytes_of(acl);
+    const byte_span bytes = format::bytes_of(acl);
     const bool is_foreign =
-        bytes.size() > qz::format::order_offset && bytes[qz::format::order_offset] != qz::format::host_order;
+        bytes.size() > format::order_offset && bytes[format::order_offset] != format::host_order;
     if (const int result = sec_convert_acl_to_host(1, &acl); result != SEC_S_OK || !is_foreign)
         return result;
     return sec__check_acl_buffer(&acl);
@@ -47,7 +49,7 @@ public:
     std::uint32_t line() const { return text_.line(); }
 
 private:
-    using choosing_timer = qz::trace_timer<qz::point::choosing_file>;
+    using choosing_timer = trace_timer<point::choosing_file>;
 
     int read_once(const char *aclfname, const choosing_timer &choosing, sec_acl_buffer_t &out);
     bool read_cache(sec_acl_buffer_t &out);
@@ -59,15 +61,15 @@ private:
     const char *username_;
     std::uint32_t asked_;
     std::uint32_t flags_; // of the attempt at hand
-    qz::acl_text text_;
-    qz::vetted_file acl_;
-    qz::vetted_file cache_;
+    acl_text text_;
+    vetted_file acl_;
+    vetted_file cache_;
 };
 
 // Takes the buffer from the cache. False, with nothing recorded, when anything about it is wrong.
 bool acl_file_reader::read_cache(sec_acl_buffer_t &out) {
-    qz::file_bytes bytes;
-    int result = qz::read_cache_of(acl_, cache_, by_library, bytes);
+    file_bytes bytes;
+    int result = read_cache_of(acl_, cache_, by_library, bytes);
     if (result == SEC_S_OK && (bytes.length == 0 || bytes.length > INT32_MAX))
         return false;
     if (result == SEC_S_OK && (flags_ & SEC_READ_ACL_CONVERT) != 0) {
@@ -83,19 +85,19 @@ bool acl_file_reader::read_cache(sec_acl_buffer_t &out) {
 }
 
 int acl_file_reader::parse_lines(sec_acltree_array &trees) {
-    const bool traces_lines = qz::traces(qz::point::line_read);
-    const bool may_wait = !traces_lines && !qz::traces(qz::point::parsing); // traces show the line of the failure
-    qz::parsed_acle entry;
+    const bool traces_lines = traces(point::line_read);
+    const bool may_wait = !traces_lines && !traces(point::parsing); // traces show the line of the failure
+    parsed_acle entry;
     for (;;) {
-        const qz::acl_line line = text_.next(entry);
-        if (line == qz::acl_line::end)
+        const acl_line line = text_.next(entry);
+        if (line == acl_line::end)
             return trees.settle(SEC_S_OK);
-        if (line == qz::acl_line::bad)
+        if (line == acl_line::bad)
             return trees.settle(text_.failure());
-        const qz::acle_view acle = qz::view_of(entry);
+        const acle_view acle = view_of(entry);
         if (traces_lines)
-            qz::point::line_read.record(text_.line(), entry.type, acle.mechanism, acle.identity, entry.perm_mask);
-        if (line == qz::acl_line::none)
+            point::line_read.record(text_.line(), entry.type, acle.mechanism, acle.identity, entry.perm_mask);
+        if (line == acl_line::none)
             continue;
         if (const int added = may_wait ? trees.add_soon(acle) : trees.add(acle); added != SEC_S_OK)
             return added;
@@ -103,7 +105,7 @@ int acl_file_reader::parse_lines(sec_acltree_array &trees) {
 }
 
 int acl_file_reader::parse(sec_acl_buffer_t &out) {
-    const qz::trace_timer<qz::point::parsing> parsing;
+    const trace_timer<point::parsing> parsing;
     flags_ &= ~std::uint32_t{SEC_READ_ACL_CONVERT};
     sec_acltree_array trees(text_.all());
     int result = parse_lines(trees);
@@ -119,7 +121,7 @@ int acl_file_reader::read_text(sec_acl_buffer_t &out) {
     if (const int result = parse(out); result != SEC_S_OK)
         return result;
     if ((flags_ & SEC_READ_ACL_CACHE) != 0 &&
-        sec__cache_aclbuffer(acl_.path.text, &out, qz::cache_rewriting::unless_current, text_.origin()) !=
+        sec__cache_aclbuffer(acl_.path.text, &out, cache_rewriting::unless_current, text_.origin()) !=
             SEC_S_OK) {
         // A cache that cannot be written is no failure of the read.
         cu_set_no_error_1();
@@ -130,14 +132,14 @@ int acl_file_reader::read_text(sec_acl_buffer_t &out) {
 
 int acl_file_reader::read_once(const char *aclfname, const choosing_timer &choosing, sec_acl_buffer_t &out) {
     flags_ = asked_;
-    if (const int result = qz::vet_acl_file(aclfname, username_, by_library, acl_); result != SEC_S_OK)
+    if (const int result = vet_acl_file(aclfname, username_, by_library, acl_); result != SEC_S_OK)
         return result;
     if (acl_.status.st_size == 0) {
-        qz::trace(qz::point::file_is_empty, acl_.path.text);
+        trace(point::file_is_empty, acl_.path.text);
         flags_ &= ~std::uint32_t{SEC_READ_ACL_CACHE};
         return SEC_S_OK;
     }
-    if (!reads_text() && !qz::cache_is_current(acl_, cache_))
+    if (!reads_text() && !cache_is_current(acl_, cache_))
         flags_ |= SEC_READ_ACL_TEXT;
     choosing.stop(reads_text() ? acl_.path.text : cache_.path.text);
     if (!reads_text()) {
@@ -155,11 +157,11 @@ int read_checked(acl_file_reader &reader, const char *aclfname, const char *user
     if (acl != nullptr)
         *acl = {};
     if (aclfname == nullptr)
-        return qz::report_bad_parameter(function, 1, 0);
+        return report_bad_parameter(function, 1, 0);
     if (acl == nullptr)
-        return qz::report_bad_parameter(function, 5, 0);
+        return report_bad_parameter(function, 5, 0);
     if (username != nullptr && *username == '\0')
-        return qz::report(SEC_S_BAD_PARAMETER, qz::msg::bad_user_name);
+        return report(SEC_S_BAD_PARAMETER, msg::bad_user_name);
     return reader.read(aclfname, *acl);
 }
 
@@ -167,10 +169,10 @@ int read_checked(acl_file_reader &reader, const char *aclfname, const char *user
 
 int sec_read_acl_file(const char *aclfname, const char *username, const sec_perm_set_t *set,
                       std::uint32_t flags, sec_acl_buffer_t *acl, std::uint32_t *out_flags) {
-    const qz::uncancelled until_all_is_closed;
+    const uncancelled until_all_is_closed;
     acl_file_reader reader(username, set, flags);
-    return qz::run(
-        qz::operation::read_acl_file, std::tie(aclfname, username, set, flags, acl),
+    return run(
+        operation::read_acl_file, std::tie(aclfname, username, set, flags, acl),
         [&] {
             const int result = read_checked(reader, aclfname, username, acl);
             if (out_flags != nullptr)

@@ -11,13 +11,15 @@
 #include <algorithm>
 #include <new>
 
+using namespace qz;
+
 namespace {
 
 // So few entries are compared one by one.
 constexpr std::uint32_t few = 16;
 
 std::size_t packed_size_of(std::uint8_t type, std::size_t identity_length) {
-    return qz::format::entry_fixed_size + (qz::has_identity(type) ? identity_length + 1 : 0);
+    return format::entry_fixed_size + (has_identity(type) ? identity_length + 1 : 0);
 }
 
 // Grows something for the entries that are expected, or where there is no memory for so many for a fair number.
@@ -29,19 +31,18 @@ bool grow_for(std::uint32_t expected, std::uint32_t count, const Grow &grow) {
 
 } // namespace
 
-bool sec_acltree::is_equal(const qz::small_entry &held, const candidate &wanted) const {
+bool sec_acltree::is_equal(const small_entry &held, const candidate &wanted) const {
     if (held.key != wanted.key)
         return false;
-    return qz::ends_within(wanted.key) ||
-           qz::compare_identities(identity(held) + qz::identity_word_size,
-                                  wanted.identity + qz::identity_word_size) == 0;
+    return ends_within(wanted.key) ||
+           compare_identities(identity(held) + identity_word_size, wanted.identity + identity_word_size) == 0;
 }
 
 bool sec_acltree::sorts_last(const candidate &wanted) const {
-    const qz::small_entry &last = entries_.all().back();
+    const small_entry &last = entries_.all().back();
     if (wanted.key != last.key)
         return wanted.key > last.key;
-    return qz::compare_identities(wanted.identity, identity(last)) > 0;
+    return compare_identities(wanted.identity, identity(last)) > 0;
 }
 
 // Puts all entries into a new table with room for those that are expected.
@@ -55,21 +56,21 @@ bool sec_acltree::fill_table(std::uint32_t place, std::size_t &refused) {
     return true;
 }
 
-qz::small_entry *sec_acltree::find_equal(const candidate &wanted, std::uint64_t hash) {
+small_entry *sec_acltree::find_equal(const candidate &wanted, std::uint64_t hash) {
     const auto entries = entries_.all();
-    const auto is_wanted = [&](const qz::small_entry &entry) { return is_equal(entry, wanted); };
+    const auto is_wanted = [&](const small_entry &entry) { return is_equal(entry, wanted); };
     if (table_.room() == 0) {
         const auto at = std::find_if(entries.begin(), entries.end(), is_wanted);
         return at == entries.end() ? nullptr : &*at;
     }
     const std::uint32_t number =
         table_.find(hash, [&](std::uint32_t each) { return is_wanted(entries[each]); });
-    return number == qz::identity_table::none ? nullptr : &entries[number];
+    return number == identity_table::none ? nullptr : &entries[number];
 }
 
-sec_acltree::insertion sec_acltree::insert(const qz::acle_view &acle) {
+sec_acltree::insertion sec_acltree::insert(const acle_view &acle) {
     const std::uint32_t count = entries_.count();
-    if (qz::is_single_type(type_) && count != 0)
+    if (is_single_type(type_) && count != 0)
         return {outcome::duplicate, &entries_.all().front(), 0};
     restore_keys();
     std::uint32_t place = 0;
@@ -80,14 +81,14 @@ sec_acltree::insertion sec_acltree::insert(const qz::acle_view &acle) {
         return {outcome::no_memory, nullptr, refused};
 
     const char *const identity = identities_.identity(place);
-    const candidate wanted = {identity, qz::ordered_word(identity)};
+    const candidate wanted = {identity, ordered_word(identity)};
     if (is_ascending_ && count != 0)
         is_ascending_ = sorts_last(wanted);
     if (!is_ascending_) {
         if (count >= few && table_.room() <= count && !fill_table(place, refused))
             return {outcome::no_memory, nullptr, refused};
         const std::uint64_t hash = table_.room() == 0 ? 0 : table_.hash(identity, wanted.key);
-        if (qz::small_entry *held = find_equal(wanted, hash); held != nullptr)
+        if (small_entry *held = find_equal(wanted, hash); held != nullptr)
             return {outcome::duplicate, held, 0};
         if (table_.room() != 0)
             table_.enter(hash, count);
@@ -95,32 +96,32 @@ sec_acltree::insertion sec_acltree::insert(const qz::acle_view &acle) {
     identities_.keep(place, acle.identity.size());
     count_entry(acle.identity.size(), 1);
     return {outcome::inserted,
-            &entries_.append({wanted.key, place & qz::identity_store::last_place, 0, acle.perm_mask}), 0};
+            &entries_.append({wanted.key, place & identity_store::last_place, 0, acle.perm_mask}), 0};
 }
 
 void sec_acltree::count_entry(std::size_t identity_length, int held) {
     const auto times = static_cast<std::uint32_t>(held); // of which -1 counts down
     held_count_ += times;
-    overlong_count_ += identity_length > qz::format::identity_max ? times : 0;
+    overlong_count_ += identity_length > format::identity_max ? times : 0;
     packed_size_ += packed_size_of(type_, identity_length) * static_cast<std::uint64_t>(held);
 }
 
-qz::small_entry *sec_acltree::find(const char *wanted) {
+small_entry *sec_acltree::find(const char *wanted) {
     const auto entries = entries_.all();
-    const auto is_wanted = [&](const qz::small_entry &entry) {
-        return entry.is_deleted == 0 && qz::fold_compare(identity(entry), wanted) == 0;
+    const auto is_wanted = [&](const small_entry &entry) {
+        return entry.is_deleted == 0 && fold_compare(identity(entry), wanted) == 0;
     };
     // Deleting is one step of an edit that has read all entries before; it must not need memory to hash a name.
-    const auto sorts_before = [&](const qz::small_entry &entry, const char *other) {
-        return qz::fold_compare(identity(entry), other) < 0;
+    const auto sorts_before = [&](const small_entry &entry, const char *other) {
+        return fold_compare(identity(entry), other) < 0;
     };
     const auto at = is_ascending_ ? std::lower_bound(entries.begin(), entries.end(), wanted, sorts_before)
                                   : std::find_if(entries.begin(), entries.end(), is_wanted);
     return at != entries.end() && is_wanted(*at) ? &*at : nullptr;
 }
 
-void sec_acltree::erase(qz::small_entry &entry) {
-    count_entry(qz::identity_length(identity(entry)), -1);
+void sec_acltree::erase(small_entry &entry) {
+    count_entry(identity_length(identity(entry)), -1);
     entry.is_deleted = 1;
 }
 
@@ -130,34 +131,34 @@ void sec_acltree::put_in_order() const {
     table_.release(); // its numbers are those of another order, and what follows can use the memory
     if (type_ == SEC_ACLE_EXPANDED)
         return;
-    has_whole_keys_ = qz::sort_by_identity(entries_.all(), identities_) == 0;
+    has_whole_keys_ = sort_by_identity(entries_.all(), identities_) == 0;
     is_ascending_ = true;
 }
 
 void sec_acltree::restore_keys() {
     if (has_whole_keys_)
         return;
-    for (qz::small_entry &entry : entries_.all())
-        entry.key = qz::ordered_word(identity(entry));
+    for (small_entry &entry : entries_.all())
+        entry.key = ordered_word(identity(entry));
     has_whole_keys_ = true;
 }
 
-std::span<const qz::small_entry> sec_acltree::in_order() const {
+std::span<const small_entry> sec_acltree::in_order() const {
     put_in_order();
     return entries_.all();
 }
 
-std::span<qz::small_entry> sec_acltree::in_order() {
+std::span<small_entry> sec_acltree::in_order() {
     put_in_order();
     return entries_.all();
 }
 
-qz::acle_view sec_acltree::view(const qz::small_entry &entry) const {
+acle_view sec_acltree::view(const small_entry &entry) const {
     const char *const text = identity(entry);
-    return {entry.perm_mask, type_, identities_.mechanism(entry.place), {text, qz::identity_length(text)}};
+    return {entry.perm_mask, type_, identities_.mechanism(entry.place), {text, identity_length(text)}};
 }
 
-sec_acle_t sec_acltree::record(const qz::small_entry &entry) const {
+sec_acle_t sec_acltree::record(const small_entry &entry) const {
     sec_acle_t made = {entry.perm_mask, {}, type_, identities_.identity(entry.place)};
     const std::string_view mechanism = identities_.mechanism(entry.place);
     std::copy(mechanism.begin(), mechanism.end(), made.mechanism);
@@ -166,11 +167,11 @@ sec_acle_t sec_acltree::record(const qz::small_entry &entry) const {
 
 std::string_view sec_acltree::compiled_mechanism() const {
     // A text spells the mechanism of all its entries alike.
-    return identities_.is_in_text() ? mechanism() : identities_.mechanism(qz::topmost(in_order())->place);
+    return identities_.is_in_text() ? mechanism() : identities_.mechanism(topmost(in_order())->place);
 }
 
 void sec_acltree::trace_release() {
-    qz::in_post_order(in_order(), [this](const qz::small_entry &entry) {
+    in_post_order(in_order(), [this](const small_entry &entry) {
         if (entry.is_deleted != 0)
             sec__trace_release(nullptr);
         else
@@ -199,31 +200,31 @@ int add_to_tree(bool reports_duplicates, const acle_view &acle, sec_acltree &tre
 
 } // namespace qz
 
-int sec__add_acle_to_tree(int report_duplicates, const qz::acle_view &acle, sec_acltree_t **slot) {
+int sec__add_acle_to_tree(int report_duplicates, const acle_view &acle, sec_acltree_t **slot) {
     if (*slot != nullptr)
-        return qz::add_to_tree(report_duplicates != 0, acle, **slot);
+        return add_to_tree(report_duplicates != 0, acle, **slot);
     void *memory = std::malloc(sizeof(sec_acltree_t));
     if (memory == nullptr)
-        return qz::report_no_memory("sec__add_acle_to_tree", sizeof(sec_acltree_t));
-    qz::owned_acltree made(new (memory) sec_acltree_t(acle.type, {}));
-    const int result = qz::add_to_tree(report_duplicates != 0, acle, *made);
+        return report_no_memory("sec__add_acle_to_tree", sizeof(sec_acltree_t));
+    owned_acltree made(new (memory) sec_acltree_t(acle.type, {}));
+    const int result = add_to_tree(report_duplicates != 0, acle, *made);
     if (result == SEC_S_OK)
         *slot = made.release();
     return result;
 }
 
 int sec__add_acle_to_tree(int report_duplicates, const sec_acle_t *acle, sec_acltree_t **slot) {
-    return sec__add_acle_to_tree(report_duplicates, qz::view_of(*acle), slot);
+    return sec__add_acle_to_tree(report_duplicates, view_of(*acle), slot);
 }
 
 int sec__del_acle_from_tree(const sec_acle_t *acle, sec_acltree_t *root) {
-    qz::small_entry *held = nullptr;
-    if (!qz::is_single_type(acle->type))
+    small_entry *held = nullptr;
+    if (!is_single_type(acle->type))
         held = root->find(acle->identity);
     else if (root->held_count() != 0)
         held = &root->in_order().front();
     if (held == nullptr)
-        return sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, qz::view_of(*acle));
+        return sec__acle_not_found(SEC_S_ACLE_NOT_FOUND, view_of(*acle));
     sec__trace_release(held, root->view(*held));
     root->erase(*held);
     return SEC_S_OK;
@@ -232,7 +233,7 @@ int sec__del_acle_from_tree(const sec_acle_t *acle, sec_acltree_t *root) {
 void sec__free_acltree(sec_acltree_t *root) {
     if (root == nullptr)
         return;
-    if (qz::traces(qz::trace_category::api))
+    if (traces(trace_category::api))
         root->trace_release();
     root->~sec_acltree();
     std::free(root);

@@ -10,33 +10,35 @@
 #include <new>
 #include <utility>
 
+using namespace qz;
+
 namespace {
 
-bool is_of_key(const sec_acltree_t &tree, const qz::acle_view &acle) {
+bool is_of_key(const sec_acltree_t &tree, const acle_view &acle) {
     if (tree.type() != acle.type)
         return false;
-    if (!qz::has_mechanism(acle.type))
+    if (!has_mechanism(acle.type))
         return true;
     const std::string_view held = tree.mechanism();
     return held == acle.mechanism || // as texts spell it
            (held.size() == acle.mechanism.size() &&
-            qz::fold_compare(held.data(), acle.mechanism.data(), held.size()) == 0);
+            fold_compare(held.data(), acle.mechanism.data(), held.size()) == 0);
 }
 
-std::uint32_t hash_of_key(const qz::acle_view &acle, const qz::identity_hash_key &key) {
-    char mechanism[qz::mechanism_max] = {};
-    if (qz::has_mechanism(acle.type))
+std::uint32_t hash_of_key(const acle_view &acle, const identity_hash_key &key) {
+    char mechanism[mechanism_max] = {};
+    if (has_mechanism(acle.type))
         std::memcpy(mechanism, acle.mechanism.data(), acle.mechanism.size());
-    std::uint64_t state = qz::hash_word(key.second, acle.type, key);
-    state = qz::hash_word(state, qz::fold8(qz::load8(mechanism)), key);
-    state = qz::hash_word(state, qz::fold8(qz::load8(mechanism + sizeof(std::uint64_t))), key);
-    return static_cast<std::uint32_t>(qz::hash_word(state, key.second, key) >> 32);
+    std::uint64_t state = hash_word(key.second, acle.type, key);
+    state = hash_word(state, fold8(load8(mechanism)), key);
+    state = hash_word(state, fold8(load8(mechanism + sizeof(std::uint64_t))), key);
+    return static_cast<std::uint32_t>(hash_word(state, key.second, key) >> 32);
 }
 
 } // namespace
 
 sec_acltree_array::~sec_acltree_array() {
-    const bool is_traced = qz::traces(qz::trace_category::api);
+    const bool is_traced = traces(trace_category::api);
     for (std::uint32_t index = count_; index != 0; --index) {
         sec_acltree_t &tree = *trees_[index - 1];
         if (is_traced)
@@ -45,7 +47,7 @@ sec_acltree_array::~sec_acltree_array() {
     }
 }
 
-sec_acltree_t *sec_acltree_array::find(const qz::acle_view &acle, std::uint32_t hash) {
+sec_acltree_t *sec_acltree_array::find(const acle_view &acle, std::uint32_t hash) {
     if (index_ == nullptr)
         return nullptr;
     for (std::uint32_t at = hash;; ++at) {
@@ -68,7 +70,7 @@ void sec_acltree_array::enter(slot entry) {
 bool sec_acltree_array::prepare(std::size_t &refused) {
     if (count_ == capacity_) {
         const std::uint32_t capacity = std::max(capacity_ * 2, std::uint32_t{8});
-        if (!qz::reallocate(trees_, capacity)) {
+        if (!reallocate(trees_, capacity)) {
             refused = capacity * sizeof(sec_acltree_t *);
             return false;
         }
@@ -77,12 +79,12 @@ bool sec_acltree_array::prepare(std::size_t &refused) {
     if (count_ < index_size_ / 4 * 3)
         return true;
     const std::uint32_t size = std::max(index_size_ * 4, std::uint32_t{16});
-    qz::owned<slot[]> grown(static_cast<slot *>(std::calloc(size, sizeof(slot))));
+    owned<slot[]> grown(static_cast<slot *>(std::calloc(size, sizeof(slot))));
     if (grown == nullptr) {
         refused = size * sizeof(slot);
         return false;
     }
-    const qz::owned<slot[]> old = std::exchange(index_, std::move(grown));
+    const owned<slot[]> old = std::exchange(index_, std::move(grown));
     const std::uint32_t old_size = std::exchange(index_size_, size);
     for (std::uint32_t at = 0; at < old_size; ++at) {
         if (old[at].number != 0)
@@ -91,15 +93,15 @@ bool sec_acltree_array::prepare(std::size_t &refused) {
     return true;
 }
 
-int sec_acltree_array::append(const qz::acle_view &acle, std::uint32_t hash) {
+int sec_acltree_array::append(const acle_view &acle, std::uint32_t hash) {
     std::size_t refused = 0;
     if (!prepare(refused))
-        return qz::report_no_memory("sec__add_acle_to_trees", refused);
+        return report_no_memory("sec__add_acle_to_trees", refused);
     void *room = memory_.room(sizeof(sec_acltree_t));
     if (room == nullptr)
-        return qz::report_no_memory("sec__add_acle_to_tree", memory_.refused());
+        return report_no_memory("sec__add_acle_to_tree", memory_.refused());
     auto *tree = new (room) sec_acltree_t(acle.type, text_);
-    if (const int result = qz::add_to_tree(true, acle, *tree); result != SEC_S_OK) {
+    if (const int result = add_to_tree(true, acle, *tree); result != SEC_S_OK) {
         tree->~sec_acltree();
         return result;
     }
@@ -111,19 +113,18 @@ int sec_acltree_array::append(const qz::acle_view &acle, std::uint32_t hash) {
 }
 
 // Places in a text are found by subtraction, which must not be done with what is elsewhere.
-bool sec_acltree_array::may_borrow(const qz::acle_view &acle) const {
+bool sec_acltree_array::may_borrow(const acle_view &acle) const {
     const auto is_in_text = [this](std::string_view piece) {
         const auto start = reinterpret_cast<std::uintptr_t>(piece.data());
         return start - reinterpret_cast<std::uintptr_t>(text_.data()) < text_.size();
     };
-    return text_.empty() || !qz::has_identity(acle.type) ||
-           (is_in_text(acle.identity) && (!qz::has_mechanism(acle.type) || is_in_text(acle.mechanism)));
+    return text_.empty() || !has_identity(acle.type) ||
+           (is_in_text(acle.identity) && (!has_mechanism(acle.type) || is_in_text(acle.mechanism)));
 }
 
-int sec_acltree_array::add(const qz::acle_view &acle) {
+int sec_acltree_array::add(const acle_view &acle) {
     if (!may_borrow(acle))
-        return qz::report(SEC_S_INTERNAL, qz::msg::internal_failure, qz::acl_source, __LINE__,
-                          SEC_S_INTERNAL);
+        return report(SEC_S_INTERNAL, msg::internal_failure, acl_source, __LINE__, SEC_S_INTERNAL);
     if (last_found_ == nullptr || !is_of_key(*last_found_, acle)) {
         const std::uint32_t hash = hash_of_key(acle, hash_key_);
         sec_acltree_t *found = find(acle, hash);
@@ -131,13 +132,13 @@ int sec_acltree_array::add(const qz::acle_view &acle) {
             return append(acle, hash);
         last_found_ = found;
     }
-    return qz::add_to_tree(true, acle, *last_found_);
+    return add_to_tree(true, acle, *last_found_);
 }
 
-int sec_acltree_array::add_soon(const qz::acle_view &acle) {
+int sec_acltree_array::add_soon(const acle_view &acle) {
     constexpr int for_writing = 1;
     int result = SEC_S_OK;
-    qz::acle_view &oldest = waiting_[first_waiting_];
+    acle_view &oldest = waiting_[first_waiting_];
     if (waiting_count_ == waiting_max)
         result = add(oldest);
     else
@@ -160,8 +161,8 @@ int sec_acltree_array::settle(int result) {
     return result;
 }
 
-int sec__add_acle_to_trees(const qz::acle_view &acle, sec_acltree_array &array) { return array.add(acle); }
+int sec__add_acle_to_trees(const acle_view &acle, sec_acltree_array &array) { return array.add(acle); }
 
 int sec__add_acle_to_trees(const sec_acle_t *acle, sec_acltree_array &array) {
-    return array.add(qz::view_of(*acle));
+    return array.add(view_of(*acle));
 }

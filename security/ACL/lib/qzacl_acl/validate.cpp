@@ -7,19 +7,19 @@
 #include "report.h"
 #include "trace_points.h"
 
+using namespace qz;
+
 namespace {
 
-namespace format = qz::format;
-
 int report_shorter_than_header(std::int32_t length, int line) {
-    return qz::report(SEC_S_BAD_ACL, qz::msg::shorter_than_header, length, qz::acl_source, line);
+    return report(SEC_S_BAD_ACL, msg::shorter_than_header, length, acl_source, line);
 }
 
 enum class field_fault : std::uint8_t { none, inexact, cut_short };
 
 // Checks that the string which starts here ends exactly with its field, and steps behind it. Bytes that are
 // too few are a fault of their own only where the string does not end before them either.
-field_fault skip_exact_string(qz::byte_reader &reader, std::size_t length) {
+field_fault skip_exact_string(byte_reader &reader, std::size_t length) {
     const void *nul = reader.left() == 0 ? nullptr : std::memchr(reader.position(), '\0', reader.left());
     if (nul == nullptr)
         return length > reader.left() ? field_fault::cut_short : field_fault::inexact;
@@ -33,8 +33,8 @@ field_fault skip_exact_string(qz::byte_reader &reader, std::size_t length) {
 
 // A mechanism that does not end with its field, shown up to the first NUL that follows; where none does, as
 // much of what is left as a mechanism's field can hold.
-int report_bad_mechanism(qz::byte_reader at_mechanism, int line) {
-    const qz::byte_span left(at_mechanism.position(), at_mechanism.left());
+int report_bad_mechanism(byte_reader at_mechanism, int line) {
+    const byte_span left(at_mechanism.position(), at_mechanism.left());
     char cut[256] = {};
     const char *shown = format::string_in(left);
     if (shown == nullptr) {
@@ -42,26 +42,24 @@ int report_bad_mechanism(qz::byte_reader at_mechanism, int line) {
             std::memcpy(cut, left.data(), std::min(left.size(), sizeof cut - 1));
         shown = cut;
     }
-    return qz::report(SEC_S_BAD_ACL, qz::msg::bad_mechanism, shown, qz::acl_source, line);
+    return report(SEC_S_BAD_ACL, msg::bad_mechanism, shown, acl_source, line);
 }
 
-int check_mechanism(qz::byte_reader &reader, format::subacl &head) {
-    if (!qz::is_acle_type(head.type))
-        return qz::report(SEC_S_BAD_ACL, qz::msg::subacl_type_unknown, head.type, qz::acl_source, __LINE__);
-    if (!qz::has_mechanism(head.type)) {
+int check_mechanism(byte_reader &reader, format::subacl &head) {
+    if (!is_acle_type(head.type))
+        return report(SEC_S_BAD_ACL, msg::subacl_type_unknown, head.type, acl_source, __LINE__);
+    if (!has_mechanism(head.type)) {
         if (head.mechanism_length != 0)
-            return qz::report(SEC_S_BAD_ACL, qz::msg::subacl_takes_no_mechanism, head.type, qz::acl_source,
-                              __LINE__);
-        if (qz::is_single_type(head.type) && head.entry_count > 1)
-            return qz::report(SEC_S_BAD_ACL, qz::msg::more_than_one_acle, qz::acl_source, __LINE__);
+            return report(SEC_S_BAD_ACL, msg::subacl_takes_no_mechanism, head.type, acl_source, __LINE__);
+        if (is_single_type(head.type) && head.entry_count > 1)
+            return report(SEC_S_BAD_ACL, msg::more_than_one_acle, acl_source, __LINE__);
         return SEC_S_OK;
     }
     if (head.mechanism_length < 2)
-        return qz::report(SEC_S_BAD_ACL, qz::msg::bad_mechanism_length, head.mechanism_length, qz::acl_source,
-                          __LINE__);
+        return report(SEC_S_BAD_ACL, msg::bad_mechanism_length, head.mechanism_length, acl_source, __LINE__);
     switch (skip_exact_string(reader, head.mechanism_length)) {
     case field_fault::cut_short:
-        return qz::report_corrupt(__LINE__);
+        return report_corrupt(__LINE__);
     case field_fault::inexact:
         return report_bad_mechanism(reader, __LINE__);
     case field_fault::none:
@@ -71,23 +69,21 @@ int check_mechanism(qz::byte_reader &reader, format::subacl &head) {
 }
 
 // Checks one entry and steps behind it.
-int check_entry(qz::byte_reader &reader, std::uint8_t type) {
+int check_entry(byte_reader &reader, std::uint8_t type) {
     format::entry entry;
     std::uint16_t identity_length = 0;
     if (!format::read_fixed_part(reader, entry, identity_length))
-        return qz::report_corrupt(__LINE__);
+        return report_corrupt(__LINE__);
     if (entry.version != format::entry_version)
-        return qz::report(SEC_S_BAD_ACLE, qz::msg::acle_version_unsupported, entry.version, qz::acl_source,
-                          __LINE__);
-    if (qz::is_single_type(type))
-        return identity_length == 0
-                   ? SEC_S_OK
-                   : qz::report(SEC_S_BAD_ACLE, qz::msg::unexpected_identity, qz::acl_source, __LINE__);
+        return report(SEC_S_BAD_ACLE, msg::acle_version_unsupported, entry.version, acl_source, __LINE__);
+    if (is_single_type(type))
+        return identity_length == 0 ? SEC_S_OK
+                                    : report(SEC_S_BAD_ACLE, msg::unexpected_identity, acl_source, __LINE__);
     switch (skip_exact_string(reader, identity_length)) {
     case field_fault::cut_short:
-        return qz::report_corrupt(__LINE__);
+        return report_corrupt(__LINE__);
     case field_fault::inexact:
-        return qz::report(SEC_S_BAD_ACLE, qz::msg::bad_identity_length, qz::acl_source, __LINE__);
+        return report(SEC_S_BAD_ACLE, msg::bad_identity_length, acl_source, __LINE__);
     case field_fault::none:
         break;
     }
@@ -96,17 +92,16 @@ int check_entry(qz::byte_reader &reader, std::uint8_t type) {
 
 // Skips sound entries with identities, save for those close to the end.
 void skip_sound_entries(format::entry_walk &walk) {
-    format::skip_entries_while(walk, qz::identity_block::size,
-                               [](std::uint8_t version, qz::byte_span identity) {
-                                   return version == format::entry_version && qz::ends_exactly(identity);
-                               });
+    format::skip_entries_while(walk, identity_block::size, [](std::uint8_t version, byte_span identity) {
+        return version == format::entry_version && ends_exactly(identity);
+    });
 }
 
 // Checks the entries of one sub-ACL. A faulty one ends its walk, with the reader standing before it.
-int check_entries(qz::byte_reader &reader, const format::subacl &head) {
+int check_entries(byte_reader &reader, const format::subacl &head) {
     format::entry_walk walk{reader, head.entry_count};
     for (;;) {
-        if (qz::has_identity(head.type))
+        if (has_identity(head.type))
             skip_sound_entries(walk);
         reader = walk.entries;
         if (walk.left == 0)
@@ -134,38 +129,38 @@ private:
 };
 
 int convert_to_host(std::span<unsigned char> bytes) {
-    qz::byte_swapper swapper(bytes);
+    byte_swapper swapper(bytes);
     std::uint16_t subacl_count = 0;
     if (!swapper.skip(format::count_offset) || !swapper.swap(subacl_count))
-        return qz::report_corrupt(__LINE__);
+        return report_corrupt(__LINE__);
     expected_end end;
     for (; subacl_count != 0; --subacl_count) {
         if (!end.is_at(swapper.position()))
-            return qz::report_corrupt(__LINE__);
+            return report_corrupt(__LINE__);
         const unsigned char *start = swapper.position();
         format::subacl head;
         if (!swapper.swap(head.length) || !swapper.byte(head.type) || !swapper.swap(head.entry_count) ||
             !swapper.byte(head.mechanism_length) || !swapper.skip(head.mechanism_length))
-            return qz::report_corrupt(__LINE__);
+            return report_corrupt(__LINE__);
         end.set(start, head.length);
         for (std::uint32_t left = head.entry_count; left != 0; --left) {
             format::entry entry;
             std::uint16_t identity_length = 0;
             if (!swapper.byte(entry.version) || !swapper.swap(entry.perm_mask) ||
                 !swapper.swap(identity_length) || !swapper.skip(identity_length))
-                return qz::report_corrupt(__LINE__);
+                return report_corrupt(__LINE__);
         }
     }
-    qz::store_field(bytes, format::order_offset, format::host_order);
+    store_field(bytes, format::order_offset, format::host_order);
     return SEC_S_OK;
 }
 
 int convert_checked(int check, sec_acl_buffer_t *acl) {
     if (acl == nullptr)
-        return qz::report_bad_parameter("sec_convert_acl_to_host", 2, 0);
+        return report_bad_parameter("sec_convert_acl_to_host", 2, 0);
     // Bytes that the length does not cover are not looked at; what of the header it covers must be right.
-    const qz::byte_span bytes = format::bytes_of(*acl);
-    qz::byte_reader reader(bytes);
+    const byte_span bytes = format::bytes_of(*acl);
+    byte_reader reader(bytes);
     std::uint8_t type = format::buffer_type;
     std::uint8_t version = format::buffer_version;
     std::uint8_t order = 0;
@@ -173,15 +168,15 @@ int convert_checked(int check, sec_acl_buffer_t *acl) {
     reader.field(version);
     if (acl->length == 0 || acl->data == nullptr || type != format::buffer_type ||
         version != format::buffer_version)
-        return qz::report(SEC_S_BAD_ACL, qz::msg::not_an_acl_buffer);
+        return report(SEC_S_BAD_ACL, msg::not_an_acl_buffer);
     if (!reader.field(order))
-        return check != 0 ? report_shorter_than_header(acl->length, __LINE__) : qz::report_corrupt(__LINE__);
+        return check != 0 ? report_shorter_than_header(acl->length, __LINE__) : report_corrupt(__LINE__);
 
     if (order == format::host_order) {
-        qz::trace(qz::point::in_host_order);
+        trace(point::in_host_order);
         return check != 0 ? sec__check_acl_buffer(acl) : SEC_S_OK;
     }
-    qz::trace(qz::point::converting_to_host_order);
+    trace(point::converting_to_host_order);
     return convert_to_host({static_cast<unsigned char *>(acl->data), bytes.size()});
 }
 
@@ -190,7 +185,7 @@ int convert_checked(int check, sec_acl_buffer_t *acl) {
 int sec__check_acl_buffer(const sec_acl_buffer_t *acl) {
     if (acl->length < static_cast<std::int32_t>(format::header_size))
         return report_shorter_than_header(acl->length, __LINE__);
-    qz::byte_reader reader(format::bytes_of(*acl));
+    byte_reader reader(format::bytes_of(*acl));
     format::header header;
     if (!format::read(reader, header))
         return report_shorter_than_header(acl->length, __LINE__);
@@ -199,11 +194,11 @@ int sec__check_acl_buffer(const sec_acl_buffer_t *acl) {
     expected_end end;
     for (unsigned left = header.subacl_count; left != 0; --left) {
         if (!end.is_at(reader.position()))
-            return qz::report_corrupt(__LINE__);
+            return report_corrupt(__LINE__);
         const unsigned char *start = reader.position();
         format::subacl head;
         if (!format::read_fixed_part(reader, head))
-            return qz::report_corrupt(__LINE__);
+            return report_corrupt(__LINE__);
         end.set(start, head.length);
         if (const int fault = check_mechanism(reader, head); fault != SEC_S_OK)
             return fault;
@@ -217,6 +212,6 @@ int sec__check_acl_buffer(const sec_acl_buffer_t *acl) {
 }
 
 int sec_convert_acl_to_host(int check, sec_acl_buffer_t *acl) {
-    return qz::run(qz::operation::convert_acl_to_host, std::tie(check, acl),
-                   [&] { return convert_checked(check, acl); });
+    return run(operation::convert_acl_to_host, std::tie(check, acl),
+               [&] { return convert_checked(check, acl); });
 }

@@ -8,6 +8,8 @@
 #include <langinfo.h>
 #include <pthread.h>
 
+using namespace qz;
+
 namespace {
 
 cu_iconv_t acl__to_utf8_hdl = nullptr;
@@ -36,7 +38,7 @@ void acl__init_from_utf8_handle() { open_handle(CU_ICONV_FROM_UTF8, &acl__from_u
 int convert(const char *function, cu_iconv_t handle, const char *in, const std::size_t *in_length, char **out,
             std::size_t *out_length) {
     if (handle == nullptr)
-        return qz::report(SEC_S_CODESET, qz::msg::conversion_unavailable);
+        return report(SEC_S_CODESET, msg::conversion_unavailable);
     constexpr int line = __LINE__ + 1; // of the call that may fail
     const int result = cu_iconv_str_1(handle, 0, in, in_length, out, out_length);
     switch (result) {
@@ -44,11 +46,11 @@ int convert(const char *function, cu_iconv_t handle, const char *in, const std::
         return SEC_S_OK;
     case CU_NO_RESOURCE:
     case CU_INTERNAL:
-        return qz::report(SEC_S_INTERNAL, qz::msg::internal_failure, qz::utils_source, line, result);
+        return report(SEC_S_INTERNAL, msg::internal_failure, utils_source, line, result);
     case CU_ICONV_NO_MEMORY:
-        return qz::report_no_memory(function, *in_length);
+        return report_no_memory(function, *in_length);
     default:
-        return qz::report(SEC_S_CODESET, qz::msg::conversion_failed);
+        return report(SEC_S_CODESET, msg::conversion_failed);
     }
 }
 

@@ -12,20 +12,22 @@
 #include <fcntl.h>
 #include <limits>
 
+using namespace qz;
+
 namespace {
 
 // Whether the file is the one that was vetted by its name, and still owned and protected as it was then.
 bool is_as_vetted(const struct stat &opened, const struct stat &vetted) {
-    return qz::same_file(opened, vetted) && S_ISREG(opened.st_mode) && opened.st_mode == vetted.st_mode &&
+    return same_file(opened, vetted) && S_ISREG(opened.st_mode) && opened.st_mode == vetted.st_mode &&
            opened.st_uid == vetted.st_uid && opened.st_gid == vetted.st_gid;
 }
 
 int not_found(const char *file_name, int error) {
-    qz::trace(qz::point::file_not_examined, file_name, error);
-    return qz::report(SEC_S_FILE_ERROR, qz::msg::bad_file_name, file_name, error);
+    trace(point::file_not_examined, file_name, error);
+    return report(SEC_S_FILE_ERROR, msg::bad_file_name, file_name, error);
 }
 
-int read_file(const char *file_name, int fd, const struct stat &vetted, qz::file_bytes &file) {
+int read_file(const char *file_name, int fd, const struct stat &vetted, file_bytes &file) {
     struct stat status = {};
     if (fstat(fd, &status) != 0)
         return not_found(file_name, errno);
@@ -38,20 +40,19 @@ int read_file(const char *file_name, int fd, const struct stat &vetted, qz::file
     // On a 32-bit machine a file may be larger than memory can be, and its size wrap to that of a small one.
     const auto size = static_cast<std::size_t>(std::min<std::uintmax_t>(
         static_cast<std::uintmax_t>(status.st_size), std::numeric_limits<std::ptrdiff_t>::max()));
-    auto text = qz::allocate<char>(size + qz::text_padding);
+    auto text = allocate<char>(size + text_padding);
     if (text == nullptr) {
-        qz::trace(qz::point::no_memory_for_file, file_name, size);
-        return qz::report_no_memory("sec_read_acl_file", size);
+        trace(point::no_memory_for_file, file_name, size);
+        return report_no_memory("sec_read_acl_file", size);
     }
     errno = 0;
     const ssize_t count = read(fd, text.get(), size);
     if (count != status.st_size) {
         const int error = errno;
-        qz::trace(qz::point::read_is_short, file_name, size, count);
-        return qz::report(SEC_S_FILE_ERROR, qz::msg::short_read, qz::shown_size(count), qz::shown_size(size),
-                          error);
+        trace(point::read_is_short, file_name, size, count);
+        return report(SEC_S_FILE_ERROR, msg::short_read, shown_size(count), shown_size(size), error);
     }
-    std::memset(text.get() + size, '\0', qz::text_padding);
+    std::memset(text.get() + size, '\0', text_padding);
     file.data = std::move(text);
     file.length = size;
     return SEC_S_OK;
@@ -75,10 +76,10 @@ descriptor open_vetted(const char *path, int access, const struct stat &vetted) 
 
 } // namespace qz
 
-int acl__lock_acl_file(const char * /*file_name*/, int /*fd*/, qz::lock_purpose /*purpose*/) { return 0; }
+int acl__lock_acl_file(const char * /*file_name*/, int /*fd*/, lock_purpose /*purpose*/) { return 0; }
 
-int acl__read_acl_file(const char *file_name, int fd, const struct stat &vetted, qz::file_bytes &bytes) {
-    const qz::trace_timer<qz::point::reading_descriptor> timer;
+int acl__read_acl_file(const char *file_name, int fd, const struct stat &vetted, file_bytes &bytes) {
+    const trace_timer<point::reading_descriptor> timer;
     bytes = {};
     const int result = read_file(file_name, fd, vetted, bytes);
     timer.stop();
