@@ -97,7 +97,8 @@ def posix_acl(group):
     """Entries that let the owner and one user write, and the group do what is said."""
     no_id = 0xffffffff
     owner, one_user, own_group, mask, others = 1, 2, 4, 0x10, 0x20
-    entries = [(owner, 6, no_id), (one_user, 6, WRITER), (own_group, group, no_id), (mask, 6, no_id), (others, 4, no_id)]
+    entries = [(owner, 6, no_id), (one_user, 6, WRITER), (own_group, group, no_id)]
+    entries += [(mask, 6, no_id), (others, 4, no_id)]
     return struct.pack("<I", 2) + b"".join(struct.pack("<HHI", *entry) for entry in entries)
 
 
