@@ -20,104 +20,59 @@ import unittest
 from typing import NamedTuple
 
 from command_case import (
-    COMMAND, ENTRIES, INHERITED, IS_MUSL, IS_ROOT, NOBODY, ORDINARY, SANITIZED, WRITER, Code, CommandCase, entry,
-    message, posix_acl, run)
-
-USAGE = message("usage")
-HELP = message("help")
-INCORRECT = message("option_incorrect")
-NO_STREAMS = message("stream_not_implemented")
-NO_CACHE = message("cache_skipped_after_errors")
-REPEATED = {f"-{letter}": message("option_repeated", f"-{letter}") for letter in "chsSvftu"}
-UNKNOWN_X = f"{COMMAND}: " + ("unrecognized option: x\n" if IS_MUSL else "invalid option -- 'x'\n")
-LACKS_ARGUMENT = f"{COMMAND}: option requires an argument" + (": %s\n" if IS_MUSL else " -- '%s'\n")
-LINE_OF_A = entry("n", "r")
-
-ODD_NAME = "missing%n%1$s\xff"
-OPTIONS = [  # the arguments, the status, and what is printed; the file "a" holds the line "n r"
-    ("-c -s -v -t p", Code.BAD_PARAMETER, message("file_option_missing") + USAGE),
-    ("-c -s -S -v -t p -u q -f a -h", Code.OK, HELP),
-    *[(f"-{letter}", Code.BAD_PARAMETER, LACKS_ARGUMENT % letter + INCORRECT + USAGE) for letter in "ftu"],
-    ("-x -h", Code.OK, UNKNOWN_X + INCORRECT),
-    ("-h -x", Code.BAD_PARAMETER, UNKNOWN_X + INCORRECT + USAGE),
-    *[(f"-{letter} -f a -{letter}", Code.BAD_PARAMETER, REPEATED[f"-{letter}"] + USAGE) for letter in "chsSv"],
-    *[(f"-{letter} p -{letter} q", Code.BAD_PARAMETER, REPEATED[f"-{letter}"] + USAGE) for letter in "ftu"],
-    ("-cvfa operand -- -x", Code.OK, LINE_OF_A),
-    ("operand - -cvfa", Code.OK, LINE_OF_A),
-    ("-S -t p -f a", Code.OK, ""),
-    ("-t p -S -v -f a", Code.OK, NO_STREAMS + NO_STREAMS + LINE_OF_A),
-    ("-u no.such.user -f a", Code.UNKNOWN_USER, message("unknown_user", "no.such.user")),
-    (f"-f {ODD_NAME}", Code.BAD_FILENAME, message("bad_acl_file_name", f"{{dir}}/{ODD_NAME}", errno.ENOENT)),
-]
-
-
-class AclText(NamedTuple):
-    """A text, what each of its lines leads to, and the cache that is made of a text without mistakes."""
-    text: str
-    results: list  # a code, and what is printed
-    cache: bytes = b""
-
-
-def shows(letter, permissions, *identity):
-    return Code.OK, entry(letter, permissions, *identity)
-
-
-def fails(code, name, *values):
-    return code, message(name, *values)
-
+    COMMAND, ENTRIES, INHERITED, IS_MUSL, IS_ROOT, NOBODY, ORDINARY, SANITIZED, SOURCE, WRITER, Code, CommandCase,
+    entry, message, posix_acl, run)
 
 A_TEXT = "u abcd xyz wr\n"
 A_LINE = entry("u", "rw", "abcd", "xyz")
 A_CACHE = bytes.fromhex("8501020100 1a000000 04 01000000 05 6162636400 01 03000000 0400 78797a00")
-ACL_TEXTS = [
-    AclText("", [(Code.OK, message("acl_file_empty", "{dir}/a"))]),
-    AclText("# nobody\n\n \t\v\n  # x y z\n", [], bytes.fromhex("8501020000")),
-    AclText(A_TEXT, [(Code.OK, A_LINE)], A_CACHE),
-    AclText(
-        "o\nN oasvdelqCxcwr #c\r\nu k Zed x\ng aB q\nE k b r\nu K amy\nG a_ l",
-        [
-            shows("o", ""),
-            shows("n", "rwcxCqledvsao"),
-            shows("u", "x", "k", "Zed"),
-            shows("g", "q", "aB"),
-            shows("e", "r", "k", "b"),
-            shows("u", "", "k", "amy"),
-            shows("g", "l", "a_"),
-        ],
-        bytes.fromhex(
-            "8501020500"
-            "15000000 08 01000000 02 6b00 01 01000000 0200 6200"
-            "1e000000 10 02000000 00 01 40000000 0300 615f00 01 20000000 0300 614200"
-            "22000000 04 02000000 02 6b00 01 00000000 0400 616d7900 01 08000000 0400 5a656400"
-            "11000000 01 01000000 00 01 ff1f0000 0000"
-            "11000000 02 01000000 00 01 00000000 0000")),
-    AclText(
-        "n r\n%s%n r\r\n# c\n\xee\nu\ng staff r extra\no w\0\nx\n",
-        [
-            shows("n", "r"),
-            fails(Code.BAD_ACL, "bad_type_token", 2, "%s%n"),
-            fails(Code.BAD_ACL, "bad_type_token", 5, "\xee"),
-            fails(Code.BAD_ACL, "tokens_missing", 6),
-            fails(Code.BAD_ACL, "tokens_in_excess", 7),
-            fails(Code.BAD_ACL, "line_corrupted", 8),
-        ]),
-    AclText(
-        "o r\no r\nn rz x\nx\n",
-        [
-            shows("o", "r"),
-            shows("o", "r"),
-            fails(Code.BAD_ACLE, "duplicate_single_acle", "o"),
-            fails(Code.BAD_PERMISSION, "bad_permission_token", 3, "rz"),
-            fails(Code.BAD_ACL, "bad_type_token", 4, "x"),
-        ]),
-    AclText(
-        "n #" + "c" * 1092 + "\no #" + "c" * 1093 + "\ng a",
-        [
-            shows("n", ""),
-            fails(Code.FILE_ERROR, "line_too_long", 2),
-            shows("g", "", "a"),
-        ]),
-]
+NO_CACHE = message("cache_skipped_after_errors")
+# What the C library says of options, which has no number.
+OF_THE_C_LIBRARY = {
+    "unknown_option": f"{COMMAND}: unrecognized option: %s\n" if IS_MUSL else f"{COMMAND}: invalid option -- '%s'\n",
+    "lacks_argument": f"{COMMAND}: option requires an argument" + (": %s\n" if IS_MUSL else " -- '%s'\n"),
+}
+
+
+def unescaped(text):
+    return text.encode("latin-1").decode("unicode_escape")
+
+
+def printed(words):
+    """What the last words of a row of command.cases stand for."""
+    name, *values = map(unescaped, words.split())
+    if name == "shows":
+        return entry(*("" if value == "none" else value for value in values))
+    if name in OF_THE_C_LIBRARY:
+        return OF_THE_C_LIBRARY[name] % values[0]
+    return message(name, *(int(value) if value.isdigit() else value for value in values))
+
+
+class AclText(NamedTuple):
+    """A text, what each of its lines leads to, as a code and what is printed, and its cache where it has no mistakes."""
+    text: str
+    results: list
+    cache: list
+
+
+def read_cases():
+    """The rows for options, and the texts."""
+    options, texts = [], []
+    for row in (SOURCE / "tests/command.cases").read_text("utf-8").splitlines():
+        kind, _, rest = row.partition(": ")
+        if kind == "text":
+            texts.append(AclText(unescaped(rest.strip('"')), [], []))
+        elif kind == "cache":
+            texts[-1].cache.append(bytes.fromhex(rest))
+        elif kind.startswith("options"):
+            code, *told = rest.split(", ")
+            options.append((unescaped(kind).partition(" ")[2], Code[code], "".join(map(printed, told))))
+        elif kind in Code.__members__:
+            texts[-1].results.append((Code[kind], printed(rest)))
+    return options, texts
+
+
+OPTIONS, ACL_TEXTS = read_cases()
 CHOICES = [options for count in range(4) for options in itertools.combinations(("-c", "-v", "-s"), count)]
 
 
@@ -148,7 +103,7 @@ class Output(CommandCase):
         told = [text for code, text in results if code or "-v" in options]
         if failure and "-s" in options:
             told.append(NO_CACHE)
-        makes = [("a.cacl", each.cache)] if each.cache and "-s" in options else []
+        makes = [("a.cacl", cache) for cache in each.cache if "-s" in options]
         self.fresh()
         self.write("a", each.text)
         self.expect([*options, "-f", "a"], Code.OK if goes_on else failure, "".join(told), makes)
@@ -158,8 +113,8 @@ class Output(CommandCase):
         failed = message("conversion_failed").removesuffix("\n")
         shown = entry("u", "r", "m", "\xc3\xa9")
         arguments = ["-v", "-f", "a"]
-        self.expect(arguments, Code.OK, failed + failed + LINE_OF_A, environment={"LC_ALL": "C"})
-        self.expect(arguments, Code.OK, shown + failed + LINE_OF_A, environment={"LC_ALL": "C.UTF-8"})
+        self.expect(arguments, Code.OK, failed + failed + entry("n", "r"), environment={"LC_ALL": "C"})
+        self.expect(arguments, Code.OK, shown + failed + entry("n", "r"), environment={"LC_ALL": "C.UTF-8"})
 
     def test_a_locale_says_nothing_about_letters(self):
         same_user = "u UNIX I@Host r\nu unix i@hoSt w\n"
@@ -409,7 +364,7 @@ class Caches(CommandCase):
         ignored = message("compile_option_ignored")
         with tempfile.NamedTemporaryFile(dir=home) as file:
             pathlib.Path(file.name).write_text("n r\n", "ascii")
-            shown = Code.OK, LINE_OF_A
+            shown = Code.OK, entry("n", "r")
             refused = Code.BAD_PERMISSION, message("acl_file_not_private", file.name, user)
             rows = [(0o755, -1, shown), (0o620, -1, refused), (0o602, -1, refused)]
             if IS_ROOT:
