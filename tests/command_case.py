@@ -75,16 +75,10 @@ def run(arguments, cwd, environment=(), child=None, user=None):
     """Runs the command, and gives its status and what it prints; `child` is called just before."""
     rights = {"user": user, "group": user, "extra_groups": []} if user else {}
     kept = {name: value for name, value in os.environ.items() if name.endswith("SAN_OPTIONS")}
-    done = subprocess.run(
-        [COMMAND] + [text.encode("latin-1") for text in arguments],
-        cwd=cwd,
-        env={**kept, "LC_ALL": "C", **dict(environment)},
-        preexec_fn=child,
-        stdin=subprocess.DEVNULL,
-        capture_output=True,
-        check=False,
-        timeout=300,  # in case that it hangs
-        **rights)
+    environment = {**kept, "LC_ALL": "C", **dict(environment)}
+    command = [COMMAND] + [text.encode("latin-1") for text in arguments]
+    done = subprocess.run(command, cwd=cwd, env=environment, preexec_fn=child, stdin=subprocess.DEVNULL,
+                          capture_output=True, check=False, timeout=300, **rights)  # in case that it hangs
     printed = b"on standard output: " + done.stdout if done.stdout else done.stderr
     return done.returncode, printed.decode("latin-1")
 

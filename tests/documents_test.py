@@ -11,10 +11,9 @@ import tempfile
 import unittest
 from pathlib import Path
 
-BUILD = Path(sys.argv.pop(1)).resolve()
-SOURCE = Path(__file__).resolve().parent.parent
+from command_case import BUILD, SANITIZED, SOURCE
+
 WRITE = "--write" in sys.argv
-SANITIZED = "QZ_SANITIZE:STRING=\n" not in (BUILD / "CMakeCache.txt").read_text()
 README = "README.md"
 RECIPES_PAGE = "docs/recipes.md"
 TRACING = "docs/tracing.md"
@@ -250,4 +249,4 @@ class Documents(unittest.TestCase):
 
 
 if __name__ == "__main__":
-    unittest.main(argv=[argument for argument in sys.argv if argument != "--write"])
+    unittest.main(argv=[sys.argv[0]] + [argument for argument in sys.argv[2:] if argument != "--write"])

@@ -154,18 +154,17 @@ class Interface(unittest.TestCase):
     def test_binaries_are_hardened(self):
         of_libraries = ["GNU_RELRO", "FLAGS.*BIND_NOW|FLAGS_1.*NOW", "GNU_STACK.* RW +0x", "__stack_chk_fail"]
         with_checked_calls = [*of_libraries, r" __\w+(?<!stack)_chk@"]
-        marks = {
-            "lib/libqz_cu.so": of_libraries,
-            "lib/libqz_tr.so": of_libraries,
-            "lib/libqzacl.so": with_checked_calls,
-            "bin/qzaclfck": [*with_checked_calls, "FLAGS_1.*PIE"],
-        }
-        for name, of_binary in marks.items():
-            found = run("readelf", "-lWd", "--dyn-syms", BUILD / name)
-            for mark in of_binary:
-                self.assertRegex(found, mark, name)
-            if IS_X86_64 and shutil.which("objdump"):
-                self.assertIn("endbr64", run("objdump", "-d", "--no-show-raw-insn", BUILD / name))
+        self.expect_marks("lib/libqz_cu.so", of_libraries)
+        self.expect_marks("lib/libqz_tr.so", of_libraries)
+        self.expect_marks("lib/libqzacl.so", with_checked_calls)
+        self.expect_marks("bin/qzaclfck", [*with_checked_calls, "FLAGS_1.*PIE"])
+
+    def expect_marks(self, name, marks):
+        found = run("readelf", "-lWd", "--dyn-syms", BUILD / name)
+        for mark in marks:
+            self.assertRegex(found, mark, name)
+        if IS_X86_64 and shutil.which("objdump"):
+            self.assertIn("endbr64", run("objdump", "-d", "--no-show-raw-insn", BUILD / name))
 
     @unittest.skipIf(SANITIZED, "the sanitizers stand in the place of the hardening")
     def test_hardening_that_leaves_no_mark_was_asked_for(self):
@@ -231,15 +230,9 @@ class Interface(unittest.TestCase):
         self.consume(prefix, f"{prefix}/lib", self.dir / "one")
         shutil.rmtree(prefix)
         apart = f"{self.dir}/libraries"
-        options = {
-            "CMAKE_BUILD_TYPE": "Debug",
-            "CMAKE_INSTALL_LIBDIR": apart,
-            "CMAKE_INSTALL_PREFIX": prefix,
-            "CMAKE_UNITY_BUILD": "ON",
-            "QZ_TESTS": "OFF",
-        }
-        settings = [f"-D{name}={value}" for name, value in options.items()]
-        run("cmake", "-S", SOURCE, "-B", self.dir / "b", "-G", "Ninja", *settings)
+        places = f"-DCMAKE_INSTALL_LIBDIR={apart}", f"-DCMAKE_INSTALL_PREFIX={prefix}"
+        options = "-DCMAKE_BUILD_TYPE=Debug", "-DCMAKE_UNITY_BUILD=ON", "-DQZ_TESTS=OFF"
+        run("cmake", "-S", SOURCE, "-B", self.dir / "b", "-G", "Ninja", *places, *options)
         run("cmake", "--build", self.dir / "b", "--target", "install")
         self.consume(prefix, apart, self.dir / "two")
 
@@ -260,11 +253,10 @@ class Completions(unittest.TestCase):
         if not shutil.which(shell):
             self.skipTest(f"there is no {shell}")
         program = script.split(".")[0]
-        ask = {
-            "bash": ("bash", "--norc", "-c", BASH.replace("PROGRAM", program)),
-            "fish": ("fish", "--no-config", "-c", FISH),
-        }
-        answer = run(*ask[shell], SOURCE / "completions" / script, line, cwd=SOURCE / "examples")
+        in_bash = ("bash", "--norc", "-c", BASH.replace("PROGRAM", program))
+        in_fish = ("fish", "--no-config", "-c", FISH)
+        ask = in_bash if shell == "bash" else in_fish
+        answer = run(*ask, SOURCE / "completions" / script, line, cwd=SOURCE / "examples")
         return {each.split("\t")[0] for each in answer.splitlines()}
 
     def offered_by_zsh(self, script):

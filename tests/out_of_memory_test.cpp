@@ -33,6 +33,12 @@ struct use {
     std::function<int(sec_acl_buffer_t &)> call;
     bool is_tolerated = false; // fails or goes on without
 };
+constexpr bool tolerated = true;
+
+struct failing_allocation {
+    std::size_t at = 0;  // from 1; 0 fails none
+    bool and_on = false; // also all behind that one
+};
 
 struct allocations : files {
     made_things made;
@@ -42,14 +48,14 @@ struct allocations : files {
         return sec_read_acl_file("acl", user_name(), nullptr, flags, &made.acl, nullptr);
     }
 
-    // Lets one allocation fail, from 1, and those behind it, too; 0 fails none. Tells how many there were.
-    std::size_t run(const use &row, std::size_t failing, bool and_on) {
-        SCOPED_TRACE(testing::Message() << "allocation " << failing << (and_on ? " and all behind" : ""));
+    // Tells how many allocations there were.
+    std::size_t run(const use &row, const failing_allocation &failing) {
+        SCOPED_TRACE(testing::Message() << "allocation " << failing.at << (failing.and_on ? " and on" : ""));
         buffer held(rich);
         const auto live = faults::allocations.live;
         faults::allocations_seen seen;
         const outcome now = watched({}, [&] {
-            faults::allocations = {.fails_at = failing, .fails_on = and_on, .live = live};
+            faults::allocations = {.fails_at = failing.at, .fails_on = failing.and_on, .live = live};
             const int result = row.call(held.acl);
             seen = faults::allocations;
             faults::allocations = {.live = seen.live};
@@ -57,33 +63,34 @@ struct allocations : files {
         });
         EXPECT_TRUE(now.code == SEC_S_OK || made.is_empty());
         made.release();
-        EXPECT_TRUE(failing == 0 || faults::allocations.live == live) << "leaks";
-        if (failing == 0 || (row.is_tolerated && now.code == SEC_S_OK)) {
+        EXPECT_TRUE(failing.at == 0 || faults::allocations.live == live) << "leaks";
+        if (failing.at == 0 || (row.is_tolerated && now.code == SEC_S_OK)) {
             EXPECT_EQ(now.code, SEC_S_OK) << now.text;
             return seen.count;
         }
         EXPECT_EQ(now.code, SEC_S_NO_MEMORY);
         // A deletion may have happened all the same, with the memory kept.
         EXPECT_TRUE(row.name.find("del") != std::string::npos || held.bytes() == rich);
-        expect_told(row, now, seen.refused, and_on);
+        expect_told(row, now, seen.refused, failing);
         return seen.count;
     }
 
     void fail_each(const use &row) {
         SCOPED_TRACE(row.name);
-        run(row, 0, false); // which also makes what then stays
-        const std::size_t count = run(row, 0, false);
+        run(row, {}); // which also makes what then stays
+        const std::size_t count = run(row, {});
         EXPECT_GT(count, 0u);
-        for (std::size_t failing = 1; failing <= count; ++failing) {
-            run(row, failing, false);
-            run(row, failing, true);
+        for (std::size_t at = 1; at <= count; ++at) {
+            run(row, {.at = at});
+            run(row, {.at = at, .and_on = true});
         }
     }
 
     // The command prints, for which it sets memory aside, or says that it wrote no cache.
-    static void expect_told(const use &row, const outcome &now, std::size_t size, bool and_on) {
+    static void expect_told(const use &row, const outcome &now, std::size_t size,
+                            const failing_allocation &failing) {
         if (now.id != msg::no_memory.id) {
-            const bool is_skipped = and_on && now.id == msg::cache_skipped_after_errors.id;
+            const bool is_skipped = failing.and_on && now.id == msg::cache_skipped_after_errors.id;
             EXPECT_TRUE(is_skipped || printed.find("3417-102") != std::string::npos) << now.text;
             return;
         }
@@ -96,7 +103,7 @@ struct allocations : files {
         arguments sizes;
         for (const std::size_t room : {0u, 1u, 16u})
             sizes.push_back(" " + std::to_string(size - room) + " bytes");
-        EXPECT_TRUE(and_on || std::ranges::any_of(sizes, is_told)) << size << " in " << now.text;
+        EXPECT_TRUE(failing.and_on || std::ranges::any_of(sizes, is_told)) << size << " in " << now.text;
     }
 };
 
@@ -130,10 +137,10 @@ TEST_F(allocations, of_entries_and_handlers_fail) {
     fail_each(
         {"sec_create_acle sec__create_acle acl__convert_to_utf8",
          [&](acl_buffer &) { return sec_create_acle(SEC_ACLE_USER, 1, "unix", "ann@0::1", &made.acle); },
-         true});
+         tolerated});
     fail_each({"sec_display_acle_id acl__convert_from_utf8",
                [&](acl_buffer &) { return sec_display_acle_id(&ann, &made.mechanism, &made.identity); },
-               true});
+               tolerated});
     fail_each({"sec__register_id_handler acl__register_id_handler", [](acl_buffer &) {
                    return sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "faulty", std::strcmp);
                }});
@@ -146,8 +153,8 @@ TEST_F(allocations, of_files_fail) {
     };
     fail_each({"read the text", [&](acl_buffer &) { return read(text_only); }});
     fail_each({"read and cache", [&](acl_buffer &) { return read(text_only | cached); }});
-    fail_each({"read the cache", [&](acl_buffer &) { return read(checked); }, true});
-    fail_each({"check", check_and_tell, true});
+    fail_each({"read the cache", [&](acl_buffer &) { return read(checked); }, tolerated});
+    fail_each({"check", check_and_tell, tolerated});
 }
 
 // Insertions wait for lines that come after them; what is told is the first mistake all the same.
@@ -175,7 +182,7 @@ TEST_F(files, tell_their_first_mistake) {
     for (const auto &[text, id] : rows) {
         write_file(path, text);
         EXPECT_EQ(read_acl(path, text_only).id, id) << text;
-        EXPECT_EQ(watched({}, [this] { return check(path, 0); }).id, id) << text;
+        EXPECT_EQ(watched({}, [this] { return check(path, no_options); }).id, id) << text;
     }
 }
 

@@ -38,10 +38,11 @@ struct disturbance {
     std::function<void(const std::string &)> act;
     bool is_replacement = false; // of the text by another
 };
+constexpr bool by_another = true;
 const disturbance disturbances[] = {
-    {"exchanged", [](auto &path) { put(other_text, path, 0); }, true},
-    {"exchanged by an old file", [](auto &path) { put(other_text, path, 50); }, true},
-    {"exchanged by an equally old file", [](auto &path) { put(other_text, path, 100); }, true},
+    {"exchanged", [](auto &path) { put(other_text, path, 0); }, by_another},
+    {"exchanged by an old file", [](auto &path) { put(other_text, path, 50); }, by_another},
+    {"exchanged by an equally old file", [](auto &path) { put(other_text, path, 100); }, by_another},
     {"edited", [](auto &path) { write_file(path, other_text); }},
     {"edited like an old file", [](auto &path) { write_file(path, other_text, 50); }},
     {"grown", append},
@@ -50,7 +51,7 @@ const disturbance disturbances[] = {
     {"a FIFO", put_fifo},
     {"a folder", put_folder},
     {"a dangling link", [](auto &path) { put_link(path); }},
-    {"a link to another", link_to_another, true},
+    {"a link to another", link_to_another, by_another},
     {"a FIFO at the cache", [](auto &path) { put_fifo(path + ".cacl"); }},
     {"a folder at the cache", [](auto &path) { put_folder(path + ".cacl"); }},
     {"a link at the cache", [](auto &path) { put_link(path + ".cacl"); }},
@@ -99,7 +100,7 @@ TEST_F(files, are_read_anew_when_they_are_replaced) {
 
         lay_out();
         replaced = 0;
-        watched(replace, [&] { return recorded(aclfck__bulk_aclfile("acl", user_name(), 0)); });
+        watched(replace, [&] { return recorded(aclfck__bulk_aclfile("acl", user_name(), no_options)); });
         EXPECT_EQ(printed.substr(0, 8), row.command_shows);
     }
 }

@@ -14,21 +14,23 @@ struct told {
     const char *name;
     bool shows_error; // of the system, or 0 when the file is another
 };
+constexpr bool shows_errno = true;
+constexpr bool shows_none = false;
 const told results[] = {
-    {0, SEC_S_OK, "ok", false},
-    {msg::unknown_user.id, SEC_S_UNKNOWN_USER, "unknown_user", false},
-    {msg::working_directory_unknown.id, SEC_S_BAD_FILENAME, "working_directory_unknown", true},
-    {msg::bad_acl_file_name.id, SEC_S_BAD_FILENAME, "bad_acl_file_name", true},
-    {msg::cannot_open_acl_file.id, SEC_S_FILE_ERROR, "cannot_open_acl_file", true},
-    {msg::bad_file_name.id, SEC_S_FILE_ERROR, "bad_file_name", true},
-    {msg::cannot_open_file.id, SEC_S_FILE_ERROR, "cannot_open_file", true},
-    {msg::short_read.id, SEC_S_FILE_ERROR, "short_read", true},
-    {msg::cannot_open_for_writing.id, SEC_S_FILE_ERROR, "cannot_open_for_writing", false},
-    {msg::cache_mode_differs.id, SEC_S_FILE_ERROR, "cache_mode_differs", false},
-    {msg::short_write.id, SEC_S_FILE_ERROR, "short_write", true},
-    {msg::cannot_set_owner.id, SEC_S_FILE_ERROR, "cannot_set_owner", false},
-    {msg::cannot_set_mode.id, SEC_S_FILE_ERROR, "cannot_set_mode", false},
-    {msg::cannot_rename_cache.id, SEC_S_FILE_ERROR, "cannot_rename_cache", false},
+    {0, SEC_S_OK, "ok", shows_none},
+    {msg::unknown_user.id, SEC_S_UNKNOWN_USER, "unknown_user", shows_none},
+    {msg::working_directory_unknown.id, SEC_S_BAD_FILENAME, "working_directory_unknown", shows_errno},
+    {msg::bad_acl_file_name.id, SEC_S_BAD_FILENAME, "bad_acl_file_name", shows_errno},
+    {msg::cannot_open_acl_file.id, SEC_S_FILE_ERROR, "cannot_open_acl_file", shows_errno},
+    {msg::bad_file_name.id, SEC_S_FILE_ERROR, "bad_file_name", shows_errno},
+    {msg::cannot_open_file.id, SEC_S_FILE_ERROR, "cannot_open_file", shows_errno},
+    {msg::short_read.id, SEC_S_FILE_ERROR, "short_read", shows_errno},
+    {msg::cannot_open_for_writing.id, SEC_S_FILE_ERROR, "cannot_open_for_writing", shows_none},
+    {msg::cache_mode_differs.id, SEC_S_FILE_ERROR, "cache_mode_differs", shows_none},
+    {msg::short_write.id, SEC_S_FILE_ERROR, "short_write", shows_errno},
+    {msg::cannot_set_owner.id, SEC_S_FILE_ERROR, "cannot_set_owner", shows_none},
+    {msg::cannot_set_mode.id, SEC_S_FILE_ERROR, "cannot_set_mode", shows_none},
+    {msg::cannot_rename_cache.id, SEC_S_FILE_ERROR, "cannot_rename_cache", shows_none},
 };
 const told &result_of(const outcome &now) {
     const auto found = std::ranges::find(results, std::pair(now.id, now.code),

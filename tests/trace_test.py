@@ -94,13 +94,13 @@ class Trace(CommandCase):
         """Below each node the left side goes first, then the right one, then the node."""
         records = self.run_test("tree", "*leaves_up", "API=8")
         released = [record["items"][4]["text"] for record in records if record["id"] == RELEASES_TOLD_ENTRY]
-        self.assertEqual("".join(released), "cifpwtm" + "cba" + "tfm")
+        self.assertEqual("".join(released), "cifpwtm" + "dcba" + "abcd" + "cbda" + "tfm")
 
     def test_replaced_entries(self):
         """A mechanism that fills its array is told without what stands behind it."""
         records = self.run_test("tree", "*leaves_up", "Info=1")
         mechanisms = [bytes_of(record["items"][1]) for record in records]
-        self.assertEqual(mechanisms, [b"sixteen-bytes-xxx"] * 3)
+        self.assertEqual(mechanisms, [b"sixteen-bytes-xxx"] * 5)
 
     def test_entries_that_nobody_gets(self):
         """They are not told to be released."""

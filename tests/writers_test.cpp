@@ -55,27 +55,6 @@ TEST_F(files, writers_that_are_ended_by_a_signal_leave_nothing) {
             ++at;
 }
 
-TEST_F(files, torn_caches_are_not_believed) {
-    constexpr std::size_t block = 512; // the least that a disk writes at once
-    std::string large = acl_text;
-    for (int index = 0; index < 200; ++index)
-        large += "u unix user" + std::to_string(index) + "@host rw\n";
-    write_file(path, large, 100);
-    const outcome whole = read_acl(path, text_only);
-    const auto expect_torn = [&](std::string bytes, std::size_t from, std::size_t to) {
-        bytes.replace(from, to - from, to - from, '\0');
-        write_file(cache, bytes);
-        EXPECT_EQ(read_acl(path, checked), whole)
-            << bytes.size() << " with zeros from " << from << " to " << to;
-    };
-    const std::size_t size = whole.bytes.size();
-    for (std::size_t end = 1; end <= size; ++end)
-        expect_torn(whole.bytes.substr(0, end), end, end);
-    for (std::size_t from = 0; from < size; from += block)
-        for (std::size_t to = from + block; to < size + block; to += block)
-            expect_torn(whole.bytes, from, std::min(to, size));
-}
-
 // The threads of a service without standard streams print all the same.
 TEST_F(files, have_no_descriptor_of_a_standard_stream) {
     constexpr std::array streams = {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO};

@@ -46,7 +46,8 @@ inline outcome read_acl(const std::string &path, unsigned flags, const char *use
     const int code = sec_read_acl_file(path.c_str(), user, nullptr, flags, &held.acl, nullptr);
     return recorded(code, held.bytes());
 }
-// The command's check with a cache written.
+// The command's check, as a rule with a cache written.
+constexpr unsigned no_options = 0;
 inline outcome check(const std::string &path, unsigned options = ACLFCK_OPT_COMPILE) {
     return recorded(aclfck__bulk_aclfile(path.c_str(), nullptr, options));
 }
