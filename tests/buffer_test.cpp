@@ -10,7 +10,7 @@ using namespace support;
 
 // Entries and sub-ACLs that many rows are made of.
 const std::string xyz = entry_bytes("xyz 3");
-const std::string bare = entry_bytes("1");
+const std::string many = xyz + xyz + xyz + xyz + xyz + xyz + xyz + xyz;
 const std::string unended = packed_entry(1, "xyz");
 const std::string any_other = subacl_bytes("o: 1");
 const std::string user_xyz = subacl_bytes("u abcd: xyz 3");
@@ -123,6 +123,9 @@ TEST(validate, names_the_first_rule_that_is_broken) {
         {"an unknown version before one that does not end",
          acl_of_one(packed_subacl(SEC_ACLE_USER, "m\0"s, 2, with(xyz, 0, 0) + unended)),
          bad_acle(msg::acle_version_unsupported, 0)},
+        {"an unknown version before many",
+         acl_of_one(packed_subacl(SEC_ACLE_GROUP, "", 9, with(xyz, 0, 9) + many)),
+         bad_acle(msg::acle_version_unsupported, 9)},
         {"an unknown version where a sub-ACL starts", packed_acl(2, no_entry + any_other),
          bad_acle(msg::acle_version_unsupported, first_length_byte)},
     };
