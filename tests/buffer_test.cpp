@@ -16,11 +16,12 @@ const std::string any_other = subacl_bytes("o: 1");
 const std::string user_xyz = subacl_bytes("u abcd: xyz 3");
 
 // Bytes in which a number was changed.
-static std::string with(std::string bytes, std::size_t offset, unsigned value, std::size_t width = 1) {
+static std::string with_number(std::string bytes, std::size_t offset, unsigned value, std::size_t width = 1) {
     return bytes.replace(offset, width, number(value, width));
 }
 // The same of bytes in the other order.
-static std::string foreign_with(std::string bytes, std::size_t offset, unsigned value, std::size_t width) {
+static std::string with_foreign_number(std::string bytes, std::size_t offset, unsigned value,
+                                       std::size_t width) {
     std::string field = number(value, width);
     std::ranges::reverse(field);
     return bytes.replace(offset, width, field);
@@ -71,7 +72,7 @@ TEST(validate, accepts_what_is_sound) {
     expect_check({"all types, and bytes behind the end", rich + "behind"});
     expect_check({"a sub-ACL repeated", packed_acl(2, user_xyz + user_xyz)});
     expect_check({"no entries, and entries repeated", acl_bytes("e m:; g: z 4294967295, xyz 3, xyz 3")});
-    expect_check({"a long mechanism", acl_of_one(with(long_mechanism, 3, 9))});
+    expect_check({"a long mechanism", acl_of_one(with_number(long_mechanism, 3, 9))});
 }
 
 TEST(validate, finds_what_is_cut_short_or_of_another_length) {
@@ -79,12 +80,13 @@ TEST(validate, finds_what_is_cut_short_or_of_another_length) {
     const checked_bytes rows[] = {
         {"four bytes", example.substr(0, 4), bad_acl(msg::shorter_than_header, 4)},
         {"a sub-ACL too few", packed_acl(2, user_xyz), corrupted},
-        {"a length too short", packed_acl(2, with(user_xyz, 0, 25, 4) + any_other), corrupted},
-        {"a length too long", packed_acl(2, with(user_xyz, 0, 27, 4) + any_other), corrupted},
+        {"a length too short", packed_acl(2, with_number(user_xyz, 0, 25, 4) + any_other), corrupted},
+        {"a length too long", packed_acl(2, with_number(user_xyz, 0, 27, 4) + any_other), corrupted},
         {"an entry cut short", acl_of_one(user_xyz.substr(0, 21)), corrupted},
         {"entries beyond number", acl_of_one(packed_subacl(SEC_ACLE_USER, "m\0"s, ~0u, xyz)), corrupted},
         // After a faulty entry the walk stands at that entry, where no further sub-ACL starts.
-        {"a faulty entry before a sub-ACL", packed_acl(2, with(any_other, 10, 2) + any_other), corrupted},
+        {"a faulty entry before a sub-ACL", packed_acl(2, with_number(any_other, 10, 2) + any_other),
+         corrupted},
     };
     for (const checked_bytes &row : rows)
         expect_check(row);
@@ -94,7 +96,7 @@ TEST(validate, finds_what_is_cut_short_or_of_another_length) {
 
 TEST(validate, names_the_first_rule_that_is_broken) {
     const failure bad_identity = bad_acle(msg::bad_identity_length);
-    const std::string no_entry = with(packed_subacl(SEC_ACLE_ANYOTHER, "", 1, ""), 0, 10, 4);
+    const std::string no_entry = with_number(packed_subacl(SEC_ACLE_ANYOTHER, "", 1, ""), 0, 10, 4);
     const int first_length_byte = is_low_byte_first ? 17 : 0;
     const checked_bytes rows[] = {
         {"a type that asks for a handler", acl_of_one(packed_subacl(by_handler, "m", 0, "")),
@@ -116,15 +118,15 @@ TEST(validate, names_the_first_rule_that_is_broken) {
          acl_of_one(packed_subacl(SEC_ACLE_USER, "ab", 1, packed_entry(0x03000003, "xyz"))),
          bad_acl(msg::bad_mechanism, "ab\1\3")},
         {"any other with an identity", acl_bytes("o: xyz 3"), bad_acle(msg::unexpected_identity)},
-        {"an identity that is too long", with(example, 25, 5, 2), bad_identity},
+        {"an identity that is too long", with_number(example, 25, 5, 2), bad_identity},
         {"an identity that does not end", acl_of_one(packed_subacl(SEC_ACLE_GROUP, "", 2, unended + xyz)),
          bad_identity},
         {"no identity", acl_bytes("e m: 1"), bad_identity},
         {"an unknown version before one that does not end",
-         acl_of_one(packed_subacl(SEC_ACLE_USER, "m\0"s, 2, with(xyz, 0, 0) + unended)),
+         acl_of_one(packed_subacl(SEC_ACLE_USER, "m\0"s, 2, with_number(xyz, 0, 0) + unended)),
          bad_acle(msg::acle_version_unsupported, 0)},
         {"an unknown version before many",
-         acl_of_one(packed_subacl(SEC_ACLE_GROUP, "", 9, with(xyz, 0, 9) + many)),
+         acl_of_one(packed_subacl(SEC_ACLE_GROUP, "", 9, with_number(xyz, 0, 9) + many)),
          bad_acle(msg::acle_version_unsupported, 9)},
         {"an unknown version where a sub-ACL starts", packed_acl(2, no_entry + any_other),
          bad_acle(msg::acle_version_unsupported, first_length_byte)},
@@ -134,14 +136,14 @@ TEST(validate, names_the_first_rule_that_is_broken) {
 }
 
 TEST(convert, marks_the_order_when_all_was_turned) {
-    const std::string twice = foreign_with(foreign, 3, 2, 2) + foreign.substr(5);
+    const std::string twice = with_foreign_number(foreign, 3, 2, 2) + foreign.substr(5);
     const std::pair<std::string, failure> rows[] = {
         {twice, no_error},
-        {with(foreign, 9, 99), no_error}, // what is wrong then is not looked for
+        {with_number(foreign, 9, 99), no_error}, // what is wrong then is not looked for
         {"\x84\1\1\0\0"s, bad_acl(msg::not_an_acl_buffer)},
         {"\x85\2"s, bad_acl(msg::not_an_acl_buffer)},
         {"\x85\1"s, bad_acl(msg::shorter_than_header, 2)},
-        {foreign_with(twice, 5, 11, 4), bad_acl(msg::buffer_corrupted)},
+        {with_foreign_number(twice, 5, 11, 4), bad_acl(msg::buffer_corrupted)},
         {foreign.substr(0, foreign.size() - 1), bad_acl(msg::buffer_corrupted)},
     };
     for (const auto &[bytes, error] : rows) {
@@ -162,7 +164,7 @@ TEST(list, refuses_what_it_cannot_expand) {
         {"two for any other", packed_acl(2, any_other + subacl_bytes("n: 1, 1")),
          bad_acl(msg::single_acle_repeated)},
         {"a sub-ACL too few", packed_acl(2, any_other), corrupted},
-        {"a length that leads nowhere", packed_acl(3, with(any_other, 0, 0, 4)), corrupted},
+        {"a length that leads nowhere", packed_acl(3, with_number(any_other, 0, 0, 4)), corrupted},
         {"another version", "\x85\2\2\0\0"s, bad_acl(msg::not_an_acl_buffer)},
         {"no mechanism", acl_of_one(packed_subacl(SEC_ACLE_USER, "", 1, xyz)), corrupted},
         {"a long mechanism", acl_bytes("u seventeen-bytes-x: x 1"), bad_acl(msg::bad_mechanism_length, 18)},
@@ -213,7 +215,8 @@ TEST(edit, reports_what_it_refuses_and_leaves_the_buffer_alone) {
         {"\x84\2\1"s, al, bad_acl(msg::second_argument_not_acl)},
         {"\x85\2\1"s, al, bad_acl(msg::buffer_version_unsupported)},
         {example.substr(0, 4), al, bad_acl(msg::buffer_corrupted)},
-        {with(example, 5, 27, 4), user("abcd", "b", 1), bad_acl(msg::buffer_corrupted)}, // a byte too long
+        {with_number(example, 5, 27, 4), user("abcd", "b", 1),
+         bad_acl(msg::buffer_corrupted)}, // a byte too long
         {acl_bytes("n: 1, 1"), entry(SEC_ACLE_UNAUTHENTICATED, "", nullptr, 1),
          bad_acl(msg::single_acle_repeated)},
     };
