@@ -29,7 +29,7 @@ A_CACHE = bytes.fromhex("8501020100 1a000000 04 01000000 05 6162636400 01 030000
 NO_CACHE = message("cache_skipped_after_errors")
 # What the C library says of options, which has no number.
 OF_THE_C_LIBRARY = {
-    "unknown_option": f"{COMMAND}: unrecognized option: %s\n" if IS_MUSL else f"{COMMAND}: invalid option -- '%s'\n",
+    "unknown_option": f"{COMMAND}: " + ("unrecognized option: %s\n" if IS_MUSL else "invalid option -- '%s'\n"),
     "lacks_argument": f"{COMMAND}: option requires an argument" + (": %s\n" if IS_MUSL else " -- '%s'\n"),
 }
 
