@@ -59,6 +59,8 @@ def read_cases():
     """The rows for options, and the texts."""
     options, texts = [], []
     for row in (SOURCE / "tests/command.cases").read_text("utf-8").splitlines():
+        if not row or row.startswith("#"):
+            continue
         kind, _, rest = row.partition(": ")
         if kind == "text":
             texts.append(AclText(unescaped(rest.strip('"')), [], []))
@@ -67,7 +69,7 @@ def read_cases():
         elif kind.startswith("options"):
             code, *told = rest.split(", ")
             options.append((unescaped(kind).partition(" ")[2], Code[code], "".join(map(printed, told))))
-        elif kind in Code.__members__:
+        else:
             texts[-1].results.append((Code[kind], printed(rest)))
     return options, texts
 
