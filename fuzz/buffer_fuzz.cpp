@@ -197,7 +197,7 @@ void expect_sound(const sec_acl_buffer_t &acl, const std::string &bytes, const s
         if (&each == &*held.find(each.type, each.mechanism)) // only the first of a key is asked
             expect_decisions(acl, each, names);
     buffer swapped(second.turned);
-    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(1, &swapped.acl)), no_error);
+    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(with_check, &swapped.acl)), no_error);
     EXPECT_EQ(swapped.bytes(), bytes);
 }
 
@@ -219,8 +219,8 @@ void use_everywhere(const std::string &bytes, const std::string &name) {
         try_edits(bytes, model(), name);
     }
     EXPECT_EQ(given.bytes(), bytes);
-    if (succeeded(sec_convert_acl_to_host(0, &acl)))
-        succeeded(sec_convert_acl_to_host(1, &acl));
+    if (succeeded(sec_convert_acl_to_host(without_check, &acl)))
+        succeeded(sec_convert_acl_to_host(with_check, &acl));
 }
 
 std::string users_and_groups(const arguments &names) {
@@ -247,7 +247,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
     use_everywhere(bytes, name);
     // What another host wrote is used again in this one's order.
     buffer here(bytes);
-    if (succeeded(sec_convert_acl_to_host(0, &here.acl)) && here.bytes() != bytes)
+    if (succeeded(sec_convert_acl_to_host(without_check, &here.acl)) && here.bytes() != bytes)
         use_everywhere(here.bytes(), name);
     return 0;
 }

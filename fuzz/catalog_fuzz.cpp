@@ -7,11 +7,17 @@
 
 namespace {
 
+constexpr std::size_t longest = 300;
+constexpr int most_arguments = 9;
+
 // A text cut into conversions, doubled percent signs, and single bytes.
 std::vector<std::smatch> pieces(const std::string &text) {
     static const std::regex piece("%([1-9])\\$(0?)([1-9]\\d{0,2})?([sduxc])|%%|[^]");
     return {std::sregex_iterator(text.begin(), text.end(), piece), std::sregex_iterator()};
 }
+
+// Of the argument of a conversion, from 0.
+int place_of(const std::smatch &conversion) { return *conversion[1].first - '1'; }
 
 // The conversions in order, with the percent signs that belong to nothing before them.
 std::vector<std::string> sorted(const std::string &text) {
@@ -33,10 +39,21 @@ std::string shown(const std::smatch &piece, const auto &argument) {
     return {text, static_cast<std::size_t>(length)};
 }
 
+// Which arguments a text takes, and whether as strings: each by the first conversion that takes it.
+std::map<int, bool> strings_in(const std::string &text) {
+    std::map<int, bool> is_string;
+    for (const std::smatch &each : pieces(text)) {
+        const bool is_conversion = each[1].matched;
+        if (is_conversion)
+            is_string.try_emplace(place_of(each), each[4] == "s");
+    }
+    return is_string;
+}
+
 // The text that a conversion, a percent sign or a byte stands for.
 std::string expanded(const std::smatch &piece, const qz::cu::arguments &given,
                      std::map<int, bool> &is_string) {
-    const int at = piece[1].matched ? *piece[1].first - '1' : 9;
+    const int at = piece[1].matched ? place_of(piece) : most_arguments;
     const bool takes_string = piece[4] == "s";
     if (at >= given.count || takes_string != is_string[at])
         return piece.str() == "%%" ? "%" : piece.str();
@@ -47,16 +64,13 @@ std::string expanded(const std::smatch &piece, const qz::cu::arguments &given,
 
 int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
     std::string_view from = fuzz::input(data, size);
-    const std::string by_default = fuzz::line(from).substr(0, 300).c_str();
-    const std::string offered(std::string(from, 0, 300).c_str());
-    std::map<int, bool> is_string; // what the default text takes, each by the first that takes it
-    for (const std::smatch &each : pieces(by_default))
-        if (each[1].matched)
-            is_string.try_emplace(*each[1].first - '1', each[4] == "s");
+    const std::string by_default = fuzz::line(from).substr(0, longest).c_str();
+    const std::string offered(std::string(from, 0, longest).c_str());
+    std::map<int, bool> is_string = strings_in(by_default);
     qz::cu::arguments given = {};
     qz::cu::find_arguments(by_default.c_str(), given);
     EXPECT_EQ(given.count, is_string.empty() ? 0 : is_string.rbegin()->first + 1);
-    for (int i = 0; i < 9; ++i) {
+    for (int i = 0; i < most_arguments; ++i) {
         EXPECT_EQ(given.is_string(static_cast<unsigned>(i)), is_string[i]);
         // What is not given holds a number, so that it would be a wild address.
         given.values[i].number = i % 2 == 0 ? -1234567 - i : 'a' + i;

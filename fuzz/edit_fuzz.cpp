@@ -93,7 +93,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
         if (!is_empty)
             expect_edit_the_long_way(edit, acle, wanted);
         expect_edit(edit, acle, held, wanted);
-        EXPECT_TRUE(is_untidy || outcome_of(sec_convert_acl_to_host(1, &held.acl)) == no_error);
+        EXPECT_TRUE(is_untidy || outcome_of(sec_convert_acl_to_host(with_check, &held.acl)) == no_error);
         EXPECT_EQ(list_of(held.acl), wanted.entries(0, nullptr));
         for (const int other : types)
             for (const char *with : {static_cast<const char *>(nullptr), by, "none"})

@@ -78,55 +78,75 @@ line_facts parse_plainly(const std::string &text, std::size_t at, int line) {
     return facts;
 }
 
-// Compiles a text beside the model, which in the end is as the bytes are.
-model compile(const std::string &text, buffer &out) {
-    // What trees point into has readable bytes behind it.
-    const bool is_borrowed = text.size() % 3 != 0;
-    const buffer copy(text_field(text) + std::string(is_borrowed ? 7 : 0, 'x'));
-    char *const start = static_cast<char *>(copy.acl.data);
-    char *cursor = start;
-    std::size_t left = text.size() + 1;
-    std::uint32_t line = 1;
-    model plain;
-    sec_acltree_array array(is_borrowed ? std::span(start, left) : std::span<char>());
-    qz::parsed_acle parsed;
-    for (std::size_t place = 0, length = 0; place < text.size() && text[place] != '\0'; place += length) {
-        const std::uint32_t number = line;
-        const line_facts wanted = parse_plainly(text, place, static_cast<int>(number));
-        length = wanted.length;
-        const int result = sec__read_acle_from_text(nullptr, &cursor, &left, &line, &parsed);
-        const sec_acle_t acle = qz::record_of(parsed);
-        const bool is_read = result == 1;
-        EXPECT_EQ(is_read ? no_error : outcome_of(result), wanted.error);
-        EXPECT_EQ(is_read && acle.type != 0 ? text_of(acle) : "", wanted.entry);
-        EXPECT_EQ(line, number + 1);
-        if (is_read && acle.type != 0) {
-            const int added = faults::patiently([&] { return array.add(qz::view_of(parsed)); });
-            EXPECT_EQ(outcome_of(added), plain.edit(sec_add_acle_to_acl2, acle));
-        }
-        const std::size_t end = place + length;
-        const bool is_last = end > text.size() || text[end - 1] == '\0';
-        EXPECT_EQ(cursor, is_last ? nullptr : start + end);
-        if (is_last)
-            break;
-        EXPECT_EQ(left, text.size() + 1 - end);
+// A text beside the model, line by line.
+class text_reader {
+public:
+    explicit text_reader(const std::string &text)
+        : text_(text), is_borrowed_(text.size() % 3 != 0),
+          copy_(text_field(text) + std::string(is_borrowed_ ? readable_behind : 0, 'x')) {}
+
+    // The model, which in the end is as the bytes are.
+    model compile(buffer &out) {
+        while (at_ < text_.size() && text_[at_] != '\0' && read_line())
+            ;
+        EXPECT_EQ(sec__read_acle_from_text(nullptr, &cursor_, &left_, &line_, &parsed_), 0);
+        // The trees, in the order in which their keys appeared, are compiled the last first.
+        std::ranges::reverse(plain_.subacls);
+        // Where memory for it fails, sorting takes another way.
+        const auto compiles = [&] { return sec__acltrees_to_acl(trees_.trees(), &out.acl); };
+        const bool is_patient = text_.size() % 2 == 0;
+        EXPECT_EQ(is_patient ? faults::patiently(compiles) : compiles(), SEC_S_OK);
+        EXPECT_EQ(out.bytes(), plain_.bytes());
+        return plain_;
     }
-    EXPECT_EQ(sec__read_acle_from_text(nullptr, &cursor, &left, &line, &parsed), 0);
-    // The trees, in the order in which their keys appeared, are compiled the last first.
-    std::ranges::reverse(plain.subacls);
-    // Where memory for it fails, sorting takes another way.
-    const auto compiles = [&] { return sec__acltrees_to_acl(array.trees(), &out.acl); };
-    EXPECT_EQ(text.size() % 2 == 0 ? faults::patiently(compiles) : compiles(), SEC_S_OK);
-    EXPECT_EQ(out.bytes(), plain.bytes());
-    return plain;
-}
+
+private:
+    // What trees point into has readable bytes behind it.
+    static constexpr std::size_t readable_behind = 7;
+
+    // Whether another line may follow.
+    bool read_line() {
+        const std::uint32_t number = line_;
+        const line_facts wanted = parse_plainly(text_, at_, static_cast<int>(number));
+        const int result = sec__read_acle_from_text(nullptr, &cursor_, &left_, &line_, &parsed_);
+        const sec_acle_t acle = qz::record_of(parsed_);
+        const bool is_read = result == 1;
+        const bool is_entry = is_read && acle.type != 0;
+        EXPECT_EQ(is_read ? no_error : outcome_of(result), wanted.error);
+        EXPECT_EQ(is_entry ? text_of(acle) : "", wanted.entry);
+        EXPECT_EQ(line_, number + 1);
+        if (is_entry) {
+            const int added = faults::patiently([&] { return trees_.add(qz::view_of(parsed_)); });
+            EXPECT_EQ(outcome_of(added), plain_.edit(sec_add_acle_to_acl2, acle));
+        }
+        at_ += wanted.length;
+        const bool is_last = at_ > text_.size() || text_[at_ - 1] == '\0';
+        EXPECT_EQ(cursor_, is_last ? nullptr : start_ + at_);
+        EXPECT_TRUE(is_last || left_ == text_.size() + 1 - at_);
+        return !is_last;
+    }
+
+    const std::string &text_;
+    const bool is_borrowed_;
+    const buffer copy_;
+    char *const start_ = static_cast<char *>(copy_.acl.data);
+    char *cursor_ = start_;
+    std::size_t left_ = text_.size() + 1;
+    std::size_t at_ = 0;
+    std::uint32_t line_ = 1;
+    model plain_;
+    sec_acltree_array trees_{is_borrowed_ ? std::span(start_, left_) : std::span<char>()};
+    qz::parsed_acle parsed_;
+};
 
 } // namespace
 
 int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
     buffer held, recompiled;
-    const model plain = compile(std::string(input(data, size)), held);
-    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(1, &held.acl)), no_error);
+    const std::string text(input(data, size));
+    text_reader reader(text);
+    const model plain = reader.compile(held);
+    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(with_check, &held.acl)), no_error);
     EXPECT_EQ(list_of(held.acl), plain.entries(0, nullptr));
     std::vector<sec_acltree_t *> trees;
     std::vector<qz::owned_acltree> owners;

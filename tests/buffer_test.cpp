@@ -10,17 +10,18 @@ using namespace support;
 
 // Entries and sub-ACLs that many rows are made of.
 const std::string xyz = entry_bytes("xyz 3");
-const std::string bare = entry_bytes("1");
+const std::string many = xyz + xyz + xyz + xyz + xyz + xyz + xyz + xyz;
 const std::string unended = packed_entry(1, "xyz");
 const std::string any_other = subacl_bytes("o: 1");
 const std::string user_xyz = subacl_bytes("u abcd: xyz 3");
 
 // Bytes in which a number was changed.
-static std::string with(std::string bytes, std::size_t offset, unsigned value, std::size_t width = 1) {
+static std::string with_number(std::string bytes, std::size_t offset, unsigned value, std::size_t width = 1) {
     return bytes.replace(offset, width, number(value, width));
 }
 // The same of bytes in the other order.
-static std::string foreign_with(std::string bytes, std::size_t offset, unsigned value, std::size_t width) {
+static std::string with_foreign_number(std::string bytes, std::size_t offset, unsigned value,
+                                       std::size_t width) {
     std::string field = number(value, width);
     std::ranges::reverse(field);
     return bytes.replace(offset, width, field);
@@ -60,8 +61,8 @@ static void expect_check(const checked_bytes &row) {
     SCOPED_TRACE(row.what);
     buffer held(row.bytes);
     EXPECT_EQ(outcome_of(sec__check_acl_buffer(&held.acl)), row.error);
-    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(1, &held.acl)), row.error);
-    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(0, &held.acl)), no_error); // nothing to convert
+    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(with_check, &held.acl)), row.error);
+    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(without_check, &held.acl)), no_error); // nothing to convert
     EXPECT_EQ(held.bytes(), row.bytes);
 }
 
@@ -71,7 +72,7 @@ TEST(validate, accepts_what_is_sound) {
     expect_check({"all types, and bytes behind the end", rich + "behind"});
     expect_check({"a sub-ACL repeated", packed_acl(2, user_xyz + user_xyz)});
     expect_check({"no entries, and entries repeated", acl_bytes("e m:; g: z 4294967295, xyz 3, xyz 3")});
-    expect_check({"a long mechanism", acl_of_one(with(long_mechanism, 3, 9))});
+    expect_check({"a long mechanism", acl_of_one(with_number(long_mechanism, 3, 9))});
 }
 
 TEST(validate, finds_what_is_cut_short_or_of_another_length) {
@@ -79,12 +80,13 @@ TEST(validate, finds_what_is_cut_short_or_of_another_length) {
     const checked_bytes rows[] = {
         {"four bytes", example.substr(0, 4), bad_acl(msg::shorter_than_header, 4)},
         {"a sub-ACL too few", packed_acl(2, user_xyz), corrupted},
-        {"a length too short", packed_acl(2, with(user_xyz, 0, 25, 4) + any_other), corrupted},
-        {"a length too long", packed_acl(2, with(user_xyz, 0, 27, 4) + any_other), corrupted},
+        {"a length too short", packed_acl(2, with_number(user_xyz, 0, 25, 4) + any_other), corrupted},
+        {"a length too long", packed_acl(2, with_number(user_xyz, 0, 27, 4) + any_other), corrupted},
         {"an entry cut short", acl_of_one(user_xyz.substr(0, 21)), corrupted},
-        {"entries beyond number", acl_of_one(packed_subacl(4, "m\0"s, ~0u, xyz)), corrupted},
+        {"entries beyond number", acl_of_one(packed_subacl(SEC_ACLE_USER, "m\0"s, ~0u, xyz)), corrupted},
         // After a faulty entry the walk stands at that entry, where no further sub-ACL starts.
-        {"a faulty entry before a sub-ACL", packed_acl(2, with(any_other, 10, 2) + any_other), corrupted},
+        {"a faulty entry before a sub-ACL", packed_acl(2, with_number(any_other, 10, 2) + any_other),
+         corrupted},
     };
     for (const checked_bytes &row : rows)
         expect_check(row);
@@ -94,30 +96,38 @@ TEST(validate, finds_what_is_cut_short_or_of_another_length) {
 
 TEST(validate, names_the_first_rule_that_is_broken) {
     const failure bad_identity = bad_acle(msg::bad_identity_length);
-    const std::string no_entry = with(packed_subacl(SEC_ACLE_ANYOTHER, "", 1, ""), 0, 10, 4);
+    const std::string no_entry = with_number(packed_subacl(SEC_ACLE_ANYOTHER, "", 1, ""), 0, 10, 4);
     const int first_length_byte = is_low_byte_first ? 17 : 0;
     const checked_bytes rows[] = {
-        {"type 132", acl_of_one(packed_subacl(132, "m", 0, "")), bad_acl(msg::subacl_type_unknown, 132)},
-        {"a group's mechanism", acl_of_one(packed_subacl(16, "abcde", 1, xyz)),
-         bad_acl(msg::subacl_takes_no_mechanism, 16)},
-        {"an unauthenticated mechanism, and two entries", acl_of_one(packed_subacl(1, "m", 2, "")),
-         bad_acl(msg::subacl_takes_no_mechanism, 1)},
-        {"two unauthenticated", acl_of_one(packed_subacl(1, "", 2, "")), bad_acl(msg::more_than_one_acle)},
-        {"no mechanism", acl_of_one(packed_subacl(4, "", 1, xyz)), bad_acl(msg::bad_mechanism_length, 0)},
-        {"an empty mechanism", acl_of_one(packed_subacl(8, "\0"s, 1, xyz)),
+        {"a type that asks for a handler", acl_of_one(packed_subacl(by_handler, "m", 0, "")),
+         bad_acl(msg::subacl_type_unknown, by_handler)},
+        {"a group's mechanism", acl_of_one(packed_subacl(SEC_ACLE_GROUP, "abcde", 1, xyz)),
+         bad_acl(msg::subacl_takes_no_mechanism, SEC_ACLE_GROUP)},
+        {"an unauthenticated mechanism, and two entries",
+         acl_of_one(packed_subacl(SEC_ACLE_UNAUTHENTICATED, "m", 2, "")),
+         bad_acl(msg::subacl_takes_no_mechanism, SEC_ACLE_UNAUTHENTICATED)},
+        {"two unauthenticated", acl_of_one(packed_subacl(SEC_ACLE_UNAUTHENTICATED, "", 2, "")),
+         bad_acl(msg::more_than_one_acle)},
+        {"no mechanism", acl_of_one(packed_subacl(SEC_ACLE_USER, "", 1, xyz)),
+         bad_acl(msg::bad_mechanism_length, 0)},
+        {"an empty mechanism", acl_of_one(packed_subacl(SEC_ACLE_EXPANDED, "\0"s, 1, xyz)),
          bad_acl(msg::bad_mechanism_length, 1)},
-        {"a mechanism that ends early", acl_of_one(packed_subacl(4, "ab\0\0"s, 1, xyz)),
+        {"a mechanism that ends early", acl_of_one(packed_subacl(SEC_ACLE_USER, "ab\0\0"s, 1, xyz)),
          bad_acl(msg::bad_mechanism, "ab")},
         {"a mechanism that does not end",
-         acl_of_one(packed_subacl(4, "ab", 1, packed_entry(0x03000003, "xyz"))),
+         acl_of_one(packed_subacl(SEC_ACLE_USER, "ab", 1, packed_entry(0x03000003, "xyz"))),
          bad_acl(msg::bad_mechanism, "ab\1\3")},
         {"any other with an identity", acl_bytes("o: xyz 3"), bad_acle(msg::unexpected_identity)},
-        {"an identity that is too long", with(example, 25, 5, 2), bad_identity},
-        {"an identity that does not end", acl_of_one(packed_subacl(16, "", 2, unended + xyz)), bad_identity},
+        {"an identity that is too long", with_number(example, 25, 5, 2), bad_identity},
+        {"an identity that does not end", acl_of_one(packed_subacl(SEC_ACLE_GROUP, "", 2, unended + xyz)),
+         bad_identity},
         {"no identity", acl_bytes("e m: 1"), bad_identity},
         {"an unknown version before one that does not end",
-         acl_of_one(packed_subacl(4, "m\0"s, 2, with(xyz, 0, 0) + unended)),
+         acl_of_one(packed_subacl(SEC_ACLE_USER, "m\0"s, 2, with_number(xyz, 0, 0) + unended)),
          bad_acle(msg::acle_version_unsupported, 0)},
+        {"an unknown version before many",
+         acl_of_one(packed_subacl(SEC_ACLE_GROUP, "", 9, with_number(xyz, 0, 9) + many)),
+         bad_acle(msg::acle_version_unsupported, 9)},
         {"an unknown version where a sub-ACL starts", packed_acl(2, no_entry + any_other),
          bad_acle(msg::acle_version_unsupported, first_length_byte)},
     };
@@ -126,25 +136,26 @@ TEST(validate, names_the_first_rule_that_is_broken) {
 }
 
 TEST(convert, marks_the_order_when_all_was_turned) {
-    const std::string twice = foreign_with(foreign, 3, 2, 2) + foreign.substr(5);
+    const std::string twice = with_foreign_number(foreign, 3, 2, 2) + foreign.substr(5);
     const std::pair<std::string, failure> rows[] = {
         {twice, no_error},
-        {with(foreign, 9, 99), no_error}, // what is wrong then is not looked for
+        {with_number(foreign, 9, 99), no_error}, // what is wrong then is not looked for
         {"\x84\1\1\0\0"s, bad_acl(msg::not_an_acl_buffer)},
         {"\x85\2"s, bad_acl(msg::not_an_acl_buffer)},
         {"\x85\1"s, bad_acl(msg::shorter_than_header, 2)},
-        {foreign_with(twice, 5, 11, 4), bad_acl(msg::buffer_corrupted)},
+        {with_foreign_number(twice, 5, 11, 4), bad_acl(msg::buffer_corrupted)},
         {foreign.substr(0, foreign.size() - 1), bad_acl(msg::buffer_corrupted)},
     };
     for (const auto &[bytes, error] : rows) {
         buffer held(bytes);
-        EXPECT_EQ(outcome_of(sec_convert_acl_to_host(1, &held.acl)), error);
+        EXPECT_EQ(outcome_of(sec_convert_acl_to_host(with_check, &held.acl)), error);
         const bool is_marked = held.bytes().substr(0, 3) != bytes.substr(0, 3);
         EXPECT_EQ(is_marked, error == no_error) << error;
     }
     sec_acl_buffer_t empty = {};
-    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(0, &empty)), bad_acl(msg::not_an_acl_buffer));
-    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(1, nullptr)), bad_parameter("sec_convert_acl_to_host", 2));
+    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(without_check, &empty)), bad_acl(msg::not_an_acl_buffer));
+    EXPECT_EQ(outcome_of(sec_convert_acl_to_host(with_check, nullptr)),
+              bad_parameter("sec_convert_acl_to_host", 2));
 }
 
 TEST(list, refuses_what_it_cannot_expand) {
@@ -153,12 +164,13 @@ TEST(list, refuses_what_it_cannot_expand) {
         {"two for any other", packed_acl(2, any_other + subacl_bytes("n: 1, 1")),
          bad_acl(msg::single_acle_repeated)},
         {"a sub-ACL too few", packed_acl(2, any_other), corrupted},
-        {"a length that leads nowhere", packed_acl(3, with(any_other, 0, 0, 4)), corrupted},
+        {"a length that leads nowhere", packed_acl(3, with_number(any_other, 0, 0, 4)), corrupted},
         {"another version", "\x85\2\2\0\0"s, bad_acl(msg::not_an_acl_buffer)},
-        {"no mechanism", acl_of_one(packed_subacl(4, "", 1, xyz)), corrupted},
+        {"no mechanism", acl_of_one(packed_subacl(SEC_ACLE_USER, "", 1, xyz)), corrupted},
         {"a long mechanism", acl_bytes("u seventeen-bytes-x: x 1"), bad_acl(msg::bad_mechanism_length, 18)},
         {"no identity", acl_bytes("u unix: x 1, 1"), corrupted},
-        {"an identity that does not end", acl_of_one(packed_subacl(16, "", 2, xyz + unended)), corrupted},
+        {"an identity that does not end", acl_of_one(packed_subacl(SEC_ACLE_GROUP, "", 2, xyz + unended)),
+         corrupted},
     };
     for (const checked_bytes &row : rows) {
         SCOPED_TRACE(row.what);
@@ -180,7 +192,7 @@ TEST(list, refuses_bad_parameters) {
     EXPECT_EQ(sec_list_acl(&empty, &list), SEC_S_OK);
     EXPECT_EQ(list.count, 0);
     EXPECT_EQ(outcome_of(sec_list_acl_by_type(nullptr, 0, "", nullptr)), bad_parameter(by_type, 1));
-    EXPECT_EQ(outcome_of(sec_list_acl_by_type(&no_length, 0x84, "", nullptr)),
+    EXPECT_EQ(outcome_of(sec_list_acl_by_type(&no_length, by_handler, "", nullptr)),
               bad_parameter(by_type, 2, "84"));
     for (const char *bad : {"", "seventeen-bytes-x"}) {
         const failure error = bad_parameter(by_type, 3, address(bad));
@@ -188,21 +200,25 @@ TEST(list, refuses_bad_parameters) {
     }
     EXPECT_EQ(outcome_of(sec_list_acl_by_type(&no_length, SEC_ACLE_GROUP, "", nullptr)),
               bad_parameter(by_type, 4));
-    EXPECT_EQ(outcome_of(sec_list_acl_by_type(&no_length, 1, "", &list)), bad_acl(msg::not_an_acl_buffer));
+    EXPECT_EQ(outcome_of(sec_list_acl_by_type(&no_length, SEC_ACLE_GROUP, "", &list)),
+              bad_acl(msg::not_an_acl_buffer));
 }
 
 TEST(edit, reports_what_it_refuses_and_leaves_the_buffer_alone) {
     const sec_acle_t al = user("unix", "al", 1);
     const std::tuple<std::string, sec_acle_t, failure> rows[] = {
-        {rich, entry(0x84, "unix", "a", 1), bad_acle(msg::acle_type_unknown, 132)},
-        {rich, user("", "a", 1), bad_acle(msg::acle_lacks_key, 4)},
-        {"no ACL", group(nullptr, 1), bad_acle(msg::acle_lacks_key, 16)}, // the entry before the buffer
+        {rich, entry(by_handler, "unix", "a", 1), bad_acle(msg::acle_type_unknown, by_handler)},
+        {rich, user("", "a", 1), bad_acle(msg::acle_lacks_key, SEC_ACLE_USER)},
+        {"no ACL", group(nullptr, 1),
+         bad_acle(msg::acle_lacks_key, SEC_ACLE_GROUP)}, // the entry before the buffer
         {foreign, al, bad_acl(msg::wrong_byte_order)},
         {"\x84\2\1"s, al, bad_acl(msg::second_argument_not_acl)},
         {"\x85\2\1"s, al, bad_acl(msg::buffer_version_unsupported)},
         {example.substr(0, 4), al, bad_acl(msg::buffer_corrupted)},
-        {with(example, 5, 27, 4), user("abcd", "b", 1), bad_acl(msg::buffer_corrupted)}, // a byte too long
-        {acl_bytes("n: 1, 1"), entry(1, "", nullptr, 1), bad_acl(msg::single_acle_repeated)},
+        {with_number(example, 5, 27, 4), user("abcd", "b", 1),
+         bad_acl(msg::buffer_corrupted)}, // a byte too long
+        {acl_bytes("n: 1, 1"), entry(SEC_ACLE_UNAUTHENTICATED, "", nullptr, 1),
+         bad_acl(msg::single_acle_repeated)},
     };
     for (const auto edit : {sec_add_acle_to_acl, sec_add_acle_to_acl2, sec_del_acle_from_acl}) {
         for (const auto &[bytes, acle, error] : rows) {
@@ -225,7 +241,8 @@ TEST(edit, holds_at_most_65534_bytes_of_identity) {
     // A buffer that the call makes, which goes with its failure; one changed in place, one rebuilt.
     for (const std::string &bytes : {""s, acl_bytes("g: a 1, b 2"), acl_bytes("g: b 2, a 1")}) {
         buffer held(bytes);
-        EXPECT_EQ(outcome_of(sec_add_acle_to_acl(&refused, &held.acl)), bad_acle(msg::acle_lacks_key, 16));
+        EXPECT_EQ(outcome_of(sec_add_acle_to_acl(&refused, &held.acl)),
+                  bad_acle(msg::acle_lacks_key, SEC_ACLE_GROUP));
         EXPECT_EQ(held.bytes(), bytes);
         EXPECT_EQ(outcome_of(sec_add_acle_to_acl(&fitting, &held.acl)), no_error);
         EXPECT_TRUE(
@@ -279,7 +296,7 @@ static std::string dumped_head(const char *length, const char *count) {
 // The fields are the length, the type, the mechanism and the number of entries.
 static std::string dumped_subacl(const std::string &indentation, arguments fields) {
     fields.insert(fields.begin(), 2, indentation);
-    return error_with(0, msg::dump_subacl.id, fields).text + "\n";
+    return error_with(SEC_S_OK, msg::dump_subacl.id, fields).text + "\n";
 }
 
 TEST(dump, goes_on_after_what_cannot_be_expanded) {

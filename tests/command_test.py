@@ -1,15 +1,14 @@
 """Runs the checker as an administrator does and compares what it prints, answers and leaves behind, to the byte.
 
-Usage: command_test.py BUILD_DIR [unittest arguments]. The helpers serve the other script tests as well."""
+usage: command_test.py BUILD-FOLDER [unittest arguments]"""
+import contextlib
 import errno
 import itertools
 import os
 import pathlib
 import pwd
 import random
-import re
 import resource
-import shutil
 import signal
 import socket
 import struct
@@ -18,65 +17,252 @@ import sys
 import tempfile
 import time
 import unittest
+from typing import NamedTuple
 
-BUILD = pathlib.Path(sys.argv[1]).resolve()
-SANITIZED = "QZ_SANITIZE:STRING=\n" not in (BUILD / "CMakeCache.txt").read_text()
-IS_ROOT, NOBODY = os.geteuid() == 0, 65534
-ORDINARY = NOBODY - 1 if IS_ROOT else None  # whom root takes to be without its rights
-# A copy of the command and its libraries that any user can reach, wherever the build folder lies.
-PLACE = tempfile.TemporaryDirectory()
-os.chmod(PLACE.name, 0o755)
-for part in ("bin", "lib"):
-    shutil.copytree(BUILD / part, f"{PLACE.name}/{part}", symlinks=True)
-subprocess.run(["chmod", "-R", "a+rX", PLACE.name], check=True)  # as the mask of who built may not allow
-COMMAND = PLACE.name + "/bin/qzaclfck"
-# The texts of the message table by id; all text here is Latin-1, so that every byte survives.
-TABLE = pathlib.Path(__file__).resolve().parent.parent / "security" / "msg" / "qzseclib_msg.h"
-TEXTS = {int(number): re.sub(r"\\(.)", lambda match: {"n": "\n", "t": "\t"}.get(match[1], match[1]),
-                             "".join(re.findall(r'"((?:[^"\\]|\\.)*)"', literals)))
-         for number, literals in re.findall(r'\{(\d+),((?:\s*"(?:[^"\\]|\\.)*")+)\}', TABLE.read_text("latin-1"))}
+from command_case import (
+    COMMAND, ENTRIES, INHERITED, IS_MUSL, IS_ROOT, NOBODY, ORDINARY, SANITIZED, SOURCE, WRITER, Code, CommandCase,
+    entry, message, posix_acl, run)
+
+A_TEXT = "u abcd xyz wr\n"
+A_LINE = entry("u", "rw", "abcd", "xyz")
+A_CACHE = bytes.fromhex("8501020100 1a000000 04 01000000 05 6162636400 01 03000000 0400 78797a00")
+NO_CACHE = message("cache_skipped_after_errors")
+# What the C library says of options, which has no number.
+OF_THE_C_LIBRARY = {
+    "unknown_option": f"{COMMAND}: " + ("unrecognized option: %s\n" if IS_MUSL else "invalid option -- '%s'\n"),
+    "lacks_argument": f"{COMMAND}: option requires an argument" + (": %s\n" if IS_MUSL else " -- '%s'\n"),
+}
 
 
-def formatted(text, *values):
-    return re.sub(r"%(\d)\$([sdcx])", lambda match: format(values[int(match[1]) - 1], match[2].strip("sdc")), text)
+def unescaped(text):
+    return text.encode("latin-1").decode("unicode_escape")
 
 
-def message(number, *values):  # as the command prints it: with an empty line behind it
-    return formatted(TEXTS[number], *values) + "\n"
+def printed(words):
+    """What the last words of a row of command.cases stand for."""
+    name, *values = map(unescaped, words.split())
+    if name == "shows":
+        return entry(*("" if value == "none" else value for value in values))
+    if name in OF_THE_C_LIBRARY:
+        return OF_THE_C_LIBRARY[name] % values[0]
+    return message(name, *(int(value) if value.isdigit() else value for value in values))
 
 
-def entry(letter, permissions, *identity):
-    """The line of verbose mode; `identity` is nothing, (identity) or (mechanism, identity)."""
-    return formatted(TEXTS[87 - len(identity)], "", letter, *identity, permissions)
+class AclText(NamedTuple):
+    """A text, what each of its lines leads to, as a code and what is printed, and its cache where it has no mistakes."""
+    text: str
+    results: list
+    cache: list
 
 
-def run(arguments, cwd, environment=(), child=None, user=None):
-    """Gives the status and what was printed; `child` is called just before."""
-    rights = {"user": user, "group": user, "extra_groups": []} if user else {}
-    kept = {name: value for name, value in os.environ.items() if name.endswith("SAN_OPTIONS")}
-    done = subprocess.run([COMMAND] + [text.encode("latin-1") for text in arguments], cwd=cwd, preexec_fn=child,
-                          env={**kept, "LC_ALL": "C", **dict(environment)}, stdin=subprocess.DEVNULL,
-                          capture_output=True, check=False, timeout=300, **rights)  # in case that it hangs
-    printed = b"on standard output: " + done.stdout if done.stdout else done.stderr
-    return done.returncode, printed.decode("latin-1")
+def read_cases():
+    """The rows for options, and the texts."""
+    options, texts = [], []
+    for row in (SOURCE / "tests/command.cases").read_text("utf-8").splitlines():
+        if not row or row.startswith("#"):
+            continue
+        kind, _, rest = row.partition(": ")
+        if kind == "text":
+            texts.append(AclText(unescaped(rest.strip('"')), [], []))
+        elif kind == "cache":
+            texts[-1].cache.append(bytes.fromhex(rest))
+        elif kind.startswith("options"):
+            code, *told = rest.split(", ")
+            options.append((unescaped(kind).partition(" ")[2], Code[code], "".join(map(printed, told))))
+        else:
+            texts[-1].results.append((Code[kind], printed(rest)))
+    return options, texts
 
 
-ENTRIES, INHERITED = "system.posix_acl_access", "system.posix_acl_default"
-WRITER = NOBODY - 2  # a user whom an entry lets write
+OPTIONS, ACL_TEXTS = read_cases()
+CHOICES = [options for count in range(4) for options in itertools.combinations(("-c", "-v", "-s"), count)]
 
 
-def posix_acl(group):
-    """Entries that let the owner and one user write, and the group do what is said."""
-    no_id = 0xffffffff
-    entries = ((1, 6, no_id), (2, 6, WRITER), (4, group, no_id), (0x10, 6, no_id), (0x20, 4, no_id))
-    return struct.pack("<I", 2) + b"".join(struct.pack("<HHI", *entry) for entry in entries)
+def started(options, cwd, **how):
+    """The command, which runs beside the test."""
+    return subprocess.Popen([COMMAND, options, "-f", "a"], cwd=cwd, env={"LC_ALL": "C"}, **how)
 
 
-def entries_of(path):
-    try:
-        return os.getxattr(path, ENTRIES)
-    except OSError as error:
-        return os.strerror(error.errno)
+class Output(CommandCase):
+    def test_options(self):
+        self.write("a", "n r\n")
+        for arguments, status, errors in OPTIONS:
+            # The C library then looks for no options behind operands.
+            for strict in ({}, {"POSIXLY_CORRECT": "1"}):
+                with self.subTest(arguments, **strict):
+                    self.expect(arguments.split(" "), status, errors, environment=strict)
+
+    def test_lines(self):
+        for each, options in itertools.product(ACL_TEXTS, CHOICES):
+            with self.subTest(each.text[:60], options=options):
+                self.expect_check(each, options)
+
+    def expect_check(self, each, options):
+        codes = [code for code, _ in each.results]
+        failure = next(filter(None, codes), Code.OK)
+        goes_on = "-c" in options or not failure
+        results = each.results if goes_on else each.results[:codes.index(failure) + 1]
+        told = [text for code, text in results if code or "-v" in options]
+        if failure and "-s" in options:
+            told.append(NO_CACHE)
+        makes = [("a.cacl", cache) for cache in each.cache if "-s" in options]
+        self.fresh()
+        self.write("a", each.text)
+        self.expect([*options, "-f", "a"], Code.OK if goes_on else failure, "".join(told), makes)
+
+    def test_a_locale_says_in_which_code_set_identities_are_shown(self):
+        self.write("a", "u m \xc3\xa9 r\ng \xff\nn r\n")
+        failed = message("conversion_failed").removesuffix("\n")
+        shown = entry("u", "r", "m", "\xc3\xa9")
+        arguments = ["-v", "-f", "a"]
+        self.expect(arguments, Code.OK, failed + failed + entry("n", "r"), environment={"LC_ALL": "C"})
+        self.expect(arguments, Code.OK, shown + failed + entry("n", "r"), environment={"LC_ALL": "C.UTF-8"})
+
+    def test_a_locale_says_nothing_about_letters(self):
+        same_user = "u UNIX I@Host r\nu unix i@hoSt w\n"
+        other_letters = "u kI \u0130 r\nu k\xa0i x\xa0 r\n"
+        two_groups = "g \xc7 r\ng \xe7 w\n"
+        self.write("a", (same_user + other_letters + two_groups).encode("utf-8"))
+        duplicate = message("duplicate_acle", "u", "UNIX", "I@Host").split(" ", maxsplit=1)[0]
+        told = run(["-c", "-f", "a"], self.dir)
+        self.assertEqual(told[1].count(duplicate), 1)
+        for environment in self.locale("tr_TR.ISO-8859-9"), self.locale("tr_TR.UTF-8"), {"LC_ALL": "not.known"}:
+            self.assertEqual(run(["-c", "-f", "a"], self.dir, environment), told)
+
+    @unittest.skipIf(IS_MUSL, "the C library knows no such locales")
+    def test_a_locale_says_what_ends_a_word(self):
+        """More white space than usual ends a word, but does not stand between two."""
+        rules = pathlib.Path("/usr/share/i18n/locales/i18n_ctype").read_text("utf-8")
+        rules = rules.replace("\nspace /", "\nspace /\n<U00A0>;/")
+        pathlib.Path(self.root, "blanks").write_text(rules, "utf-8")
+        localedef = ["localedef", "-ci", "blanks", "-f", "ISO-8859-1", "./x"]
+        subprocess.run(localedef, cwd=self.root, capture_output=True, check=False)
+        self.write("a", "g a\xa0r\no \xa0r\n")
+        told = entry("g", "r", "a") + message("tokens_in_excess", 2)
+        environment = {"LC_ALL": "", "LC_CTYPE": "x", "LOCPATH": self.root}
+        self.expect(["-cv", "-f", "a"], Code.OK, told, environment=environment)
+
+    def test_entries_are_gathered_into_one_write(self):
+        self.write("a", "n\no\ng a\n")
+        reader, writer = socket.socketpair(type=socket.SOCK_SEQPACKET)  # which keeps writes apart
+        with reader, writer:
+            self.expect(["-v", "-f", "a"], Code.OK, "", child=lambda: os.dup2(writer.fileno(), 2))
+            first_write = reader.recv(1 << 20).decode()
+        self.assertEqual(first_write, entry("n", "") + entry("o", "") + entry("g", "", "a"))
+
+    @unittest.skipUnless(os.path.exists("/proc/self/io"), "the system does not count writes")
+    def test_failures_are_flushed_one_by_one_on_a_terminal_only(self):
+        self.write("a", "x\nn r\ny\no w\n")
+        terminal, its_end = os.openpty()
+        self.addCleanup(os.close, terminal)
+        self.addCleanup(os.close, its_end)
+        log = pathlib.Path(self.root, "log")
+        with open(log, "wb") as file:
+            for stream, options, writes in ((its_end, "-c", 2), (its_end, "-cv", 3), (file, "-cvs", 2)):
+                with started(options, self.dir, stderr=stream) as child:
+                    os.waitid(os.P_PID, child.pid, os.WEXITED | os.WNOWAIT)
+                    counts = pathlib.Path(f"/proc/{child.pid}/io").read_text("ascii")
+                self.assertIn(f"\nsyscw: {writes}\n", counts, options)
+        first, second = message("bad_type_token", 1, "x"), message("bad_type_token", 3, "y")
+        told = first + entry("n", "r") + second + entry("o", "w") + NO_CACHE
+        self.assertEqual(log.read_text("latin-1"), told)
+
+    def test_a_signal_loses_nothing_that_was_gathered(self):
+        for number in (signal.SIGHUP, signal.SIGINT, signal.SIGQUIT, signal.SIGTERM):
+            with self.subTest(number):
+                status, printed, whole = self.printed_until(number, signal.SIG_DFL)
+                self.assertEqual(status, -number)
+                self.assertNotEqual(printed, whole)
+                self.assertTrue(whole.startswith(printed))
+                self.assertTrue(printed.endswith("\n\n"))
+                self.assertEqual(self.printed_until(number, signal.SIG_IGN), (0, whole, whole))
+
+    def printed_until(self, number, action):
+        """The status, what stands in the pipe when a signal comes early, and what would without it."""
+        count = 5000
+        self.write("a", "x\n" * count)
+        set_action = lambda: signal.signal(number, action)
+        with started("-c", self.dir, stderr=subprocess.PIPE, preexec_fn=set_action) as child:
+            first = child.stderr.read(1)  # more than the pipe takes is left
+            child.send_signal(number)
+            printed = first + child.stderr.read()
+            status = child.wait()
+        whole = [message("bad_type_token", line, "x") for line in range(1, count + 1)]
+        return status, printed.decode("latin-1"), "".join(whole)
+
+    def test_a_second_signal_ends_what_nobody_reads(self):
+        self.write("a", "x\n" * 5000)
+        with started("-c", self.dir, stderr=subprocess.PIPE) as child:
+            child.stderr.read(1)
+            while child.poll() is None:
+                child.terminate()
+                time.sleep(0.01)
+            self.assertEqual(child.returncode, -signal.SIGTERM)
+
+    def test_closed_standard_descriptors(self):
+        self.write("mistake", "x\n" + A_TEXT)
+        self.write("b", A_TEXT)
+        mistake = message("bad_type_token", 1, "x") + NO_CACHE
+        for closed in ((0,), (1,), (2,), (0, 1), (0, 2), (1, 2), (0, 1, 2)):
+            is_silent = 2 in closed
+            close = lambda: list(map(os.close, closed))
+            with self.subTest(closed=closed):
+                self.expect(["-csf", "mistake"], Code.OK, "" if is_silent else mistake, child=close)
+                self.expect(["-vsf", "b"], Code.OK, "" if is_silent else A_LINE, [("b.cacl", A_CACHE)], child=close)
+
+
+def packed_subacl(kind, mask, names):
+    """A sub-ACL of the mechanism "m"."""
+    entries = b"".join(struct.pack("=BIH", 1, mask, len(name) + 1) + name.encode() + b"\0" for name in names)
+    return struct.pack("=IBIB", 12 + len(entries), kind, len(names), 2) + b"m\0" + entries
+
+
+def limited_to(memory):
+    """What a process calls to set its own limits."""
+    def limit():
+        resource.setrlimit(resource.RLIMIT_STACK, (256 << 10, 256 << 10))
+        resource.setrlimit(resource.RLIMIT_AS, (memory, memory))
+    return limit
+
+
+class Memory(CommandCase):
+    @unittest.skipIf(SANITIZED, "the sanitizers need much memory")
+    def test_the_check_succeeds_or_says_that_there_is_too_little(self):
+        sorted_names = [f"{number:05}" for number in range(50000)]
+        names = sorted_names[:20000] + random.Random(1).sample(sorted_names[20000:], 30000)
+        self.write("a", "".join(f"u m {name} r\ne m {name}\n" for name in names))
+        statuses = []
+        for megabytes in range(4, 64, 2):
+            status, errors = run(["-cs", "-f", "a"], self.dir, child=limited_to(megabytes << 20))
+            self.assertEqual(os.path.exists(self.dir + "/a.cacl"), status == 0)
+            if status < 0 or "error while loading" in errors:
+                continue  # not even the C library found its place
+            statuses.append(status)
+            self.assertTrue(errors == "" if status == 0 else errors.startswith("3417-102"), errors)
+        self.assertEqual(set(statuses), {Code.NO_MEMORY, Code.OK})
+        self.assertEqual(statuses, sorted(statuses, reverse=True))
+        order = b"\2" if sys.byteorder == "little" else b"\1"
+        head = b"\x85\1" + order + struct.pack("=H", 2)
+        cache = head + packed_subacl(8, 0, names) + packed_subacl(4, 1, sorted_names)
+        self.assertTrue(pathlib.Path(self.dir, "a.cacl").read_bytes() == cache)
+
+
+NO_FILE = Code.BAD_FILENAME, message("bad_acl_file_name", "{dir}/a", 0)
+OTHER_MODE = Code.FILE_ERROR, message("cache_mode_differs", "{dir}/a")
+NO_WRITING = Code.FILE_ERROR, message("cannot_open_for_writing", "{dir}/a.cacl")
+IN_THE_WAY = [  # what the owner does before, and what "-s" then comes to
+    ("rm a; mkdir a", NO_FILE),
+    ("rm a; mkfifo a", NO_FILE),
+    ("ln -sf /dev/zero a", NO_FILE),
+    ("chmod 200 a", (Code.FILE_ERROR, message("cannot_open_acl_file", "{dir}/a", errno.EACCES))),
+    ("mkdir -m 644 a.cacl", OTHER_MODE),
+    ("mkfifo -m 644 a.cacl", OTHER_MODE),
+    ("ln -s nowhere a.cacl", NO_WRITING),
+    ("chmod 444 a; cp -p a a.cacl", NO_WRITING),
+]
+if IS_ROOT:
+    REFUSED = Code.FILE_ERROR, message("cannot_set_owner", "{dir}/a.cacl", "0", 0)
+    IN_THE_WAY.append(("ln -sf of_root a", REFUSED))
 
 
 def may_write(path, user, group):
@@ -84,306 +270,111 @@ def may_write(path, user, group):
     return done.returncode == 0
 
 
-def snapshot(directory):
-    """What tells of changes to anything in a directory, by name."""
-    return {item.name: (info.st_mode, info.st_uid, info.st_gid, info.st_ino, info.st_size, info.st_mtime_ns)
-            for item in os.scandir(directory) for info in [item.stat(follow_symlinks=False)]}
+def entries_of(path):
+    with contextlib.suppress(OSError):
+        return os.getxattr(path, ENTRIES)
+    return None
 
 
-class CommandCase(unittest.TestCase):
-    """A test with directories of its own; in expected texts "{dir}" stands for the one in use."""
-    maxDiff = None
-
-    def setUp(self):
-        self.root = os.path.realpath(tempfile.mkdtemp())
-        self.addCleanup(shutil.rmtree, self.root)
-        os.chmod(self.root, 0o755)
-        self.fresh()
-
-    def fresh(self):
-        self.dir = tempfile.mkdtemp(dir=self.root)
-        os.chmod(self.dir, 0o755)
-
-    def write(self, name, text, mode=0o644, owner=None):
-        path = os.path.join(self.dir, name)
-        pathlib.Path(path).write_bytes(text if isinstance(text, bytes) else text.encode("latin-1"))
-        if owner is not None:
-            os.chown(path, owner, owner)
-        os.chmod(path, mode)
-        return path
-
-    def locale(self, name):
-        """The environment for a locale, which is made here."""
-        language, code_set = name.split(".")
-        if not os.path.exists("/usr/share/i18n/locales/" + language):
-            self.skipTest(f"the locale {language} is not there")
-        subprocess.run(["localedef", "-i", language, "-f", code_set, f"{self.root}/{name}"], check=True)
-        return {"LC_ALL": name, "LOCPATH": self.root}
-
-    def expect(self, arguments, status, errors, makes=(), **how):
-        """Compares status and text, and that only the files of `makes`, (name, bytes), changed."""
-        before = snapshot(self.dir)
-        got = run([text.replace("{dir}", self.dir) for text in arguments], self.dir, **how)
-        self.assertEqual(got, (status, errors.replace("{dir}", self.dir)))
-        after = snapshot(self.dir)
-        for name, content in makes:
-            self.assertNotEqual(after.pop(name), before.pop(name, None))
-            self.assertEqual(pathlib.Path(self.dir, name).read_bytes(), content)
-        self.assertEqual(after, before)
+def limited_to_file_size(size, action):
+    """What a process calls to set the limit, and what the signal of going beyond does."""
+    def limit():
+        signal.signal(signal.SIGXFSZ, action)
+        resource.setrlimit(resource.RLIMIT_FSIZE, (size, size))
+    return limit
 
 
-USAGE = message(80)
-LINE_OF_A = entry("n", "r")
-# The C library musl says it in other words, and knows no locales but "C" and such in UTF-8.
-IS_MUSL = b"/ld-musl-" in pathlib.Path(COMMAND).read_bytes()
-UNKNOWN_X = f"{COMMAND}: " + ("unrecognized option: x\n" if IS_MUSL else "invalid option -- 'x'\n")
-LACKS_ARGUMENT = f"{COMMAND}: option requires an argument" + (": %s\n" if IS_MUSL else " -- '%s'\n")
-OPTIONS = [  # arguments, status, standard error; the file "a" holds the line "n r"
-    ("-c -s -v -t p", 4, message(148) + USAGE),
-    ("-c -s -S -v -t p -u q -f a -h", 0, message(81)),
-    *[(f"-{letter}", 4, LACKS_ARGUMENT % letter + message(147) + USAGE) for letter in "ftu"],
-    ("-x -h", 0, UNKNOWN_X + message(147)), ("-h -x", 4, UNKNOWN_X + message(147) + USAGE),
-    *[(f"-{letter} -f a -{letter}", 4, message(146, f"-{letter}") + USAGE) for letter in "chsSv"],
-    *[(f"-{letter} p -{letter} q", 4, message(146, f"-{letter}") + USAGE) for letter in "ftu"],
-    ("-cvfa operand -- -x", 0, LINE_OF_A),
-    ("operand - -cvfa", 0, LINE_OF_A),
-    ("-S -t p -f a", 0, ""), ("-t p -S -v -f a", 0, message(149) * 2 + LINE_OF_A),
-    ("-u no.such.user -f a", 15, message(127, "no.such.user")),
-    ("-f missing%n%1$s\xff", 105, message(154, "{dir}/missing%n%1$s\xff", errno.ENOENT)),
-]
+class Caches(CommandCase):
+    def expect_cache(self, **how):
+        self.expect(["-s", "-f", "a"], Code.OK, "", [("a.cacl", A_CACHE)], **how)
 
-CODES = {131: 42, 145: 37, 158: 42, 159: 42, 160: 43, 165: 42, 166: 36}
-LINES = [  # file text, in order what it gives (an entry's line, or a failure's message), the cache of a clean text
-    ("", [(157, "{dir}/a")]),
-    ("# nobody\n\n \t\v\n  # x y z\n", [], bytes.fromhex("8501020000")),
-    ("u abcd xyz wr\n", [("u", "rw", "abcd", "xyz")],
-     bytes.fromhex("8501020100 1a000000 04 01000000 05 6162636400 01 03000000 0400 78797a00")),
-    ("o\nN oasvdelqCxcwr #c\r\nu k Zed x\ng aB q\nE k b r\nu K amy\nG a_ l",
-     [("o", ""), ("n", "rwcxCqledvsao"), ("u", "x", "k", "Zed"), ("g", "q", "aB"), ("e", "r", "k", "b"),
-      ("u", "", "k", "amy"), ("g", "l", "a_")],
-     bytes.fromhex("8501020500 15000000 08 01000000 02 6b00 01 01000000 0200 6200"
-                   "1e000000 10 02000000 00 01 40000000 0300 615f00 01 20000000 0300 614200"
-                   "22000000 04 02000000 02 6b00 01 00000000 0400 616d7900 01 08000000 0400 5a656400"
-                   "11000000 01 01000000 00 01 ff1f0000 0000 11000000 02 01000000 00 01 00000000 0000")),
-    ("n r\n%s%n r\r\n# c\n\xee\nu\ng staff r extra\no w\0\nx\n",
-     [("n", "r"), (165, 2, "%s%n"), (165, 5, "\xee"), (158, 6), (159, 7), (131, 8)]),
-    ("o r\no r\nn rz x\nx\n", [("o", "r"), ("o", "r"), (160, "o"), (166, 3, "rz"), (165, 4, "x")]),
-    ("n #" + "c" * 1092 + "\no #" + "c" * 1093 + "\ng a", [("n", ""), (145, 2), ("g", "", "a")]),
-]
-A_TEXT, _, A_CACHE = LINES[2]
-
-
-class Command(CommandCase):
-    def test_options(self):
-        self.write("a", "n r\n")
-        for arguments, status, errors in OPTIONS:
-            for strict in ({}, {"POSIXLY_CORRECT": "1"}):  # when the C library looks for no options behind operands
-                with self.subTest(arguments, **strict):
-                    self.expect(arguments.split(" "), status, errors, environment=strict)
-
-    def test_lines(self):
-        """The facts of a text give what is printed with each of the eight choices of options."""
-        for (text, facts, *cache), number in itertools.product(LINES, range(8)):
-            options = [option for bit, option in enumerate(("-c", "-v", "-s")) if number >> bit & 1]
-            codes = [CODES.get(fact[0], 0) for fact in facts]
-            failure = next(filter(None, codes), 0)
-            told = facts if "-c" in options or not failure else facts[:codes.index(failure) + 1]
-            errors = [message(*fact) if fact[0] in TEXTS else entry(*fact) for fact in told
-                      if fact[0] in CODES or "-v" in options]
-            if "-s" in options and failure:
-                errors.append(message(162))
-            with self.subTest(text[:60], options=options):
-                self.fresh()
-                self.write("a", text)
-                self.expect([*options, "-f", "a"], 0 if "-c" in options else failure, "".join(errors),
-                            [("a.cacl", content) for content in cache if "-s" in options])
-
-    def test_locales(self):
-        """They say in which code set identities are shown and what ends a word, and nothing about letters."""
-        self.write("a", "u m \xc3\xa9 r\ng \xff\nn r\n")
-        for locale, shown in (("C", TEXTS[130]), ("C.UTF-8", entry("u", "r", "m", "\xc3\xa9"))):
-            self.expect(["-v", "-f", "a"], 0, shown + TEXTS[130] + LINE_OF_A, environment={"LC_ALL": locale})
-        text = "u UNIX I@Host r\nu unix i@hoSt w\nu kI \u0130 r\nu k\xa0i x\xa0 r\ng \xc7 r\ng \xe7 w\n"
-        self.write("a", text.encode("utf-8"))
-        told = run(["-c", "-f", "a"], self.dir)
-        self.assertEqual(told[1].count("3417-157"), 1)  # the user, and neither of the groups
-        for environment in self.locale("tr_TR.ISO-8859-9"), self.locale("tr_TR.UTF-8"), {"LC_ALL": "not.known"}:
-            self.assertEqual(run(["-c", "-f", "a"], self.dir, environment), told)
-        if IS_MUSL:
-            return
-        # More bytes than usual are white space: they end a token, but do not stand between two.
-        rules = pathlib.Path("/usr/share/i18n/locales/i18n_ctype").read_text("utf-8")
-        rules = rules.replace("\nspace /", "\nspace /\n<U00A0>;/")
-        pathlib.Path(self.root, "blanks").write_text(rules, "utf-8")
-        subprocess.run(["localedef", "-ci", "blanks", "-f", "ISO-8859-1", "./x"], cwd=self.root, capture_output=True)
-        self.write("a", "g a\xa0r\no \xa0r\n")
-        self.expect(["-cv", "-f", "a"], 0, entry("g", "r", "a") + message(159, 2),
-                    environment={"LC_ALL": "", "LC_CTYPE": "x", "LOCPATH": self.root})
-
-    def test_entries_are_gathered_into_one_write(self):
-        self.write("a", "n\no\ng a\n")
-        reader, writer = socket.socketpair(type=socket.SOCK_SEQPACKET)  # which keeps writes apart
-        with reader, writer:
-            self.expect(["-v", "-f", "a"], 0, "", child=lambda: os.dup2(writer.fileno(), 2))
-            self.assertEqual(reader.recv(1 << 20).decode(), entry("n", "") + entry("o", "") + entry("g", "", "a"))
-
-    @unittest.skipUnless(os.path.exists("/proc/self/io"), "the system does not count writes")
-    def test_failures_are_flushed_one_by_one_on_a_terminal_only(self):
-        self.write("a", "x\nn r\ny\no w\n")
-        terminal, writer = os.openpty()
-        self.addCleanup(os.close, terminal)
-        with open(writer, "wb") as shown, open(os.path.join(self.root, "log"), "wb") as log:
-            for stream, options, writes in ((shown, "-c", 2), (shown, "-cv", 3), (log, "-cvs", 2)):
-                with self.subTest(stream=stream.name, options=options):
-                    command = [COMMAND, options, "-f", "a"]
-                    with subprocess.Popen(command, cwd=self.dir, stderr=stream, env={"LC_ALL": "C"}) as child:
-                        os.waitid(os.P_PID, child.pid, os.WEXITED | os.WNOWAIT)
-                        counts = pathlib.Path(f"/proc/{child.pid}/io").read_text("ascii")
-                    self.assertIn(f"\nsyscw: {writes}\n", counts)
-        told = [message(165, 1, "x"), entry("n", "r"), message(165, 3, "y"), entry("o", "w"), message(162)]
-        self.assertEqual(pathlib.Path(log.name).read_text("latin-1"), "".join(told))
-
-    def test_a_signal_loses_nothing_that_was_gathered(self):
-        """It ends the command behind a line, with everything up to there in the pipe; ignored, it ends nothing."""
-        count = 5000
-        self.write("a", "x\n" * count)
-        told = "".join(message(165, number, "x") for number in range(1, count + 1))
-        for number in (signal.SIGHUP, signal.SIGINT, signal.SIGQUIT, signal.SIGTERM):
-            for action, status in ((signal.SIG_DFL, -number), (signal.SIG_IGN, 0)):
-                command, child = [COMMAND, "-c", "-f", "a"], lambda: signal.signal(number, action)
-                with self.subTest(number, action=action), subprocess.Popen(
-                        command, cwd=self.dir, stderr=subprocess.PIPE, env={"LC_ALL": "C"}, preexec_fn=child) as done:
-                    first = done.stderr.read(1)  # more than the pipe takes is left
-                    done.send_signal(number)
-                    printed = (first + done.stderr.read()).decode("latin-1")
-                    self.assertEqual(done.wait(), status)
-                    self.assertTrue(told.startswith(printed) and printed.endswith("\n\n"))
-                    self.assertEqual(len(printed) == len(told), action == signal.SIG_IGN)
-
-    def test_a_second_signal_ends_what_nobody_reads(self):
-        self.write("a", "x\n" * 5000)
-        with subprocess.Popen([COMMAND, "-c", "-f", "a"], cwd=self.dir, stderr=subprocess.PIPE) as child:
-            child.stderr.read(1)
-            while child.poll() is None:
-                child.terminate()
-                time.sleep(0.01)
-            self.assertEqual(child.returncode, -signal.SIGTERM)
-
-    @unittest.skipIf(SANITIZED, "the sanitizers need much memory")
-    def test_little_memory(self):
-        """However little there is, the check succeeds or says that it was too little."""
-        names = [f"{number:05}" for number in range(50000)]
-        shuffled = names[:20000] + random.Random(1).sample(names[20000:], 30000)
-        self.write("a", "".join(f"u m {name} r\ne m {name}\n" for name in shuffled))
-        mark = b"\2" if sys.byteorder == "little" else b"\1"
-        cache = b"\x85\1" + mark + struct.pack("=H", 2) + b"".join(
-            struct.pack("=IBIB", 12 + 50000 * 13, kind, 50000, 2) + b"m\0" + b"".join(
-                struct.pack("=BIH", 1, mask, 6) + name.encode() + b"\0" for name in order)
-            for kind, mask, order in ((8, 0, shuffled), (4, 1, names)))
-        found = []
-        for megabytes in range(4, 64, 2):
-            limits = ((resource.RLIMIT_STACK, 256 << 10), (resource.RLIMIT_AS, megabytes << 20))
-            code, errors = run(["-cs", "-f", "a"], self.dir, child=lambda: [
-                resource.setrlimit(kind, (limit, limit)) for kind, limit in limits])
-            if code >= 0 and "error while loading" not in errors:
-                found.append((code, errors[:8]))
-            self.assertEqual(os.path.exists(self.dir + "/a.cacl"), code == 0)
-        self.assertEqual((found[0], found[-1], len(set(found))), ((6, "3417-102"), (0, ""), 2))
-        self.assertTrue(pathlib.Path(self.dir, "a.cacl").read_bytes() == cache)
+    def expect_refusal(self, result, **how):
+        self.expect(["-s", "-f", "a"], *result, **how)
 
     def test_what_stands_in_the_way(self):
-        for does, *told in [  # what its owner does before, and what "-s" then says to the owner
-                ("rm a; mkdir a", 154, "{dir}/a", 0), ("rm a; mkfifo a", 154, "{dir}/a", 0),
-                ("ln -sf /dev/zero a", 154, "{dir}/a", 0), ("chmod 200 a", 156, "{dir}/a", errno.EACCES),
-                ("mkdir -m 644 a.cacl", 137, "{dir}/a"), ("mkfifo -m 644 a.cacl", 137, "{dir}/a"),
-                ("ln -s nowhere a.cacl", 138, "{dir}/a.cacl"), ("chmod 444 a; cp -p a a.cacl", 138, "{dir}/a.cacl"),
-                *[("ln -sf of_root a", 141, "{dir}/a.cacl", "0", 0)] * IS_ROOT]:
+        for does, result in IN_THE_WAY:
             with self.subTest(does):
                 self.fresh()
                 os.chmod(self.dir, 0o777)
                 self.write("of_root", A_TEXT)
                 self.write("a", A_TEXT, owner=ORDINARY)
                 subprocess.run(does, shell=True, cwd=self.dir, user=ORDINARY, group=ORDINARY, check=True)
-                self.expect(["-s", "-f", "a"], 105 if told[0] == 154 else 37, message(*told), user=ORDINARY)
+                self.expect_refusal(result, user=ORDINARY)
 
-    def test_cache_is_protected_like_the_file(self):
+    def test_a_cache_is_protected_like_the_file(self):
         for mode in (0o640, 0o400, 0o1666, 0o2755, 0o4711):
             self.fresh()
-            self.write("a", A_TEXT, mode, ORDINARY)
-            self.expect(["-s", "-f", "a"], 0, "", [("a.cacl", A_CACHE)], child=lambda: os.umask(0o077))
-            self.assertEqual(*[(info.st_uid, info.st_gid, info.st_mode) for info in map(os.stat, os.scandir(self.dir))])
+            path = self.write("a", A_TEXT, mode, ORDINARY)
+            self.expect_cache(child=lambda: os.umask(0o077))
+            text, cache = os.stat(path), os.stat(path + ".cacl")
+            self.assertEqual(cache.st_mode, text.st_mode)
+            self.assertEqual((cache.st_uid, cache.st_gid), (text.st_uid, text.st_gid))
 
-    def test_cache_has_the_entries_of_the_file_and_no_others(self):
+    def test_a_cache_has_the_entries_of_the_file_and_no_others(self):
         """Nobody can write the cache who cannot write the file, whatever new files in the folder inherit."""
         for entries, inherited in itertools.product((None, posix_acl(group=4)), (None, posix_acl(group=6))):
             with self.subTest(entries=entries, inherited=inherited):
                 self.fresh()
                 path = self.write("a", A_TEXT, owner=ORDINARY)
-                try:
-                    if entries:
-                        os.setxattr(path, ENTRIES, entries)
-                    if inherited:
-                        os.setxattr(self.dir, INHERITED, inherited)
-                except OSError:
-                    self.skipTest("the file system has no POSIX ACLs")
-                self.expect(["-s", "-f", "a"], 0, "", [("a.cacl", A_CACHE)])
+                if entries:
+                    self.set_entries(path, entries)
+                if inherited:
+                    self.set_entries(self.dir, inherited, INHERITED)
+                self.expect_cache()
                 self.assertEqual(entries_of(path + ".cacl"), entries_of(path))
                 self.assertEqual(os.stat(path + ".cacl").st_mode, os.stat(path).st_mode)
                 if IS_ROOT:
                     self.assertFalse(may_write(path + ".cacl", NOBODY, ORDINARY))
                     self.assertEqual(may_write(path + ".cacl", WRITER, WRITER), entries is not None)
 
-    def test_cache_with_other_entries_is_not_replaced(self):
+    def test_a_cache_with_other_entries_is_not_replaced(self):
         path = self.write("a", A_TEXT, 0o664)
         self.write("a.cacl", "old", 0o664)
-        try:
-            os.setxattr(path, ENTRIES, posix_acl(group=4))
-        except OSError:
-            self.skipTest("the file system has no POSIX ACLs")
-        self.expect(["-s", "-f", "a"], 37, message(137, "{dir}/a"))
-        os.setxattr(path + ".cacl", ENTRIES, posix_acl(group=6))
-        self.expect(["-s", "-f", "a"], 37, message(137, "{dir}/a"))
-        os.setxattr(path + ".cacl", ENTRIES, posix_acl(group=4))
-        self.expect(["-s", "-f", "a"], 0, "", [("a.cacl", A_CACHE)])
+        self.set_entries(path, posix_acl(group=4))
+        self.expect_refusal(OTHER_MODE)
+        self.set_entries(path + ".cacl", posix_acl(group=6))
+        self.expect_refusal(OTHER_MODE)
+        self.set_entries(path + ".cacl", posix_acl(group=4))
+        self.expect_cache()
 
-    def test_full_disk(self):
+    def test_a_full_disk_leaves_the_cache_that_was_there(self):
         self.write("a", A_TEXT)
-        for _ in range(2):  # without a cache, and with one, which stays
-            for room, count, error, action in ((7, 7, 0, signal.SIG_IGN), (0, -1, errno.EFBIG, signal.SIG_DFL)):
-                self.expect(["-s", "-f", "a"], 37, message(139, count, len(A_CACHE), error), child=lambda: (
-                    signal.signal(signal.SIGXFSZ, action), resource.setrlimit(resource.RLIMIT_FSIZE, (room, room))))
+        size = len(A_CACHE)
+        short = Code.FILE_ERROR, message("short_write", 7, size, 0)
+        nothing = Code.FILE_ERROR, message("short_write", -1, size, errno.EFBIG)
+        for _ in ("without a cache", "with one"):
+            self.expect_refusal(short, child=limited_to_file_size(7, signal.SIG_IGN))
+            self.expect_refusal(nothing, child=limited_to_file_size(0, signal.SIG_DFL))
             self.write("a.cacl", "old")
 
-    def test_closed_standard_descriptors(self):
-        self.write("a", "x\n" + A_TEXT)
-        self.write("b", A_TEXT)
-        for closed in ((0,), (1,), (2,), (0, 1), (0, 2), (1, 2), (0, 1, 2)):
-            for name, option, errors, makes in (("a", "-c", message(165, 1, "x") + message(162), []),
-                                                ("b", "-v", entry("u", "rw", "abcd", "xyz"), [("b.cacl", A_CACHE)])):
-                self.expect([option, "-s", "-f", name], 0, "" if 2 in closed else errors, makes,
-                            child=lambda: list(map(os.close, closed)))
-
-    def test_long_paths(self):
+    def test_the_longest_path_leaves_room_for_the_suffix(self):
         folder = os.path.join(self.dir, *["d" * 200] * 19)
         os.makedirs(folder)
-        for length in (4089, 4090):
-            path = (folder + "/").ljust(length, "f")
+        longest = (folder + "/").ljust(4089, "f")
+        too_long = longest + "f"
+        for path in longest, too_long:
             pathlib.Path(path).write_text(A_TEXT, "ascii")
-            self.expect(["-s", "-f", path], *((37, message(135, path)) if length > 4089 else (0, "")))
-            self.assertEqual(os.path.exists(path + ".cacl"), length == 4089)
+        self.expect(["-s", "-f", longest], Code.OK, "")
+        self.assertTrue(os.path.exists(longest + ".cacl"))
+        self.expect(["-s", "-f", too_long], Code.FILE_ERROR, message("name_too_long_for_cache", too_long))
+        self.assertFalse(os.path.exists(too_long + ".cacl"))
 
-    def test_home_directory(self):
+    def test_a_file_in_the_home_directory_must_be_the_users_alone(self):
         user, home = pwd.getpwuid(os.geteuid())[0:6:5]
         if not os.access(home, os.W_OK):
             self.skipTest("no home directory to write to")
+        ignored = message("compile_option_ignored")
         with tempfile.NamedTemporaryFile(dir=home) as file:
             pathlib.Path(file.name).write_text("n r\n", "ascii")
-            refused = (36, message(155, file.name, user))
-            for mode, owner, *told in [(0o755, -1, 0, LINE_OF_A), (0o620, -1, *refused), (0o602, -1, *refused),
-                                       *[(0o600, NOBODY, *refused)] * IS_ROOT]:
+            shown = Code.OK, entry("n", "r")
+            refused = Code.BAD_PERMISSION, message("acl_file_not_private", file.name, user)
+            rows = [(0o755, -1, shown), (0o620, -1, refused), (0o602, -1, refused)]
+            if IS_ROOT:
+                rows.append((0o600, NOBODY, refused))
+            for mode, owner, (status, told) in rows:
                 os.chmod(file.name, mode)
                 os.chown(file.name, owner, -1)
-                self.expect(["-sv", "-u", user, "-f", os.path.basename(file.name)], told[0], message(150) + told[1])
+                self.expect(["-sv", "-u", user, "-f", os.path.basename(file.name)], status, ignored + told)
             self.assertFalse(os.path.exists(file.name + ".cacl"))
 
 

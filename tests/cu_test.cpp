@@ -10,6 +10,10 @@
 
 namespace {
 
+constexpr int some_code = 42; // of a library above this one
+constexpr int some_message = 97;
+constexpr std::uint32_t unknown_flag = 2;
+
 std::unique_ptr<cu_error_t, void (*)(cu_error_t *)> current() {
     cu_error_t *error = nullptr;
     EXPECT_EQ(cu_get_error_1(&error), CU_OK);
@@ -23,7 +27,7 @@ std::string current_text() {
 }
 
 std::string recorded(const char *text, auto... arguments) {
-    EXPECT_EQ(cu_set_error_1(4, 0, nullptr, 1, 88, text, arguments...), CU_OK);
+    EXPECT_EQ(cu_set_error_1(some_code, 0, nullptr, 1, some_message, text, arguments...), CU_OK);
     return current_text();
 }
 
@@ -36,13 +40,13 @@ TEST(Error, TextsAndArguments) {
 }
 
 TEST(Error, IsOfItsThreadAndKeptByAHandle) {
-    cu_set_error_1(42, 0, nullptr, 1, 97, "%1$s %2$d", "first", 1);
+    cu_set_error_1(some_code, 0, nullptr, 1, some_message, "%1$s %2$d", "first", 1);
     auto first = current();
-    EXPECT_EQ(first->code, 42);
-    EXPECT_EQ(first->message_id, 97);
+    EXPECT_EQ(first->code, some_code);
+    EXPECT_EQ(first->message_id, some_message);
     cu_set_no_error_1();
     const auto none = current();
-    EXPECT_EQ(none->code, 0);
+    EXPECT_EQ(none->code, CU_OK);
     cu_pset_error_1(first.get());
     first.reset();
     std::thread([] {
@@ -159,10 +163,10 @@ TEST(Failures, BadParametersAreRefused) {
         cu_iconv_open_1("UTF-8", 0, nullptr),
         cu_iconv_open_1(nullptr, 0, &handle),
         cu_iconv_open_1("", 0, &handle),
-        cu_iconv_open_1("UTF-8", 2, &handle),
-        cu_iconv_open_1("ISO-8859-1//TRANSLIT", 1, &handle),
+        cu_iconv_open_1("UTF-8", unknown_flag, &handle),
+        cu_iconv_open_1("ISO-8859-1//TRANSLIT", CU_ICONV_FROM_UTF8, &handle),
         cu_iconv_str_1(nullptr, 0, "a", &n, &out, &n),
-        cu_iconv_str_1(from_latin1, 1, "a", &n, &out, &n),
+        cu_iconv_str_1(from_latin1, unknown_flag, "a", &n, &out, &n),
         cu_iconv_str_1(from_latin1, 0, nullptr, &n, &out, &n),
         cu_iconv_str_1(from_latin1, 0, "a", nullptr, &out, &n),
         cu_iconv_str_1(from_latin1, 0, "a", &n, nullptr, &n),
@@ -180,7 +184,7 @@ TEST(Failures, WithoutMemoryMakeNothing) {
     char *out = nullptr;
     size_t n = 1;
     faults::allocations = {.fails_at = 1, .fails_on = true};
-    cu_set_error_1(6, 0, nullptr, 1, 89, "%1$s%2$s%3$d", a.c_str(), "b", 3);
+    cu_set_error_1(some_code, 0, nullptr, 1, some_message, "%1$s%2$s%3$d", a.c_str(), "b", 3);
     const int got_code = cu_get_error_1(&got);
     const int text_code = cu_get_errmsg_1(error.get(), &text);
     const int converted_code = cu_iconv_str_1(from_latin1, 0, "\xe9", &n, &out, &n);

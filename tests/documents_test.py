@@ -11,16 +11,20 @@ import tempfile
 import unittest
 from pathlib import Path
 
-BUILD, SOURCE, WRITE = Path(sys.argv.pop(1)).resolve(), Path(__file__).resolve().parent.parent, "--write" in sys.argv
-DOCS = {path: path.read_text() for path in (SOURCE / name for name in (
-    "README.md", "docs/recipes.md", "docs/tracing.md", "docs/man/qzaclfck.1", "docs/man/qzacl.1",
-    "docs/man/qzacl.5", "docs/man/qzcacl.5"))}
+from command_case import BUILD, SANITIZED, SOURCE
+
+WRITE = "--write" in sys.argv
+README = "README.md"
+RECIPES_PAGE = "docs/recipes.md"
+TRACING = "docs/tracing.md"
+MANUAL = "docs/man/qzaclfck.1"
+PAGES = (README, RECIPES_PAGE, TRACING, MANUAL, "docs/man/qzacl.1", "docs/man/qzacl.5", "docs/man/qzcacl.5")
+DOCS = {name: (SOURCE / name).read_text() for name in PAGES}
 RECIPES = dict(re.findall(r"<!-- recipe: (.*?) -->\n```\w*\n(.*?)```\n", "".join(DOCS.values()), re.S))
 # A command and what it prints, in Markdown and in a manual page; and how the command is written there.
 OUTPUT = re.compile(r"(<!-- output: (.*?) -->\n```\n)((?s:.*?))(?=```\n)")
 EXAMPLE = re.compile(r"(?m)^(\$ ((?:.*\\e\n)*.*\n))((?:.*\n)*?)(?=\$ |\.Ed)")
 WRITTEN = {"./dev run": "qzaclfck", "build/release/examples/": "", "\\-": "-", "\\(aq": "'", "\\e": "\\"}
-SANITIZED = "QZ_SANITIZE:STRING=\n" not in (BUILD / "CMakeCache.txt").read_text()
 TIMES = re.compile(r"\d+:\d+:\d+|\d+(?= us)")  # which differ each time
 MARKUP = str.maketrans({"\\": "\\e", "-": "\\-", "'": "\\(aq"})
 # What docs/tracing.md takes as its example.
@@ -57,31 +61,39 @@ class Documents(unittest.TestCase):
             (self.dir / name).write_text(text)
             (self.dir / name).chmod(0o755)
 
-    def run_in_shell(self, command, folder=".", **more):  # gives the status, and what is printed on either stream
-        environment = {"PATH": f"{BUILD}/bin:{BUILD}/examples:{self.dir}:{os.environ['PATH']}", "LC_ALL": "C",
-                       "HOME": str(self.dir), "LOCPATH": str(self.dir), **more}
+    def run_in_shell(self, command, folder=".", **more):
+        """Gives the status, and what is printed on either stream."""
+        here = str(self.dir)
+        path = f"{BUILD}/bin:{BUILD}/examples:{here}:{os.environ['PATH']}"
+        environment = {"PATH": path, "LC_ALL": "C", "HOME": here, "LOCPATH": here, **more}
         done = subprocess.run(command, shell=True, env=environment, cwd=self.dir / folder, check=False, text=True,
                               stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
         return done.returncode, done.stdout.replace(str(self.dir), "/etc")
 
+    def real_output(self, found, page):
+        """A command and what it really prints, which is compared with what the page shows."""
+        command = found[2]
+        for written, meant in WRITTEN.items():
+            command = command.replace(written, meant)
+        is_manual = not page.endswith(".md")
+        _, printed = self.run_in_shell(command, Path(page).stem if is_manual else ".")
+        if is_manual:
+            printed = printed.translate(MARKUP)
+        if not WRITE:
+            self.assertEqual(TIMES.sub("", printed), TIMES.sub("", found[3]), command)
+        return found[1] + printed
+
     def test_outputs(self):
         self.assertEqual(self.run_in_shell(SERVED)[0], 0)
-        for path, text in DOCS.items():
-            place, pattern, markup = (".", OUTPUT, {}) if path.suffix == ".md" else (path.stem, EXAMPLE, MARKUP)
-            (self.dir / place).mkdir(exist_ok=True)
-
-            def real(found, place=place, markup=markup):
-                command = found[2]
-                for written, meant in WRITTEN.items():
-                    command = command.replace(written, meant)
-                printed = self.run_in_shell(command, place)[1].translate(markup)
-                self.assertEqual(*[WRITE or TIMES.sub("", each) for each in (printed, found[3])], command)
-                return found[1] + printed
-            if path.name != "tracing.md" or shutil.which("jq"):
-                shown, count = pattern.subn(real, text)
-                self.assertTrue(count, path)
-                if WRITE:
-                    path.write_text(shown)
+        for page, text in DOCS.items():
+            if page == TRACING and not shutil.which("jq"):
+                continue
+            (self.dir / Path(page).stem).mkdir(exist_ok=True)
+            pattern = OUTPUT if page.endswith(".md") else EXAMPLE
+            shown, count = pattern.subn(lambda found, page=page: self.real_output(found, page), text)
+            self.assertTrue(count, page)
+            if WRITE:
+                (SOURCE / page).write_text(shown)
 
     def test_recipes_tell_right_from_wrong(self):
         commands = re.findall("(?:validate|command): (qzaclfck .*)(?:%s|/etc/)", RECIPES["ansible"])
@@ -90,7 +102,8 @@ class Documents(unittest.TestCase):
             self.assertEqual(self.run_in_shell(command + "examples/service.acl"), (0, ""))
             self.assertEqual(self.run_in_shell(command + "examples/mistakes.acl")[0], 37)
 
-    def starts(self):  # whether systemd would go on: a command with "-" may fail
+    def starts(self):
+        """Whether systemd would go on: a command with "-" may fail."""
         recipe = RECIPES["unit"].replace("/etc/", "examples/")
         commands = re.findall(r"ExecStartPre=(-?)/usr/bin/(.*)", recipe)
         return all(may_fail or self.run_in_shell(command)[0] == 0 for may_fail, command in commands)
@@ -103,9 +116,9 @@ class Documents(unittest.TestCase):
         self.assertFalse(self.starts())
 
     def test_replacing_a_file_by_an_older_one_takes_effect(self):
-        manual = re.search(r"\$ (.*mv new\.acl site\.acl.*)", DOCS[SOURCE / "docs/man/qzaclfck.1"])[1]
+        manual = re.search(r"\$ (.*mv new\.acl site\.acl.*)", DOCS[MANUAL])[1]
         manual = manual.replace("\\-", "-").replace("site.acl", "service.acl")
-        recipe = re.search(r"(?m)^(.*mv new\.acl /etc/.*)$", DOCS[SOURCE / "docs/recipes.md"])[1]
+        recipe = re.search(r"(?m)^(.*mv new\.acl /etc/.*)$", DOCS[RECIPES_PAGE])[1]
         task = re.search("command: (.*)", RECIPES["ansible"])[1]
         (self.dir / "postinst").write_text(RECIPES["postinst"].replace("/etc/", ""))
         move = "mv new.acl service.acl"
@@ -114,7 +127,8 @@ class Documents(unittest.TestCase):
             shown = self.run_in_shell(f"{REVOKED}; {replace}; service service.acl carol@a.example")
             self.assertRegex(shown[1], "^read from the cache, 22 bytes\nnothing is granted\n", way)
 
-    def with_checker(self, script):  # an environment in which this is qzaclfck
+    def with_checker(self, script):
+        """An environment in which the script is qzaclfck."""
         checker = self.dir / "checker/qzaclfck"
         checker.parent.mkdir(exist_ok=True)
         checker.write_text("#!/bin/sh\n" + script)
@@ -135,12 +149,12 @@ class Documents(unittest.TestCase):
         places = "map(filter(getqflist(), 'v:val.valid'), 'v:val.lnum')"
         ask = f"silent make | call writefile({places}, 'places') | qall!"
         self.run_in_shell(f'vim -es -u DEFAULTS -c "{ask}" examples/mistakes.acl </dev/null')
-        expected = re.findall(r"(?m)^examples/mistakes\.acl:(\d+):", DOCS[SOURCE / "docs/recipes.md"])
+        expected = re.findall(r"(?m)^examples/mistakes\.acl:(\d+):", DOCS[RECIPES_PAGE])
         self.assertEqual((self.dir / "places").read_text().split(), expected)
 
     @unittest.skipIf(SANITIZED or not shutil.which("cc"), "needs a compiler and a plain build")
     def test_snippet_shows_a_broken_file(self):
-        snippet = re.search(r"```c\n(.*?)```", DOCS[SOURCE / "README.md"], re.S)[1].replace("/etc/", "")
+        snippet = re.search(r"```c\n(.*?)```", DOCS[README], re.S)[1].replace("/etc/", "")
         (self.dir / "snippet.c").write_text(PROGRAM % snippet)
         flags = f"-Wall -Wextra -Werror -I{SOURCE}/include -L{BUILD}/lib -Wl,-rpath,{BUILD}/lib"
         self.assertEqual(self.run_in_shell(f"cc {flags} snippet.c -o snippet -lqzacl"), (0, ""))
@@ -148,12 +162,15 @@ class Documents(unittest.TestCase):
             self.assertEqual(self.run_in_shell(f"printf '{text}' >service.acl; ./snippet"), (0, shown), text)
 
     def test_edits_of_ansible_change_once(self):
-        command = re.search("cmd: (.*)", RECIPES["edit"])[1].replace("/etc/", "examples/")
-        for mode, status, shown in (("--check", 1, "+g operators  rw\n"), ("-s", 0, "changed\n"), ("--check", 0, ""),
-                                    ("-s", 0, "unchanged\n")):
-            got = self.run_in_shell(re.sub("{{.*?}}", mode, command))
-            self.assertEqual(got[0], status)
-            self.assertIn(shown, got[1])
+        task = re.search("cmd: (.*)", RECIPES["edit"])[1].replace("/etc/", "examples/")
+        for mode, status, expected in (
+                ("--check", 1, "+g operators  rw\n"),
+                ("-s", 0, "changed\n"),
+                ("--check", 0, ""),
+                ("-s", 0, "unchanged\n")):
+            got, shown = self.run_in_shell(re.sub("{{.*?}}", mode, task))
+            self.assertEqual(got, status)
+            self.assertIn(expected, shown)
 
     def test_cases_that_must_hold(self):
         self.assertEqual(self.run_in_shell("gate examples/service.acl"), (0, "23 passed, 0 failed\n"))
@@ -166,23 +183,29 @@ class Documents(unittest.TestCase):
         self.run_in_shell("sed -i '/^e hba2 node02/d' examples/service.acl")
         self.assertEqual(self.run_in_shell("compare same other"), (0, "other: + g new r\n"))
 
-    @unittest.skipUnless(shutil.which("git"), "there is no git")
-    def test_commits(self):
-        self.run_in_shell("git init repo; mv pre-commit repo/.git/hooks")
-        killed = self.with_checker("kill -KILL $$")
-        (self.dir / "examples/other.acl").write_text("o r\n")
-        for staged, present, expected, environment in (
-                ("service", "mistakes", 0, {}), ("mistakes", "service", 1, {}), ("other", "service", 1, killed)):
-            change = f"cd repo && cp ../examples/{staged}.acl 'a b.acl' && git add . && cp ../examples/{present}.acl *"
-            commit = "git -c user.name=x -c user.email=x commit -m x"
-            self.assertEqual(self.run_in_shell(f"{change} && {commit}", **environment)[0], expected, staged)
+    def commit(self, staged, present, environment):
+        """The status of a commit of one file while another stands in its place."""
+        stage = f"cd repo && cp ../examples/{staged}.acl 'a b.acl' && git add ."
+        change = f"cp ../examples/{present}.acl *"
+        commit = "git -c user.name=x -c user.email=x commit -m x"
+        return self.run_in_shell(f"{stage} && {change} && {commit}", **environment)[0]
 
-    @unittest.skipUnless(shutil.which("gencat") and os.path.exists("/usr/share/i18n/locales/de_DE"), "no German locale")
+    @unittest.skipUnless(shutil.which("git"), "there is no git")
+    def test_commits_of_mistakes_are_refused(self):
+        self.run_in_shell("git init repo; mv pre-commit repo/.git/hooks")
+        (self.dir / "examples/other.acl").write_text("o r\n")
+        self.assertEqual(self.commit("service", "mistakes", {}), 0)
+        self.assertEqual(self.commit("mistakes", "service", {}), 1)
+        self.assertEqual(self.commit("other", "service", self.with_checker("kill -KILL $$")), 1)
+
+    @unittest.skipUnless(shutil.which("gencat"), "there is no gencat")
+    @unittest.skipUnless(os.path.exists("/usr/share/i18n/locales/de_DE"), "there is no German locale")
     def test_places_of_mistakes_in_another_language(self):
         subprocess.run(["localedef", "-i", "de_DE", "-f", "UTF-8", self.dir / "de_DE.UTF-8"], check=True)
-        catalogs = re.search("NLSPATH=(.*)", RECIPES["language"])[1].replace("/usr/local", str(BUILD).replace("%", "%%"))
+        build = str(BUILD).replace("%", "%%")
+        catalogs = re.search("NLSPATH=(.*)", RECIPES["language"])[1].replace("/usr/local", build)
         matcher = json.loads(RECIPES["matcher"])["problemMatcher"][0]["pattern"][0]
-        places = re.findall(r"(?m)^examples/\S+: 3417-\d+", DOCS[SOURCE / "docs/recipes.md"])
+        places = re.findall(r"(?m)^examples/\S+: 3417-\d+", DOCS[RECIPES_PAGE])
         _, shown = self.run_in_shell("aclcheck examples/*.acl", LC_ALL="de_DE.UTF-8", NLSPATH=catalogs)
         found = [re.match(matcher["regexp"], line) for line in shown.splitlines()]
         keys = [matcher[key] for key in ("file", "line", "code")]
@@ -190,7 +213,7 @@ class Documents(unittest.TestCase):
         self.assertIn("Der ACL-Eintrag in Zeile 5", found[0][matcher["message"]])
 
     def test_tracing_as_the_readme_shows_it(self):
-        command = re.search(r"(?m)^QZ_TRACE_LEVELS=.*\\\n.*$", DOCS[SOURCE / "README.md"])[0]
+        command = re.search(r"(?m)^QZ_TRACE_LEVELS=.*\\\n.*$", DOCS[README])[0]
         shown = self.run_in_shell(f"mkdir build; {command.replace('build/release/examples/', '')}")
         self.assertEqual(shown[0], 0, shown)
         self.assertIn('"id":84', (self.dir / "build/trace.jsonl").read_text())  # an answer of sec__single_acle_perm
@@ -204,19 +227,26 @@ class Documents(unittest.TestCase):
             left = entered + {"arguments": 3, "acl_and": 5}[arguments]
             recorded.update(range(entered, left, 2))
             recorded.update(range(left, left + {"bare": 1, "result": 2, "outputs": 3}[leaving]))
-        self.assertEqual(recorded, set(map(int, re.findall(r"\*\*(\d+)\*\*", DOCS[SOURCE / "docs/tracing.md"]))))
+        self.assertEqual(recorded, set(map(int, re.findall(r"\*\*(\d+)\*\*", DOCS[TRACING]))))
 
-    def test_manual_is_sound_and_has_every_function_and_option(self):
-        for name in "security/ACL/lib/libqzacl.map", "platform/libqz_cu/libqz_cu.map", "platform/libqz_tr/libqz_tr.map":
-            for function in re.findall(r"(\w+);\n", (SOURCE / name).read_text()):
-                page = BUILD / "share/man" / (BUILD / f"share/man/man3/{function}.3").read_text().split()[1]
-                self.assertRegex(page.read_text(), rf"(?m)^\.Nm {function}\b")
-        options = re.findall(r"(?m)^\.It Fl (\w)", DOCS[SOURCE / "docs/man/qzaclfck.1"])
-        self.assertEqual(set(options), set(re.findall(r"\s\[?-(\w)\b", self.run_in_shell("qzaclfck")[1])))
-        if shutil.which("mandoc"):  # without matters of style, such as blanks at the end of what was printed
-            checked = self.run_in_shell("mandoc -T lint -W warning $(grep -L '^[.]so ' man*/*)", BUILD / "share/man")
-            self.assertEqual(checked, (0, ""))
+    def test_manual_has_every_function(self):
+        pages = BUILD / "share/man"
+        for library in "security/ACL/lib/libqzacl", "platform/libqz_cu/libqz_cu", "platform/libqz_tr/libqz_tr":
+            for function in re.findall(r"(\w+);\n", (SOURCE / f"{library}.map").read_text()):
+                _, page = (pages / f"man3/{function}.3").read_text().split(maxsplit=2)[:2]
+                self.assertRegex((pages / page).read_text(), rf"(?m)^\.Nm {function}\b")
+
+    def test_manual_has_every_option(self):
+        described = re.findall(r"(?m)^\.It Fl (\w)", DOCS[MANUAL])
+        _, usage = self.run_in_shell("qzaclfck")
+        self.assertEqual(set(described), set(re.findall(r"\s\[?-(\w)\b", usage)))
+
+    @unittest.skipUnless(shutil.which("mandoc"), "there is no mandoc")
+    def test_manual_is_sound(self):
+        # Without matters of style, such as blanks at the end of what was printed.
+        checked = self.run_in_shell("mandoc -T lint -W warning $(grep -L '^[.]so ' man*/*)", BUILD / "share/man")
+        self.assertEqual(checked, (0, ""))
 
 
 if __name__ == "__main__":
-    unittest.main(argv=[argument for argument in sys.argv if argument != "--write"])
+    unittest.main(argv=[sys.argv[0]] + [argument for argument in sys.argv[2:] if argument != "--write"])

@@ -35,13 +35,17 @@ extern "C" int cu_iconv_str_1(cu_iconv_t handle, std::uint32_t options, const ch
 namespace {
 
 TEST(messages, have_a_text_whatever_their_id) {
-    for (const int id : {-1, 1, msg::table_size})
-        EXPECT_EQ(msg::shown_text(id), cu_badid_qzseclib_msg);
-    EXPECT_EQ(msg::shown_text(88), msg::default_text(88));
+    for (const int unknown_id : {-1, 1, msg::table_size})
+        EXPECT_EQ(msg::shown_text(unknown_id), cu_badid_qzseclib_msg);
+    const int known_id = msg::incorrect_parameter.id;
+    EXPECT_EQ(msg::shown_text(known_id), msg::default_text(known_id));
 }
 
+constexpr std::uint32_t highest_bit = 0x80000000;
+constexpr std::uint32_t every_bit = 0xffffffff;
+constexpr std::uint8_t no_type = 3;
 const sec_perm_template_t own_templates[] = {
-    {0x80000000, 'r', "", ""}, {1, '\xe9', "", ""}, {1, 'x', "", ""}, {2, 'r', "", ""}};
+    {highest_bit, 'r', "", ""}, {1, '\xe9', "", ""}, {1, 'x', "", ""}, {2, 'r', "", ""}};
 const sec_perm_set_t own_letters = {4, own_templates};
 
 // After an error, what was found before it is there.
@@ -49,13 +53,13 @@ TEST(permissions, turn_letters_into_bits) {
     const std::tuple<const char *, const sec_perm_set_t *, std::uint32_t, const char *> rows[] = {
         {nullptr, nullptr, 0, ""},
         {"oasvdelqCxcwr", nullptr, 0x1fff, ""},
-        {"xr\xe9r", &own_letters, 0x80000001, ""},
+        {"xr\xe9r", &own_letters, highest_bit | 1, ""},
         {"rR", nullptr, 1, "R"},
         {"xw", &own_letters, 1, "w"},
     };
     for (const auto &[letters, set, wanted, unknown] : rows) {
         const failure error = error_of(SEC_S_BAD_PERMISSION, msg::no_template_for_letter, unknown);
-        std::uint32_t mask = 0xffffffff;
+        std::uint32_t mask = every_bit;
         EXPECT_EQ(outcome_of(sec_translate_perms(letters, set, &mask)), *unknown == '\0' ? no_error : error);
         EXPECT_EQ(mask, wanted);
     }
@@ -65,9 +69,9 @@ TEST(permissions, turn_letters_into_bits) {
 TEST(permissions, turn_bits_into_letters) {
     const std::tuple<std::uint32_t, const sec_perm_set_t *, const char *, const char *> rows[] = {
         {0, nullptr, "", ""},
-        {0x80000001, &own_letters, "\xe9r", ""},
-        {0x80000000, nullptr, "", "80000000"},
-        {0xffffffff, nullptr, "rwcxCqledvsao", "00002000"},
+        {highest_bit | 1, &own_letters, "\xe9r", ""},
+        {highest_bit, nullptr, "", "80000000"},
+        {every_bit, nullptr, "rwcxCqledvsao", "00002000"},
         {5, &own_letters, "\xe9", "00000004"},
     };
     for (const auto &[mask, set, letters, unknown] : rows) {
@@ -82,13 +86,13 @@ TEST(permissions, turn_bits_into_letters) {
 // What an entry made of these parameters holds, or the error.
 std::string made_of(std::uint8_t type, const char *mechanism, const char *identity) {
     auto *made = reinterpret_cast<sec_acle_t *>(0x10);
-    const failure error = outcome_of(sec_create_acle(type, 1u << 31, mechanism, identity, &made));
+    const failure error = outcome_of(sec_create_acle(type, highest_bit, mechanism, identity, &made));
     const std::unique_ptr<sec_acle_t, void (*)(sec_acle_t *)> owner(made, sec_release_acle);
     if (made == nullptr)
         return PrintToString(error);
     EXPECT_EQ(error, no_error);
     EXPECT_EQ(made->type, type);
-    EXPECT_EQ(made->perm_mask, 1u << 31);
+    EXPECT_EQ(made->perm_mask, highest_bit);
     return made->mechanism + "/"s + (made->identity == nullptr ? "none" : made->identity);
 }
 
@@ -124,7 +128,7 @@ TEST(entries, are_not_made_from_bad_parameters) {
     const char no_host[] = "alice";
     const char empty_host[] = "alice@";
     const parameters rows[] = {
-        {3, "unix", nullptr, refused(1, "3")},
+        {no_type, "unix", nullptr, refused(1, "3")},
         {SEC_ACLE_USER, nullptr, nullptr, refused(3, "0")},
         {SEC_ACLE_EXPANDED, empty, no_host, refused(3, address(empty))},
         {SEC_ACLE_USER, long_mechanism, no_host, refused(3, address(long_mechanism))},
@@ -135,7 +139,8 @@ TEST(entries, are_not_made_from_bad_parameters) {
     };
     for (const auto &[type, mechanism, identity, error] : rows)
         EXPECT_EQ(made_of(type, mechanism, identity), error);
-    EXPECT_EQ(outcome_of(sec_create_acle(1, 0, "", "", nullptr)), bad_parameter("sec_create_acle", 5));
+    EXPECT_EQ(outcome_of(sec_create_acle(SEC_ACLE_UNAUTHENTICATED, 0, "", "", nullptr)),
+              bad_parameter("sec_create_acle", 5));
 }
 
 // An internal failure names the line of the call that failed.
@@ -172,8 +177,8 @@ TEST(entries, are_shown_when_they_are_whole) {
     EXPECT_EQ(outcome_of(sec_display_acle_id(nullptr, nullptr, nullptr)), bad_parameter(name, 1));
     EXPECT_EQ(outcome_of(sec_display_acle_id(&good, nullptr, &text)), bad_parameter(name, 2));
     EXPECT_EQ(outcome_of(sec_display_acle_id(&good, &text, nullptr)), bad_parameter(name, 3));
-    const failure bad_type = bad_acle(msg::acle_type_not_displayable, 3);
-    EXPECT_EQ(shown_for(entry(3, "kdz", "x", 1)), PrintToString(bad_type));
+    const failure bad_type = bad_acle(msg::acle_type_not_displayable, no_type);
+    EXPECT_EQ(shown_for(entry(no_type, "kdz", "x", 1)), PrintToString(bad_type));
     for (const sec_acle_t &part : {user("", "x", 1), expanded("kdz", "", 1), group(nullptr, 1)})
         EXPECT_EQ(shown_for(part), PrintToString(bad_acle(msg::acle_incomplete)));
     sec_release_aclelist(nullptr);

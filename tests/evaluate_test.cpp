@@ -8,8 +8,12 @@ namespace {
 
 using namespace support;
 
+constexpr std::uint32_t no_kind = 0x80000001; // of handler
 constexpr std::uint32_t untouched = 0xabad1dea;
-constexpr int by_handler = SEC_ACLE_USER | SEC_ACLE_USE_ID_HANDLER;
+constexpr int any_other_by_handler = SEC_ACLE_ANYOTHER | SEC_ACLE_USE_ID_HANDLER;
+// With bits that no type has.
+constexpr int unauthenticated = SEC_ACLE_UNAUTHENTICATED | SEC_ACLE_USE_ID_HANDLER | 0x60;
+constexpr int no_type = 99;
 
 // The mask, and the error beside the result.
 using decision = std::pair<std::uint32_t, failure>;
@@ -49,7 +53,7 @@ decision answer_to_groups(const std::string &bytes, const std::vector<const char
 int same_end(const char *wanted, const char *held) {
     if (std::string_view(wanted).ends_with(held))
         return 0;
-    cu_set_error_1(99, 0, "none.cat", 1, 1, "no match"); // which is nobody else's business
+    cu_set_error_1(SEC_S_WARNING, 0, "none.cat", 1, 1, "no match"); // which is nobody else's business
     return -1;
 }
 int never(const char *, const char *) { return 1; }
@@ -61,24 +65,29 @@ int never(const char *, const char *) { return 1; }
 TEST(evaluate, decides_by_exactly_one_entry) {
     const std::string acl = acl_bytes("u unix: Alice 1; e krb5: .x 32, x 64; u Exact: A 8, a 16, C 4;"
                                       "e unix: alice 1; o: 256");
-    const std::tuple<const char *, question, decision> rows[] = {
-        {"any other needs no names", {0x82, "unused", "unused"}, granted(256)},
-        {"there is no unauthenticated", {0xe1, "shown", "unused"}, denied(225, "shown", "")},
-        {"without a handler as without the flag", {by_handler, "unix", "ALICE"}, granted(1)},
-        {"the handler sorts it before the second", {by_handler, "exact", "C"}, denied(132, "exact", "C")},
-        {"the requester's handler", {by_handler, "exact", "alice", "unix"}, denied(132, "exact", "alice")},
-        {"no handler of the other kind", {by_handler, "krb5", "a", "exact"}, granted(8)},
-        {"whatever the sign for the first", {SEC_ACLE_EXPANDED, "krb5", "hx"}, granted(64)},
-        {"entries, but no handler", {SEC_ACLE_EXPANDED, "unix", "alice"}, denied(8, "unix", "alice")},
+    constexpr std::uint32_t nothing = 0;
+    const std::tuple<const char *, question, std::uint32_t> rows[] = {
+        {"any other needs no names", {any_other_by_handler, "unused", "unused"}, 256},
+        {"without a handler as without the flag", {by_handler, "unix", "ALICE"}, 1},
+        {"the handler sorts it before the second", {by_handler, "exact", "C"}, nothing},
+        {"the requester's handler", {by_handler, "exact", "alice", "unix"}, nothing},
+        {"no handler of the other kind", {by_handler, "krb5", "a", "exact"}, 8},
+        {"whatever the sign for the first", {SEC_ACLE_EXPANDED, "krb5", "hx"}, 64},
+        {"entries, but no handler", {SEC_ACLE_EXPANDED, "unix", "alice"}, nothing},
     };
-    for (const auto &[what, asked, wanted] : rows)
+    for (const auto &[what, asked, mask] : rows) {
+        const decision wanted =
+            mask == nothing ? denied(asked.type, asked.mechanism, asked.identity) : granted(mask);
         EXPECT_EQ(answer(acl, asked), wanted) << what;
+    }
+    EXPECT_EQ(answer(acl, {unauthenticated, "shown", "unused"}), denied(unauthenticated, "shown", ""));
 }
 
 TEST(evaluate, fails_at_what_it_cannot_read_when_it_gets_there) {
     const question anybody = {SEC_ACLE_UNAUTHENTICATED, "m", "i"};
-    EXPECT_EQ(answer(acl_of_one(packed_subacl(1, "", 0, "")), anybody), denied(1, "m", ""));
-    EXPECT_EQ(answer(acl_of_one(packed_subacl(1, "", 1, "")), anybody), unreadable());
+    EXPECT_EQ(answer(acl_of_one(packed_subacl(SEC_ACLE_UNAUTHENTICATED, "", 0, "")), anybody),
+              denied(SEC_ACLE_UNAUTHENTICATED, "m", ""));
+    EXPECT_EQ(answer(acl_of_one(packed_subacl(SEC_ACLE_UNAUTHENTICATED, "", 1, "")), anybody), unreadable());
     EXPECT_EQ(answer(acl_bytes("n: 1, 1"), anybody), decision(0, bad_acl(msg::more_than_one_acle)));
     const std::string a_and_unended_m = entry_bytes("a 1") + packed_entry(2, "m");
     const std::string users =
@@ -93,7 +102,7 @@ TEST(evaluate, fails_at_what_it_cannot_read_when_it_gets_there) {
 
 TEST(evaluate, asks_about_many_groups_and_about_none) {
     std::vector<const char *> names(200, nullptr);
-    EXPECT_EQ(answer_to_groups(rich, names), denied(16, "", ""));
+    EXPECT_EQ(answer_to_groups(rich, names), denied(SEC_ACLE_GROUP, "", ""));
     names[150] = "Staff";
     EXPECT_EQ(answer_to_groups(rich, names), granted(18));
     EXPECT_EQ(answer_to_groups(rich, {}), granted(0));
@@ -102,24 +111,26 @@ TEST(evaluate, asks_about_many_groups_and_about_none) {
 TEST(evaluate, refuses_what_is_no_question) {
     const failure no_mechanism = error_of(SEC_S_BAD_PARAMETER, msg::mechanism_required);
     const failure no_identity = error_of(SEC_S_BAD_PARAMETER, msg::identity_required);
-    const failure bad_type = error_of(SEC_S_BAD_PARAMETER, msg::type_not_evaluated, 16);
+    const failure bad_type = error_of(SEC_S_BAD_PARAMETER, msg::type_not_evaluated, SEC_ACLE_GROUP);
     EXPECT_EQ(answer(rich, {SEC_ACLE_GROUP, "unix", "a"}), refused(bad_type));
     EXPECT_EQ(answer(rich, {SEC_ACLE_USER, nullptr, "a", "unix"}), refused(no_mechanism));
     EXPECT_EQ(answer(rich, {SEC_ACLE_EXPANDED, "", "a", "unix"}), refused(no_mechanism));
-    EXPECT_EQ(answer(rich, {SEC_ACLE_EXPANDED | 0x80, "unix", ""}), refused(no_identity));
+    EXPECT_EQ(answer(rich, {SEC_ACLE_EXPANDED | SEC_ACLE_USE_ID_HANDLER, "unix", ""}), refused(no_identity));
     const buffer held(rich);
     const sec_acl_buffer_t &acl = held.acl;
     const sec_group_ref_t group = {1, "staff"};
     std::uint32_t mask = untouched;
     const std::string single = "sec__single_acle_perm";
     const std::string groups = "sec__group_acles_perm";
-    EXPECT_EQ(outcome_of(sec__single_acle_perm(nullptr, 99, "", "", "", nullptr)), bad_parameter(single, 1));
-    EXPECT_EQ(outcome_of(sec__single_acle_perm(&acl, 99, "", "", "", nullptr)), bad_parameter(single, 5));
+    EXPECT_EQ(outcome_of(sec__single_acle_perm(nullptr, no_type, "", "", "", nullptr)),
+              bad_parameter(single, 1));
+    EXPECT_EQ(outcome_of(sec__single_acle_perm(&acl, no_type, "", "", "", nullptr)),
+              bad_parameter(single, 5));
     EXPECT_EQ(outcome_of(sec__group_acles_perm(nullptr, 1, nullptr, nullptr)), bad_parameter(groups, 1));
     EXPECT_EQ(outcome_of(sec__group_acles_perm(&acl, 1, nullptr, nullptr)), bad_parameter(groups, 3));
     EXPECT_EQ(outcome_of(sec__group_acles_perm(&acl, 1, &group, nullptr)), bad_parameter(groups, 4));
     EXPECT_EQ(outcome_of(sec__group_acles_perm(&acl, -1, &group, &mask)),
-              bad_acle(msg::no_matching_acle, 16, "", ""));
+              bad_acle(msg::no_matching_acle, SEC_ACLE_GROUP, "", ""));
 }
 
 TEST(evaluate, refuses_bytes_that_are_no_acl_of_this_host) {
@@ -132,7 +143,7 @@ TEST(evaluate, refuses_bytes_that_are_no_acl_of_this_host) {
         {foreign.substr(0, 4), bad_acl(msg::wrong_byte_order)},
     };
     for (const auto &[bytes, error] : rows) {
-        EXPECT_EQ(answer(bytes, {99, nullptr, nullptr}), refused(error)); // before the type
+        EXPECT_EQ(answer(bytes, {no_type, nullptr, nullptr}), refused(error)); // before the type
         EXPECT_EQ(answer_to_groups(bytes, {}), refused(error));
     }
     const buffer acl(rich);
@@ -147,7 +158,7 @@ TEST(evaluate, goes_on_when_handlers_cannot_be_looked_up) {
     const pthread_mutex_t kept = std::exchange(acl__state.lock, PTHREAD_ERRORCHECK_MUTEX_INITIALIZER_NP);
     pthread_mutex_lock(&acl__state.lock);
     EXPECT_EQ(answer(rich, {by_handler, "unix", "al"}), granted(1));
-    EXPECT_EQ(answer(rich, {SEC_ACLE_EXPANDED, "kRb5", "z"}), denied(8, "kRb5", "z"));
+    EXPECT_EQ(answer(rich, {SEC_ACLE_EXPANDED, "kRb5", "z"}), denied(SEC_ACLE_EXPANDED, "kRb5", "z"));
     pthread_mutex_unlock(&acl__state.lock);
     acl__state.lock = kept;
 }
@@ -156,13 +167,13 @@ TEST(evaluate, registrations_stay_in_the_order_in_which_they_came) {
     const std::string name = "acl__register_id_handler";
     const failure bad_mechanism = error_of(SEC_S_BAD_PARAMETER, msg::bad_handler_mechanism);
     const std::tuple<std::uint32_t, const char *, sec_id_compare_fn, failure> rows[] = {
-        {0x80000001, nullptr, nullptr, bad_parameter(name, 1, "80000001")},
-        {1, nullptr, nullptr, bad_parameter(name, 2)},
-        {2, "", nullptr, bad_parameter(name, 3)},
-        {2, "", never, bad_mechanism},
-        {1, "seventeen-bytes-x", never, bad_mechanism},
-        {2, "sixteen-bytes-xx", std::strcmp, no_error},
-        {2, "SIXTEEN-bytes-XX", never, no_error},
+        {no_kind, nullptr, nullptr, bad_parameter(name, 1, "80000001")},
+        {SEC_ID_HANDLER_EXPANDED, nullptr, nullptr, bad_parameter(name, 2)},
+        {SEC_ID_HANDLER_USER, "", nullptr, bad_parameter(name, 3)},
+        {SEC_ID_HANDLER_USER, "", never, bad_mechanism},
+        {SEC_ID_HANDLER_EXPANDED, "seventeen-bytes-x", never, bad_mechanism},
+        {SEC_ID_HANDLER_USER, "sixteen-bytes-xx", std::strcmp, no_error},
+        {SEC_ID_HANDLER_USER, "SIXTEEN-bytes-XX", never, no_error},
     };
     for (const auto &[kind, mechanism, handler, error] : rows)
         EXPECT_EQ(outcome_of(sec__register_id_handler(kind, mechanism, handler)), error);

@@ -14,7 +14,7 @@ int prefix_matches(const char *requested, const char *entry) {
 // The code that an operation recorded, behind which lies one that has nothing to do with the next.
 std::string end() {
     const int code = recorded_error().code;
-    cu_set_error_1(99, 0, "none.cat", 1, 1, "stale");
+    cu_set_error_1(SEC_S_WARNING, 0, "none.cat", 1, 1, "stale");
     return " (" + std::to_string(code) + ")\n";
 }
 
@@ -75,7 +75,7 @@ std::string use_all(const std::string &path, const sec_acl_buffer_t &shared) {
     sec_release_acl(&acl);
     read(SEC_READ_ACL_CONVERT);
     found << "copy: " << sec_read_acl_from_data(acl.length, acl.data, &copy) << end();
-    found << "convert: " << sec_convert_acl_to_host(1, &copy) << end();
+    found << "convert: " << sec_convert_acl_to_host(with_check, &copy) << end();
     found << "create empty: " << sec_create_empty_acl(&empty) << ' ' << empty.length << end();
     found << "release: " << sec_release_acl(&empty) << end();
     found << "to a mask: " << sec_translate_perms("wr", nullptr, &mask) << ' ' << mask << end();

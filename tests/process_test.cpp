@@ -72,7 +72,7 @@ TEST(registration, asks_for_the_trace_file_when_times_are_traced) {
 bool looks_up_a_handler() {
     const buffer acl(rich);
     std::uint32_t mask = 0;
-    return sec__single_acle_perm(&acl.acl, 0x84, "unix", nullptr, "al", &mask) == SEC_S_OK && mask == 1;
+    return sec__single_acle_perm(&acl.acl, by_handler, "unix", nullptr, "al", &mask) == SEC_S_OK && mask == 1;
 }
 bool fetches_a_text() {
     cu_set_error_1(4, 0, "none.cat", 1, 1, "text");

@@ -15,7 +15,7 @@ import subprocess
 import sys
 import unittest
 
-from command_test import (BUILD, ENTRIES, IS_ROOT, NOBODY, PLACE, SANITIZED, CommandCase, posix_acl, snapshot)
+from command_case import (BUILD, ENTRIES, IS_ROOT, NOBODY, PLACE, SANITIZED, CommandCase, posix_acl, snapshot)
 
 os.environ["QZ_LIBRARY_DIR"] = str(BUILD / "lib")
 sys.path.insert(0, str(pathlib.Path(__file__).resolve().parent.parent / "bindings" / "python"))

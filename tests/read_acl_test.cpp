@@ -90,6 +90,10 @@ TEST_F(read_acl_file, reads_a_cache_of_the_same_owner_and_mode) {
 
 TEST_F(read_acl_file, reads_the_cache_when_its_entries_are_those_of_the_text) {
     constexpr unsigned none = 8; // for user 1, else the permissions
+    constexpr unsigned read_only = 4;
+    constexpr unsigned read_write = 6;
+    constexpr bool believed = true;
+    constexpr bool not_believed = false;
     struct row {
         const char *what;
         unsigned of_text;
@@ -98,12 +102,12 @@ TEST_F(read_acl_file, reads_the_cache_when_its_entries_are_those_of_the_text) {
         bool is_believed;
     };
     const row rows[] = {
-        {"neither has entries", none, none, 0664, true},
-        {"both have the same", 6, 6, 0664, true},
-        {"the group may write the cache", 6, none, 0664, false},
-        {"the group may read the cache", 4, none, 0644, false},
-        {"user 1 may write the cache", none, 6, 0664, false},
-        {"user 1 may write the cache, not only read it", 4, 6, 0664, false},
+        {"neither has entries", none, none, 0664, believed},
+        {"both have the same", read_write, read_write, 0664, believed},
+        {"the group may write the cache", read_write, none, 0664, not_believed},
+        {"the group may read the cache", read_only, none, 0644, not_believed},
+        {"user 1 may write the cache", none, read_write, 0664, not_believed},
+        {"user 1 may write the cache, not only read it", read_only, read_write, 0664, not_believed},
     };
     for (const auto &[what, of_text, of_cache, mode, is_believed] : rows) {
         SCOPED_TRACE(what);
@@ -149,17 +153,19 @@ TEST_F(read_acl_file, larger_than_memory_can_be_does_not_fit) {
 
 TEST_F(read_acl_file, reports_what_it_refuses) {
     const failure no_file = error_of(SEC_S_FILE_ERROR, msg::bad_file_name, folder.path, 0);
-    EXPECT_EQ(read(folder.path, 0xf2), failed(no_file, 0xf2));
+    EXPECT_EQ(read(folder.path, cache | others), failed(no_file, cache | others));
     EXPECT_EQ(read("acl", cache, ""), failed(error_of(SEC_S_BAD_PARAMETER, msg::bad_user_name), cache));
     write_file(path, "o r\no r\n");
     EXPECT_EQ(read(path, cache | convert), failed(bad_acle(msg::duplicate_single_acle, "o"), text | cache));
     EXPECT_FALSE(fs::exists(cache_path));
-    unsigned flags = 9;
+    unsigned flags = others;
     sec_acl_buffer_t acl = {7, &flags};
     const std::string name = "sec_read_acl_file";
-    EXPECT_EQ(outcome_of(sec_read_acl_file(nullptr, "", nullptr, 2, &acl, &flags)), bad_parameter(name, 1));
-    EXPECT_EQ(flags, 2u);
-    EXPECT_EQ(outcome_of(sec_read_acl_file("", "", nullptr, 4, nullptr, nullptr)), bad_parameter(name, 5));
+    EXPECT_EQ(outcome_of(sec_read_acl_file(nullptr, "", nullptr, cache, &acl, &flags)),
+              bad_parameter(name, 1));
+    EXPECT_EQ(flags, cache);
+    EXPECT_EQ(outcome_of(sec_read_acl_file("", "", nullptr, convert, nullptr, nullptr)),
+              bad_parameter(name, 5));
 }
 
 TEST_F(read_acl_file, takes_letters_to_mean_what_the_caller_says) {

@@ -1,5 +1,5 @@
 // Tests of service.hpp: decisions against the questions of the C interface, texts, and files that change while they
-// are followed. The cases of examples/service.cases are asked of the example services by interface_test.py.
+// are followed. qzacl_test.py asks the companion the cases of examples/service.cases.
 #include "support.h"
 
 #include <atomic>

@@ -1,6 +1,8 @@
-"""Turns tracing on for the checker as an administrator does, and reads the records that it leaves.
-Usage: trace_test.py BUILD_DIR [unittest arguments]."""
+"""Turns tracing on for the checker and for other tests' programs, and reads the records that they leave.
+
+usage: trace_test.py BUILD-FOLDER [unittest arguments]"""
 import errno
+import itertools
 import json
 import os
 import pathlib
@@ -8,137 +10,143 @@ import subprocess
 import sys
 import unittest
 
-from command_test import BUILD, IS_ROOT, TEXTS, CommandCase, message
+from command_case import BUILD, IS_ROOT, SOURCE, Code, CommandCase, message
 
-WIDE = 8  # bytes of an item whose value differs from run to run
+LINES = (SOURCE / "tests/operations.trace").read_text("utf-8").splitlines()
+# The rows of records that are expected, by the setting of the levels.
+EXPECTED = {}
+for line in LINES:
+    if line.startswith("["):
+        rows = EXPECTED.setdefault(line.strip("[]"), [])
+    elif line and not line.startswith("#"):
+        rows.append(line)
+
+# Whether trees let go of their entries one by one is not seen from outside.
+RELEASES_OF_ENTRIES = (45, 47, 48)
+CREATES_ENTRY = 40
+CREATED_ENTRY = 43
+RELEASES_ENTRY = 45
+RELEASES_TOLD_ENTRY = 47
+KEYS = ["time", "pid", "tid", "component", "id", "items"]
 
 
-def number(value, width=4):
-    return value.to_bytes(width, sys.byteorder)
+def number_of(row):
+    return int(row.split()[0])
 
 
-RESULT, REFUSED = number(0), number(43)
-EDIT = (WIDE, number(4), number(3), "kRb", "Bob", WIDE, number(75), WIDE)
-EDIT_AGAIN = EDIT[:6] + (number(100), WIDE)
-SHARED = (WIDE, number(182), WIDE)
-# What each public operation, called as operations_test does, leaves at the level of arguments and results.
-OPERATIONS = [
-    (11, None, "", WIDE, number(6), WIDE), (14, RESULT, number(4)), (72, WIDE, number(75), WIDE), (73,),
-    (11, None, "", WIDE, number(4), WIDE), (14, RESULT, number(4)),
-    (17, number(75), WIDE, WIDE), (19, RESULT), (57, number(1), WIDE, number(75), WIDE), (59, RESULT),
-    (72, WIDE, number(5), WIDE), (73,), (93, "wr", WIDE, WIDE), (96, RESULT, number(3)),
-    (99, number(3), WIDE, ""), (102, RESULT, "rw"),
-    (42, number(4), number(3), "kRb", "Bob", WIDE), (44, RESULT),
-    (51, WIDE, number(4), number(3), "kRb", "Bob", WIDE, WIDE), (54, RESULT, "kRb", "Bob"),
-    (62, *EDIT), (64, RESULT), (62, *EDIT_AGAIN), (64, RESULT), (62, *EDIT_AGAIN), (64, REFUSED),
-    (24, number(100), WIDE, WIDE), (27, RESULT, number(4)), (38, WIDE, number(4)), (39,),
-    (32, number(100), WIDE, number(4), "krb", WIDE), (35, RESULT, number(1)), (38, WIDE, number(1)), (39,),
-    (67, *EDIT_AGAIN), (69, RESULT), (76, number(1), "kRb5", WIDE), (78, RESULT),
-    (81, *SHARED, number(4), "unix", "AL", WIDE), (84, RESULT, number(1)),
-    (81, *SHARED, number(8), "krb5", "apple", WIDE), (84, RESULT, number(5)),
-    (81, *SHARED, number(4), "unix", "nobody", WIDE), (83, REFUSED),
-    (87, *SHARED, number(3), WIDE, WIDE), (90, RESULT, number(0x13)),
-    (72, WIDE, number(75), WIDE), (73,), (72, WIDE, number(75), WIDE), (73,),
-]
-LINES_READ = [(114, number(2), number(1), "", "", number(1)), (114, number(3), number(4), "unix", "alice@h", number(3)),
-              (114, number(4), number(16), "", "staff", number(32))]
-# What reading, converting, replacing and deciding tell of their decisions and times.
-DECISIONS = [(117, None), (118, None, number(errno.ENOENT)), (121, None), *LINES_READ, (110, None),
-             (117, None), (119, None), (121, None), *LINES_READ, (104,), (113, "user", "kRb", "Bob")]
-TIMES = {1: [(0, number(1)), *[(1, None, WIDE, WIDE, WIDE), (2, None, WIDE, WIDE, WIDE),
-                               (3, None, number(4), WIDE, WIDE, WIDE)] * 2],
-         2: [(0, number(2)), *[(4, None, WIDE, WIDE, WIDE), (6, WIDE, WIDE, WIDE)] * 2,
-             (7, number(2), number(4), "unix", "AL", WIDE, WIDE, WIDE),
-             (7, number(0xffffffff), number(8), "krb5", "apple", WIDE, WIDE, WIDE),
-             (7, number(2), number(4), "unix", "nobody", WIDE, WIDE, WIDE), (8, WIDE, WIDE, WIDE)]}
-# The bare numbers of entry and exit of the same calls.
-BARE = [9, 12, 70, 73, 9, 12, 15, 18, 55, 58, 70, 73, 91, 94, 97, 100, 40, 43, 49, 52, 60, 63, 60, 63, 60, 63, 20, 25,
-        36, 39, 28, 33, 36, 39, 65, 68, 74, 77, 79, 82, 79, 82, 79, 82, 85, 88, 70, 73, 70, 73]
-RUNS = [  # what is traced, and what that leaves of the operations
-    ("API=1", [(each,) for each in BARE]), ("API=8", OPERATIONS), ("API=5", [(73,), (73,), (39,), (39,), (73,), (73,)]),
-    ("Errors=1,Info=8", DECISIONS), ("Info=1", [each for each in DECISIONS if each[0] != 114]),
-    ("Perf=1", TIMES[1]), ("Perf=2", TIMES[2]), *[(f"Perf={level}", [(0, number(level))]) for level in (3, 4, 7, 8)],
-    *[(levels, []) for levels in ("Perf=0", "Perf=5", "Perf=6", "Perf=9", "Buffer=8", "nonsense,Info=256,=,Perf")],
-]
+def wanted_items(row):
+    """Of each item of a row the last word, which says what it holds."""
+    _, _, items = row.partition(": ")
+    return [item.split()[-1] for item in items.split(", ")] if items else []
+
+
+def is_as_wanted(item, wanted):
+    """Whether the bytes of an item are what its row says: see operations.trace."""
+    if wanted == "any":
+        return True
+    if wanted == "wide":
+        return len(item) == 8
+    if wanted.startswith('"'):
+        return item == wanted.strip('"').encode("latin-1") + b"\0"
+    value, _, width = wanted.partition(":")
+    return item == int(value, 0).to_bytes(int(width or 4), sys.byteorder, signed=value.startswith("-"))
+
+
+def bytes_of(item):
+    return bytes.fromhex(item["hex"])
 
 
 class Trace(CommandCase):
     def traced(self, levels):
         return {"QZ_TRACE_LEVELS": "_SEL:" + levels, "QZ_TRACE_FILE": self.dir + ".trace"}
 
-    def expect_records(self, expected):
-        """Compares ids and items, as far as these are told; each line is checked to be a record by itself."""
+    def run_test(self, name, cases, levels):
+        """Runs some cases of a test program, and gives the records."""
+        self.fresh()
+        program = [BUILD / f"tests/{name}_test", "--gtest_filter=" + cases]
+        environment = os.environ | self.traced(levels)
+        subprocess.run(program, check=True, capture_output=True, env=environment)
+        return self.records()
+
+    def records(self):
         trace = pathlib.Path(self.dir + ".trace")
-        records = map(json.loads, trace.read_text("utf-8").splitlines() if trace.exists() else [])
-        # Whether trees let go of their entries one by one is not seen from outside.
-        records = [record for record in records if record["id"] not in (45, 47, 48)]
-        self.assertEqual([record["id"] for record in records], [identifier for identifier, *_ in expected])
-        for record, (_, *wanted) in zip(records, expected):
-            self.assertEqual((*record, record["component"]), ("time", "pid", "tid", "component", "id", "items", "_SEL"))
-            items = [bytes.fromhex(item["hex"]) for item in record["items"]]
-            wanted = [item.replace("{dir}", self.dir).encode("latin-1") + b"\0" if isinstance(item, str) else item
-                      for item in wanted]
-            shown = [len(item) if want == WIDE else want and item for item, want in zip(items, wanted)]
-            self.assertEqual((len(items), shown), (len(wanted), wanted))
+        lines = trace.read_text("utf-8").splitlines() if trace.exists() else []
+        return [json.loads(line) for line in lines]
+
+    def expect_records(self, records, rows):
+        records = [record for record in records if record["id"] not in RELEASES_OF_ENTRIES]
+        self.assertEqual([record["id"] for record in records], [number_of(row) for row in rows])
+        for record, row in zip(records, rows):
+            self.assertEqual(list(record), KEYS)
+            self.assertEqual(record["component"], "_SEL")
+            items = [bytes_of(item) for item in record["items"]]
+            wanted = wanted_items(row.replace("{dir}", self.dir))
+            self.assertEqual(len(items), len(wanted), row)
+            for item, what in zip(items, wanted):
+                self.assertTrue(is_as_wanted(item, what), f"{item} in the record {row}")
 
     def test_every_operation(self):
-        program = [BUILD / "tests" / "operations_test", "--gtest_filter=*answer_once"]
-        for levels, expected in RUNS:
+        for levels, rows in EXPECTED.items():
             with self.subTest(levels):
-                self.fresh()
-                subprocess.run(program, check=True, stdout=subprocess.DEVNULL, env=os.environ | self.traced(levels))
-                self.expect_records(expected)
-
-    def records_of(self, test, levels):
-        self.fresh()
-        name, _, cases = test.partition(":")
-        subprocess.run([BUILD / f"tests/{name}_test", "--gtest_filter=" + cases], check=True, stdout=subprocess.DEVNULL,
-                       env=os.environ | self.traced(levels))
-        return [json.loads(line) for line in pathlib.Path(self.dir + ".trace").read_text("utf-8").splitlines()]
+                self.expect_records(self.run_test("operations", "*answer_once", levels), rows)
 
     def test_released_trees(self):
         """Below each node the left side goes first, then the right one, then the node."""
-        released = [record["items"][4]["text"] for record in self.records_of("tree:*leaves_up", "API=8")
-                    if record["id"] == 47]
-        self.assertEqual(released, [*"cifpwtm", *"cba", *"tfm"])
+        records = self.run_test("tree", "*leaves_up", "API=8")
+        released = [record["items"][4]["text"] for record in records if record["id"] == RELEASES_TOLD_ENTRY]
+        self.assertEqual("".join(released), "cifpwtm" + "dcba" + "abcd" + "cbda" + "tfm")
 
     def test_replaced_entries(self):
         """A mechanism that fills its array is told without what stands behind it."""
-        replaced = [record["items"][1] for record in self.records_of("tree:*leaves_up", "Info=1")]
-        self.assertEqual([(item["len"], bytes.fromhex(item["hex"])) for item in replaced],
-                         [(17, b"sixteen-bytes-xxx")] * 3)
+        records = self.run_test("tree", "*leaves_up", "Info=1")
+        mechanisms = [bytes_of(record["items"][1]) for record in records]
+        self.assertEqual(mechanisms, [b"sixteen-bytes-xxx"] * 5)
 
     def test_entries_that_nobody_gets(self):
         """They are not told to be released."""
-        records = self.records_of("entry:*DeathTest.*", "API=1")
-        numbers = [record["id"] for record in records if record["id"] in (40, 43, 45)]
-        self.assertEqual(numbers.count(40), 8)
-        self.assertNotIn((40, 45), zip(numbers, numbers[1:]))
+        records = self.run_test("entry", "*DeathTest.*", "API=1")
+        shown = (CREATES_ENTRY, CREATED_ENTRY, RELEASES_ENTRY)
+        numbers = [record["id"] for record in records if record["id"] in shown]
+        self.assertEqual(numbers.count(CREATES_ENTRY), 8)
+        self.assertNotIn((CREATES_ENTRY, RELEASES_ENTRY), itertools.pairwise(numbers))
 
     def test_other_tests_pass_with_everything_traced(self):
         """Whatever is handed to an operation, null pointers included, can be told."""
         for name in "buffer", "entry", "evaluate", "read_acl":
-            subprocess.run([BUILD / f"tests/{name}_test"], check=True, stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL,
-                           env=os.environ | self.traced("API=8,Errors=8,Info=8,Perf=2"))
+            self.run_test(name, "*", "API=8,Errors=8,Info=8,Perf=2")
 
-    def test_failures(self):
-        def check(options, text, status, errors):
-            self.write("a", text)
-            self.expect([options, "-f", "a"], status, errors, environment=self.traced("Errors=1,API=8"))
-        check("-cv", "g \xff r\nn" + " " * 1200, 0, TEXTS[130] + message(145, 2))
-        expected = [(51, WIDE, number(16), number(1), "", b"\xff\0", WIDE, WIDE), (53, number(26)),
-                    (115, number(2), number(1202, WIDE))]
-        self.write("a.cacl", "", 0o600)
-        check("-s", "n", 37, message(137, "{dir}/a"))
-        expected.append((111, "{dir}/a.cacl", number(0o600), number(0o644)))
-        for owner, group in ((7, 0), (0, 8)) if IS_ROOT else ():
-            os.chown(self.dir + "/a.cacl", owner, group)
-            check("-s", "n", 37, message(136, "{dir}/a"))
-            expected.append((111, "{dir}/a.cacl", number(owner), number(group), number(0), number(0)))
-        os.unlink(self.dir + "/a.cacl")
-        os.symlink("a.cacl", self.dir + "/a.cacl")
-        check("-s", "n", 37, message(122, "{dir}/a", errno.ELOOP))
-        self.expect_records([*expected, (109, "{dir}/a.cacl", "stat()", number(errno.ELOOP))])
+    def check(self, options, text, status, errors):
+        self.write("a", text)
+        self.expect([options, "-f", "a"], status, errors, environment=self.traced("Errors=1,API=8"))
+
+    def test_entries_that_cannot_be_shown_and_lines_that_are_too_long(self):
+        unshown = message("conversion_failed").removesuffix("\n")
+        self.check("-cv", "g \xff r\nn" + " " * 1200, Code.OK, unshown + message("line_too_long", 2))
+        shows = '51 sec_display_acle_id begins: entry wide, type 16, mask 1, mechanism "", identity "\xff"'
+        rows = [
+            shows + ", output wide, output wide",
+            f"53 sec_display_acle_id ends: code {Code.CODESET:d}",
+            "115 line is too long: line 2, length 1202:8",
+        ]
+        self.expect_records(self.records(), rows)
+
+    def refuse(self, name, *values):
+        self.check("-s", "n", Code.FILE_ERROR, message(name, "{dir}/a", *values))
+
+    def test_caches_that_cannot_be_written(self):
+        cache = self.write("a.cacl", "", 0o600)
+        self.refuse("cache_mode_differs")
+        rows = ['111 mode differs: name "{dir}/a.cacl", of the cache 0o600, of the text 0o644']
+        for user, group in ((7, 0), (0, 8)) if IS_ROOT else ():
+            os.chown(cache, user, group)
+            self.refuse("cache_owner_differs")
+            of_cache = f'name "{{dir}}/a.cacl", user of the cache {user}, group {group}'
+            rows.append(f"111 owner differs: {of_cache}, user of the text 0, group 0")
+        os.unlink(cache)
+        os.symlink("a.cacl", cache)
+        self.refuse("bad_file_name", errno.ELOOP)
+        rows.append(f'109 query fails: name "{{dir}}/a.cacl", call "stat()", errno {errno.ELOOP}')
+        self.expect_records(self.records(), rows)
 
 
 if __name__ == "__main__":

@@ -38,15 +38,18 @@ TEST(tree, is_named_by_its_topmost_entry) {
             mechanism[bit] ^= (*name >> bit & 1) == 0 ? 0 : 0x20;
         return entry(type, mechanism, name, 1);
     };
-    std::vector<std::tuple<int, std::string, std::string>> rows = {{4, "m f t c i p w", "m f c i t p w"}};
+    std::vector<std::tuple<int, std::string, std::string>> rows = {
+        {SEC_ACLE_USER, "m f t c i p w", "m f c i t p w"}};
     for (std::string chain = "d e f c b a g h"; !chain.empty();
          chain.resize(std::max<std::size_t>(chain.size(), 2) - 2))
-        rows.emplace_back(8, chain, chain);
+        rows.emplace_back(SEC_ACLE_EXPANDED, chain, chain);
     for (const auto &[type, inserted, topmost] : rows) {
         sec_acltree_t *root = nullptr;
         for (const std::string &name : words(inserted)) {
             const sec_acle_t acle = acle_of(type, name.c_str());
-            EXPECT_EQ(faults::patiently([&] { return sec__add_acle_to_tree(1, &acle, &root); }), SEC_S_OK);
+            EXPECT_EQ(
+                faults::patiently([&] { return sec__add_acle_to_tree(report_duplicates, &acle, &root); }),
+                SEC_S_OK);
         }
         const qz::owned_acltree owner(root);
         buffer most, refused;
@@ -61,30 +64,6 @@ TEST(tree, is_named_by_its_topmost_entry) {
             EXPECT_EQ(sec__del_acle_from_tree(&acle, root), SEC_S_OK);
             EXPECT_EQ(sec__del_acle_from_tree(&acle, root), SEC_S_ACLE_NOT_FOUND);
         }
-    }
-}
-
-// As a linked tree is released: what is below an entry before the entry itself.
-TEST(tree, is_released_in_post_order) {
-    const std::tuple<int, std::string, std::string> rows[] = {
-        {SEC_ACLE_USER, "m f t c i p w", "c i f p w t m"},
-        {SEC_ACLE_USER, "a b c d", "d c b a"},
-        {SEC_ACLE_USER, "d c b a", "a b c d"},
-        {SEC_ACLE_USER, "a d b c", "c b d a"},
-        {SEC_ACLE_GROUP, "b a c", "a c b"},
-        {SEC_ACLE_EXPANDED, "b a c", "c a b"},
-    };
-    for (const auto &[type, inserted, released] : rows) {
-        sec_acltree_t *root = nullptr;
-        for (const std::string &name : words(inserted)) {
-            const sec_acle_t acle = entry(type, "unix", name.c_str(), 0);
-            EXPECT_EQ(sec__add_acle_to_tree(1, &acle, &root), SEC_S_OK);
-        }
-        const qz::owned_acltree owner(root);
-        arguments found;
-        qz::in_post_order(root->in_order(),
-                          [&](const qz::small_entry &each) { found.emplace_back(root->identity(each)); });
-        EXPECT_EQ(found, words(released)) << inserted;
     }
 }
 
@@ -122,7 +101,7 @@ TEST(tree, takes_more_entries_after_it_was_compiled) {
         sec_acltree_t *root = nullptr;
         const auto add = [&](const std::string &name) {
             const sec_acle_t acle = entry(SEC_ACLE_GROUP, "", name.c_str(), 1);
-            return sec__add_acle_to_tree(1, &acle, &root);
+            return sec__add_acle_to_tree(report_duplicates, &acle, &root);
         };
         const auto name_of = [](int number) { return "common-" + std::to_string(1000 + number); };
         for (int number = count; number != 0; --number)
@@ -144,18 +123,23 @@ TEST(tree, takes_more_entries_after_it_was_compiled) {
     }
 }
 
-// Whose order trace_test reads.
+// Whose order trace_test reads, and the mechanism that the last entry replaces.
 TEST(tree, is_released_from_its_leaves_up) {
-    for (const auto &[type, inserted] : {std::pair(16, "m f t c i p w"), {16, "a b c"}, {8, "m f t"}}) {
+    const char mechanism[] = "sixteen-bytes-xx";
+    const std::pair<int, std::string> rows[] = {
+        {SEC_ACLE_GROUP, "m f t c i p w"}, {SEC_ACLE_GROUP, "a b c d"},  {SEC_ACLE_GROUP, "d c b a"},
+        {SEC_ACLE_GROUP, "a d b c"},       {SEC_ACLE_EXPANDED, "m f t"},
+    };
+    for (const auto &[type, inserted] : rows) {
         sec_acltree_t *root = nullptr;
         for (const std::string &name : words(inserted)) {
-            const sec_acle_t acle = entry(type, "sixteen-bytes-xx", name.c_str(), 1);
-            EXPECT_EQ(sec__add_acle_to_tree(1, &acle, &root), SEC_S_OK);
+            const sec_acle_t acle = entry(type, mechanism, name.c_str(), 1);
+            EXPECT_EQ(sec__add_acle_to_tree(report_duplicates, &acle, &root), SEC_S_OK);
         }
-        const std::string first(inserted, 1);
-        sec_acle_t again = entry(type, "sixteen-bytes-xx", first.c_str(), 2);
-        again.mechanism[16] = 'x'; // in place of the NUL, as a caller may fill the array
-        EXPECT_EQ(sec__add_acle_to_tree(0, &again, &root), SEC_S_OK);
+        const std::string first = inserted.substr(0, 1);
+        sec_acle_t again = entry(type, mechanism, first.c_str(), 2);
+        again.mechanism[sizeof mechanism - 1] = 'x'; // in place of the NUL, as a caller may fill the array
+        EXPECT_EQ(sec__add_acle_to_tree(replace_duplicates, &again, &root), SEC_S_OK);
         sec__free_acltree(root);
     }
 }
@@ -184,7 +168,8 @@ TEST(tree, asks_for_no_less_memory_than_it_means) {
 TEST(tree, takes_no_memory_for_a_comment) {
     constexpr std::size_t line_size = 4;
     std::string text;
-    for (char name = 'z'; name >= 'a'; --name) text += "g "s + name + '\0';
+    for (char name = 'z'; name >= 'a'; --name)
+        text += "g "s + name + '\0';
     const std::size_t count = text.size() / line_size;
     text.append(std::size_t{1} << 22, '#');
     std::size_t most = 0;
