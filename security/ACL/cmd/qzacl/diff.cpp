@@ -28,7 +28,7 @@ struct side {
 // Tells the differences one by one.
 class difference_list {
 public:
-    difference_list(const call &call, const side &before, const side &after)
+    difference_list(const call &call, side &before, side &after)
         : call_(call), before_(before), after_(after) {}
 
     bool is_empty() const { return is_empty_; }
@@ -79,22 +79,28 @@ private:
 
     void tell_json(const char *change, const qz::entry_fields &shown, const sec_acle_t *before,
                    const sec_acle_t *after) {
-        const side &from = after != nullptr ? after_ : before_;
-        json object;
-        object["change"] = change;
-        put_entry(object, from.document.file(), from.lines.line_of(shown), shown, call_.permissions);
-        object["before"] = letters_or_null(before);
-        object["after"] = letters_or_null(after);
-        call_.out.object(object);
+        side &from = after != nullptr ? after_ : before_;
+        const std::size_t number = from.lines.line_of(shown);
+        line_.clear();
+        append_entry_json(line_, from.document.file(), number, shown, call_.permissions);
+        line_.resize(line_.size() - 2); // the end of the object is yet to come
+        line_.append(",\"change\":\"").append(change).append("\",\"before\":");
+        append_letters_or_null(before);
+        line_ += ",\"after\":";
+        append_letters_or_null(after);
+        call_.out.line(line_ += '}');
     }
 
-    json letters_or_null(const sec_acle_t *entry) const {
-        return entry == nullptr ? json() : json_text(call_.permissions.letters_of(entry->perm_mask));
+    void append_letters_or_null(const sec_acle_t *entry) {
+        if (entry == nullptr)
+            line_ += "null";
+        else
+            append_json_text(line_, call_.permissions.letters_of(entry->perm_mask));
     }
 
     const call &call_;
-    const side &before_;
-    const side &after_;
+    side &before_;
+    side &after_;
     bool is_empty_ = true;
     std::string line_;
 };
