@@ -46,6 +46,71 @@ private:
     std::size_t line_ = 1;
 };
 
+// Puts entries into their trees. Some wait before, while the memory that their insertion looks at is fetched. Messages
+// are printed in the order of the lines.
+class insertions {
+public:
+    explicit insertions(sec_acltree_array &trees) : trees_(trees) {}
+
+    bool is_sound() const { return is_sound_; }
+    bool lacks_memory() const { return lacks_memory_; }
+
+    void add(const qz::acle_view &entry) {
+        if (count_ == waiting_max)
+            insert_oldest();
+        fetch(entry);
+        waiting_[(first_ + count_++) % waiting_max] = entry;
+    }
+
+    // Takes a line that holds no entry, whose error is recorded.
+    void refuse(int code) {
+        cu_error_t *error = nullptr;
+        cu_get_error_1(&error);
+        finish();
+        cu_pset_error_1(error);
+        cu_rel_error_1(error);
+        note(code);
+    }
+
+    void finish() {
+        while (count_ != 0)
+            insert_oldest();
+    }
+
+private:
+    static constexpr std::size_t waiting_max = 16;
+
+    void insert_oldest() {
+        const qz::acle_view entry = waiting_[first_];
+        first_ = (first_ + 1) % waiting_max;
+        --count_;
+        note(trees_.add(entry));
+    }
+
+    // Most entries are of the key that came up last.
+    void fetch(const qz::acle_view &entry) const {
+        const auto trees = trees_.trees();
+        if (!trees.empty() && trees.back()->type() == entry.type &&
+            trees.back()->mechanism() == entry.mechanism)
+            __builtin_prefetch(trees.back()->first_look(entry), 1);
+    }
+
+    void note(int code) {
+        if (code == SEC_S_OK)
+            return;
+        print_recorded_error();
+        is_sound_ = false;
+        lacks_memory_ = lacks_memory_ || code == SEC_S_NO_MEMORY;
+    }
+
+    sec_acltree_array &trees_;
+    qz::acle_view waiting_[waiting_max];
+    std::size_t first_ = 0;
+    std::size_t count_ = 0;
+    bool is_sound_ = true;
+    bool lacks_memory_ = false;
+};
+
 void open(const std::string &file, qz::acl_text &text) {
     if (file == standard_input)
         return require(text.take(read_whole(file)));
@@ -93,34 +158,29 @@ void acl_document::read(const reading &watched) {
 void acl_document::read_lines(const reading &watched) {
     const std::string_view whole = text_.unread();
     feed_counter feeds(whole);
-    bool is_sound = true;
+    insertions inserting(*trees_);
     qz::parsed_acle record;
-    for (;;) {
+    while (!inserting.lacks_memory()) {
         const std::size_t left = text_.unread().size();
         const std::size_t line = feeds.line_of(text_.unread());
         const qz::acl_line found = text_.next(record);
         if (found == qz::acl_line::end)
             break;
-        if (found == qz::acl_line::none)
+        if (found == qz::acl_line::bad)
+            inserting.refuse(text_.failure());
+        if (found != qz::acl_line::entry)
             continue;
-        int result = text_.failure();
-        if (found == qz::acl_line::entry)
-            result = trees_->add(qz::view_of(record));
-        if (found == qz::acl_line::entry && result == SEC_S_OK) {
-            if (watched.entry) {
-                const qz::acle_view view = qz::view_of(record);
-                qz::entry_fields entry = {view.type, view.perm_mask, view.mechanism, view.identity};
-                entry.mechanism = kept(entry.mechanism);
-                watched.entry(entry, {line, whole.size() - left, whole.size() - text_.unread().size()});
-            }
-            continue;
+        const qz::acle_view view = qz::view_of(record);
+        inserting.add(view);
+        if (watched.unnamed && view.identity.empty())
+            watched.unnamed(view.type, line);
+        if (watched.entry) {
+            const qz::entry_fields entry = {view.type, view.perm_mask, kept(view.mechanism), view.identity};
+            watched.entry(entry, {line, whole.size() - left, whole.size() - text_.unread().size()});
         }
-        print_recorded_error();
-        is_sound = false;
-        if (result == SEC_S_NO_MEMORY)
-            break;
     }
-    if (!is_sound)
+    inserting.finish();
+    if (!inserting.is_sound())
         throw told_trouble();
 }
 
@@ -201,11 +261,6 @@ void append_place(std::string &text, const std::string &file, std::size_t line) 
     text += file;
     if (line != 0)
         append_number(text.append(":"), line);
-}
-
-qz::entry_fields fields_of(const sec_acle_t &record) {
-    const char *identity = record.identity == nullptr ? "" : record.identity;
-    return {record.type, record.perm_mask, record.mechanism, identity};
 }
 
 } // namespace qzacl

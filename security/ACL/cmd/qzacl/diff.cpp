@@ -5,14 +5,13 @@
 #include "entry_words.h"
 #include "trouble.h"
 
+#include <algorithm>
 #include <unordered_map>
 #include <vector>
 
 namespace qzacl {
 
 namespace {
-
-using nodes = std::span<const sec_acle_t>;
 
 struct side {
     entry_lines lines; // which watch the document being read
@@ -28,44 +27,46 @@ struct side {
 // Tells the differences one by one.
 class difference_list {
 public:
-    difference_list(const call &call, side &before, side &after)
-        : call_(call), before_(before), after_(after) {}
+    difference_list(const call &call, const side &before, const side &after)
+        : call_(call), before_(before), after_(after), before_json_(before.document.file(), call.permissions),
+          after_json_(after.document.file(), call.permissions) {}
 
     bool is_empty() const { return is_empty_; }
 
-    void remove(const sec_acle_t &entry) { tell("- ", "remove", &entry, nullptr); }
-    void add(const sec_acle_t &entry) { tell("+ ", "add", nullptr, &entry); }
-    void compare(const sec_acle_t &before, const sec_acle_t &after) {
-        if (before.perm_mask != after.perm_mask)
+    void remove(const qz::entry_fields &entry) { tell("- ", "remove", &entry, nullptr); }
+    void add(const qz::entry_fields &entry) { tell("+ ", "add", nullptr, &entry); }
+    void compare(const qz::entry_fields &before, const qz::entry_fields &after) {
+        if (before.permissions != after.permissions)
             tell("~ ", "alter", &before, &after);
     }
 
-    void reorder(const char *mechanism) {
+    void reorder(std::string_view mechanism) {
         is_empty_ = false;
         if (!call_.out.is_json())
-            return call_.out.line(std::string("! e ") + mechanism + ": other order");
+            return call_.out.line("! e " + folded(mechanism) + ": other order");
         json object;
         object["change"] = "order";
         object["file"] = json_text(after_.document.file());
         object["line"] = nullptr;
         object["type"] = "e";
-        object["mechanism"] = json_text(mechanism);
+        object["mechanism"] = json_text(folded(mechanism));
         for (const char *key : {"identity", "permissions", "before", "after"})
             object[key] = nullptr;
         call_.out.object(object);
     }
 
 private:
-    void tell(const char *sign, const char *change, const sec_acle_t *before, const sec_acle_t *after) {
+    void tell(const char *sign, const char *change, const qz::entry_fields *before,
+              const qz::entry_fields *after) {
         is_empty_ = false;
-        const qz::entry_fields shown = fields_of(after != nullptr ? *after : *before);
+        const qz::entry_fields &shown = after != nullptr ? *after : *before;
         if (call_.out.is_json())
             return tell_json(change, shown, before, after);
         line_ = sign;
         if (before != nullptr && after != nullptr) {
             append_key(line_, shown);
-            append_letters(" +", after->perm_mask & ~before->perm_mask);
-            append_letters(" -", before->perm_mask & ~after->perm_mask);
+            append_letters(" +", after->permissions & ~before->permissions);
+            append_letters(" -", before->permissions & ~after->permissions);
         } else {
             append_entry(line_, shown, call_.permissions);
         }
@@ -77,13 +78,13 @@ private:
             line_.append(sign).append(call_.permissions.letters_of(mask));
     }
 
-    void tell_json(const char *change, const qz::entry_fields &shown, const sec_acle_t *before,
-                   const sec_acle_t *after) {
-        side &from = after != nullptr ? after_ : before_;
+    void tell_json(const char *change, const qz::entry_fields &shown, const qz::entry_fields *before,
+                   const qz::entry_fields *after) {
+        const side &from = after != nullptr ? after_ : before_;
         const std::size_t number = from.lines.line_of(shown);
         line_.clear();
-        append_entry_json(line_, from.document.file(), number, shown, call_.permissions);
-        line_.resize(line_.size() - 2); // the end of the object is yet to come
+        (after != nullptr ? after_json_ : before_json_).append(line_, number, shown);
+        line_.pop_back(); // the end of the object is yet to come
         line_.append(",\"change\":\"").append(change).append("\",\"before\":");
         append_letters_or_null(before);
         line_ += ",\"after\":";
@@ -91,70 +92,87 @@ private:
         call_.out.line(line_ += '}');
     }
 
-    void append_letters_or_null(const sec_acle_t *entry) {
+    void append_letters_or_null(const qz::entry_fields *entry) {
         if (entry == nullptr)
             line_ += "null";
         else
-            append_json_text(line_, call_.permissions.letters_of(entry->perm_mask));
+            append_json_text(line_, call_.permissions.letters_of(entry->permissions));
     }
 
     const call &call_;
-    side &before_;
-    side &after_;
+    const side &before_;
+    const side &after_;
+    entry_json before_json_;
+    entry_json after_json_;
     bool is_empty_ = true;
     std::string line_;
 };
 
 // Entries that are stored in the order of their identities.
-void compare_sorted(nodes before, nodes after, difference_list &found) {
-    auto a = before.begin();
-    auto b = after.begin();
-    while (a != before.end() || b != after.end()) {
-        int order = a == before.end() ? 1 : -1;
-        if (a != before.end() && b != after.end())
-            order = qz::detail::compare_folded(fields_of(*a).identity, fields_of(*b).identity);
+void compare_sorted(const tree_entries &before, const tree_entries &after, difference_list &found) {
+    std::size_t a = 0;
+    std::size_t b = 0;
+    while (a != before.size() && b != after.size()) {
+        const qz::entry_fields one = before[a];
+        const qz::entry_fields other = after[b];
+        const int order = qz::detail::compare_folded(one.identity, other.identity);
         if (order < 0)
-            found.remove(*a++);
+            found.remove(one);
         else if (order > 0)
-            found.add(*b++);
+            found.add(other);
         else
-            found.compare(*a++, *b++);
+            found.compare(one, other);
+        a += order <= 0 ? 1 : 0;
+        b += order >= 0 ? 1 : 0;
     }
+    for (; a != before.size(); ++a)
+        found.remove(before[a]);
+    for (; b != after.size(); ++b)
+        found.add(after[b]);
 }
 
-// Finds entries by identity.
+// Finds entries by identity, from a place on.
 class identity_index {
 public:
-    explicit identity_index(nodes entries) {
-        places_.reserve(entries.size());
-        for (std::size_t place = 0; place < entries.size(); ++place)
+    identity_index(const tree_entries &entries, std::size_t first) : missing_(entries.size()) {
+        places_.reserve(entries.size() - first);
+        for (std::size_t place = first; place < entries.size(); ++place)
             places_.emplace(folded(entries[place].identity), place);
     }
 
     // The place in the entries, or that behind them.
-    std::size_t find(const sec_acle_t &entry) const {
+    std::size_t find(const qz::entry_fields &entry) const {
         const auto found = places_.find(folded(entry.identity));
-        return found == places_.end() ? places_.size() : found->second;
+        return found == places_.end() ? missing_ : found->second;
     }
 
 private:
     std::unordered_map<std::string, std::size_t> places_;
+    std::size_t missing_;
 };
 
-// Entries of which the first that matches decides, so that their order is a difference.
-void compare_chains(nodes before, nodes after, difference_list &found) {
-    const std::string mechanism = (before.empty() ? after : before)[0].mechanism;
-    while (!before.empty() && !after.empty() &&
-           qz::detail::same_folded(before[0].identity, after[0].identity)) {
-        found.compare(before[0], after[0]);
-        before = before.subspan(1);
-        after = after.subspan(1);
+// Compares what both chains begin with. Returns how many entries that is.
+std::size_t compare_common(const tree_entries &before, const tree_entries &after, difference_list &found) {
+    std::size_t at = 0;
+    for (; at < std::min(before.size(), after.size()); ++at) {
+        const qz::entry_fields one = before[at];
+        const qz::entry_fields other = after[at];
+        if (!qz::detail::same_folded(one.identity, other.identity))
+            break;
+        found.compare(one, other);
     }
-    const identity_index index(after);
+    return at;
+}
+
+// Entries of which the first that matches decides, so that their order is a difference.
+void compare_chains(const tree_entries &before, const tree_entries &after, difference_list &found) {
+    const std::size_t first = compare_common(before, after, found);
+    const identity_index index(after, first);
     std::vector<bool> is_in_both(after.size());
     bool is_in_order = true;
     std::size_t last = 0;
-    for (const sec_acle_t &entry : before) {
+    for (std::size_t at = first; at < before.size(); ++at) {
+        const qz::entry_fields entry = before[at];
         const std::size_t place = index.find(entry);
         if (place == after.size()) {
             found.remove(entry);
@@ -165,15 +183,15 @@ void compare_chains(nodes before, nodes after, difference_list &found) {
         is_in_order = is_in_order && place >= last;
         last = place;
     }
-    for (std::size_t place = 0; place < after.size(); ++place) {
+    for (std::size_t place = first; place < after.size(); ++place) {
         if (!is_in_both[place])
             found.add(after[place]);
     }
     if (!is_in_order)
-        found.reorder(mechanism.c_str());
+        found.reorder(before[0].mechanism);
 }
 
-void compare_trees(nodes before, nodes after, difference_list &found) {
+void compare_trees(const tree_entries &before, const tree_entries &after, difference_list &found) {
     if ((before.empty() ? after : before)[0].type == SEC_ACLE_EXPANDED)
         compare_chains(before, after, found);
     else
@@ -182,20 +200,20 @@ void compare_trees(nodes before, nodes after, difference_list &found) {
 
 std::string key_of_tree(const sec_acltree_t &tree) { return key_of({tree.type(), 0, tree.mechanism(), {}}); }
 
-void compare_all(acl_document &before, acl_document &after, difference_list &found) {
+void compare_all(side &before, side &after, difference_list &found) {
+    const auto entries_of = [](const side &from, const sec_acltree_t *tree) {
+        return tree != nullptr ? tree_entries(*tree, from.lines) : tree_entries();
+    };
     std::unordered_map<std::string, const sec_acltree_t *> only_after;
-    for (const sec_acltree_t *tree : after.trees())
+    for (const sec_acltree_t *tree : after.document.trees())
         only_after.emplace(key_of_tree(*tree), tree);
-    for (const sec_acltree_t *tree : before.trees()) {
-        const auto other = only_after.find(key_of_tree(*tree));
-        const bool is_common = other != only_after.end();
-        compare_trees(nodes_of(*tree), is_common ? nodes_of(*other->second) : nodes(), found);
-        if (is_common)
-            only_after.erase(other);
+    for (const sec_acltree_t *tree : before.document.trees()) {
+        const auto other = only_after.extract(key_of_tree(*tree));
+        compare_trees(entries_of(before, tree), entries_of(after, other ? other.mapped() : nullptr), found);
     }
-    for (const sec_acltree_t *tree : after.trees()) {
+    for (const sec_acltree_t *tree : after.document.trees()) {
         if (only_after.count(key_of_tree(*tree)) != 0)
-            compare_trees({}, nodes_of(*tree), found);
+            compare_trees({}, entries_of(after, tree), found);
     }
 }
 
@@ -205,7 +223,7 @@ int diff(const call &call) {
     side before(call, 0);
     side after(call, 1);
     difference_list found(call, before, after);
-    compare_all(before.document, after.document, found);
+    compare_all(before, after, found);
     return found.is_empty() ? yes : no;
 }
 

@@ -14,8 +14,6 @@ namespace qzacl {
 
 namespace {
 
-constexpr std::size_t enough_to_write = 1 << 18;
-
 // C0, DEL, and C1 as UTF-8 has them, which terminals obey as well.
 bool is_control(std::string_view text, std::size_t at) {
     const auto byte = static_cast<unsigned char>(text[at]);
@@ -56,9 +54,12 @@ std::string shown_on(int fd, std::string_view lines) {
 json json_text(std::string_view bytes) { return valid_utf8(bytes); }
 
 void append_json_text(std::string &line, std::string_view bytes) {
-    const auto is_plain = [](char c) { return c >= ' ' && c <= '~' && c != '"' && c != '\\'; };
-    if (std::all_of(bytes.begin(), bytes.end(), is_plain))
-        line.append("\"").append(bytes).append("\"");
+    // Does not stop early, so that several bytes are compared at once.
+    bool is_plain = true;
+    for (const char c : bytes)
+        is_plain = is_plain & (c >= ' ' && c <= '~' && c != '"' && c != '\\');
+    if (is_plain)
+        line.append(1, '"').append(bytes).append(1, '"');
     else
         line += json_text(bytes).dump();
 }
@@ -80,20 +81,18 @@ void output::line(std::string_view text) {
 }
 
 void output::lines(std::string_view text) {
+    if (text.size() >= enough_to_write && !is_terminal_) {
+        flush();
+        return write_all(text);
+    }
     add(text, true);
     if (gathered_.size() >= enough_to_write)
         flush();
 }
 
 void output::lines(const held_lines &held) {
-    if (is_terminal_) {
-        for (const std::string &part : held.parts_)
-            lines(part);
-        return;
-    }
-    flush();
     for (const std::string &part : held.parts_)
-        write_all(part);
+        lines(part);
 }
 
 void output::object(const json &object) { line(object.dump(-1, ' ', false, json::error_handler_t::replace)); }

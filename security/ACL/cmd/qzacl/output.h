@@ -20,20 +20,21 @@ void append_json_text(std::string &line, std::string_view bytes);
 // A text in which control bytes are shown as \xHH, but for line feeds where they are to stay.
 std::string escaped(std::string_view text, bool keeps_line_feeds);
 
+// So many bytes are written at once.
+inline constexpr std::size_t enough_to_write = 1 << 18;
+
 // Lines that are held back until all of them are known, without ever being moved to a larger place.
 class held_lines {
 public:
     // Where the next line is to be appended, with its line feed.
     std::string &next() {
-        if (parts_.empty() || parts_.back().size() >= part_size)
-            parts_.emplace_back().reserve(part_size + part_size / 8);
+        if (parts_.empty() || parts_.back().size() >= enough_to_write)
+            parts_.emplace_back().reserve(enough_to_write + enough_to_write / 8);
         return parts_.back();
     }
 
 private:
     friend class output;
-    static constexpr std::size_t part_size = 1 << 18;
-
     std::deque<std::string> parts_;
 };
 
