@@ -141,6 +141,12 @@ class Qzacl(unittest.TestCase):
         messages = self.run_words("show bad.acl")[2].decode()
         self.assertEqual(re.findall(r"3417-\d+", messages), ["3417-179", "3417-174"])
 
+    def test_messages_say_which_of_several_files(self):
+        self.write("bad.cacl", b"\x85\x01")
+        for words in "diff a.acl bad.acl", "test bad.acl cases", "lint a.acl bad.acl", "diff bad.cacl bad.acl", "lint none.acl":
+            name = next(word for word in words.split() if word[:3] in ("bad", "non"))
+            self.assertRegex(self.run_words(words)[2].decode(), rf"\Aqzacl: {name}: does not (parse|read)\n3417-")
+
     def test_json_agrees_with_plain(self):
         for line, printed, status in ASKED:
             with self.subTest(line):

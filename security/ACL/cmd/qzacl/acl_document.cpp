@@ -2,10 +2,10 @@
 #include "acl_document.h"
 
 #include "entry_words.h"
-#include "input.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/compile.h"
 #include "trouble.h"
+#include "whole_file.h"
 
 #include <cstring>
 #include <vector>
@@ -13,14 +13,6 @@
 namespace qzacl {
 
 namespace {
-
-constexpr qz::acl_file_use by_companion = {
-    .not_found = {SEC_S_BAD_FILENAME, qz::msg::bad_acl_file_name},
-    .not_private = {SEC_S_BAD_PERMISSION, qz::msg::acl_file_not_private},
-    .cannot_open = {SEC_S_FILE_ERROR, qz::msg::cannot_open_acl_file},
-    .takes_empty_of_anybody = false,
-    .is_traced = false,
-};
 
 // Counts line feeds ahead of the parser, which overwrites them.
 class feed_counter {
@@ -50,7 +42,8 @@ private:
 // are printed in the order of the lines.
 class insertions {
 public:
-    explicit insertions(sec_acltree_array &trees) : trees_(trees) {}
+    // Messages of a file with a name begin with a line that says it.
+    insertions(sec_acltree_array &trees, const std::string &name) : trees_(trees), name_(name) {}
 
     bool is_sound() const { return is_sound_; }
     bool lacks_memory() const { return lacks_memory_; }
@@ -98,12 +91,15 @@ private:
     void note(int code) {
         if (code == SEC_S_OK)
             return;
+        if (is_sound_ && !name_.empty())
+            print_message(name_ + ": does not parse");
         print_recorded_error();
         is_sound_ = false;
         lacks_memory_ = lacks_memory_ || code == SEC_S_NO_MEMORY;
     }
 
     sec_acltree_array &trees_;
+    std::string name_;
     qz::acle_view waiting_[waiting_max];
     std::size_t first_ = 0;
     std::size_t count_ = 0;
@@ -115,10 +111,7 @@ void open(const std::string &file, qz::acl_text &text) {
     if (file == standard_input)
         return require(text.take(read_whole(file)));
     qz::vetted_file vetted;
-    require(text.open_again_while_replaced([&] {
-        const int found = qz::vet_acl_file(file.c_str(), nullptr, by_companion, vetted);
-        return found != SEC_S_OK ? found : text.open(vetted, by_companion);
-    }));
+    require(read_acl_text(file, vetted, text));
 }
 
 bool is_buffer(std::string_view bytes) {
@@ -134,8 +127,14 @@ std::string_view text_in(qz::byte_span field) {
 
 acl_document::acl_document(const std::string &file, const permission_set &set, const reading &watched)
     : file_(file), text_(set.get()) {
-    open(file, text_);
-    read(watched);
+    try {
+        open(file, text_);
+        read(watched);
+    } catch (const recorded_trouble &) {
+        if (watched.names_file)
+            print_message(file_ + ": does not read");
+        throw;
+    }
 }
 
 acl_document::acl_document(const std::string &file, std::string_view bytes, const permission_set &set,
@@ -158,7 +157,7 @@ void acl_document::read(const reading &watched) {
 void acl_document::read_lines(const reading &watched) {
     const std::string_view whole = text_.unread();
     feed_counter feeds(whole);
-    insertions inserting(*trees_);
+    insertions inserting(*trees_, watched.names_file ? file_ : std::string());
     qz::parsed_acle record;
     while (!inserting.lacks_memory()) {
         const std::size_t left = text_.unread().size();

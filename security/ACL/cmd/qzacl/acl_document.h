@@ -29,6 +29,7 @@ struct reading {
     std::function<void(std::string_view)> whole_text = {}; // before its first line is read
     // An entry that names nobody, by its type and line.
     std::function<void(std::uint8_t, std::size_t)> unnamed = {};
+    bool names_file = false; // in a line before the messages, for verbs with several files
 };
 
 class acl_document {

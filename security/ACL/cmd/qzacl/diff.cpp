@@ -18,10 +18,16 @@ struct side {
     acl_document document;
 
     side(const call &call, std::size_t word)
-        : document(call.line.words[word], call.permissions,
-                   call.out.is_json() ? lines.watched() : reading()) {}
+        : document(call.line.words[word], call.permissions, watched(call)) {}
     side(const side &) = delete;
     side &operator=(const side &) = delete;
+
+private:
+    reading watched(const call &call) {
+        reading made = call.out.is_json() ? lines.watched() : reading();
+        made.names_file = true;
+        return made;
+    }
 };
 
 // Tells the differences one by one.

@@ -3,8 +3,8 @@
 
 #include "trouble.h"
 #include "utf8.h"
+#include "whole_file.h"
 
-#include <algorithm>
 #include <cerrno>
 #include <csignal>
 #include <cstring>
@@ -83,7 +83,7 @@ void output::line(std::string_view text) {
 void output::lines(std::string_view text) {
     if (text.size() >= enough_to_write && !is_terminal_) {
         flush();
-        return write_all(text);
+        return write(text);
     }
     add(text, true);
     if (gathered_.size() >= enough_to_write)
@@ -98,21 +98,16 @@ void output::lines(const held_lines &held) {
 void output::object(const json &object) { line(object.dump(-1, ' ', false, json::error_handler_t::replace)); }
 
 void output::flush() {
-    write_all(gathered_);
+    write(gathered_);
     gathered_.clear();
 }
 
-void output::write_all(std::string_view bytes) {
-    while (!bytes.empty()) {
-        const ssize_t written = write(STDOUT_FILENO, bytes.data(), bytes.size());
-        if (written < 0 && errno == EINTR)
-            continue;
-        if (written < 0 && errno == EPIPE)
-            end_quietly();
-        if (written < 0)
-            throw trouble(std::string("standard output: ") + std::strerror(errno));
-        bytes.remove_prefix(static_cast<std::size_t>(written));
-    }
+void output::write(std::string_view bytes) {
+    if (write_all(STDOUT_FILENO, bytes))
+        return;
+    if (errno == EPIPE)
+        end_quietly();
+    throw trouble(std::string("standard output: ") + std::strerror(errno));
 }
 
 } // namespace qzacl

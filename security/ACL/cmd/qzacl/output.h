@@ -61,7 +61,7 @@ public:
 
 private:
     void add(std::string_view text, bool keeps_line_feeds);
-    static void write_all(std::string_view bytes);
+    static void write(std::string_view bytes);
 
     bool is_json_;
     bool is_terminal_;
