@@ -338,6 +338,21 @@ class Locks(EditCase):
         os.mkfifo(f"{self.dir}/a.lock")
         self.expect_refused("a.lock", "set", "a", "n", "r")
 
+    @unittest.skipUnless(CAN_TRACE and not SANITIZED, "takes strace")
+    def test_a_lock_that_was_replaced_is_none(self):
+        self.write("a", OLD)
+        os.close(self.lock())
+        trace = f"{self.dir}/trace"
+        command = ["strace", "-o", trace, "-e", "trace=openat,flock", "-e", "inject=flock:delay_enter=1000000:when=1"]
+        running = subprocess.Popen([*command, QZACL, "set", "a", "n", "r", "--wait", "2"], cwd=self.dir)
+        while not re.search(rb'"a\.lock".* = \d+\n', self.read("trace") if os.path.exists(trace) else b""):
+            self.assertIsNone(running.poll())
+        os.unlink(f"{self.dir}/a.lock")
+        held = self.lock()
+        fcntl.flock(held, fcntl.LOCK_EX)
+        self.assertEqual((running.wait(), self.read()), (2, OLD))
+        os.close(held)
+
     def test_many_at_once(self):
         words = [("set", "a", "g", f"g{number}") for number in range(4)]
         words += [("grant", "a", letter, "n") for letter in "rwcx"]
