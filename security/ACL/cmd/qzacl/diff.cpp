@@ -3,9 +3,11 @@
 #include "cli.h"
 #include "entry_lines.h"
 #include "entry_words.h"
+#include "qzacl_acl/identity_table.h"
 #include "trouble.h"
 
 #include <algorithm>
+#include <new>
 #include <unordered_map>
 #include <vector>
 
@@ -119,8 +121,8 @@ void compare_sorted(const tree_entries &before, const tree_entries &after, diffe
     std::size_t a = 0;
     std::size_t b = 0;
     while (a != before.size() && b != after.size()) {
-        const qz::entry_fields one = before[a];
-        const qz::entry_fields other = after[b];
+        const qz::entry_fields one = before.in_turn(a);
+        const qz::entry_fields other = after.in_turn(b);
         const int order = qz::detail::compare_folded(one.identity, other.identity);
         if (order < 0)
             found.remove(one);
@@ -140,21 +142,32 @@ void compare_sorted(const tree_entries &before, const tree_entries &after, diffe
 // Finds entries by identity, from a place on.
 class identity_index {
 public:
-    identity_index(const tree_entries &entries, std::size_t first) : missing_(entries.size()) {
-        places_.reserve(entries.size() - first);
+    identity_index(const tree_entries &entries, std::size_t first) : entries_(entries) {
+        std::size_t refused = 0;
+        if (!table_.reset(static_cast<std::uint32_t>(entries.size() - first + 1), refused))
+            throw std::bad_alloc();
         for (std::size_t place = first; place < entries.size(); ++place)
-            places_.emplace(folded(entries[place].identity), place);
+            table_.enter(hash_of(entries.identity(place)), static_cast<std::uint32_t>(place));
     }
 
+    // Fetches what find will look at.
+    void fetch(const char *identity) const { __builtin_prefetch(table_.first_look(hash_of(identity))); }
+
     // The place in the entries, or that behind them.
-    std::size_t find(const qz::entry_fields &entry) const {
-        const auto found = places_.find(folded(entry.identity));
-        return found == places_.end() ? missing_ : found->second;
+    std::size_t find(const char *identity) const {
+        const std::uint32_t found = table_.find(hash_of(identity), [&](std::uint32_t place) {
+            return qz::compare_identities(entries_.identity(place), identity) == 0;
+        });
+        return found == qz::identity_table::none ? entries_.size() : found;
     }
 
 private:
-    std::unordered_map<std::string, std::size_t> places_;
-    std::size_t missing_;
+    std::uint64_t hash_of(const char *identity) const {
+        return table_.hash(identity, qz::ordered_word(identity));
+    }
+
+    const tree_entries &entries_;
+    qz::identity_table table_;
 };
 
 // Compares what both chains begin with. Returns how many entries that is.
@@ -172,14 +185,17 @@ std::size_t compare_common(const tree_entries &before, const tree_entries &after
 
 // Entries of which the first that matches decides, so that their order is a difference.
 void compare_chains(const tree_entries &before, const tree_entries &after, difference_list &found) {
+    constexpr std::size_t fetched_ahead = 16;
     const std::size_t first = compare_common(before, after, found);
     const identity_index index(after, first);
     std::vector<bool> is_in_both(after.size());
     bool is_in_order = true;
     std::size_t last = 0;
     for (std::size_t at = first; at < before.size(); ++at) {
+        if (before.size() - at > fetched_ahead)
+            index.fetch(before.identity(at + fetched_ahead));
         const qz::entry_fields entry = before[at];
-        const std::size_t place = index.find(entry);
+        const std::size_t place = index.find(before.identity(at));
         if (place == after.size()) {
             found.remove(entry);
             continue;

@@ -80,16 +80,23 @@ public:
     std::size_t size() const { return entries_.size(); }
     bool empty() const { return entries_.empty(); }
 
-    // Entries lie in memory as they stood in the text, so those that come next are fetched ahead.
+    const char *identity(std::size_t at) const { return tree_->identity(entries_[at]); }
+
     qz::entry_fields operator[](std::size_t at) const {
+        const qz::acle_view entry = tree_->view(entries_[at]);
+        return {entry.type, entry.perm_mask, entry.mechanism, entry.identity};
+    }
+
+    // The same for entries that are taken one after the other. They lie in memory as they stood in the text, so
+    // those that come next are fetched ahead.
+    qz::entry_fields in_turn(std::size_t at) const {
         constexpr std::size_t fetched_ahead = 32;
         if (entries_.size() - at > fetched_ahead) {
-            const char *const next = tree_->identity(entries_[at + fetched_ahead]);
+            const char *const next = identity(at + fetched_ahead);
             __builtin_prefetch(next);
             lines_->fetch(next);
         }
-        const qz::acle_view entry = tree_->view(entries_[at]);
-        return {entry.type, entry.perm_mask, entry.mechanism, entry.identity};
+        return (*this)[at];
     }
 
 private:

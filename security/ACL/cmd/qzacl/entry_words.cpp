@@ -72,12 +72,13 @@ void entry_json::append(std::string &line, std::size_t number, const qz::entry_f
         append_number(line, number);
     else
         line += "null";
-    line += middle_;
-    if (entry.identity.empty())
-        line += "null";
-    else
-        append_json_text(line, entry.identity);
-    line += end_of(entry.permissions);
+    const std::string &end = end_of(entry.permissions);
+    if (!entry.identity.empty() && is_plain_in_json(entry.identity)) {
+        line.append(middle_).append(entry.identity).append(end);
+        return;
+    }
+    line.append(middle_, 0, middle_.size() - 1);
+    line.append(text_or_null(entry.identity).dump()).append(end, 1);
 }
 
 void entry_json::name(std::uint8_t type, std::string_view mechanism) {
@@ -85,13 +86,13 @@ void entry_json::name(std::uint8_t type, std::string_view mechanism) {
     mechanism_ = mechanism;
     middle_ = ",\"type\":\"";
     middle_.append(1, qz::type_letter(type)).append("\",\"mechanism\":");
-    middle_.append(text_or_null(folded(mechanism)).dump()).append(",\"identity\":");
+    middle_.append(text_or_null(folded(mechanism)).dump()).append(",\"identity\":\"");
 }
 
 const std::string &entry_json::end_of(std::uint32_t mask) {
     ending &found = endings_[mask % std::size(endings_)];
     if (found.text.empty() || found.mask != mask) {
-        found = {mask, ",\"permissions\":"};
+        found = {mask, "\",\"permissions\":"};
         append_json_text(found.text, set_.letters_of(mask));
         found.text += '}';
     }

@@ -41,7 +41,7 @@ private:
     void name(std::uint8_t type, std::string_view mechanism);
     const std::string &end_of(std::uint32_t mask);
 
-    // The parts of objects around the line and the identity, which most share.
+    // The parts of objects around the line and the identity, which most share; with the quotation marks of the identity.
     struct ending {
         std::uint32_t mask = 0;
         std::string text;

@@ -53,12 +53,16 @@ std::string shown_on(int fd, std::string_view lines) {
 
 json json_text(std::string_view bytes) { return valid_utf8(bytes); }
 
-void append_json_text(std::string &line, std::string_view bytes) {
-    // Does not stop early, so that several bytes are compared at once.
+// Does not stop early, so that several bytes are compared at once.
+bool is_plain_in_json(std::string_view bytes) {
     bool is_plain = true;
     for (const char c : bytes)
         is_plain = is_plain & (c >= ' ' && c <= '~' && c != '"' && c != '\\');
-    if (is_plain)
+    return is_plain;
+}
+
+void append_json_text(std::string &line, std::string_view bytes) {
+    if (is_plain_in_json(bytes))
         line.append(1, '"').append(bytes).append(1, '"');
     else
         line += json_text(bytes).dump();

@@ -14,7 +14,9 @@ using json = nlohmann::ordered_json;
 
 // A text as JSON can hold it: with U+FFFD for each byte that is no UTF-8.
 json json_text(std::string_view bytes);
-// The same as it stands in a line of JSON, in its quotation marks, appended.
+// Whether it stands in JSON as it is.
+bool is_plain_in_json(std::string_view bytes);
+// The same text as it stands in a line of JSON, in its quotation marks, appended.
 void append_json_text(std::string &line, std::string_view bytes);
 
 // A text in which control bytes are shown as \xHH, but for line feeds where they are to stay.

@@ -42,7 +42,7 @@ void for_each_entry(acl_document &document, const entry_lines &numbers, const Ea
     for (const sec_acltree_t *tree : document.trees()) {
         const tree_entries entries(*tree, numbers);
         for (std::size_t at = 0; at < entries.size(); ++at)
-            each(entries[at]);
+            each(entries.in_turn(at));
     }
 }
 
