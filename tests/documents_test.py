@@ -161,6 +161,20 @@ class Documents(unittest.TestCase):
         for text, shown in (r"u unix a@b r\nu unix a@b r\n", "shown\n"), (r"o r\n", ""), ("", ""):
             self.assertEqual(self.run_in_shell(f"printf '{text}' >service.acl; ./snippet"), (0, shown), text)
 
+    def test_an_edit_reaches_every_host(self):
+        (self.dir / "ssh").write_text('#!/bin/sh\ncd "$1" && shift && exec "$@"\n')  # a host is a folder
+        (self.dir / "ssh").chmod(0o755)
+        script = self.dir / "edit-by-hand"
+        script.write_text(script.read_text().replace("/etc/", ""))
+        texts = {"a": "g ops rw\ng interns r\n", "b": "g ops rw\n"}
+        for host, text in texts.items():
+            (self.dir / host).mkdir()
+            (self.dir / host / "service.acl").write_text(text)
+        shown = self.run_in_shell("edit-by-hand a b")
+        self.assertEqual(shown, (0, "a: changed\nb: unchanged\n"))
+        for host in texts:
+            self.assertEqual((self.dir / host / "service.acl").read_text(), "g ops rw\n")
+
     def test_edits_of_ansible_change_once(self):
         task = re.search("cmd: (.*)", RECIPES["edit"])[1].replace("/etc/", "examples/")
         for mode, status, expected in (

@@ -8,6 +8,7 @@ import pathlib
 import random
 import re
 import shutil
+import struct
 import subprocess
 import sys
 import tempfile
@@ -72,7 +73,7 @@ CASES = b"unix alice@head rw yes # hers\nunix bob@x +ops v yes\n"
 REFUSED = [
     "", "nothing a.acl", "who a.acl", "who a.acl r w", "who a.acl ''", "who a.acl z", "show", "show missing.acl",
     "show bad.acl", "who bad.acl r", "ask bad.acl", "lint bad.acl", "diff a.acl bad.acl", "diff - -", "cache -",
-    "ask -g ops a.acl", "ask -m a.acl", "ask -m unix -m unix a.acl", "ask --order= a.acl x@y", "ask --order most a.acl",
+    "ask -g ops a.acl", "ask -m a.acl", "ask -m unix -m unix a.acl", "ask --handler= unix=none a.acl x@y", "ask --order most a.acl",
     "ask --handler unix=all a.acl", "ask --handler unix a.acl", "ask --handler unix=none --handler UNIX=exact a.acl",
     "show --json=false a.acl", "show --unknown a.acl", "show -w r a.acl", "who a.acl -- -r", "ask a.acl x -- -y",
     "show --permissions - -", "show --permissions missing a.acl", "show a.acl.cacl",
@@ -139,6 +140,12 @@ class Qzacl(unittest.TestCase):
     def test_all_messages_of_a_check_are_told(self):
         messages = self.run_words("show bad.acl")[2].decode()
         self.assertEqual(re.findall(r"3417-\d+", messages), ["3417-179", "3417-174"])
+
+    def test_messages_say_which_of_several_files(self):
+        self.write("bad.cacl", b"\x85\x01")
+        for words in "diff a.acl bad.acl", "test bad.acl cases", "lint a.acl bad.acl", "diff bad.cacl bad.acl", "lint none.acl":
+            name = next(word for word in words.split() if word[:3] in ("bad", "non"))
+            self.assertRegex(self.run_words(words)[2].decode(), rf"\Aqzacl: {name}: does not (parse|read)\n3417-")
 
     def test_json_agrees_with_plain(self):
         for line, printed, status in ASKED:
@@ -226,6 +233,20 @@ class Qzacl(unittest.TestCase):
         again = self.compile("again.acl")
         self.assertEqual((self.dir / again).read_bytes(), (self.dir / compiled).read_bytes())
 
+    def test_entries_that_no_line_can_hold(self):
+        for name in (b"a b", b"#a", b"", b"x" * 1095, b"a\n"):
+            with self.subTest(name):
+                entry = struct.pack("=BIH", 1, 1, len(name) + 1) + name + b"\0"
+                subacl = struct.pack("=IBIB", 10 + len(entry), 16, 1, 0) + entry
+                order = 2 if sys.byteorder == "little" else 1
+                self.write("odd.acl", struct.pack("=BBBH", 0x85, 1, order, 1) + subacl)
+                self.assertEqual(self.run_words("show odd.acl")[:2], (b"", 2))
+
+    def test_identities_are_asked_in_their_stored_form(self):
+        text = b"u hba2 a@fe80::1 w\no r\n"
+        for host in ("fe80::1", "FE80:0:0::1", "fe80:0000::0001"):
+            self.assertIn(b"granted: w\n", self.run_it("ask", "-m", "HBA2", "-", f"A@{host}", given=text)[0], host)
+
     def test_lines_are_counted_by_line_feeds(self):
         printed = self.run_it("who", "-", "r", given=b"\r\n#\f\rg a r\r\n\x0bg b r\ng c r")[0]
         self.assertEqual(printed, b"-:2: g a r\n-:3: g b r\n-:4: g c r\n")
@@ -255,7 +276,9 @@ class Qzacl(unittest.TestCase):
             self.assertEqual((done.returncode, b"standard output" in done.stderr), (2, True), redirection)
         reader, writer = os.pipe()
         os.close(reader)
-        done = subprocess.run([COMMAND, "show", "a.acl"], cwd=self.dir, check=False, stdout=writer, stderr=subprocess.PIPE)
+        # Also where the signal is ignored, as it is here.
+        done = subprocess.run([COMMAND, "show", "a.acl"], cwd=self.dir, check=False, stdout=writer,
+                              stderr=subprocess.PIPE, restore_signals=False)
         os.close(writer)
         self.assertEqual(done.stderr, b"")
 
@@ -267,6 +290,10 @@ class Qzacl(unittest.TestCase):
         self.assertEqual(self.run_words("show --permissions set jobs.acl"), (expected, 0, b""))
         self.assertEqual(self.run_words("show jobs.acl")[1], 2)
         compiled = self.compile("a.acl")
+        self.assertEqual(self.run_words(f"show {compiled} --permissions set")[:2], (b"", 2))
+        self.write("set", b"".join(b"%c %d\n" % (ord("a") + bit, 1 << bit) for bit in range(13)))
+        self.assertEqual(self.run_words(f"who {compiled} c --permissions set")[1], 1)
+        self.write("set", b"".join(b"%c %d\n" % (ord("a") + bit // 2, 1 << bit) for bit in range(13)))
         self.assertEqual(self.run_words(f"show {compiled} --permissions set")[:2], (b"", 2))
         for line in (b"SK 1", b"S 3", b"S x", b"S", b"S 0", b"S 4294967296", b"S 1 fourteen_bytes"):
             self.write("set", line + b"\n")

@@ -455,4 +455,29 @@ TEST_F(live_acl, is_shared_by_threads) {
     EXPECT_EQ(granted_to_others(live), 1u);
 }
 
+// Another thread nearly always holds a lock when the child is made.
+TEST_F(live_acl, goes_on_in_the_child_of_a_fork) {
+    write_file(path, "o r\n");
+    expect_refresh(live, SEC_S_OK, true);
+    std::atomic<bool> is_done = false;
+    std::jthread refreshing([&] {
+        for (int round = 0; !is_done; ++round) {
+            write_file(path, round % 2 == 0 ? "o w\n" : "o r\n");
+            EXPECT_EQ(live.refresh().code(), SEC_S_OK);
+        }
+    });
+    int status = 0;
+    for (int left = 20; left != 0 && status == 0; --left) {
+        const pid_t child = fork();
+        if (child == 0) {
+            alarm(10);
+            const bool is_held = static_cast<bool>(live.snapshot());
+            _exit(is_held && live.refresh().code() != SEC_S_NO_MEMORY && live.snapshot() ? 0 : 1);
+        }
+        waitpid(child, &status, 0);
+    }
+    is_done = true;
+    EXPECT_EQ(status, 0);
+}
+
 } // namespace

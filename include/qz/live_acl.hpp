@@ -5,11 +5,11 @@
 #define QZ_LIVE_ACL_HPP
 
 #include <qz/acl.hpp>
+#include <qz/fork_lock.hpp>
 
 #include <atomic>
 #include <cstring>
 #include <ctime>
-#include <mutex>
 #include <new>
 #include <sys/stat.h>
 
@@ -29,9 +29,11 @@ public:
     }
     acl_snapshot(acl_snapshot &&other) noexcept : shared_(std::exchange(other.shared_, nullptr)) {}
     acl_snapshot &operator=(acl_snapshot other) noexcept {
-        std::swap(shared_, other.shared_);
+        swap(other);
         return *this;
     }
+    /* Writes each pointer once, so that a fork meanwhile leaves a whole one. */
+    void swap(acl_snapshot &other) noexcept { std::swap(shared_, other.shared_); }
     ~acl_snapshot() {
         if (shared_ != nullptr && shared_->holders.fetch_sub(1, std::memory_order_acq_rel) == 1)
             delete shared_;
@@ -100,9 +102,9 @@ struct file_stamp {
  * An ACL file as it is now: any number of threads take the snapshot and decide by it, while refresh, in one
  * of them or in several, reads the file anew when it has changed.
  *
- * Forks: the child must not use the live_acl of its parent when another thread may have been using it, as one of
- * its locks may stay held there. It follows the file with one of its own; the snapshots that the thread that
- * forked holds are good in the child, too.
+ * Forks: the child may go on with the live_acl of its parent, whatever other threads did with it at that moment;
+ * its first refresh may then read the file once more. This takes a fork that runs the handlers of
+ * pthread_atfork, as fork does and vfork does not.
  */
 class live_acl {
 public:
@@ -135,7 +137,9 @@ public:
      * Threads: shared; several at once wait for each other.
      */
     result<bool> refresh() noexcept {
-        const std::lock_guard<std::mutex> one_at_a_time(refreshing_);
+        const held one_at_a_time(refreshing_);
+        if (one_at_a_time.is_new())
+            is_settled_ = false;
         const result<bool> outcome = refresh_alone();
         code_.store(outcome.code(), std::memory_order_relaxed);
         return outcome;
@@ -143,7 +147,7 @@ public:
 
     /* What was read last; null as long as nothing could be read. Threads: shared. */
     [[nodiscard]] acl_snapshot snapshot() const noexcept {
-        const std::lock_guard<std::mutex> lock(exchanging_);
+        const held lock(exchanging_);
         return current_;
     }
 
@@ -151,6 +155,19 @@ public:
     [[nodiscard]] int code() const noexcept { return code_.load(std::memory_order_relaxed); }
 
 private:
+    class held {
+    public:
+        explicit held(detail::fork_lock &lock) noexcept : lock_(lock), is_new_(lock.lock()) {}
+        held(const held &) = delete;
+        held &operator=(const held &) = delete;
+        ~held() { lock_.unlock(); }
+        [[nodiscard]] bool is_new() const noexcept { return is_new_; }
+
+    private:
+        detail::fork_lock &lock_;
+        bool is_new_;
+    };
+
     struct release {
         void operator()(char *path) const noexcept { std::free(path); }
     };
@@ -204,8 +221,8 @@ private:
     bool exchange(acl_snapshot made) noexcept {
         if (!made)
             return false;
-        const std::lock_guard<std::mutex> lock(exchanging_);
-        std::swap(current_, made);
+        const held lock(exchanging_);
+        current_.swap(made);
         return true;
     }
 
@@ -213,11 +230,12 @@ private:
     const bool lacks_memory_;
     const sec_perm_set_t *const set_;
     const std::uint32_t flags_;
-    std::mutex refreshing_;    /* held while the stamp is used, and while the current snapshot is exchanged */
+    detail::fork_lock
+        refreshing_;           /* held while the stamp is used, and while the current snapshot is exchanged */
     detail::file_stamp seen_;  /* before the last reading that was tried */
     detail::file_stamp stamp_; /* of the current snapshot */
     bool is_settled_ = false;
-    mutable std::mutex exchanging_; /* held while the current snapshot is copied or exchanged */
+    mutable detail::fork_lock exchanging_; /* held while the current snapshot is copied or exchanged */
     acl_snapshot current_;
     std::atomic<int> code_{SEC_S_FILE_ERROR};
 };

@@ -2,6 +2,7 @@
 from __future__ import annotations
 
 import ctypes
+import fcntl
 import itertools
 import os
 import weakref
@@ -53,7 +54,7 @@ class Acl:
     def from_text(cls, lines: str | bytes, permissions: PermissionSet | None = None) -> Acl:
         """Reads the text of an ACL file from memory. Needs /proc."""
         encoded = lines if isinstance(lines, bytes) else lines.encode(errors="surrogateescape")
-        with os.fdopen(os.memfd_create("acl"), "wb") as file:
+        with os.fdopen(_memory_file(), "wb") as file:
             file.write(encoded)
             file.flush()
             return cls.read(f"/proc/self/fd/{file.fileno()}", permissions=permissions)
@@ -170,6 +171,17 @@ class Acl:
             return None
         check(code)
         return mask.value
+
+
+def _memory_file() -> int:
+    """A file in memory, on a descriptor of no standard stream: what is printed meanwhile must not become part of it."""
+    made = os.memfd_create("acl")
+    if made > 2:
+        return made
+    try:
+        return fcntl.fcntl(made, fcntl.F_DUPFD_CLOEXEC, 3)
+    finally:
+        os.close(made)
 
 
 def _line_of(entry: Entry, permissions: PermissionSet | None) -> str:

@@ -4,6 +4,7 @@ from __future__ import annotations
 import os
 import threading
 import time
+import weakref
 from typing import NamedTuple
 
 from ._acl import Acl
@@ -34,7 +35,7 @@ class _Stamp(NamedTuple):
 
 class LiveAcl:
     """An ACL file as it is now: any number of threads decide by the snapshot, while refresh, in one of them or in several,
-    reads the file anew when it has changed."""
+    reads the file anew when it has changed. The child of os.fork may go on with it."""
 
     def __init__(self, path: str | os.PathLike[str], permissions: PermissionSet | None = None, *,
                  default_permissions: bool = False) -> None:
@@ -49,6 +50,7 @@ class LiveAcl:
         self._stamp: _Stamp | None = None  # of the current snapshot, once it has settled
         self._current: Acl | None = None
         self._problem: Error | None = Error(FILE_ERROR, reason="not read yet")
+        _all.add(self)
 
     def refresh(self) -> bool:
         """Reads the file if its device, number, size or one of its times is another than at the last reading, or if it had
@@ -108,3 +110,16 @@ class LiveAcl:
         except OSError:
             return None
         return _Stamp(status.st_dev, status.st_ino, status.st_size, status.st_mtime_ns, status.st_ctime_ns)
+
+
+_all: weakref.WeakSet[LiveAcl] = weakref.WeakSet()
+
+
+def _free_locks() -> None:
+    """A thread that refreshed at the fork is none of the child, which would wait for it forever."""
+    for live in _all:
+        live._refreshing = threading.Lock()
+        live._stamp = None
+
+
+os.register_at_fork(after_in_child=_free_locks)

@@ -5,6 +5,7 @@ Run by CTest, or with QZ_LIBRARY_DIR set by python3 -m pytest in bindings/python
 import gc
 import os
 import random
+import signal
 import threading
 import time
 from pathlib import Path
@@ -264,3 +265,34 @@ def test_a_live_acl_is_shared_by_threads(tmp_path):
     assert failures == []
     live.refresh()
     assert live.snapshot().any_other() == 1
+
+
+def test_a_fork_leaves_no_lock_of_a_live_acl_behind(tmp_path, monkeypatch):
+    path, is_reading, may_go_on = tmp_path / "live.acl", threading.Event(), threading.Event()
+    path.write_text("o r\n")
+    live = qzacl.LiveAcl(path)
+    with monkeypatch.context() as slow:
+        slow.setattr(live, "_refresh_once", lambda: is_reading.set() or may_go_on.wait())
+        reader = threading.Thread(target=live.refresh)
+        reader.start()
+        is_reading.wait()
+    child = os.fork()
+    if child == 0:
+        signal.alarm(20)
+        os._exit(0 if live.refresh() and live.snapshot().any_other() == 1 else 1)
+    may_go_on.set()
+    reader.join()
+    assert os.waitpid(child, 0) == (child, 0)
+
+
+def test_no_text_is_read_through_a_standard_stream(monkeypatch):
+    paths, read = [], Acl.read
+    monkeypatch.setattr(Acl, "read", lambda path, **rest: paths.append(path) or read(path, **rest))
+    kept = os.dup(0)
+    os.close(0)
+    try:
+        assert Acl.from_text("o r\n").any_other() == 1
+    finally:
+        os.dup2(kept, 0)
+        os.close(kept)
+    assert int(paths[0].rpartition("/")[2]) > 2

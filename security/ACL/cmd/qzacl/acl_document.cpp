@@ -2,10 +2,10 @@
 #include "acl_document.h"
 
 #include "entry_words.h"
-#include "input.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/compile.h"
 #include "trouble.h"
+#include "whole_file.h"
 
 #include <cstring>
 #include <vector>
@@ -13,14 +13,6 @@
 namespace qzacl {
 
 namespace {
-
-constexpr qz::acl_file_use by_companion = {
-    .not_found = {SEC_S_BAD_FILENAME, qz::msg::bad_acl_file_name},
-    .not_private = {SEC_S_BAD_PERMISSION, qz::msg::acl_file_not_private},
-    .cannot_open = {SEC_S_FILE_ERROR, qz::msg::cannot_open_acl_file},
-    .takes_empty_of_anybody = false,
-    .is_traced = false,
-};
 
 // Counts line feeds ahead of the parser, which overwrites them.
 class feed_counter {
@@ -46,14 +38,80 @@ private:
     std::size_t line_ = 1;
 };
 
+// Puts entries into their trees. Some wait before, while the memory that their insertion looks at is fetched. Messages
+// are printed in the order of the lines.
+class insertions {
+public:
+    // Messages of a file with a name begin with a line that says it.
+    insertions(sec_acltree_array &trees, const std::string &name) : trees_(trees), name_(name) {}
+
+    bool is_sound() const { return is_sound_; }
+    bool lacks_memory() const { return lacks_memory_; }
+
+    void add(const qz::acle_view &entry) {
+        if (count_ == waiting_max)
+            insert_oldest();
+        fetch(entry);
+        waiting_[(first_ + count_++) % waiting_max] = entry;
+    }
+
+    // Takes a line that holds no entry, whose error is recorded.
+    void refuse(int code) {
+        cu_error_t *error = nullptr;
+        cu_get_error_1(&error);
+        finish();
+        cu_pset_error_1(error);
+        cu_rel_error_1(error);
+        note(code);
+    }
+
+    void finish() {
+        while (count_ != 0)
+            insert_oldest();
+    }
+
+private:
+    static constexpr std::size_t waiting_max = 16;
+
+    void insert_oldest() {
+        const qz::acle_view entry = waiting_[first_];
+        first_ = (first_ + 1) % waiting_max;
+        --count_;
+        note(trees_.add(entry));
+    }
+
+    // Most entries are of the key that came up last.
+    void fetch(const qz::acle_view &entry) const {
+        const auto trees = trees_.trees();
+        if (!trees.empty() && trees.back()->type() == entry.type &&
+            trees.back()->mechanism() == entry.mechanism)
+            __builtin_prefetch(trees.back()->first_look(entry), 1);
+    }
+
+    void note(int code) {
+        if (code == SEC_S_OK)
+            return;
+        if (is_sound_ && !name_.empty())
+            print_message(name_ + ": does not parse");
+        print_recorded_error();
+        is_sound_ = false;
+        lacks_memory_ = lacks_memory_ || code == SEC_S_NO_MEMORY;
+    }
+
+    sec_acltree_array &trees_;
+    std::string name_;
+    qz::acle_view waiting_[waiting_max];
+    std::size_t first_ = 0;
+    std::size_t count_ = 0;
+    bool is_sound_ = true;
+    bool lacks_memory_ = false;
+};
+
 void open(const std::string &file, qz::acl_text &text) {
     if (file == standard_input)
         return require(text.take(read_whole(file)));
     qz::vetted_file vetted;
-    require(text.open_again_while_replaced([&] {
-        const int found = qz::vet_acl_file(file.c_str(), nullptr, by_companion, vetted);
-        return found != SEC_S_OK ? found : text.open(vetted, by_companion);
-    }));
+    require(read_acl_text(file, vetted, text));
 }
 
 bool is_buffer(std::string_view bytes) {
@@ -69,8 +127,14 @@ std::string_view text_in(qz::byte_span field) {
 
 acl_document::acl_document(const std::string &file, const permission_set &set, const reading &watched)
     : file_(file), text_(set.get()) {
-    open(file, text_);
-    read(watched);
+    try {
+        open(file, text_);
+        read(watched);
+    } catch (const recorded_trouble &) {
+        if (watched.names_file)
+            print_message(file_ + ": does not read");
+        throw;
+    }
 }
 
 acl_document::acl_document(const std::string &file, std::string_view bytes, const permission_set &set,
@@ -93,34 +157,29 @@ void acl_document::read(const reading &watched) {
 void acl_document::read_lines(const reading &watched) {
     const std::string_view whole = text_.unread();
     feed_counter feeds(whole);
-    bool is_sound = true;
+    insertions inserting(*trees_, watched.names_file ? file_ : std::string());
     qz::parsed_acle record;
-    for (;;) {
+    while (!inserting.lacks_memory()) {
         const std::size_t left = text_.unread().size();
         const std::size_t line = feeds.line_of(text_.unread());
         const qz::acl_line found = text_.next(record);
         if (found == qz::acl_line::end)
             break;
-        if (found == qz::acl_line::none)
+        if (found == qz::acl_line::bad)
+            inserting.refuse(text_.failure());
+        if (found != qz::acl_line::entry)
             continue;
-        int result = text_.failure();
-        if (found == qz::acl_line::entry)
-            result = trees_->add(qz::view_of(record));
-        if (found == qz::acl_line::entry && result == SEC_S_OK) {
-            if (watched.entry) {
-                const qz::acle_view view = qz::view_of(record);
-                qz::entry_fields entry = {view.type, view.perm_mask, view.mechanism, view.identity};
-                entry.mechanism = kept(entry.mechanism);
-                watched.entry(entry, {line, whole.size() - left, whole.size() - text_.unread().size()});
-            }
-            continue;
+        const qz::acle_view view = qz::view_of(record);
+        inserting.add(view);
+        if (watched.unnamed && view.identity.empty())
+            watched.unnamed(view.type, line);
+        if (watched.entry) {
+            const qz::entry_fields entry = {view.type, view.perm_mask, kept(view.mechanism), view.identity};
+            watched.entry(entry, {line, whole.size() - left, whole.size() - text_.unread().size()});
         }
-        print_recorded_error();
-        is_sound = false;
-        if (result == SEC_S_NO_MEMORY)
-            break;
     }
-    if (!is_sound)
+    inserting.finish();
+    if (!inserting.is_sound())
         throw told_trouble();
 }
 
@@ -201,11 +260,6 @@ void append_place(std::string &text, const std::string &file, std::size_t line) 
     text += file;
     if (line != 0)
         append_number(text.append(":"), line);
-}
-
-qz::entry_fields fields_of(const sec_acle_t &record) {
-    const char *identity = record.identity == nullptr ? "" : record.identity;
-    return {record.type, record.perm_mask, record.mechanism, identity};
 }
 
 } // namespace qzacl

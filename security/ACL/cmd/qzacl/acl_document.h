@@ -27,6 +27,9 @@ struct text_place {
 struct reading {
     std::function<void(const qz::entry_fields &, const text_place &)> entry = {};
     std::function<void(std::string_view)> whole_text = {}; // before its first line is read
+    // An entry that names nobody, by its type and line.
+    std::function<void(std::uint8_t, std::size_t)> unnamed = {};
+    bool names_file = false; // in a line before the messages, for verbs with several files
 };
 
 class acl_document {
@@ -76,9 +79,6 @@ void for_each_stored(const qz::acl &acl, const std::function<void(const qz::entr
 
 // Appends "FILE:LINE", or the file alone where the line is 0.
 void append_place(std::string &text, const std::string &file, std::size_t line);
-
-// The fields of a record, whose texts end in NUL.
-qz::entry_fields fields_of(const sec_acle_t &record);
 
 } // namespace qzacl
 

@@ -1,10 +1,10 @@
 // cache: what services read, and whether it is right.
 #include "cli.h"
 #include "entry_words.h"
-#include "input.h"
 #include "qz/service.hpp"
 #include "qzacl_acl/cache_vetting.h"
 #include "trouble.h"
+#include "whole_file.h"
 
 #include <algorithm>
 #include <optional>
@@ -60,6 +60,7 @@ finding examine(const std::string &file, const permission_set &set) {
     finding made;
     const auto compiled = qz::acl::read_file(file.c_str(), nullptr, set.get(), SEC_READ_ACL_TEXT);
     if (!compiled) {
+        print_message(file + ": does not parse");
         print_recorded_error();
         return made;
     }

@@ -2,8 +2,8 @@
 // ones it gives "++", words in brackets and names of subcommands a meaning.
 #include "cli.h"
 
-#include "input.h"
 #include "trouble.h"
+#include "whole_file.h"
 
 #include <CLI/CLI.hpp>
 #include <algorithm>

@@ -3,11 +3,11 @@
 
 #include "base/owned.h"
 #include "lock_file.h"
-#include "qzacl_acl/acl_text.h"
 #include "qzacl_acl/cache_file.h"
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/trees.h"
 #include "trouble.h"
+#include "whole_file.h"
 
 #include <cstring>
 #include <ctime>
@@ -17,14 +17,6 @@
 namespace qzacl {
 
 namespace {
-
-constexpr qz::acl_file_use by_edit = {
-    .not_found = {SEC_S_BAD_FILENAME, qz::msg::bad_acl_file_name},
-    .not_private = {SEC_S_BAD_PERMISSION, qz::msg::acl_file_not_private},
-    .cannot_open = {SEC_S_FILE_ERROR, qz::msg::cannot_open_acl_file},
-    .takes_empty_of_anybody = false,
-    .is_traced = false,
-};
 
 enum class outcome { counts, does_not_count, failed };
 
@@ -72,10 +64,7 @@ bool is_what_services_read(const std::string &path, const sec_perm_set_t &set,
 outcome compile_once(const std::string &path, const sec_perm_set_t &set) {
     qz::vetted_file file;
     qz::acl_text text(&set);
-    const int opened = text.open_again_while_replaced([&] {
-        const int result = qz::vet_acl_file(path.c_str(), nullptr, by_edit, file);
-        return result != SEC_S_OK ? result : text.open(file, by_edit);
-    });
+    const int opened = read_acl_text(path, file, text);
     sec_acltree_array trees(text.all());
     if (opened != SEC_S_OK || (!text.is_empty() && read_trees(text, trees) != SEC_S_OK))
         return outcome::failed;

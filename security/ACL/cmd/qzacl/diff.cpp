@@ -3,8 +3,11 @@
 #include "cli.h"
 #include "entry_lines.h"
 #include "entry_words.h"
+#include "qzacl_acl/identity_table.h"
 #include "trouble.h"
 
+#include <algorithm>
+#include <new>
 #include <unordered_map>
 #include <vector>
 
@@ -12,60 +15,66 @@ namespace qzacl {
 
 namespace {
 
-using nodes = std::span<const sec_acle_t>;
-
 struct side {
     entry_lines lines; // which watch the document being read
     acl_document document;
 
     side(const call &call, std::size_t word)
-        : document(call.line.words[word], call.permissions,
-                   call.out.is_json() ? lines.watched() : reading()) {}
+        : document(call.line.words[word], call.permissions, watched(call)) {}
     side(const side &) = delete;
     side &operator=(const side &) = delete;
+
+private:
+    reading watched(const call &call) {
+        reading made = call.out.is_json() ? lines.watched() : reading();
+        made.names_file = true;
+        return made;
+    }
 };
 
 // Tells the differences one by one.
 class difference_list {
 public:
     difference_list(const call &call, const side &before, const side &after)
-        : call_(call), before_(before), after_(after) {}
+        : call_(call), before_(before), after_(after), before_json_(before.document.file(), call.permissions),
+          after_json_(after.document.file(), call.permissions) {}
 
     bool is_empty() const { return is_empty_; }
 
-    void remove(const sec_acle_t &entry) { tell("- ", "remove", &entry, nullptr); }
-    void add(const sec_acle_t &entry) { tell("+ ", "add", nullptr, &entry); }
-    void compare(const sec_acle_t &before, const sec_acle_t &after) {
-        if (before.perm_mask != after.perm_mask)
+    void remove(const qz::entry_fields &entry) { tell("- ", "remove", &entry, nullptr); }
+    void add(const qz::entry_fields &entry) { tell("+ ", "add", nullptr, &entry); }
+    void compare(const qz::entry_fields &before, const qz::entry_fields &after) {
+        if (before.permissions != after.permissions)
             tell("~ ", "alter", &before, &after);
     }
 
-    void reorder(const char *mechanism) {
+    void reorder(std::string_view mechanism) {
         is_empty_ = false;
         if (!call_.out.is_json())
-            return call_.out.line(std::string("! e ") + mechanism + ": other order");
+            return call_.out.line("! e " + folded(mechanism) + ": other order");
         json object;
         object["change"] = "order";
         object["file"] = json_text(after_.document.file());
         object["line"] = nullptr;
         object["type"] = "e";
-        object["mechanism"] = json_text(mechanism);
+        object["mechanism"] = json_text(folded(mechanism));
         for (const char *key : {"identity", "permissions", "before", "after"})
             object[key] = nullptr;
         call_.out.object(object);
     }
 
 private:
-    void tell(const char *sign, const char *change, const sec_acle_t *before, const sec_acle_t *after) {
+    void tell(const char *sign, const char *change, const qz::entry_fields *before,
+              const qz::entry_fields *after) {
         is_empty_ = false;
-        const qz::entry_fields shown = fields_of(after != nullptr ? *after : *before);
+        const qz::entry_fields &shown = after != nullptr ? *after : *before;
         if (call_.out.is_json())
             return tell_json(change, shown, before, after);
         line_ = sign;
         if (before != nullptr && after != nullptr) {
             append_key(line_, shown);
-            append_letters(" +", after->perm_mask & ~before->perm_mask);
-            append_letters(" -", before->perm_mask & ~after->perm_mask);
+            append_letters(" +", after->permissions & ~before->permissions);
+            append_letters(" -", before->permissions & ~after->permissions);
         } else {
             append_entry(line_, shown, call_.permissions);
         }
@@ -77,79 +86,116 @@ private:
             line_.append(sign).append(call_.permissions.letters_of(mask));
     }
 
-    void tell_json(const char *change, const qz::entry_fields &shown, const sec_acle_t *before,
-                   const sec_acle_t *after) {
+    void tell_json(const char *change, const qz::entry_fields &shown, const qz::entry_fields *before,
+                   const qz::entry_fields *after) {
         const side &from = after != nullptr ? after_ : before_;
-        json object;
-        object["change"] = change;
-        put_entry(object, from.document.file(), from.lines.line_of(shown), shown, call_.permissions);
-        object["before"] = letters_or_null(before);
-        object["after"] = letters_or_null(after);
-        call_.out.object(object);
+        const std::size_t number = from.lines.line_of(shown);
+        line_.clear();
+        (after != nullptr ? after_json_ : before_json_).append(line_, number, shown);
+        line_.pop_back(); // the end of the object is yet to come
+        line_.append(",\"change\":\"").append(change).append("\",\"before\":");
+        append_letters_or_null(before);
+        line_ += ",\"after\":";
+        append_letters_or_null(after);
+        call_.out.line(line_ += '}');
     }
 
-    json letters_or_null(const sec_acle_t *entry) const {
-        return entry == nullptr ? json() : json_text(call_.permissions.letters_of(entry->perm_mask));
+    void append_letters_or_null(const qz::entry_fields *entry) {
+        if (entry == nullptr)
+            line_ += "null";
+        else
+            append_json_text(line_, call_.permissions.letters_of(entry->permissions));
     }
 
     const call &call_;
     const side &before_;
     const side &after_;
+    entry_json before_json_;
+    entry_json after_json_;
     bool is_empty_ = true;
     std::string line_;
 };
 
 // Entries that are stored in the order of their identities.
-void compare_sorted(nodes before, nodes after, difference_list &found) {
-    auto a = before.begin();
-    auto b = after.begin();
-    while (a != before.end() || b != after.end()) {
-        int order = a == before.end() ? 1 : -1;
-        if (a != before.end() && b != after.end())
-            order = qz::detail::compare_folded(fields_of(*a).identity, fields_of(*b).identity);
+void compare_sorted(const tree_entries &before, const tree_entries &after, difference_list &found) {
+    std::size_t a = 0;
+    std::size_t b = 0;
+    while (a != before.size() && b != after.size()) {
+        const qz::entry_fields one = before.in_turn(a);
+        const qz::entry_fields other = after.in_turn(b);
+        const int order = qz::detail::compare_folded(one.identity, other.identity);
         if (order < 0)
-            found.remove(*a++);
+            found.remove(one);
         else if (order > 0)
-            found.add(*b++);
+            found.add(other);
         else
-            found.compare(*a++, *b++);
+            found.compare(one, other);
+        a += order <= 0 ? 1 : 0;
+        b += order >= 0 ? 1 : 0;
     }
+    for (; a != before.size(); ++a)
+        found.remove(before[a]);
+    for (; b != after.size(); ++b)
+        found.add(after[b]);
 }
 
-// Finds entries by identity.
+// Finds entries by identity, from a place on.
 class identity_index {
 public:
-    explicit identity_index(nodes entries) {
-        places_.reserve(entries.size());
-        for (std::size_t place = 0; place < entries.size(); ++place)
-            places_.emplace(folded(entries[place].identity), place);
+    identity_index(const tree_entries &entries, std::size_t first) : entries_(entries) {
+        std::size_t refused = 0;
+        if (!table_.reset(static_cast<std::uint32_t>(entries.size() - first + 1), refused))
+            throw std::bad_alloc();
+        for (std::size_t place = first; place < entries.size(); ++place)
+            table_.enter(hash_of(entries.identity(place)), static_cast<std::uint32_t>(place));
     }
 
+    // Fetches what find will look at.
+    void fetch(const char *identity) const { __builtin_prefetch(table_.first_look(hash_of(identity))); }
+
     // The place in the entries, or that behind them.
-    std::size_t find(const sec_acle_t &entry) const {
-        const auto found = places_.find(folded(entry.identity));
-        return found == places_.end() ? places_.size() : found->second;
+    std::size_t find(const char *identity) const {
+        const std::uint32_t found = table_.find(hash_of(identity), [&](std::uint32_t place) {
+            return qz::compare_identities(entries_.identity(place), identity) == 0;
+        });
+        return found == qz::identity_table::none ? entries_.size() : found;
     }
 
 private:
-    std::unordered_map<std::string, std::size_t> places_;
+    std::uint64_t hash_of(const char *identity) const {
+        return table_.hash(identity, qz::ordered_word(identity));
+    }
+
+    const tree_entries &entries_;
+    qz::identity_table table_;
 };
 
-// Entries of which the first that matches decides, so that their order is a difference.
-void compare_chains(nodes before, nodes after, difference_list &found) {
-    const std::string mechanism = (before.empty() ? after : before)[0].mechanism;
-    while (!before.empty() && !after.empty() &&
-           qz::detail::same_folded(before[0].identity, after[0].identity)) {
-        found.compare(before[0], after[0]);
-        before = before.subspan(1);
-        after = after.subspan(1);
+// Compares what both chains begin with. Returns how many entries that is.
+std::size_t compare_common(const tree_entries &before, const tree_entries &after, difference_list &found) {
+    std::size_t at = 0;
+    for (; at < std::min(before.size(), after.size()); ++at) {
+        const qz::entry_fields one = before[at];
+        const qz::entry_fields other = after[at];
+        if (!qz::detail::same_folded(one.identity, other.identity))
+            break;
+        found.compare(one, other);
     }
-    const identity_index index(after);
+    return at;
+}
+
+// Entries of which the first that matches decides, so that their order is a difference.
+void compare_chains(const tree_entries &before, const tree_entries &after, difference_list &found) {
+    constexpr std::size_t fetched_ahead = 16;
+    const std::size_t first = compare_common(before, after, found);
+    const identity_index index(after, first);
     std::vector<bool> is_in_both(after.size());
     bool is_in_order = true;
     std::size_t last = 0;
-    for (const sec_acle_t &entry : before) {
-        const std::size_t place = index.find(entry);
+    for (std::size_t at = first; at < before.size(); ++at) {
+        if (before.size() - at > fetched_ahead)
+            index.fetch(before.identity(at + fetched_ahead));
+        const qz::entry_fields entry = before[at];
+        const std::size_t place = index.find(before.identity(at));
         if (place == after.size()) {
             found.remove(entry);
             continue;
@@ -159,15 +205,15 @@ void compare_chains(nodes before, nodes after, difference_list &found) {
         is_in_order = is_in_order && place >= last;
         last = place;
     }
-    for (std::size_t place = 0; place < after.size(); ++place) {
+    for (std::size_t place = first; place < after.size(); ++place) {
         if (!is_in_both[place])
             found.add(after[place]);
     }
     if (!is_in_order)
-        found.reorder(mechanism.c_str());
+        found.reorder(before[0].mechanism);
 }
 
-void compare_trees(nodes before, nodes after, difference_list &found) {
+void compare_trees(const tree_entries &before, const tree_entries &after, difference_list &found) {
     if ((before.empty() ? after : before)[0].type == SEC_ACLE_EXPANDED)
         compare_chains(before, after, found);
     else
@@ -176,20 +222,20 @@ void compare_trees(nodes before, nodes after, difference_list &found) {
 
 std::string key_of_tree(const sec_acltree_t &tree) { return key_of({tree.type(), 0, tree.mechanism(), {}}); }
 
-void compare_all(acl_document &before, acl_document &after, difference_list &found) {
+void compare_all(side &before, side &after, difference_list &found) {
+    const auto entries_of = [](const side &from, const sec_acltree_t *tree) {
+        return tree != nullptr ? tree_entries(*tree, from.lines) : tree_entries();
+    };
     std::unordered_map<std::string, const sec_acltree_t *> only_after;
-    for (const sec_acltree_t *tree : after.trees())
+    for (const sec_acltree_t *tree : after.document.trees())
         only_after.emplace(key_of_tree(*tree), tree);
-    for (const sec_acltree_t *tree : before.trees()) {
-        const auto other = only_after.find(key_of_tree(*tree));
-        const bool is_common = other != only_after.end();
-        compare_trees(nodes_of(*tree), is_common ? nodes_of(*other->second) : nodes(), found);
-        if (is_common)
-            only_after.erase(other);
+    for (const sec_acltree_t *tree : before.document.trees()) {
+        const auto other = only_after.extract(key_of_tree(*tree));
+        compare_trees(entries_of(before, tree), entries_of(after, other ? other.mapped() : nullptr), found);
     }
-    for (const sec_acltree_t *tree : after.trees()) {
+    for (const sec_acltree_t *tree : after.document.trees()) {
         if (only_after.count(key_of_tree(*tree)) != 0)
-            compare_trees({}, nodes_of(*tree), found);
+            compare_trees({}, entries_of(after, tree), found);
     }
 }
 
@@ -199,7 +245,7 @@ int diff(const call &call) {
     side before(call, 0);
     side after(call, 1);
     difference_list found(call, before, after);
-    compare_all(before.document, after.document, found);
+    compare_all(before, after, found);
     return found.is_empty() ? yes : no;
 }
 

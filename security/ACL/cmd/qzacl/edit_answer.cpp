@@ -4,11 +4,11 @@
 #include "cli.h"
 #include "counting_cache.h"
 #include "hidden_grant.h"
-#include "input.h"
 #include "lock_file.h"
 #include "replaced_file.h"
 #include "trouble.h"
 #include "unified_diff.h"
+#include "whole_file.h"
 
 #include <chrono>
 #include <span>

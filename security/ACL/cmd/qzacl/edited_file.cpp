@@ -1,8 +1,8 @@
 // The file that an edit is about, found and read.
 #include "edited_file.h"
 
-#include "input.h"
 #include "qzacl_utils/file_bytes.h"
+#include "whole_file.h"
 
 #include <cerrno>
 #include <climits>
@@ -25,15 +25,6 @@ bool same_time(const timespec &one, const timespec &other) {
 } // namespace
 
 trouble system_failure(const std::string &what) { return trouble(what + ": " + strerror(errno)); }
-
-void write_all(int fd, std::string_view bytes, const std::string &what) {
-    while (!bytes.empty()) {
-        const ssize_t count = write(fd, bytes.data(), bytes.size());
-        if (count < 0 && errno != EINTR)
-            throw system_failure("cannot write " + what);
-        bytes.remove_prefix(count > 0 ? static_cast<std::size_t>(count) : 0);
-    }
-}
 
 edited_file::edited_file(const std::string &path) : path_(path) {
     const qz::owned<char> real(realpath(path.c_str(), nullptr));

@@ -7,16 +7,12 @@
 #include "trouble.h"
 
 #include <string>
-#include <string_view>
 #include <sys/stat.h>
 
 namespace qzacl {
 
 // What could not be done, and why by errno.
 trouble system_failure(const std::string &what);
-
-// Writes all bytes; `what` names the file should that fail.
-void write_all(int fd, std::string_view bytes, const std::string &what);
 
 class edited_file {
 public:

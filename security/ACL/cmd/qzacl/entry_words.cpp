@@ -59,26 +59,44 @@ void put_entry(json &object, const std::string &file, std::size_t line, const qz
     object["permissions"] = json_text(set.letters_of(entry.permissions));
 }
 
-void append_entry_json(std::string &line, const std::string &file, std::size_t number,
-                       const qz::entry_fields &entry, const permission_set &set) {
-    const auto append_text_or_null = [&](std::string_view text) {
-        if (text.empty())
-            line += "null";
-        else
-            append_json_text(line, text);
-    };
-    append_json_text(line.append("{\"file\":"), file);
-    line += ",\"line\":";
+entry_json::entry_json(const std::string &file, const permission_set &set) : set_(set), head_("{\"file\":") {
+    append_json_text(head_, file);
+    head_ += ",\"line\":";
+}
+
+void entry_json::append(std::string &line, std::size_t number, const qz::entry_fields &entry) {
+    if (entry.type != type_ || entry.mechanism.data() != mechanism_.data())
+        name(entry.type, entry.mechanism);
+    line += head_;
     if (number != 0)
         append_number(line, number);
     else
         line += "null";
-    line.append(",\"type\":\"").append(1, qz::type_letter(entry.type)).append("\",\"mechanism\":");
-    append_text_or_null(folded(entry.mechanism));
-    line += ",\"identity\":";
-    append_text_or_null(entry.identity);
-    append_json_text(line.append(",\"permissions\":"), set.letters_of(entry.permissions));
-    line += "}\n";
+    const std::string &end = end_of(entry.permissions);
+    if (!entry.identity.empty() && is_plain_in_json(entry.identity)) {
+        line.append(middle_).append(entry.identity).append(end);
+        return;
+    }
+    line.append(middle_, 0, middle_.size() - 1);
+    line.append(text_or_null(entry.identity).dump()).append(end, 1);
+}
+
+void entry_json::name(std::uint8_t type, std::string_view mechanism) {
+    type_ = type;
+    mechanism_ = mechanism;
+    middle_ = ",\"type\":\"";
+    middle_.append(1, qz::type_letter(type)).append("\",\"mechanism\":");
+    middle_.append(text_or_null(folded(mechanism)).dump()).append(",\"identity\":\"");
+}
+
+const std::string &entry_json::end_of(std::uint32_t mask) {
+    ending &found = endings_[mask % std::size(endings_)];
+    if (found.text.empty() || found.mask != mask) {
+        found = {mask, "\",\"permissions\":"};
+        append_json_text(found.text, set_.letters_of(mask));
+        found.text += '}';
+    }
+    return found.text;
 }
 
 void append_number(std::string &line, std::size_t number) {

@@ -28,9 +28,32 @@ void append_entry(std::string &line, const qz::entry_fields &entry, const permis
 void put_entry(json &object, const std::string &file, std::size_t line, const qz::entry_fields &entry,
                const permission_set &set);
 
-// Appends the same object as a line of JSON, which is quicker where there may be a million.
-void append_entry_json(std::string &line, const std::string &file, std::size_t number,
-                       const qz::entry_fields &entry, const permission_set &set);
+// Writes the same objects, which is quicker where there may be a million.
+class entry_json {
+public:
+    // The set outlives the writer.
+    entry_json(const std::string &file, const permission_set &set);
+
+    // Appends the object, without a line end. A mechanism stays what it is as long as it is at the same place.
+    void append(std::string &line, std::size_t number, const qz::entry_fields &entry);
+
+private:
+    void name(std::uint8_t type, std::string_view mechanism);
+    const std::string &end_of(std::uint32_t mask);
+
+    // The parts of objects around the line and the identity, which most share; with the quotation marks of the identity.
+    struct ending {
+        std::uint32_t mask = 0;
+        std::string text;
+    };
+
+    const permission_set &set_;
+    std::string head_;
+    std::string middle_;
+    ending endings_[64];
+    std::uint8_t type_ = 0; // of the middle, as the mechanism
+    std::string_view mechanism_;
+};
 
 // Appends a number in decimal.
 void append_number(std::string &line, std::size_t number);

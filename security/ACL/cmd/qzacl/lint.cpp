@@ -41,7 +41,8 @@ public:
     reading watched() {
         return {
             .entry = [this](const qz::entry_fields &entry, const text_place &place) { look(entry, place); },
-            .whole_text = [this](std::string_view text) { look_for_crlf(text); }};
+            .whole_text = [this](std::string_view text) { look_for_crlf(text); },
+            .names_file = true};
     }
 
     // By line; what is about the whole file comes first in its line.
@@ -158,7 +159,6 @@ int lint(const call &call) {
         try {
             status = std::max(status, lint_file(file, call));
         } catch (const told_trouble &) {
-            print_message(file + ": does not parse");
             status = failed;
         } catch (const recorded_trouble &) {
             print_recorded_error();

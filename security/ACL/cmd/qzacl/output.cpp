@@ -3,8 +3,8 @@
 
 #include "trouble.h"
 #include "utf8.h"
+#include "whole_file.h"
 
-#include <algorithm>
 #include <cerrno>
 #include <csignal>
 #include <cstring>
@@ -13,8 +13,6 @@
 namespace qzacl {
 
 namespace {
-
-constexpr std::size_t enough_to_write = 1 << 18;
 
 // C0, DEL, and C1 as UTF-8 has them, which terminals obey as well.
 bool is_control(std::string_view text, std::size_t at) {
@@ -55,10 +53,17 @@ std::string shown_on(int fd, std::string_view lines) {
 
 json json_text(std::string_view bytes) { return valid_utf8(bytes); }
 
+// Does not stop early, so that several bytes are compared at once.
+bool is_plain_in_json(std::string_view bytes) {
+    bool is_plain = true;
+    for (const char c : bytes)
+        is_plain = is_plain & (c >= ' ' && c <= '~' && c != '"' && c != '\\');
+    return is_plain;
+}
+
 void append_json_text(std::string &line, std::string_view bytes) {
-    const auto is_plain = [](char c) { return c >= ' ' && c <= '~' && c != '"' && c != '\\'; };
-    if (std::all_of(bytes.begin(), bytes.end(), is_plain))
-        line.append("\"").append(bytes).append("\"");
+    if (is_plain_in_json(bytes))
+        line.append(1, '"').append(bytes).append(1, '"');
     else
         line += json_text(bytes).dump();
 }
@@ -80,40 +85,33 @@ void output::line(std::string_view text) {
 }
 
 void output::lines(std::string_view text) {
+    if (text.size() >= enough_to_write && !is_terminal_) {
+        flush();
+        return write(text);
+    }
     add(text, true);
     if (gathered_.size() >= enough_to_write)
         flush();
 }
 
 void output::lines(const held_lines &held) {
-    if (is_terminal_) {
-        for (const std::string &part : held.parts_)
-            lines(part);
-        return;
-    }
-    flush();
     for (const std::string &part : held.parts_)
-        write_all(part);
+        lines(part);
 }
 
 void output::object(const json &object) { line(object.dump(-1, ' ', false, json::error_handler_t::replace)); }
 
 void output::flush() {
-    write_all(gathered_);
+    write(gathered_);
     gathered_.clear();
 }
 
-void output::write_all(std::string_view bytes) {
-    while (!bytes.empty()) {
-        const ssize_t written = write(STDOUT_FILENO, bytes.data(), bytes.size());
-        if (written < 0 && errno == EINTR)
-            continue;
-        if (written < 0 && errno == EPIPE)
-            end_quietly();
-        if (written < 0)
-            throw trouble(std::string("standard output: ") + std::strerror(errno));
-        bytes.remove_prefix(static_cast<std::size_t>(written));
-    }
+void output::write(std::string_view bytes) {
+    if (write_all(STDOUT_FILENO, bytes))
+        return;
+    if (errno == EPIPE)
+        end_quietly();
+    throw trouble(std::string("standard output: ") + std::strerror(errno));
 }
 
 } // namespace qzacl

@@ -14,26 +14,29 @@ using json = nlohmann::ordered_json;
 
 // A text as JSON can hold it: with U+FFFD for each byte that is no UTF-8.
 json json_text(std::string_view bytes);
-// The same as it stands in a line of JSON, in its quotation marks, appended.
+// Whether it stands in JSON as it is.
+bool is_plain_in_json(std::string_view bytes);
+// The same text as it stands in a line of JSON, in its quotation marks, appended.
 void append_json_text(std::string &line, std::string_view bytes);
 
 // A text in which control bytes are shown as \xHH, but for line feeds where they are to stay.
 std::string escaped(std::string_view text, bool keeps_line_feeds);
+
+// So many bytes are written at once.
+inline constexpr std::size_t enough_to_write = 1 << 18;
 
 // Lines that are held back until all of them are known, without ever being moved to a larger place.
 class held_lines {
 public:
     // Where the next line is to be appended, with its line feed.
     std::string &next() {
-        if (parts_.empty() || parts_.back().size() >= part_size)
-            parts_.emplace_back().reserve(part_size + part_size / 8);
+        if (parts_.empty() || parts_.back().size() >= enough_to_write)
+            parts_.emplace_back().reserve(enough_to_write + enough_to_write / 8);
         return parts_.back();
     }
 
 private:
     friend class output;
-    static constexpr std::size_t part_size = 1 << 18;
-
     std::deque<std::string> parts_;
 };
 
@@ -60,7 +63,7 @@ public:
 
 private:
     void add(std::string_view text, bool keeps_line_feeds);
-    static void write_all(std::string_view bytes);
+    static void write(std::string_view bytes);
 
     bool is_json_;
     bool is_terminal_;

@@ -1,8 +1,8 @@
 // The permissions that entries are read and shown with.
 #include "permission_set.h"
 
-#include "input.h"
 #include "trouble.h"
+#include "whole_file.h"
 
 #include <bit>
 #include <cerrno>

@@ -3,7 +3,7 @@
 
 #include "base/owned.h"
 #include "edited_file.h"
-#include "input.h"
+#include "whole_file.h"
 
 #include <cerrno>
 #include <csignal>
@@ -66,7 +66,8 @@ private_copy::private_copy(const std::string &name, std::string_view text)
     const qz::descriptor file(open(path_.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, owner_alone));
     if (!file)
         throw system_failure("cannot make " + path_);
-    write_all(file.get(), text, path_);
+    if (!write_all(file.get(), text))
+        throw system_failure("cannot write " + path_);
 }
 
 void private_copy::edit() const {

@@ -3,6 +3,7 @@
 
 #include "base/owned.h"
 #include "qzacl_acl/posix_acl.h"
+#include "whole_file.h"
 
 #include <cerrno>
 #include <fcntl.h>
@@ -109,7 +110,8 @@ void replace_file(const edited_file &file, std::string_view bytes) {
     // What it inherits from its folder, the file that it replaces may not have.
     if (!qz::remove_posix_acl(made.fd()))
         throw system_failure("cannot protect the new file");
-    write_all(made.fd(), bytes, "the new file");
+    if (!write_all(made.fd(), bytes))
+        throw system_failure("cannot write the new file");
     protect_like(file, made.fd());
     if (fsync(made.fd()) != 0)
         throw system_failure("cannot sync the new file");

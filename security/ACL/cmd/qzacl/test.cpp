@@ -3,9 +3,9 @@
 #include "cases.h"
 #include "cli.h"
 #include "entry_words.h"
-#include "input.h"
 #include "party.h"
 #include "trouble.h"
+#include "whole_file.h"
 
 #include <set>
 #include <sstream>
@@ -116,7 +116,7 @@ private:
 } // namespace
 
 int test(const call &call) {
-    acl_document document(call.line.words[0], call.permissions);
+    acl_document document(call.line.words[0], call.permissions, {.names_file = true});
     tester testing(call, document);
     std::istringstream lines(read_whole(call.line.words[1]));
     std::string line;

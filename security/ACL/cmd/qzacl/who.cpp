@@ -11,6 +11,7 @@ int who(const call &call) {
     const std::uint32_t wanted = call.permissions.mask_of(call.line.words[1]);
     held_lines found; // until the whole file is known to be sound
     bool is_empty = true;
+    entry_json as_json(file, call.permissions);
     reading watched;
     watched.entry = [&](const qz::entry_fields &entry, const text_place &place) {
         if ((entry.permissions & wanted) != wanted)
@@ -18,11 +19,11 @@ int who(const call &call) {
         is_empty = false;
         std::string &lines = found.next();
         if (call.out.is_json()) {
-            append_entry_json(lines, file, place.line, entry, call.permissions);
-            return;
+            as_json.append(lines, place.line, entry);
+        } else {
+            append_place(lines, file, place.line);
+            append_entry(lines.append(": "), entry, call.permissions);
         }
-        append_place(lines, file, place.line);
-        append_entry(lines.append(": "), entry, call.permissions);
         lines += '\n';
     };
     const acl_document document(file, call.permissions, watched);

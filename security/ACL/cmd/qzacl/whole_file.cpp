@@ -1,5 +1,5 @@
-// Files that are read whole.
-#include "input.h"
+// Files that are read and written whole.
+#include "whole_file.h"
 
 #include "base/open_file.h"
 #include "trouble.h"
@@ -11,6 +11,14 @@
 namespace qzacl {
 
 namespace {
+
+constexpr qz::acl_file_use by_companion = {
+    .not_found = {SEC_S_BAD_FILENAME, qz::msg::bad_acl_file_name},
+    .not_private = {SEC_S_BAD_PERMISSION, qz::msg::acl_file_not_private},
+    .cannot_open = {SEC_S_FILE_ERROR, qz::msg::cannot_open_acl_file},
+    .takes_empty_of_anybody = false,
+    .is_traced = false,
+};
 
 [[noreturn]] void fail(const std::string &name) { throw trouble(name + ": " + std::strerror(errno)); }
 
@@ -38,6 +46,23 @@ std::string read_whole(int fd, const std::string &name) {
         if (count == 0)
             return bytes;
     }
+}
+
+int read_acl_text(const std::string &path, qz::vetted_file &file, qz::acl_text &text) {
+    return text.open_again_while_replaced([&] {
+        const int found = qz::vet_acl_file(path.c_str(), nullptr, by_companion, file);
+        return found != SEC_S_OK ? found : text.open(file, by_companion);
+    });
+}
+
+bool write_all(int fd, std::string_view bytes) {
+    while (!bytes.empty()) {
+        const ssize_t count = write(fd, bytes.data(), bytes.size());
+        if (count < 0 && errno != EINTR)
+            return false;
+        bytes.remove_prefix(count > 0 ? static_cast<std::size_t>(count) : 0);
+    }
+    return true;
 }
 
 } // namespace qzacl
