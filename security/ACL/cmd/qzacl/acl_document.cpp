@@ -10,6 +10,8 @@
 #include <cstring>
 #include <vector>
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
@@ -48,7 +50,7 @@ public:
     bool is_sound() const { return is_sound_; }
     bool lacks_memory() const { return lacks_memory_; }
 
-    void add(const qz::acle_view &entry) {
+    void add(const acle_view &entry) {
         if (count_ == waiting_max)
             insert_oldest();
         fetch(entry);
@@ -74,14 +76,14 @@ private:
     static constexpr std::size_t waiting_max = 16;
 
     void insert_oldest() {
-        const qz::acle_view entry = waiting_[first_];
+        const acle_view entry = waiting_[first_];
         first_ = (first_ + 1) % waiting_max;
         --count_;
         note(trees_.add(entry));
     }
 
     // Most entries have the key of the newest tree.
-    void fetch(const qz::acle_view &entry) const {
+    void fetch(const acle_view &entry) const {
         const auto trees = trees_.trees();
         if (!trees.empty() && trees.back()->type() == entry.type &&
             trees.back()->mechanism() == entry.mechanism)
@@ -100,26 +102,26 @@ private:
 
     sec_acltree_array &trees_;
     std::string name_;
-    qz::acle_view waiting_[waiting_max];
+    acle_view waiting_[waiting_max];
     std::size_t first_ = 0;
     std::size_t count_ = 0;
     bool is_sound_ = true;
     bool lacks_memory_ = false;
 };
 
-void open(const std::string &file, qz::acl_text &text) {
+void open(const std::string &file, acl_text &text) {
     if (file == standard_input)
         return require(text.take(read_whole(file)));
-    qz::vetted_file vetted;
+    vetted_file vetted;
     require(read_acl_text(file, vetted, text));
 }
 
 bool is_buffer(std::string_view bytes) {
-    return !bytes.empty() && static_cast<std::uint8_t>(bytes[0]) == qz::format::buffer_type;
+    return !bytes.empty() && static_cast<std::uint8_t>(bytes[0]) == format::buffer_type;
 }
 
-std::string_view text_in(qz::byte_span field) {
-    const char *text = qz::format::string_in(field);
+std::string_view text_in(byte_span field) {
+    const char *text = format::string_in(field);
     return text == nullptr ? std::string_view() : text;
 }
 
@@ -158,23 +160,23 @@ void acl_document::read_lines(const reading &watched) {
     const std::string_view whole = text_.unread();
     feed_counter feeds(whole);
     insertions inserting(*trees_, watched.names_file ? file_ : std::string());
-    qz::parsed_acle record;
+    parsed_acle record;
     while (!inserting.lacks_memory()) {
         const std::size_t left = text_.unread().size();
         const std::size_t line = feeds.line_of(text_.unread());
-        const qz::acl_line found = text_.next(record);
-        if (found == qz::acl_line::end)
+        const acl_line found = text_.next(record);
+        if (found == acl_line::end)
             break;
-        if (found == qz::acl_line::bad)
+        if (found == acl_line::bad)
             inserting.refuse(text_.failure());
-        if (found != qz::acl_line::entry)
+        if (found != acl_line::entry)
             continue;
-        const qz::acle_view view = qz::view_of(record);
+        const acle_view view = view_of(record);
         inserting.add(view);
         if (watched.unnamed && view.identity.empty())
             watched.unnamed(view.type, line);
         if (watched.entry) {
-            const qz::entry_fields entry = {view.type, view.perm_mask, kept(view.mechanism), view.identity};
+            const entry_fields entry = {view.type, view.perm_mask, kept(view.mechanism), view.identity};
             watched.entry(entry, {line, whole.size() - left, whole.size() - text_.unread().size()});
         }
     }
@@ -184,12 +186,12 @@ void acl_document::read_lines(const reading &watched) {
 }
 
 void acl_document::read_buffer(std::string_view bytes, const reading &watched) {
-    auto copy = qz::acl::from_bytes(bytes.data(), bytes.size());
+    auto copy = acl::from_bytes(bytes.data(), bytes.size());
     require(copy.code());
     require(copy->to_host());
     compiled_ = std::move(*copy);
     if (watched.entry)
-        for_each_stored(compiled_, [&](const qz::entry_fields &entry) { watched.entry(entry, {}); });
+        for_each_stored(compiled_, [&](const entry_fields &entry) { watched.entry(entry, {}); });
 }
 
 std::string_view acl_document::kept(std::string_view mechanism) {
@@ -209,7 +211,7 @@ std::string acl_document::place(std::size_t line) const {
 
 std::span<sec_acltree_t *const> acl_document::trees() {
     if (is_compiled() && !has_trees_of_buffer_) {
-        for_each_stored(compiled_, [&](const qz::entry_fields &entry) {
+        for_each_stored(compiled_, [&](const entry_fields &entry) {
             const sec_acle_t record = record_of(entry);
             require(sec__add_acle_to_trees(&record, *trees_));
         });
@@ -218,40 +220,40 @@ std::span<sec_acltree_t *const> acl_document::trees() {
     return trees_->trees();
 }
 
-qz::acl acl_document::take_acl() {
+acl acl_document::take_acl() {
     if (is_compiled())
         return std::move(compiled_);
     sec_acl_buffer_t buffer = {};
     if (!trees_->trees().empty())
         require(sec__acltrees_to_acl(trees_->trees(), &buffer));
-    return qz::acl(buffer);
+    return acl(buffer);
 }
 
 void acl_document::require_compilable() const {
-    std::uint64_t size = qz::format::header_size;
+    std::uint64_t size = format::header_size;
     for (const sec_acltree_t *tree : trees_->trees())
-        size += qz::format::subacl_header_size + qz::mechanism_max + 1 + tree->packed_size();
-    if (trees_->trees().size() <= qz::format::subacls_max && size <= qz::format::buffer_max)
+        size += format::subacl_header_size + mechanism_max + 1 + tree->packed_size();
+    if (trees_->trees().size() <= format::subacls_max && size <= format::buffer_max)
         return;
     // So close to the limits the compiler says whether they are kept, and if not, how.
     sec_acl_buffer_t buffer = {};
     const int result = sec__acltrees_to_acl(trees_->trees(), &buffer);
-    const qz::owned<void> owner(buffer.data);
+    const owned<void> owner(buffer.data);
     require(result);
 }
 
-void for_each_stored(const qz::acl &acl, const std::function<void(const qz::entry_fields &)> &each) {
-    std::vector<qz::byte_span> subacls;
-    qz::format::subacl_walk walk(qz::format::bytes_of(*acl.get()));
-    while (walk.next() == qz::format::subacl_walk::step::found)
+void for_each_stored(const acl &acl, const std::function<void(const entry_fields &)> &each) {
+    std::vector<byte_span> subacls;
+    format::subacl_walk walk(format::bytes_of(*acl.get()));
+    while (walk.next() == format::subacl_walk::step::found)
         subacls.push_back(walk.bytes());
     for (auto bytes = subacls.rbegin(); bytes != subacls.rend(); ++bytes) {
-        qz::byte_reader reader(*bytes);
-        qz::format::subacl head;
-        if (!qz::format::read(reader, head))
+        byte_reader reader(*bytes);
+        format::subacl head;
+        if (!format::read(reader, head))
             continue;
-        qz::format::entry entry;
-        for (std::uint32_t left = head.entry_count; left != 0 && qz::format::read(reader, entry); --left)
+        format::entry entry;
+        for (std::uint32_t left = head.entry_count; left != 0 && format::read(reader, entry); --left)
             each({head.type, entry.perm_mask, text_in(head.mechanism), text_in(entry.identity)});
     }
 }

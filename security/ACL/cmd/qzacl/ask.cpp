@@ -10,6 +10,8 @@
 #include <unordered_set>
 #include <vector>
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
@@ -23,12 +25,12 @@ public:
             groups_.insert(folded(group));
     }
 
-    void add(const qz::entry_fields &entry, const text_place &place) {
+    void add(const entry_fields &entry, const text_place &place) {
         if (may_answer(entry))
             found_.push_back({entry, place.line});
     }
 
-    qz::acl compiled() const {
+    acl compiled() const {
         sec_acltree_array trees;
         for (const found_entry &each : found_) {
             const sec_acle_t record = record_of(each.entry);
@@ -37,13 +39,13 @@ public:
         sec_acl_buffer_t buffer = {};
         if (!found_.empty())
             require(sec__acltrees_to_acl(trees.trees(), &buffer));
-        return qz::acl(buffer);
+        return acl(buffer);
     }
 
     // 0 where it is not known.
-    std::size_t line_of(const qz::entry_fields &entry) const {
+    std::size_t line_of(const entry_fields &entry) const {
         for (const found_entry &each : found_) {
-            if (each.entry.type == entry.type && qz::detail::same_folded(each.entry.identity, entry.identity))
+            if (each.entry.type == entry.type && detail::same_folded(each.entry.identity, entry.identity))
                 return each.line;
         }
         return 0;
@@ -51,17 +53,17 @@ public:
 
 private:
     struct found_entry {
-        qz::entry_fields entry;
+        entry_fields entry;
         std::size_t line;
     };
 
-    bool may_answer(const qz::entry_fields &entry) const {
+    bool may_answer(const entry_fields &entry) const {
         if (!asking_.is_user())
             return entry.type == SEC_ACLE_UNAUTHENTICATED;
         switch (entry.type) {
         case SEC_ACLE_USER:
             return entry.mechanism == asking_.mechanism() &&
-                   qz::detail::same_folded(entry.identity, asking_.identity());
+                   detail::same_folded(entry.identity, asking_.identity());
         case SEC_ACLE_EXPANDED:
             return entry.mechanism == asking_.mechanism() && handler_ != nullptr &&
                    handler_(asking_.identity().c_str(), entry.identity.data()) == 0;
@@ -85,38 +87,38 @@ struct question {
     const permission_set &set;
 };
 
-json json_of(const qz::party_answer &said, const question &about) {
+json json_of(const party_answer &said, const question &about) {
     json object;
-    object["party"] = qz::name_of(said.party);
+    object["party"] = name_of(said.party);
     if (said.has_entry()) {
         put_entry(object, about.document.file(), about.found.line_of(said.entry), said.entry, about.set);
     } else {
         for (const char *key : {"file", "line", "type", "mechanism", "identity", "permissions"})
             object[key] = nullptr;
-        if (said.party == qz::who::group)
+        if (said.party == who::group)
             object["identity"] = json_text(said.group);
     }
     object["decides"] = said.decides;
     return object;
 }
 
-json json_of(const qz::answer &made, const question &about) {
+json json_of(const answer &made, const question &about) {
     const bool wants = made.wanted() != 0;
-    const std::string_view decider = qz::name_of(made.decided_by());
+    const std::string_view decider = name_of(made.decided_by());
     json object;
     object["granted"] = json_text(about.set.letters_of(made.granted()));
     object["wanted"] = wants ? json_text(about.set.letters_of(made.wanted())) : json();
     object["allowed"] = wants ? json(made.allowed()) : json();
     object["decided_by"] = decider.empty() ? json() : json(decider);
     object["answers"] = json::array();
-    for (const qz::party_answer &each : made)
+    for (const party_answer &each : made)
         object["answers"].push_back(json_of(each, about));
     return object;
 }
 
-void print(const qz::answer &made, const question &about, output &out) {
+void print(const answer &made, const question &about, output &out) {
     std::string place;
-    const auto place_of = [&](const qz::party_answer &said) -> std::string_view {
+    const auto place_of = [&](const party_answer &said) -> std::string_view {
         return place = about.document.place(about.found.line_of(said.entry));
     };
     const auto write = [&](std::string_view line) { out.line(line.substr(0, line.size() - 1)); };
@@ -143,17 +145,17 @@ int ask(const call &call) {
 
     candidates found(*asking, handling.of(asking->mechanism()));
     reading watched;
-    watched.entry = [&](const qz::entry_fields &entry, const text_place &place) {
+    watched.entry = [&](const entry_fields &entry, const text_place &place) {
         if (place.line != 0)
             found.add(entry, place);
     };
     acl_document document(call.line.words[0], call.permissions, watched);
     document.require_compilable();
-    const qz::acl acl = document.is_compiled() ? document.take_acl() : found.compiled();
+    const acl acl = document.is_compiled() ? document.take_acl() : found.compiled();
     if (asking->is_user())
         handling.register_for(asking->mechanism());
-    const auto made = qz::decide(acl, asking->requester(), wanted,
-                                 call.line.takes_sum ? qz::order::sum : qz::order::closest);
+    const auto made =
+        decide(acl, asking->requester(), wanted, call.line.takes_sum ? order::sum : order::closest);
     require(made.code());
 
     const question about{document, found, call.permissions};

@@ -9,6 +9,8 @@
 #include <algorithm>
 #include <optional>
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
@@ -27,7 +29,7 @@ struct finding {
 
 // Why services read the text: the rules of cache_vetting in the order in which they are reported.
 const char *reason_of(const std::string &file, const struct stat &text) {
-    const std::string name = file + qz::cache_extension;
+    const std::string name = file + cache_extension;
     struct stat cache = {};
     if (stat(name.c_str(), &cache) != 0)
         return "missing";
@@ -37,9 +39,9 @@ const char *reason_of(const std::string &file, const struct stat &text) {
         return "same second";
     if (cache.st_uid != text.st_uid || cache.st_gid != text.st_gid)
         return "owner";
-    qz::posix_acl of_text;
-    qz::posix_acl of_cache;
-    if (((cache.st_mode ^ text.st_mode) & qz::permission_bits) != 0 || !of_text.read(file.c_str()) ||
+    posix_acl of_text;
+    posix_acl of_cache;
+    if (((cache.st_mode ^ text.st_mode) & permission_bits) != 0 || !of_text.read(file.c_str()) ||
         !of_cache.read(name.c_str()) || !(of_text == of_cache))
         return "mode";
     return "damaged";
@@ -53,18 +55,18 @@ finding examine(const std::string &file, const permission_set &set) {
         return {"empty", true};
     // Reads the file as services do. The library reports a missing file.
     std::uint32_t flags = 0;
-    const auto read = qz::acl::read_file(file.c_str(), nullptr, set.get(), SEC_READ_ACL_CONVERT, &flags);
+    const auto read = acl::read_file(file.c_str(), nullptr, set.get(), SEC_READ_ACL_CONVERT, &flags);
     require(read.code());
     if ((flags & SEC_READ_ACL_TEXT) != 0)
         return {reason_of(file, text)};
     finding made;
-    const auto compiled = qz::acl::read_file(file.c_str(), nullptr, set.get(), SEC_READ_ACL_TEXT);
+    const auto compiled = acl::read_file(file.c_str(), nullptr, set.get(), SEC_READ_ACL_TEXT);
     if (!compiled) {
         print_message(file + ": does not parse");
         print_recorded_error();
         return made;
     }
-    const auto is_same = qz::same(*read, *compiled);
+    const auto is_same = same(*read, *compiled);
     require(is_same.code());
     made.same = *is_same;
     return made;

@@ -14,6 +14,8 @@
 #include <sys/stat.h>
 #include <thread>
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
@@ -32,17 +34,17 @@ long rest_of_second(const std::string &path) {
     return second - now.tv_nsec;
 }
 
-int read_trees(qz::acl_text &text, sec_acltree_array &trees) {
-    qz::parsed_acle entry;
+int read_trees(acl_text &text, sec_acltree_array &trees) {
+    parsed_acle entry;
     for (;;) {
-        const qz::acl_line line = text.next(entry);
-        if (line == qz::acl_line::end)
+        const acl_line line = text.next(entry);
+        if (line == acl_line::end)
             return SEC_S_OK;
-        if (line == qz::acl_line::bad)
+        if (line == acl_line::bad)
             return text.failure();
-        if (line == qz::acl_line::none)
+        if (line == acl_line::none)
             continue;
-        if (const int result = trees.add(qz::view_of(entry)); result != SEC_S_OK)
+        if (const int result = trees.add(view_of(entry)); result != SEC_S_OK)
             return result;
     }
 }
@@ -53,7 +55,7 @@ bool is_what_services_read(const std::string &path, const sec_perm_set_t &set,
     sec_acl_buffer_t served = {};
     std::uint32_t flags = 0;
     const int result = sec_read_acl_file(path.c_str(), nullptr, &set, 0, &served, &flags);
-    const qz::owned<void> owner(served.data);
+    const owned<void> owner(served.data);
     const bool is_text = (flags & SEC_READ_ACL_TEXT) != 0;
     if (result != SEC_S_OK || compiled.length == 0)
         return result == SEC_S_OK && is_text;
@@ -62,8 +64,8 @@ bool is_what_services_read(const std::string &path, const sec_perm_set_t &set,
 }
 
 outcome compile_once(const std::string &path, const sec_perm_set_t &set) {
-    qz::vetted_file file;
-    qz::acl_text text(&set);
+    vetted_file file;
+    acl_text text(&set);
     const int opened = read_acl_text(path, file, text);
     sec_acltree_array trees(text.all());
     if (opened != SEC_S_OK || (!text.is_empty() && read_trees(text, trees) != SEC_S_OK))
@@ -72,9 +74,9 @@ outcome compile_once(const std::string &path, const sec_perm_set_t &set) {
     sec_acl_buffer_t compiled = {};
     if (has_entries && sec__acltrees_to_acl(trees.trees(), &compiled) != SEC_S_OK)
         return outcome::failed;
-    const qz::owned<void> owner(compiled.data);
-    if (has_entries && sec__cache_aclbuffer(file.path.text, &compiled, qz::cache_rewriting::always,
-                                            text.origin()) != SEC_S_OK)
+    const owned<void> owner(compiled.data);
+    if (has_entries &&
+        sec__cache_aclbuffer(file.path.text, &compiled, cache_rewriting::always, text.origin()) != SEC_S_OK)
         return outcome::failed;
     return is_what_services_read(path, set, compiled) ? outcome::counts : outcome::does_not_count;
 }

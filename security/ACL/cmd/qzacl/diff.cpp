@@ -11,6 +11,8 @@
 #include <unordered_map>
 #include <vector>
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
@@ -41,9 +43,9 @@ public:
 
     bool is_empty() const { return is_empty_; }
 
-    void remove(const qz::entry_fields &entry) { tell("- ", "remove", &entry, nullptr); }
-    void add(const qz::entry_fields &entry) { tell("+ ", "add", nullptr, &entry); }
-    void compare(const qz::entry_fields &before, const qz::entry_fields &after) {
+    void remove(const entry_fields &entry) { tell("- ", "remove", &entry, nullptr); }
+    void add(const entry_fields &entry) { tell("+ ", "add", nullptr, &entry); }
+    void compare(const entry_fields &before, const entry_fields &after) {
         if (before.permissions != after.permissions)
             tell("~ ", "alter", &before, &after);
     }
@@ -64,10 +66,9 @@ public:
     }
 
 private:
-    void tell(const char *sign, const char *change, const qz::entry_fields *before,
-              const qz::entry_fields *after) {
+    void tell(const char *sign, const char *change, const entry_fields *before, const entry_fields *after) {
         is_empty_ = false;
-        const qz::entry_fields &shown = after != nullptr ? *after : *before;
+        const entry_fields &shown = after != nullptr ? *after : *before;
         if (call_.out.is_json())
             return tell_json(change, shown, before, after);
         line_ = sign;
@@ -86,8 +87,8 @@ private:
             line_.append(sign).append(call_.permissions.letters_of(mask));
     }
 
-    void tell_json(const char *change, const qz::entry_fields &shown, const qz::entry_fields *before,
-                   const qz::entry_fields *after) {
+    void tell_json(const char *change, const entry_fields &shown, const entry_fields *before,
+                   const entry_fields *after) {
         const side &from = after != nullptr ? after_ : before_;
         const std::size_t number = from.lines.line_of(shown);
         line_.clear();
@@ -100,7 +101,7 @@ private:
         call_.out.line(line_ += '}');
     }
 
-    void append_letters_or_null(const qz::entry_fields *entry) {
+    void append_letters_or_null(const entry_fields *entry) {
         if (entry == nullptr)
             line_ += "null";
         else
@@ -121,9 +122,9 @@ void compare_sorted(const tree_entries &before, const tree_entries &after, diffe
     std::size_t a = 0;
     std::size_t b = 0;
     while (a != before.size() && b != after.size()) {
-        const qz::entry_fields one = before.in_turn(a);
-        const qz::entry_fields other = after.in_turn(b);
-        const int order = qz::detail::compare_folded(one.identity, other.identity);
+        const entry_fields one = before.in_turn(a);
+        const entry_fields other = after.in_turn(b);
+        const int order = detail::compare_folded(one.identity, other.identity);
         if (order < 0)
             found.remove(one);
         else if (order > 0)
@@ -156,27 +157,27 @@ public:
     // The place in the entries, or their number if there is none.
     std::size_t find(const char *identity) const {
         const std::uint32_t found = table_.find(hash_of(identity), [&](std::uint32_t place) {
-            return qz::compare_identities(entries_.identity(place), identity) == 0;
+            return compare_identities(entries_.identity(place), identity) == 0;
         });
-        return found == qz::identity_table::none ? entries_.size() : found;
+        return found == identity_table::none ? entries_.size() : found;
     }
 
 private:
     std::uint64_t hash_of(const char *identity) const {
-        return table_.hash(identity, qz::ordered_word(identity));
+        return table_.hash(identity, ordered_word(identity));
     }
 
     const tree_entries &entries_;
-    qz::identity_table table_;
+    identity_table table_;
 };
 
 // Compares what both chains begin with. Returns how many entries that is.
 std::size_t compare_common(const tree_entries &before, const tree_entries &after, difference_list &found) {
     std::size_t at = 0;
     for (; at < std::min(before.size(), after.size()); ++at) {
-        const qz::entry_fields one = before[at];
-        const qz::entry_fields other = after[at];
-        if (!qz::detail::same_folded(one.identity, other.identity))
+        const entry_fields one = before[at];
+        const entry_fields other = after[at];
+        if (!detail::same_folded(one.identity, other.identity))
             break;
         found.compare(one, other);
     }
@@ -194,7 +195,7 @@ void compare_chains(const tree_entries &before, const tree_entries &after, diffe
     for (std::size_t at = first; at < before.size(); ++at) {
         if (before.size() - at > fetched_ahead)
             index.fetch(before.identity(at + fetched_ahead));
-        const qz::entry_fields entry = before[at];
+        const entry_fields entry = before[at];
         const std::size_t place = index.find(before.identity(at));
         if (place == after.size()) {
             found.remove(entry);

@@ -12,6 +12,8 @@
 #include <memory>
 #include <unistd.h>
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
@@ -27,13 +29,13 @@ bool same_time(const timespec &one, const timespec &other) {
 trouble system_failure(const std::string &what) { return trouble(what + ": " + strerror(errno)); }
 
 edited_file::edited_file(const std::string &path) : path_(path) {
-    const qz::owned<char> real(realpath(path.c_str(), nullptr));
+    const owned<char> real(realpath(path.c_str(), nullptr));
     if (real == nullptr)
         throw system_failure("cannot find " + path);
     const std::string found = real.get();
     const std::size_t slash = found.rfind('/');
     leaf_ = found.substr(slash + 1);
-    folder_ = qz::descriptor(open(found.substr(0, slash + 1).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    folder_ = descriptor(open(found.substr(0, slash + 1).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     if (!folder_)
         throw system_failure("cannot open the folder of " + path);
 }
@@ -42,7 +44,7 @@ void edited_file::read() {
     // Tries again if the file is replaced by rename between these two calls.
     constexpr int most_attempts = 50;
     for (int left = most_attempts; left != 0; --left) {
-        file_ = qz::descriptor(openat(folder_.get(), leaf_.c_str(), reading));
+        file_ = descriptor(openat(folder_.get(), leaf_.c_str(), reading));
         if (!file_)
             throw system_failure("cannot open " + path_);
         if (fstat(file_.get(), &status_) != 0)
@@ -59,9 +61,9 @@ void edited_file::read() {
 
 bool edited_file::is_as_read() const {
     struct stat now = {};
-    return fstatat(folder_.get(), leaf_.c_str(), &now, AT_SYMLINK_NOFOLLOW) == 0 &&
-           qz::same_file(now, status_) && now.st_size == status_.st_size &&
-           same_time(now.st_mtim, status_.st_mtim) && same_time(now.st_ctim, status_.st_ctim);
+    return fstatat(folder_.get(), leaf_.c_str(), &now, AT_SYMLINK_NOFOLLOW) == 0 && same_file(now, status_) &&
+           now.st_size == status_.st_size && same_time(now.st_mtim, status_.st_mtim) &&
+           same_time(now.st_ctim, status_.st_ctim);
 }
 
 } // namespace qzacl

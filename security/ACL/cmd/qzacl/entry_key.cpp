@@ -14,17 +14,19 @@
 #include <cctype>
 #include <memory>
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
 
-char folded_byte(char c) { return static_cast<char>(qz::fold(static_cast<unsigned char>(c))); }
+char folded_byte(char c) { return static_cast<char>(fold(static_cast<unsigned char>(c))); }
 
 std::uint8_t type_of(std::string_view word) {
     constexpr std::uint8_t types[] = {SEC_ACLE_UNAUTHENTICATED, SEC_ACLE_ANYOTHER, SEC_ACLE_USER,
                                       SEC_ACLE_EXPANDED, SEC_ACLE_GROUP};
     for (const std::uint8_t type : types) {
-        if (word.size() == 1 && folded_byte(word[0]) == qz::type_letter(type))
+        if (word.size() == 1 && folded_byte(word[0]) == type_letter(type))
             return type;
     }
     return 0;
@@ -33,8 +35,8 @@ std::uint8_t type_of(std::string_view word) {
 // True when the line that a word is put into gives it back as one word.
 bool is_word(const std::string &word) {
     std::string line = word;
-    qz::line_words tokens(line.data(), line.data() + line.size());
-    qz::line_word first;
+    line_words tokens(line.data(), line.data() + line.size());
+    line_word first;
     return word.find_first_of(std::string_view("\n\f\r\0", 4)) == std::string::npos && tokens.next(first) &&
            first.length == word.size();
 }
@@ -53,7 +55,7 @@ std::string plain(std::string text) {
 
 void find_stored_form(entry_key &key) {
     key.stored = key.identity;
-    if (!qz::has_identity(key.type))
+    if (!has_identity(key.type))
         return;
     const std::string identity = plain(key.identity);
     sec_acle_t *made = nullptr;
@@ -79,18 +81,17 @@ void read_entry_key(std::span<const std::string> words, entry_key &key, std::str
     if (key.type == 0)
         throw wrong_use("an entry begins with n, o, u, e or g");
 
-    const std::size_t needed =
-        1U + (qz::has_mechanism(key.type) ? 1U : 0U) + (qz::has_identity(key.type) ? 1U : 0U);
+    const std::size_t needed = 1U + (has_mechanism(key.type) ? 1U : 0U) + (has_identity(key.type) ? 1U : 0U);
     if (words.size() < needed)
         throw wrong_use("words are missing behind \"" + words.back() + "\"");
     if (words.size() > needed + (letters == nullptr ? 0U : 1U))
         throw wrong_use("\"" + words.back() + "\" is a word too many");
-    if (qz::has_mechanism(key.type)) {
+    if (has_mechanism(key.type)) {
         key.mechanism = folded(words[1]);
-        if (key.mechanism.size() > qz::mechanism_max)
+        if (key.mechanism.size() > mechanism_max)
             throw wrong_use("\"" + words[1] + "\" is longer than the 16 bytes of a mechanism");
     }
-    if (qz::has_identity(key.type))
+    if (has_identity(key.type))
         key.identity = words[needed - 1];
     if (letters != nullptr && words.size() > needed)
         *letters = words[needed];

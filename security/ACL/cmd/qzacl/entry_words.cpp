@@ -6,11 +6,13 @@
 #include <charconv>
 #include <iterator>
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
 
-char folded(char c) { return static_cast<char>(qz::detail::fold(c)); }
+char folded(char c) { return static_cast<char>(detail::fold(c)); }
 
 json text_or_null(std::string_view text) { return text.empty() ? json() : json_text(text); }
 
@@ -23,16 +25,16 @@ std::string folded(std::string_view text) {
     return made;
 }
 
-std::string key_of(const qz::entry_fields &entry) {
-    std::string key(1, qz::type_letter(entry.type));
+std::string key_of(const entry_fields &entry) {
+    std::string key(1, type_letter(entry.type));
     key += folded(entry.mechanism);
     key += '\0';
     key += folded(entry.identity);
     return key;
 }
 
-void append_key(std::string &line, const qz::entry_fields &entry) {
-    line += qz::type_letter(entry.type);
+void append_key(std::string &line, const entry_fields &entry) {
+    line += type_letter(entry.type);
     if (!entry.mechanism.empty()) {
         line.append(" ").append(entry.mechanism);
         for (std::size_t at = line.size() - entry.mechanism.size(); at < line.size(); ++at)
@@ -42,18 +44,18 @@ void append_key(std::string &line, const qz::entry_fields &entry) {
         line.append(" ").append(entry.identity);
 }
 
-void append_entry(std::string &line, const qz::entry_fields &entry, const permission_set &set) {
+void append_entry(std::string &line, const entry_fields &entry, const permission_set &set) {
     const std::string_view letters = set.letters_of(entry.permissions);
     append_key(line, entry);
     if (!letters.empty())
         line.append(" ").append(letters);
 }
 
-void put_entry(json &object, const std::string &file, std::size_t line, const qz::entry_fields &entry,
+void put_entry(json &object, const std::string &file, std::size_t line, const entry_fields &entry,
                const permission_set &set) {
     object["file"] = json_text(file);
     object["line"] = line != 0 ? json(line) : json();
-    object["type"] = std::string(1, qz::type_letter(entry.type));
+    object["type"] = std::string(1, type_letter(entry.type));
     object["mechanism"] = text_or_null(folded(entry.mechanism));
     object["identity"] = text_or_null(entry.identity);
     object["permissions"] = json_text(set.letters_of(entry.permissions));
@@ -64,7 +66,7 @@ entry_json::entry_json(const std::string &file, const permission_set &set) : set
     head_ += ",\"line\":";
 }
 
-void entry_json::append(std::string &line, std::size_t number, const qz::entry_fields &entry) {
+void entry_json::append(std::string &line, std::size_t number, const entry_fields &entry) {
     if (entry.type != type_ || entry.mechanism.data() != mechanism_.data())
         name(entry.type, entry.mechanism);
     line += head_;
@@ -85,7 +87,7 @@ void entry_json::name(std::uint8_t type, std::string_view mechanism) {
     type_ = type;
     mechanism_ = mechanism;
     middle_ = ",\"type\":\"";
-    middle_.append(1, qz::type_letter(type)).append("\",\"mechanism\":");
+    middle_.append(1, type_letter(type)).append("\",\"mechanism\":");
     middle_.append(text_or_null(folded(mechanism)).dump()).append(",\"identity\":\"");
 }
 
@@ -105,7 +107,7 @@ void append_number(std::string &line, std::size_t number) {
     line.append(digits, static_cast<std::size_t>(end - digits));
 }
 
-sec_acle_t record_of(const qz::entry_fields &entry) {
+sec_acle_t record_of(const entry_fields &entry) {
     sec_acle_t record = {};
     if (entry.mechanism.size() >= sizeof record.mechanism)
         throw trouble("a mechanism has more than 16 bytes");

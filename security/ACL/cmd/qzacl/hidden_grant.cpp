@@ -3,6 +3,8 @@
 
 #include "entry_words.h"
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
@@ -19,7 +21,7 @@ bool is_host_of(std::string_view identity, std::string_view entry) {
            same_identity(host.substr(host.size() - entry.size()), entry);
 }
 
-bool answers_for(const qz::entry_fields &entry, const entry_key &key) {
+bool answers_for(const entry_fields &entry, const entry_key &key) {
     if (entry.type == SEC_ACLE_ANYOTHER)
         return key.type == SEC_ACLE_USER || key.type == SEC_ACLE_EXPANDED || key.type == SEC_ACLE_GROUP;
     return key.type == SEC_ACLE_USER && entry.type == SEC_ACLE_EXPANDED && entry.mechanism == key.mechanism &&
@@ -37,7 +39,7 @@ struct answer {
 std::string hidden_by(const named_text &text, const permission_set &set, const text_change &change) {
     answer found;
     reading watched;
-    watched.entry = [&](const qz::entry_fields &entry, const text_place &place) {
+    watched.entry = [&](const entry_fields &entry, const text_place &place) {
         if (found.type == SEC_ACLE_EXPANDED || !answers_for(entry, change.key))
             return;
         found = {entry.type, entry.permissions, text.name + ":" + std::to_string(place.line) + ": "};

@@ -11,6 +11,8 @@
 #include <unordered_set>
 #include <vector>
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
@@ -19,7 +21,7 @@ struct warning {
     const char *name;
     std::string text;
     std::size_t line;
-    qz::entry_fields entry; // of type 0 where it is about no entry
+    entry_fields entry; // of type 0 where it is about no entry
 };
 
 bool names_hosts(std::string_view mechanism) { return mechanism == "unix" || mechanism == "hba2"; }
@@ -39,10 +41,9 @@ class linter {
 public:
     // `document` is known once it is read.
     reading watched() {
-        return {
-            .entry = [this](const qz::entry_fields &entry, const text_place &place) { look(entry, place); },
-            .whole_text = [this](std::string_view text) { look_for_crlf(text); },
-            .names_file = true};
+        return {.entry = [this](const entry_fields &entry, const text_place &place) { look(entry, place); },
+                .whole_text = [this](std::string_view text) { look_for_crlf(text); },
+                .names_file = true};
     }
 
     // By line; what is about the whole file comes first in its line.
@@ -61,7 +62,7 @@ private:
         found_.push_back({"crlf", "lines end in CR LF", static_cast<std::size_t>(line), {}});
     }
 
-    void look(const qz::entry_fields &entry, const text_place &place) {
+    void look(const entry_fields &entry, const text_place &place) {
         const auto warn = [&](const char *name, const std::string &text) {
             found_.push_back({name, text, place.line, entry});
         };
@@ -78,7 +79,7 @@ private:
     }
 
     template <class Warn>
-    static void look_at_host(const qz::entry_fields &entry, const Warn &warn) {
+    static void look_at_host(const entry_fields &entry, const Warn &warn) {
         const std::size_t at = entry.identity.find('@');
         if (at == std::string_view::npos && entry.type == SEC_ACLE_USER)
             return warn("no-host", "matches nobody: a user of this mechanism is USER@HOST");
@@ -86,7 +87,7 @@ private:
         if (host.empty())
             return warn("no-host", "matches nobody: there is no host behind the @");
         const std::string form = one_form_of(host);
-        if (!form.empty() && !qz::detail::same_folded(form, host))
+        if (!form.empty() && !detail::same_folded(form, host))
             warn("ipv6-form", "matches nobody: the address is compared as " + form);
     }
 

@@ -10,6 +10,8 @@
 #include <thread>
 #include <unistd.h>
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
@@ -44,10 +46,10 @@ lock_file::lock_file(const edited_file &file, std::chrono::seconds wait)
 bool lock_file::open_or_make(const edited_file &file) {
     constexpr auto any_group = static_cast<gid_t>(-1);
     constexpr int how = O_RDWR | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
-    file_ = qz::descriptor(openat(folder_, name_.c_str(), how | O_CREAT | O_EXCL, owner_alone));
+    file_ = descriptor(openat(folder_, name_.c_str(), how | O_CREAT | O_EXCL, owner_alone));
     const bool is_new = static_cast<bool>(file_);
     if (!is_new && errno == EEXIST)
-        file_ = qz::descriptor(openat(folder_, name_.c_str(), how));
+        file_ = descriptor(openat(folder_, name_.c_str(), how));
     if (!file_ && errno == ENOENT)
         return false;
     struct stat status = {};
@@ -69,7 +71,7 @@ bool lock_file::is_named() const {
     struct stat held = {};
     struct stat named = {};
     return fstat(file_.get(), &held) == 0 &&
-           fstatat(folder_, name_.c_str(), &named, AT_SYMLINK_NOFOLLOW) == 0 && qz::same_file(held, named);
+           fstatat(folder_, name_.c_str(), &named, AT_SYMLINK_NOFOLLOW) == 0 && same_file(held, named);
 }
 
 lock_file::~lock_file() {

@@ -4,15 +4,17 @@
 #include "entry_words.h"
 #include "trouble.h"
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
 
 sec_id_compare_fn handler_named(const std::string &name) {
     if (name == "domain")
-        return qz::domain_handler;
+        return domain_handler;
     if (name == "exact")
-        return qz::exact_handler;
+        return exact_handler;
     if (name != "none")
         throw wrong_use("--handler is MECH=domain, MECH=exact or MECH=none");
     return nullptr;
@@ -33,7 +35,7 @@ handlers::handlers(const std::vector<std::string> &words) {
 
 sec_id_compare_fn handlers::of(const std::string &mechanism) const {
     const auto found = named_.find(mechanism);
-    return found == named_.end() ? qz::domain_handler : found->second;
+    return found == named_.end() ? domain_handler : found->second;
 }
 
 void handlers::register_for(const std::string &mechanism) const {
@@ -43,18 +45,18 @@ void handlers::register_for(const std::string &mechanism) const {
 
 party::party(const std::string &mechanism, const std::string &identity, std::vector<std::string> groups)
     : is_user_(true), mechanism_(folded(mechanism)), groups_(std::move(groups)) {
-    qz::text kept;
-    identity_ = qz::stored_identity(mechanism_.c_str(), identity.c_str(), kept);
+    text kept;
+    identity_ = stored_identity(mechanism_.c_str(), identity.c_str(), kept);
     if (kept.failed())
         throw std::bad_alloc();
     for (const std::string &group : groups_)
         group_refs_.push_back({0, group.c_str()});
 }
 
-qz::requester party::requester() const {
+requester party::requester() const {
     if (!is_user_)
-        return qz::requester::unauthenticated();
-    return qz::requester::user(mechanism_.c_str(), identity_.c_str()).in_groups(group_refs_);
+        return requester::unauthenticated();
+    return requester::user(mechanism_.c_str(), identity_.c_str()).in_groups(group_refs_);
 }
 
 } // namespace qzacl

@@ -13,6 +13,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
@@ -63,7 +65,7 @@ private_folder::~private_folder() {
 private_copy::private_copy(const std::string &name, std::string_view text)
     : path_(folder_.path() + "/" + name) {
     constexpr mode_t owner_alone = 0600;
-    const qz::descriptor file(open(path_.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, owner_alone));
+    const descriptor file(open(path_.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, owner_alone));
     if (!file)
         throw system_failure("cannot make " + path_);
     if (!write_all(file.get(), text))
@@ -89,7 +91,7 @@ void private_copy::edit() const {
 }
 
 std::string private_copy::text() const {
-    const qz::descriptor file(open(path_.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC));
+    const descriptor file(open(path_.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC));
     if (!file)
         throw system_failure("cannot open " + path_);
     return read_whole(file.get(), path_);

@@ -13,6 +13,8 @@
 #include <sys/xattr.h>
 #include <unistd.h>
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
@@ -25,7 +27,7 @@ public:
         constexpr int making = O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
         constexpr mode_t owner_alone = 0600;
         unlinkat(folder_, name_.c_str(), 0);
-        file_ = qz::descriptor(openat(folder_, name_.c_str(), making, owner_alone));
+        file_ = descriptor(openat(folder_, name_.c_str(), making, owner_alone));
         if (!file_)
             throw system_failure("cannot make a new file beside " + file.path());
     }
@@ -47,7 +49,7 @@ public:
 private:
     int folder_;
     std::string name_;
-    qz::descriptor file_;
+    descriptor file_;
     bool has_moved_ = false;
 };
 
@@ -91,7 +93,7 @@ void copy_attributes(int from, int to) {
 
 // The mode comes last, since giving a file away clears bits of it.
 void protect_like(const edited_file &file, int fd) {
-    qz::posix_acl entries;
+    posix_acl entries;
     const struct stat &status = file.status();
     if (fchown(fd, status.st_uid, status.st_gid) != 0)
         throw system_failure("cannot keep the owner of " + file.path());
@@ -108,7 +110,7 @@ void protect_like(const edited_file &file, int fd) {
 void replace_file(const edited_file &file, std::string_view bytes) {
     new_file made(file);
     // What it inherits from its folder, the file that it replaces may not have.
-    if (!qz::remove_posix_acl(made.fd()))
+    if (!remove_posix_acl(made.fd()))
         throw system_failure("cannot protect the new file");
     if (!write_all(made.fd(), bytes))
         throw system_failure("cannot write the new file");

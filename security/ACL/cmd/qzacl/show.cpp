@@ -6,6 +6,8 @@
 #include "qzacl_acl/entry_parser.h"
 #include "trouble.h"
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
@@ -15,14 +17,14 @@ class line_checker {
 public:
     explicit line_checker(const permission_set &set) : set_(set) {}
 
-    void require_readable(const qz::entry_fields &entry) {
+    void require_readable(const entry_fields &entry) {
         const bool has_mechanism = (entry.type & (SEC_ACLE_USER | SEC_ACLE_EXPANDED)) != 0;
         const bool has_identity = has_mechanism || entry.type == SEC_ACLE_GROUP;
-        const bool has_words = (!has_mechanism || qz::detail::is_word(entry.mechanism)) &&
-                               (!has_identity || qz::detail::is_word(entry.identity));
+        const bool has_words = (!has_mechanism || detail::is_word(entry.mechanism)) &&
+                               (!has_identity || detail::is_word(entry.identity));
         line_.clear();
         append_entry(line_, entry, set_);
-        if (!has_words || line_.size() + 1 > qz::line_length_max || !leads_back(entry.permissions))
+        if (!has_words || line_.size() + 1 > line_length_max || !leads_back(entry.permissions))
             throw trouble("no line can hold the entry: " + line_);
     }
 
@@ -30,7 +32,7 @@ private:
     // Letters that two permissions share do not lead back to the second one.
     bool leads_back(std::uint32_t mask) const {
         const std::string letters(set_.letters_of(mask));
-        return mask == 0 || (qz::detail::is_word(letters) && set_.mask_of(letters) == mask);
+        return mask == 0 || (detail::is_word(letters) && set_.mask_of(letters) == mask);
     }
 
     const permission_set &set_;
@@ -55,11 +57,11 @@ int show(const call &call) {
     if (document.is_compiled()) {
         line_checker checker(call.permissions);
         for_each_entry(document, numbers,
-                       [&](const qz::entry_fields &entry) { checker.require_readable(entry); });
+                       [&](const entry_fields &entry) { checker.require_readable(entry); });
     }
     entry_json as_json(document.file(), call.permissions);
     std::string lines;
-    for_each_entry(document, numbers, [&](const qz::entry_fields &entry) {
+    for_each_entry(document, numbers, [&](const entry_fields &entry) {
         if (is_json)
             as_json.append(lines, numbers.line_of(entry), entry);
         else

@@ -10,6 +10,8 @@
 #include <set>
 #include <sstream>
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
@@ -18,7 +20,7 @@ class tester {
 public:
     tester(const call &call, acl_document &document)
         : call_(call), file_(call.line.words[1]), handlers_(call.line.handlers), acl_(document.take_acl()),
-          order_(call.line.takes_sum ? qz::order::sum : qz::order::closest) {}
+          order_(call.line.takes_sum ? order::sum : order::closest) {}
 
     // Checks the case in a line.
     void try_line(std::size_t number, std::string_view line) {
@@ -66,7 +68,7 @@ private:
     }
 
     std::uint32_t granted_to(const party &asking) const {
-        const qz::decision made = qz::granted(acl_, asking.requester(), order_);
+        const decision made = granted(acl_, asking.requester(), order_);
         require(made.failed() ? made.code() : SEC_S_OK);
         return made.permissions();
     }
@@ -106,8 +108,8 @@ private:
     std::string file_;
     handlers handlers_;
     std::set<std::string> has_handler_;
-    qz::acl acl_;
-    qz::order order_;
+    acl acl_;
+    order order_;
     std::size_t passed_ = 0;
     std::size_t failed_ = 0;
     std::size_t unasked_ = 0;

@@ -9,6 +9,8 @@
 
 #include <algorithm>
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
@@ -42,10 +44,10 @@ std::string with_letters(std::string_view text, const found_entry &entry, std::u
     const std::size_t begin = entry.place.begin;
     std::string line(text.substr(begin, entry.place.end - begin));
     const std::size_t line_end = line.find_last_not_of(line_ends) + 1;
-    qz::line_words tokens(line.data(), line.data() + line_end);
-    qz::line_word last;
-    qz::line_word word;
-    const int words = 1 + (qz::has_mechanism(type) ? 1 : 0) + (qz::has_identity(type) ? 1 : 0);
+    line_words tokens(line.data(), line.data() + line_end);
+    line_word last;
+    line_word word;
+    const int words = 1 + (has_mechanism(type) ? 1 : 0) + (has_identity(type) ? 1 : 0);
     for (int left = words; left != 0 && tokens.next(word); --left)
         last = word;
     const std::string_view view(line);
@@ -76,7 +78,7 @@ std::string with_line(std::string_view text, const std::string &words) {
     return std::string(text).insert(place, added);
 }
 
-bool matches(const qz::entry_fields &entry, const entry_key &key, const std::string &identity) {
+bool matches(const entry_fields &entry, const entry_key &key, const std::string &identity) {
     return entry.type == key.type && entry.mechanism == key.mechanism &&
            same_identity(entry.identity, identity);
 }
@@ -109,7 +111,7 @@ std::optional<found_entry> find_entry(const named_text &text, const permission_s
     std::optional<found_entry> written;
     std::optional<found_entry> stored;
     reading watched;
-    watched.entry = [&](const qz::entry_fields &entry, const text_place &place) {
+    watched.entry = [&](const entry_fields &entry, const text_place &place) {
         if (matches(entry, key, key.identity))
             written = {place, entry.permissions};
         else if (matches(entry, key, key.stored))

@@ -7,10 +7,12 @@
 #include <cstdio>
 #include <unistd.h>
 
+using namespace qz;
+
 namespace qzacl {
 
 void print_recorded_error() {
-    static_cast<void>(qz::print_recorded(stderr, "\n"));
+    static_cast<void>(print_recorded(stderr, "\n"));
     std::fflush(stderr);
 }
 

@@ -4,6 +4,8 @@
 #include "entry_words.h"
 #include "trouble.h"
 
+using namespace qz;
+
 namespace qzacl {
 
 int who(const call &call) {
@@ -13,7 +15,7 @@ int who(const call &call) {
     bool is_empty = true;
     entry_json as_json(file, call.permissions);
     reading watched;
-    watched.entry = [&](const qz::entry_fields &entry, const text_place &place) {
+    watched.entry = [&](const entry_fields &entry, const text_place &place) {
         if ((entry.permissions & wanted) != wanted)
             return;
         is_empty = false;

@@ -8,14 +8,16 @@
 #include <cstring>
 #include <unistd.h>
 
+using namespace qz;
+
 namespace qzacl {
 
 namespace {
 
-constexpr qz::acl_file_use by_companion = {
-    .not_found = {SEC_S_BAD_FILENAME, qz::msg::bad_acl_file_name},
-    .not_private = {SEC_S_BAD_PERMISSION, qz::msg::acl_file_not_private},
-    .cannot_open = {SEC_S_FILE_ERROR, qz::msg::cannot_open_acl_file},
+constexpr acl_file_use by_companion = {
+    .not_found = {SEC_S_BAD_FILENAME, msg::bad_acl_file_name},
+    .not_private = {SEC_S_BAD_PERMISSION, msg::acl_file_not_private},
+    .cannot_open = {SEC_S_FILE_ERROR, msg::cannot_open_acl_file},
     .takes_empty_of_anybody = false,
     .is_traced = false,
 };
@@ -27,7 +29,7 @@ constexpr qz::acl_file_use by_companion = {
 std::string read_whole(const std::string &name) {
     if (name == standard_input)
         return read_whole(STDIN_FILENO, name);
-    const qz::descriptor opened = qz::open_file(name.c_str(), O_RDONLY);
+    const descriptor opened = open_file(name.c_str(), O_RDONLY);
     if (!opened)
         fail(name);
     return read_whole(opened.get(), name);
@@ -48,9 +50,9 @@ std::string read_whole(int fd, const std::string &name) {
     }
 }
 
-int read_acl_text(const std::string &path, qz::vetted_file &file, qz::acl_text &text) {
+int read_acl_text(const std::string &path, vetted_file &file, acl_text &text) {
     return text.open_again_while_replaced([&] {
-        const int found = qz::vet_acl_file(path.c_str(), nullptr, by_companion, file);
+        const int found = vet_acl_file(path.c_str(), nullptr, by_companion, file);
         return found != SEC_S_OK ? found : text.open(file, by_companion);
     });
 }
