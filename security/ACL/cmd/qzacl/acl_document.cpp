@@ -7,6 +7,7 @@
 #include "trouble.h"
 #include "whole_file.h"
 
+#include <algorithm>
 #include <cstring>
 #include <vector>
 
@@ -247,8 +248,9 @@ void for_each_stored(const acl &acl, const std::function<void(const entry_fields
     format::subacl_walk walk(format::bytes_of(*acl.get()));
     while (walk.next() == format::subacl_walk::step::found)
         subacls.push_back(walk.bytes());
-    for (auto bytes = subacls.rbegin(); bytes != subacls.rend(); ++bytes) {
-        byte_reader reader(*bytes);
+    std::reverse(subacls.begin(), subacls.end());
+    for (const byte_span bytes : subacls) {
+        byte_reader reader(bytes);
         format::subacl head;
         if (!format::read(reader, head))
             continue;

@@ -68,7 +68,7 @@ private:
             return entry.mechanism == asking_.mechanism() && handler_ != nullptr &&
                    handler_(asking_.identity().c_str(), entry.identity.data()) == 0;
         case SEC_ACLE_GROUP:
-            return !groups_.empty() && groups_.count(folded(entry.identity)) != 0;
+            return !groups_.empty() && groups_.contains(folded(entry.identity));
         default:
             return entry.type == SEC_ACLE_ANYOTHER;
         }
