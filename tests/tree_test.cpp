@@ -46,7 +46,9 @@ TEST(tree, is_named_by_its_topmost_entry) {
         sec_acltree_t *root = nullptr;
         for (const std::string &name : words(inserted)) {
             const sec_acle_t acle = acle_of(type, name.c_str());
-            EXPECT_EQ(faults::patiently([&] { return sec__add_acle_to_tree(1, &acle, &root); }), SEC_S_OK);
+            EXPECT_EQ(faults::patiently(
+                          [&] { return sec__add_acle_to_tree(qz::on_duplicate::report, &acle, &root); }),
+                      SEC_S_OK);
         }
         const qz::owned_acltree owner(root);
         buffer most, refused;
@@ -78,7 +80,7 @@ TEST(tree, is_released_in_post_order) {
         sec_acltree_t *root = nullptr;
         for (const std::string &name : words(inserted)) {
             const sec_acle_t acle = entry(type, "unix", name.c_str(), 0);
-            EXPECT_EQ(sec__add_acle_to_tree(1, &acle, &root), SEC_S_OK);
+            EXPECT_EQ(sec__add_acle_to_tree(qz::on_duplicate::report, &acle, &root), SEC_S_OK);
         }
         const qz::owned_acltree owner(root);
         arguments found;
@@ -122,7 +124,7 @@ TEST(tree, takes_more_entries_after_it_was_compiled) {
         sec_acltree_t *root = nullptr;
         const auto add = [&](const std::string &name) {
             const sec_acle_t acle = entry(SEC_ACLE_GROUP, "", name.c_str(), 1);
-            return sec__add_acle_to_tree(1, &acle, &root);
+            return sec__add_acle_to_tree(qz::on_duplicate::report, &acle, &root);
         };
         const auto name_of = [](int number) { return "common-" + std::to_string(1000 + number); };
         for (int number = count; number != 0; --number)
@@ -150,12 +152,12 @@ TEST(tree, is_released_from_its_leaves_up) {
         sec_acltree_t *root = nullptr;
         for (const std::string &name : words(inserted)) {
             const sec_acle_t acle = entry(type, "sixteen-bytes-xx", name.c_str(), 1);
-            EXPECT_EQ(sec__add_acle_to_tree(1, &acle, &root), SEC_S_OK);
+            EXPECT_EQ(sec__add_acle_to_tree(qz::on_duplicate::report, &acle, &root), SEC_S_OK);
         }
         const std::string first(inserted, 1);
         sec_acle_t again = entry(type, "sixteen-bytes-xx", first.c_str(), 2);
         again.mechanism[16] = 'x'; // in place of the NUL, as a caller may fill the array
-        EXPECT_EQ(sec__add_acle_to_tree(0, &again, &root), SEC_S_OK);
+        EXPECT_EQ(sec__add_acle_to_tree(qz::on_duplicate::replace_mask, &again, &root), SEC_S_OK);
         sec__free_acltree(root);
     }
 }
@@ -184,7 +186,8 @@ TEST(tree, asks_for_no_less_memory_than_it_means) {
 TEST(tree, takes_no_memory_for_a_comment) {
     constexpr std::size_t line_size = 4;
     std::string text;
-    for (char name = 'z'; name >= 'a'; --name) text += "g "s + name + '\0';
+    for (char name = 'z'; name >= 'a'; --name)
+        text += "g "s + name + '\0';
     const std::size_t count = text.size() / line_size;
     text.append(std::size_t{1} << 22, '#');
     std::size_t most = 0;

@@ -4,6 +4,13 @@
 
 #include "qzacl_acl/entry.h"
 
+namespace qz {
+
+// What adding an entry does when its key already has an entry with its identity.
+enum class on_duplicate : std::uint8_t { replace_mask, report };
+
+} // namespace qz
+
 // Records that no entry matches the given one. Returns `code`, SEC_S_ACLE_NOT_FOUND or SEC_S_BAD_ACLE.
 int sec__acle_not_found(int code, const qz::acle_view &acle);
 

@@ -88,7 +88,8 @@ int expand(byte_reader reader, const format::subacl &head, sec_acltree_t **root)
             if (acle.identity.data() == nullptr)
                 return report_corrupt(__LINE__);
         }
-        if (const int result = sec__add_acle_to_tree(0, acle, root); result != SEC_S_OK)
+        if (const int result = sec__add_acle_to_tree(on_duplicate::replace_mask, acle, root);
+            result != SEC_S_OK)
             return result;
         if (is_traced)
             sec__trace_release(&acle, acle);
@@ -187,7 +188,7 @@ int sec__acltree_to_aclelist(sec_acltree_t *root, sec_aclelist_t *list) {
         const acle_view held = root->view(entry);
         sec_acle_t *made = nullptr;
         const int result = sec__create_acle(held.type, held.perm_mask, held.mechanism.data(),
-                                            held.identity.data(), 0, &made);
+                                            held.identity.data(), strings_in::utf8, &made);
         if (result != SEC_S_OK) {
             // A list without entries owns no array.
             if (list->count == 0)

@@ -80,7 +80,7 @@ int replace_subacl(const loose_subacl &compiled, const stored_subacl &stored, co
     return SEC_S_OK;
 }
 
-int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_subacl &stored,
+int add_by_tree(const sec_acle_t &acle, on_duplicate handling, const stored_subacl &stored,
                 sec_acl_buffer_t &acl) {
     sec_acltree_t *root = nullptr;
     if (stored.is_there) {
@@ -88,7 +88,7 @@ int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_suba
         if (result != SEC_S_OK)
             return result;
     }
-    int result = sec__add_acle_to_tree(report_duplicates, &acle, &root);
+    int result = sec__add_acle_to_tree(handling, &acle, &root);
     const owned_acltree tree(root);
     loose_subacl compiled;
     if (result == SEC_S_OK)
@@ -106,7 +106,7 @@ int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_suba
     return replaced;
 }
 
-int add_to_buffer(const sec_acle_t &acle, int report_duplicates, sec_acl_buffer_t &acl) {
+int add_to_buffer(const sec_acle_t &acle, on_duplicate handling, sec_acl_buffer_t &acl) {
     stored_subacl stored;
     if (const int result = find_edited(acl, acle, stored); result != SEC_S_OK)
         return result;
@@ -115,11 +115,11 @@ int add_to_buffer(const sec_acle_t &acle, int report_duplicates, sec_acl_buffer_
     packed_place place;
     if (stored.is_there && find_packed(acl, stored, acle, place) &&
         std::strlen(acle.identity) <= format::identity_max)
-        return add_packed(acle, report_duplicates, stored, place, acl);
-    return add_by_tree(acle, report_duplicates, stored, acl);
+        return add_packed(acle, handling, stored, place, acl);
+    return add_by_tree(acle, handling, stored, acl);
 }
 
-int add_checked(const sec_acle_t *acle, int report_duplicates, sec_acl_buffer_t *acl) {
+int add_checked(const sec_acle_t *acle, on_duplicate handling, sec_acl_buffer_t *acl) {
     if (acle == nullptr)
         return report_bad_parameter(add_function, 1, 0);
     if (acl == nullptr)
@@ -128,7 +128,7 @@ int add_checked(const sec_acle_t *acle, int report_duplicates, sec_acl_buffer_t 
         return result;
     if (acl->data != nullptr) {
         const int result = check_header(*acl);
-        return result == SEC_S_OK ? add_to_buffer(*acle, report_duplicates, *acl) : result;
+        return result == SEC_S_OK ? add_to_buffer(*acle, handling, *acl) : result;
     }
 
     auto memory = allocate<unsigned char>(format::header_size);
@@ -136,7 +136,7 @@ int add_checked(const sec_acle_t *acle, int report_duplicates, sec_acl_buffer_t 
         return report_no_memory(add_function, format::header_size);
     std::memcpy(memory.get(), format::empty_acl, format::header_size);
     sec_acl_buffer_t made = {format::header_size, memory.release()};
-    const int result = add_to_buffer(*acle, report_duplicates, made);
+    const int result = add_to_buffer(*acle, handling, made);
     if (result != SEC_S_OK) {
         std::free(made.data);
         made = {};
@@ -186,19 +186,19 @@ int delete_checked(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
     return delete_by_tree(*acle, stored, *acl);
 }
 
-int sec__add_acle_to_acl(int report_duplicates, const sec_acle_t *acle, sec_acl_buffer_t *acl) {
+int sec__add_acle_to_acl(on_duplicate handling, const sec_acle_t *acle, sec_acl_buffer_t *acl) {
     return run(operation::add_acle_to_acl, std::tie(acle, acl),
-               [&] { return add_checked(acle, report_duplicates, acl); });
+               [&] { return add_checked(acle, handling, acl); });
 }
 
 } // namespace
 
 int sec_add_acle_to_acl(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
-    return sec__add_acle_to_acl(0, acle, acl);
+    return sec__add_acle_to_acl(on_duplicate::replace_mask, acle, acl);
 }
 
 int sec_add_acle_to_acl2(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
-    return sec__add_acle_to_acl(1, acle, acl);
+    return sec__add_acle_to_acl(on_duplicate::report, acle, acl);
 }
 
 int sec_del_acle_from_acl(const sec_acle_t *acle, sec_acl_buffer_t *acl) {

@@ -1,7 +1,6 @@
 // The proof that entries are as compiling gives them, and the changes that it allows.
 #include "qzacl_acl/edit_packed.h"
 
-#include "qzacl_acl/acle_report.h"
 #include "qzacl_acl/packed_identity.h"
 #include "qzacl_acl/splice.h"
 #include "qzacl_trace.h"
@@ -107,10 +106,10 @@ bool find_packed(const sec_acl_buffer_t &acl, const stored_subacl &stored, const
                        acle.identity, place);
 }
 
-int add_packed(const sec_acle_t &acle, int report_duplicates, const stored_subacl &stored,
+int add_packed(const sec_acle_t &acle, on_duplicate handling, const stored_subacl &stored,
                const packed_place &place, sec_acl_buffer_t &acl) {
     if (place.size != 0) {
-        if (report_duplicates != 0)
+        if (handling == on_duplicate::report)
             return sec__report_duplicate(view_of(acle));
         store_field(writable_bytes(acl), stored.offset + place.offset + format::entry_mask_offset,
                     acle.perm_mask);

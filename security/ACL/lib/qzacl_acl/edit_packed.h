@@ -7,6 +7,7 @@
 #define QZACL_EDIT_PACKED_H
 
 #include "qz/acl.h"
+#include "qzacl_acl/acle_report.h"
 #include "qzacl_acl/buffer.h"
 
 #include <cstddef>
@@ -24,9 +25,9 @@ struct packed_place {
 bool find_packed(const sec_acl_buffer_t &acl, const stored_subacl &stored, const sec_acle_t &acle,
                  packed_place &place);
 
-// Adds an entry, whose identity fits the format, at its place. An entry that is there already gets the new mask, or
-// is reported with `report_duplicates` non-zero. Returns SEC_S_OK, or the code of what it recorded.
-int add_packed(const sec_acle_t &acle, int report_duplicates, const stored_subacl &stored,
+// Adds an entry, whose identity fits the format, at its place. Returns SEC_S_OK, or the code of what it
+// recorded.
+int add_packed(const sec_acle_t &acle, on_duplicate handling, const stored_subacl &stored,
                const packed_place &place, sec_acl_buffer_t &acl);
 
 // Deletes the entry at the place, and with the last entry its sub-ACL. Returns as finish_deletion() does.

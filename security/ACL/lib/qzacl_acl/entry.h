@@ -67,6 +67,9 @@ inline acle_view view_of(const sec_acle_t &acle) {
             acle.identity == nullptr ? no_text : acle.identity};
 }
 
+// The code set of the strings that an entry is made from.
+enum class strings_in : std::uint8_t { utf8, locale };
+
 } // namespace qz
 
 // Records the trace points of releasing an entry, which may be null.
@@ -74,10 +77,10 @@ void sec__trace_release(const sec_acle_t *acle);
 // The same for an entry that has no record: it stands at `place`.
 void sec__trace_release(const void *place, const qz::acle_view &acle);
 
-// Makes an entry whose arguments were checked by the caller: a mechanism of at most 16 bytes for types 4 and
-// 8, an identity for types 4, 8 and 16. With `convert` non-zero both are converted to UTF-8. Returns SEC_S_OK
-// with a new entry in `*acle`, or the code of the failed allocation or conversion with null there.
+// Makes an entry from arguments that the caller has checked: a mechanism of at most 16 bytes for types 4 and 8, an
+// identity for types 4, 8 and 16. The entry holds both in UTF-8. Returns SEC_S_OK with a new entry in `*acle`, or the
+// code of the failed allocation or conversion with null there.
 int sec__create_acle(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
-                     int convert, sec_acle_t **acle);
+                     qz::strings_in code_set, sec_acle_t **acle);
 
 #endif

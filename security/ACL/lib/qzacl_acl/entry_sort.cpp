@@ -99,13 +99,15 @@ std::size_t sort_by_identity(std::span<small_entry> entries, const identity_stor
         for (small_entry &entry : entries)
             entry.key = ordered_word(identities.identity(entry.place) + prefix);
     }
+    constexpr unsigned first_byte = 0;
+    constexpr bool ends_in_scratch = false;
     owned<small_entry[]> scratch;
     if (entries.size() > comparison_sort_max)
         scratch = allocate<small_entry>(entries.size());
     if (scratch == nullptr)
         std::sort(entries.begin(), entries.end(), sorts_before{identities});
     else
-        radix_sort(identities).sort(entries, {scratch.get(), entries.size()}, 0, false);
+        radix_sort(identities).sort(entries, {scratch.get(), entries.size()}, first_byte, ends_in_scratch);
     return prefix;
 }
 

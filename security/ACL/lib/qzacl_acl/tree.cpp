@@ -1,7 +1,6 @@
 // Trees: the entries of one key, collected in the order in which they are compiled.
 #include "qzacl_acl/tree.h"
 
-#include "qzacl_acl/acle_report.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/identity_order.h"
 #include "qzacl_acl/tree_shape.h"
@@ -96,7 +95,11 @@ sec_acltree::insertion sec_acltree::insert(const acle_view &acle) {
     identities_.keep(place, acle.identity.size());
     count_entry(acle.identity.size(), 1);
     return {outcome::inserted,
-            &entries_.append({wanted.key, place & identity_store::last_place, 0, acle.perm_mask}), 0};
+            &entries_.append({.key = wanted.key,
+                              .place = place & identity_store::last_place,
+                              .is_deleted = 0,
+                              .perm_mask = acle.perm_mask}),
+            0};
 }
 
 void sec_acltree::count_entry(std::size_t identity_length, int held) {
@@ -181,13 +184,13 @@ void sec_acltree::trace_release() {
 
 namespace qz {
 
-int add_to_tree(bool reports_duplicates, const acle_view &acle, sec_acltree &tree) {
+int add_to_tree(on_duplicate handling, const acle_view &acle, sec_acltree &tree) {
     const sec_acltree::insertion done = tree.insert(acle);
     switch (done.result) {
     case sec_acltree::outcome::inserted:
         break;
     case sec_acltree::outcome::duplicate:
-        if (reports_duplicates)
+        if (handling == on_duplicate::report)
             return sec__report_duplicate(acle);
         done.entry->perm_mask = acle.perm_mask;
         sec__trace_replacement(acle);
@@ -200,21 +203,21 @@ int add_to_tree(bool reports_duplicates, const acle_view &acle, sec_acltree &tre
 
 } // namespace qz
 
-int sec__add_acle_to_tree(int report_duplicates, const acle_view &acle, sec_acltree_t **slot) {
+int sec__add_acle_to_tree(on_duplicate handling, const acle_view &acle, sec_acltree_t **slot) {
     if (*slot != nullptr)
-        return add_to_tree(report_duplicates != 0, acle, **slot);
+        return add_to_tree(handling, acle, **slot);
     void *memory = std::malloc(sizeof(sec_acltree_t));
     if (memory == nullptr)
         return report_no_memory("sec__add_acle_to_tree", sizeof(sec_acltree_t));
     owned_acltree made(new (memory) sec_acltree_t(acle.type, {}));
-    const int result = add_to_tree(report_duplicates != 0, acle, *made);
+    const int result = add_to_tree(handling, acle, *made);
     if (result == SEC_S_OK)
         *slot = made.release();
     return result;
 }
 
-int sec__add_acle_to_tree(int report_duplicates, const sec_acle_t *acle, sec_acltree_t **slot) {
-    return sec__add_acle_to_tree(report_duplicates, view_of(*acle), slot);
+int sec__add_acle_to_tree(on_duplicate handling, const sec_acle_t *acle, sec_acltree_t **slot) {
+    return sec__add_acle_to_tree(handling, view_of(*acle), slot);
 }
 
 int sec__del_acle_from_tree(const sec_acle_t *acle, sec_acltree_t *root) {

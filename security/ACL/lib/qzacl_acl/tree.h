@@ -8,6 +8,7 @@
 #define QZACL_TREE_H
 
 #include "qz/acl.h"
+#include "qzacl_acl/acle_report.h"
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/entry_array.h"
 #include "qzacl_acl/identity_store.h"
@@ -97,11 +98,10 @@ private:
     std::uint8_t type_;
 };
 
-// Inserts the entry into the tree in `*slot`, made when that is null; the tree copies what it keeps. An entry with
-// the same identity is reported when `report_duplicates` is not 0, else it takes the new permission mask. Returns
-// SEC_S_OK, SEC_S_BAD_ACLE for a duplicate or SEC_S_NO_MEMORY.
-int sec__add_acle_to_tree(int report_duplicates, const qz::acle_view &acle, sec_acltree_t **slot);
-int sec__add_acle_to_tree(int report_duplicates, const sec_acle_t *acle, sec_acltree_t **slot);
+// Inserts the entry into the tree in `*slot`, made when that is null; the tree copies what it keeps. Returns SEC_S_OK,
+// SEC_S_BAD_ACLE for a reported duplicate or SEC_S_NO_MEMORY.
+int sec__add_acle_to_tree(qz::on_duplicate handling, const qz::acle_view &acle, sec_acltree_t **slot);
+int sec__add_acle_to_tree(qz::on_duplicate handling, const sec_acle_t *acle, sec_acltree_t **slot);
 
 // Deletes the entry with the same identity from a tree of the same key. Returns SEC_S_OK or SEC_S_ACLE_NOT_FOUND.
 int sec__del_acle_from_tree(const sec_acle_t *acle, sec_acltree_t *root);
@@ -112,7 +112,7 @@ void sec__free_acltree(sec_acltree_t *root);
 namespace qz {
 
 // The same insertion into a tree that is there.
-int add_to_tree(bool reports_duplicates, const acle_view &acle, sec_acltree &tree);
+int add_to_tree(on_duplicate handling, const acle_view &acle, sec_acltree &tree);
 
 struct free_acltree {
     void operator()(sec_acltree_t *root) const { sec__free_acltree(root); }

@@ -101,7 +101,7 @@ int sec_acltree_array::append(const acle_view &acle, std::uint32_t hash) {
     if (room == nullptr)
         return report_no_memory("sec__add_acle_to_tree", memory_.refused());
     auto *tree = new (room) sec_acltree_t(acle.type, text_);
-    if (const int result = add_to_tree(true, acle, *tree); result != SEC_S_OK) {
+    if (const int result = add_to_tree(on_duplicate::report, acle, *tree); result != SEC_S_OK) {
         tree->~sec_acltree();
         return result;
     }
@@ -132,7 +132,7 @@ int sec_acltree_array::add(const acle_view &acle) {
             return append(acle, hash);
         last_found_ = found;
     }
-    return add_to_tree(true, acle, *last_found_);
+    return add_to_tree(on_duplicate::report, acle, *last_found_);
 }
 
 int sec_acltree_array::add_soon(const acle_view &acle) {
