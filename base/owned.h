@@ -20,6 +20,19 @@ struct free_memory {
 template <class T>
 using owned = std::unique_ptr<T, free_memory>;
 
+// The size of an allocation that failed, for its message; none where all succeeded.
+class [[nodiscard]] shortage {
+public:
+    constexpr shortage() = default;
+    explicit constexpr shortage(std::size_t bytes) : bytes_(bytes) {}
+
+    explicit constexpr operator bool() const { return bytes_ != 0; }
+    constexpr std::size_t bytes() const { return bytes_; }
+
+private:
+    std::size_t bytes_ = 0;
+};
+
 // Uninitialised memory for `count` objects of a trivial type, or null.
 template <class T>
 owned<T[]> allocate(std::size_t count) {

@@ -3,6 +3,7 @@
 #ifndef QZ_REPORT_H
 #define QZ_REPORT_H
 
+#include "base/owned.h"
 #include "msg/messages.h"
 #include "qz/acl.h"
 #include "qz/cu.h"
@@ -54,6 +55,10 @@ constexpr int shown_size(Size size) {
 
 inline int report_no_memory(const char *function, std::uint64_t bytes) {
     return report(SEC_S_NO_MEMORY, msg::no_memory, function, shown_size(bytes));
+}
+
+inline int report_no_memory(const char *function, shortage lacking) {
+    return report_no_memory(function, lacking.bytes());
 }
 
 inline int report_bad_parameter(const char *function, int position, int value) {

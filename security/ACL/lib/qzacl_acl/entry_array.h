@@ -3,6 +3,7 @@
 #ifndef QZACL_ENTRY_ARRAY_H
 #define QZACL_ENTRY_ARRAY_H
 
+#include "base/owned.h"
 #include "qzacl_acl/entry_sort.h"
 
 #include <cstddef>
@@ -24,8 +25,7 @@ public:
 
     std::uint32_t count() const { return count_; }
     bool is_full() const { return count_ == capacity_; }
-    // False, the bytes asked for in `refused`, when memory is lacking.
-    bool reserve(std::uint32_t capacity, std::size_t &refused);
+    shortage reserve(std::uint32_t capacity);
     // Appends an entry, for which there is room.
     small_entry &append(const small_entry &entry) { return entries_[count_++] = entry; }
 

@@ -32,33 +32,35 @@ identity_store::~identity_store() {
         std::free(base_);
 }
 
-bool identity_store::place(const acle_view &acle, std::uint32_t &place, std::size_t &refused) {
+shortage identity_store::place(const acle_view &acle, std::uint32_t &place) {
     if (is_in_text()) {
         if (mechanism_length_ == 0 && has_mechanism(acle.type)) {
             mechanism_ = static_cast<std::uint32_t>(acle.mechanism.data() - base_);
             mechanism_length_ = static_cast<std::uint8_t>(acle.mechanism.size());
         }
         place = static_cast<std::uint32_t>(acle.identity.data() - base_);
-        return true;
+        return {};
     }
-    return copy(acle, place, refused);
+    return copy(acle, place);
 }
 
-bool identity_store::copy(const acle_view &acle, std::uint32_t &place, std::size_t &refused) {
+shortage identity_store::copy(const acle_view &acle, std::uint32_t &place) {
     // The word behind the last one is there to be read, too; the next copy takes it.
     const std::uint64_t units = mechanism_units + units_of(acle.identity.size());
-    if (used_ + units >= size_ && !grow(used_ + units + 1, refused))
-        return false;
+    if (used_ + units >= size_) {
+        if (const shortage lacking = grow(used_ + units + 1))
+            return lacking;
+    }
     place = used_ + mechanism_units;
     char *const at = identity(place);
     std::memset(at - mechanism_size, 0, mechanism_size);
     std::memcpy(at - mechanism_size, acle.mechanism.data(), acle.mechanism.size());
     std::memset(at + (units_of(acle.identity.size()) - 1) * own_unit, 0, 2 * own_unit);
     std::memcpy(at, acle.identity.data(), acle.identity.size());
-    return true;
+    return {};
 }
 
-bool identity_store::grow(std::uint64_t units, std::size_t &refused) {
+shortage identity_store::grow(std::uint64_t units) {
     constexpr std::uint64_t first_units = 16;
     const std::uint64_t size = std::max({units, std::uint64_t{size_} * 2, first_units});
     // On a 32-bit machine more may be asked for than memory can be.
@@ -66,13 +68,11 @@ bool identity_store::grow(std::uint64_t units, std::size_t &refused) {
     const bool fits = size <= last_place && size <= most_bytes / own_unit;
     const std::size_t bytes = fits ? static_cast<std::size_t>(size) * own_unit : most_bytes;
     void *grown = fits ? std::realloc(base_, bytes) : nullptr;
-    if (grown == nullptr) {
-        refused = bytes;
-        return false;
-    }
+    if (grown == nullptr)
+        return shortage(bytes);
     base_ = static_cast<char *>(grown);
     size_ = static_cast<std::uint32_t>(size);
-    return true;
+    return {};
 }
 
 void identity_store::keep(std::uint32_t place, std::size_t identity_length) {

@@ -25,9 +25,8 @@ public:
     identity_store &operator=(const identity_store &) = delete;
     ~identity_store();
 
-    // Finds the entry's place, or makes room and copies it there. False, the bytes asked for in `refused`, when
-    // memory is lacking. The place is lost to the next entry unless it is kept.
-    bool place(const acle_view &acle, std::uint32_t &place, std::size_t &refused);
+    // Finds the entry's place, or makes room and copies it there. The next entry takes the place unless it is kept.
+    shortage place(const acle_view &acle, std::uint32_t &place);
     void keep(std::uint32_t place, std::size_t identity_length);
 
     // The identity at a place, with its NUL and seven readable bytes behind that.
@@ -43,8 +42,8 @@ public:
     std::uint32_t expected_count(std::uint32_t count, std::uint32_t place) const;
 
 private:
-    bool copy(const acle_view &acle, std::uint32_t &place, std::size_t &refused);
-    bool grow(std::uint64_t units, std::size_t &refused);
+    shortage copy(const acle_view &acle, std::uint32_t &place);
+    shortage grow(std::uint64_t units);
 
     char *base_ = nullptr;
     std::uint32_t used_ = 0;      // units of own memory

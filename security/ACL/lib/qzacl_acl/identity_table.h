@@ -28,9 +28,8 @@ public:
     identity_table &operator=(const identity_table &) = delete;
     ~identity_table() { release(); }
 
-    // Makes an empty table with room for `count` entries. False, the bytes asked for in `refused`, when memory is
-    // lacking; then the table is as before.
-    bool reset(std::uint32_t count, std::size_t &refused);
+    // Makes an empty table with room for `count` entries. Without memory the table stays as it is.
+    shortage reset(std::uint32_t count);
     void release();
     // How many entries it has room for; 0 without a table.
     std::uint64_t room() const { return head_ == nullptr ? 0 : room_of(head_->group_bits); }

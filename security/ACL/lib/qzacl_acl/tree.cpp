@@ -23,9 +23,10 @@ std::size_t packed_size_of(std::uint8_t type, std::size_t identity_length) {
 
 // Grows something for the entries that are expected, or where there is no memory for so many for a fair number.
 template <class Grow>
-bool grow_for(std::uint32_t expected, std::uint32_t count, const Grow &grow) {
+shortage grow_for(std::uint32_t expected, std::uint32_t count, const Grow &grow) {
     const std::uint32_t fair = std::max(count * 2, few);
-    return grow(expected) || (expected > fair && grow(fair));
+    const shortage lacking = grow(expected);
+    return lacking && expected > fair ? grow(fair) : lacking;
 }
 
 } // namespace
@@ -45,14 +46,15 @@ bool sec_acltree::sorts_last(const candidate &wanted) const {
 }
 
 // Puts all entries into a new table with room for those that are expected.
-bool sec_acltree::fill_table(std::uint32_t place, std::size_t &refused) {
+shortage sec_acltree::fill_table(std::uint32_t place) {
     const auto entries = std::as_const(entries_).all();
-    const auto reset = [&](std::uint32_t room) { return table_.reset(room, refused); };
-    if (!grow_for(identities_.expected_count(entries_.count(), place), entries_.count(), reset))
-        return false;
+    const auto reset = [&](std::uint32_t room) { return table_.reset(room); };
+    const std::uint32_t expected = identities_.expected_count(entries_.count(), place);
+    if (const shortage lacking = grow_for(expected, entries_.count(), reset))
+        return lacking;
     for (std::uint32_t number = 0; number < entries.size(); ++number)
         table_.enter(table_.hash(identity(entries[number]), entries[number].key), number);
-    return true;
+    return {};
 }
 
 small_entry *sec_acltree::find_equal(const candidate &wanted, std::uint64_t hash) {
@@ -70,25 +72,29 @@ small_entry *sec_acltree::find_equal(const candidate &wanted, std::uint64_t hash
 sec_acltree::insertion sec_acltree::insert(const acle_view &acle) {
     const std::uint32_t count = entries_.count();
     if (is_single_type(type_) && count != 0)
-        return {outcome::duplicate, &entries_.all().front(), 0};
+        return {outcome::duplicate, &entries_.all().front(), {}};
     restore_keys();
     std::uint32_t place = 0;
-    std::size_t refused = 0;
-    const auto reserve = [&](std::uint32_t room) { return entries_.reserve(room, refused); };
-    if (!identities_.place(acle, place, refused) ||
-        (entries_.is_full() && !grow_for(identities_.expected_count(count, place), count, reserve)))
-        return {outcome::no_memory, nullptr, refused};
+    if (const shortage lacking = identities_.place(acle, place))
+        return {outcome::no_memory, nullptr, lacking};
+    if (entries_.is_full()) {
+        const auto reserve = [&](std::uint32_t room) { return entries_.reserve(room); };
+        if (const shortage lacking = grow_for(identities_.expected_count(count, place), count, reserve))
+            return {outcome::no_memory, nullptr, lacking};
+    }
 
     const char *const identity = identities_.identity(place);
     const candidate wanted = {identity, ordered_word(identity)};
     if (is_ascending_ && count != 0)
         is_ascending_ = sorts_last(wanted);
     if (!is_ascending_) {
-        if (count >= few && table_.room() <= count && !fill_table(place, refused))
-            return {outcome::no_memory, nullptr, refused};
+        if (count >= few && table_.room() <= count) {
+            if (const shortage lacking = fill_table(place))
+                return {outcome::no_memory, nullptr, lacking};
+        }
         const std::uint64_t hash = table_.room() == 0 ? 0 : table_.hash(identity, wanted.key);
         if (small_entry *held = find_equal(wanted, hash); held != nullptr)
-            return {outcome::duplicate, held, 0};
+            return {outcome::duplicate, held, {}};
         if (table_.room() != 0)
             table_.enter(hash, count);
     }
@@ -99,7 +105,7 @@ sec_acltree::insertion sec_acltree::insert(const acle_view &acle) {
                               .place = place & identity_store::last_place,
                               .is_deleted = 0,
                               .perm_mask = acle.perm_mask}),
-            0};
+            {}};
 }
 
 void sec_acltree::count_entry(std::size_t identity_length, int held) {
@@ -196,7 +202,7 @@ int add_to_tree(on_duplicate handling, const acle_view &acle, sec_acltree &tree)
         sec__trace_replacement(acle);
         break;
     case sec_acltree::outcome::no_memory:
-        return report_no_memory("sec__add_acle_to_tree", done.refused);
+        return report_no_memory("sec__add_acle_to_tree", done.lacking);
     }
     return SEC_S_OK;
 }

@@ -26,7 +26,7 @@ public:
     struct insertion {
         outcome result;
         qz::small_entry *entry; // the new one, or the one that was there
-        std::size_t refused;    // the bytes that could not be had
+        qz::shortage lacking;
     };
 
     // The identities of the entries stand in the text, or are copied when that is empty.
@@ -80,7 +80,7 @@ private:
     bool is_equal(const qz::small_entry &held, const candidate &wanted) const;
     bool sorts_last(const candidate &wanted) const;
     qz::small_entry *find_equal(const candidate &wanted, std::uint64_t hash);
-    bool fill_table(std::uint32_t place, std::size_t &refused);
+    qz::shortage fill_table(std::uint32_t place);
     void count_entry(std::size_t identity_length, int held);
     void put_in_order() const;
     void restore_keys();

@@ -67,40 +67,34 @@ void sec_acltree_array::enter(slot entry) {
 }
 
 // Makes sure of places for one more tree; a quarter of the index stays free.
-bool sec_acltree_array::prepare(std::size_t &refused) {
+shortage sec_acltree_array::prepare() {
     if (count_ == capacity_) {
         const std::uint32_t capacity = std::max(capacity_ * 2, std::uint32_t{8});
-        if (!reallocate(trees_, capacity)) {
-            refused = capacity * sizeof(sec_acltree_t *);
-            return false;
-        }
+        if (!reallocate(trees_, capacity))
+            return shortage(capacity * sizeof(sec_acltree_t *));
         capacity_ = capacity;
     }
     if (count_ < index_size_ / 4 * 3)
-        return true;
+        return {};
     const std::uint32_t size = std::max(index_size_ * 4, std::uint32_t{16});
     owned<slot[]> grown(static_cast<slot *>(std::calloc(size, sizeof(slot))));
-    if (grown == nullptr) {
-        refused = size * sizeof(slot);
-        return false;
-    }
+    if (grown == nullptr)
+        return shortage(size * sizeof(slot));
     const owned<slot[]> old = std::exchange(index_, std::move(grown));
     const std::uint32_t old_size = std::exchange(index_size_, size);
     for (std::uint32_t at = 0; at < old_size; ++at) {
         if (old[at].number != 0)
             enter(old[at]);
     }
-    return true;
+    return {};
 }
 
 int sec_acltree_array::append(const acle_view &acle, std::uint32_t hash) {
-    std::size_t refused = 0;
-    if (!prepare(refused))
-        return report_no_memory("sec__add_acle_to_trees", refused);
-    void *room = memory_.room(sizeof(sec_acltree_t));
-    if (room == nullptr)
-        return report_no_memory("sec__add_acle_to_tree", memory_.refused());
-    auto *tree = new (room) sec_acltree_t(acle.type, text_);
+    if (const shortage lacking = prepare())
+        return report_no_memory("sec__add_acle_to_trees", lacking);
+    if (const shortage lacking = memory_.make_room(sizeof(sec_acltree_t)))
+        return report_no_memory("sec__add_acle_to_tree", lacking);
+    auto *tree = new (memory_.room()) sec_acltree_t(acle.type, text_);
     if (const int result = add_to_tree(on_duplicate::report, acle, *tree); result != SEC_S_OK) {
         tree->~sec_acltree();
         return result;

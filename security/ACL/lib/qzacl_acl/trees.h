@@ -47,7 +47,7 @@ private:
 
     sec_acltree_t *find(const qz::acle_view &acle, std::uint32_t hash);
     int append(const qz::acle_view &acle, std::uint32_t hash);
-    bool prepare(std::size_t &refused);
+    qz::shortage prepare();
     void enter(slot entry);
 
     std::span<char> text_;
