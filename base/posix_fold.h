@@ -24,23 +24,6 @@ constexpr std::uint64_t fold8(std::uint64_t word) {
     return word | (upper >> 2);
 }
 
-// Orders two runs of n bytes without regard to case, NUL being a byte like any other: below 0, 0 or above 0.
-inline int fold_compare(const char *a, const char *b, std::size_t n) {
-    for (; n >= word_size; a += word_size, b += word_size, n -= word_size) {
-        const std::uint64_t left = first_byte_highest(fold8(load8(a)));
-        const std::uint64_t right = first_byte_highest(fold8(load8(b)));
-        if (left != right)
-            return left < right ? -1 : 1;
-    }
-    for (; n != 0; ++a, ++b, --n) {
-        const int left = fold(static_cast<unsigned char>(*a));
-        const int right = fold(static_cast<unsigned char>(*b));
-        if (left != right)
-            return left - right;
-    }
-    return 0;
-}
-
 // Orders two NUL-terminated strings without regard to case: below 0, 0 or above 0. It goes byte by byte, since a
 // word might reach behind the end of the storage.
 constexpr int fold_compare(const char *a, const char *b) {

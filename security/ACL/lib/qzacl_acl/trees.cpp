@@ -20,9 +20,12 @@ bool is_of_key(const sec_acltree_t &tree, const acle_view &acle) {
     if (!has_mechanism(acle.type))
         return true;
     const std::string_view held = tree.mechanism();
+    const auto is_equal_folded = [](char a, char b) {
+        return fold(static_cast<unsigned char>(a)) == fold(static_cast<unsigned char>(b));
+    };
     return held == acle.mechanism || // as texts spell it
-           (held.size() == acle.mechanism.size() &&
-            fold_compare(held.data(), acle.mechanism.data(), held.size()) == 0);
+           std::equal(held.begin(), held.end(), acle.mechanism.begin(), acle.mechanism.end(),
+                      is_equal_folded);
 }
 
 std::uint32_t hash_of_key(const acle_view &acle, const identity_hash_key &key) {
