@@ -1,10 +1,10 @@
 // Code-set conversion over the system's iconv. A handle is only ever read; what a conversion changes, the
 // system's converter with its shift state, each thread has of its own for each handle.
+#include "base/kept_errno.h"
 #include "base/owned.h"
 #include "base/posix_fold.h"
 #include "base/uncancelled.h"
 #include "base/utf8.h"
-#include "libqz_cu/kept_errno.h"
 #include "qz/cu.h"
 
 #include <algorithm>
@@ -26,7 +26,7 @@ struct cu_iconv {
 
 namespace {
 
-using qz::cu::kept_errno;
+using qz::kept_errno;
 
 const iconv_t no_converter = reinterpret_cast<iconv_t>(-1);
 constexpr std::size_t failed = static_cast<std::size_t>(-1);

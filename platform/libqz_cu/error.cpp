@@ -1,6 +1,6 @@
 // The error facility: each thread's current error, recorded as it comes and made into a text when fetched.
+#include "base/kept_errno.h"
 #include "libqz_cu/catalog.h"
-#include "libqz_cu/kept_errno.h"
 #include "libqz_cu/message_text.h"
 #include "qz/cu.h"
 
@@ -141,6 +141,7 @@ const char *text_of(const recorded_error &error) {
 } // namespace qz::cu
 
 using namespace qz::cu;
+using qz::kept_errno;
 
 int cu_set_error_1(int code, int, const char *catalog, int set, int message_id, const char *default_text,
                    ...) {

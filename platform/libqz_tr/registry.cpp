@@ -43,7 +43,7 @@ public:
     table_lock &operator=(const table_lock &) = delete;
 };
 
-component_place *find(std::string_view name) {
+component_place *find_component(std::string_view name) {
     const auto end = places.begin() + named.load(std::memory_order_acquire);
     const auto found = std::find_if(places.begin(), end,
                                     [&](const component_place &place) { return place.name_view() == name; });
@@ -52,7 +52,7 @@ component_place *find(std::string_view name) {
 
 // Under the mutex.
 component_place *find_or_name(std::string_view name) {
-    if (component_place *place = find(name))
+    if (component_place *place = find_component(name))
         return place;
     const std::size_t next = named.load(std::memory_order_relaxed);
     if (next == places.size())
@@ -97,7 +97,7 @@ int enter(std::string_view name, std::span<std::uint8_t> levels, std::span<const
 
 int leave(std::string_view name) {
     const table_lock locked;
-    component_place *place = find(name);
+    component_place *place = find_component(name);
     if (place == nullptr || !place->registered.load(std::memory_order_relaxed))
         return TR_NOT_REGISTERED;
     clear(place->levels);
@@ -107,7 +107,7 @@ int leave(std::string_view name) {
 }
 
 bool contains(std::string_view name) {
-    const component_place *place = find(name);
+    const component_place *place = find_component(name);
     return place != nullptr && place->registered.load(std::memory_order_acquire);
 }
 

@@ -1,6 +1,7 @@
 // The public operations: they check arguments and keep the caller's thread undisturbed.
 #include "qz/tr.h"
 
+#include "base/kept_errno.h"
 #include "base/owned.h"
 #include "base/uncancelled.h"
 #include "libqz_tr/line.h"
@@ -9,7 +10,6 @@
 
 #include <algorithm>
 #include <array>
-#include <cerrno>
 #include <cstdarg>
 #include <cstring>
 #include <unistd.h>
@@ -22,16 +22,9 @@ namespace trace_file = qz::tr::trace_file;
 
 // Tracing goes on in the middle of other people's operations: they must find errno as it was, and must not
 // become a point where their thread can be cancelled.
-class undisturbed_caller {
-public:
-    undisturbed_caller() = default;
-    ~undisturbed_caller() { errno = errno_; }
-    undisturbed_caller(const undisturbed_caller &) = delete;
-    undisturbed_caller &operator=(const undisturbed_caller &) = delete;
-
-private:
-    int errno_ = errno;
-    qz::uncancelled uncancelled_;
+struct undisturbed_caller {
+    const qz::kept_errno error_number{};
+    const qz::uncancelled cancellation{};
 };
 
 // What a line says besides its items, so that it can be formed twice alike.

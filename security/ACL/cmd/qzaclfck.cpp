@@ -127,7 +127,7 @@ void warn_not_implemented() {
     cu_set_no_error_1();
 }
 
-int check(unsigned flags) {
+int check_file(unsigned flags) {
     if (aclfname == nullptr) {
         report(SEC_S_BAD_PARAMETER, msg::file_option_missing);
         aclfck__print_error();
@@ -171,7 +171,7 @@ int main(int argc, char *argv[]) {
     std::setvbuf(stderr, stream_buffer, _IOFBF, sizeof stream_buffer);
 
     const option_state state = read_options(argc, argv);
-    const int status = state.status != 0 ? finish_without_check(state) : check(state.flags);
+    const int status = state.status != 0 ? finish_without_check(state) : check_file(state.flags);
     std::fflush(stderr);
     return status;
 }

@@ -137,8 +137,6 @@ public:
             Point.record_since(start_, args...);
     }
 
-    bool is_running() const { return is_running_; }
-
 private:
     bool is_running_;
     std::uint64_t start_;

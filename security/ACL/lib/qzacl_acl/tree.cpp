@@ -115,7 +115,7 @@ void sec_acltree::count_entry(std::size_t identity_length, int held) {
     packed_size_ += packed_size_of(type_, identity_length) * static_cast<std::uint64_t>(held);
 }
 
-small_entry *sec_acltree::find(const char *wanted) {
+small_entry *sec_acltree::find_entry(const char *wanted) {
     const auto entries = entries_.all();
     const auto is_wanted = [&](const small_entry &entry) {
         return entry.is_deleted == 0 && fold_compare(identity(entry), wanted) == 0;
@@ -229,7 +229,7 @@ int sec__add_acle_to_tree(on_duplicate handling, const sec_acle_t *acle, sec_acl
 int sec__del_acle_from_tree(const sec_acle_t *acle, sec_acltree_t *root) {
     small_entry *held = nullptr;
     if (!is_single_type(acle->type))
-        held = root->find(acle->identity);
+        held = root->find_entry(acle->identity);
     else if (root->held_count() != 0)
         held = &root->in_order().front();
     if (held == nullptr)

@@ -47,7 +47,7 @@ public:
         return table_.room() == 0 ? nullptr : table_.first_look(table_.hash(text, qz::ordered_word(text)));
     }
     // The held entry whose identity equals the wanted one in any letter case, or null.
-    qz::small_entry *find(const char *wanted);
+    qz::small_entry *find_entry(const char *wanted);
     // Takes the entry out; its node stays, so that the order of the others does not change.
     void erase(qz::small_entry &entry);
 

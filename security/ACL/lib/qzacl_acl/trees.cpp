@@ -50,7 +50,7 @@ sec_acltree_array::~sec_acltree_array() {
     }
 }
 
-sec_acltree_t *sec_acltree_array::find(const acle_view &acle, std::uint32_t hash) {
+sec_acltree_t *sec_acltree_array::find_tree(const acle_view &acle, std::uint32_t hash) {
     if (index_ == nullptr)
         return nullptr;
     for (std::uint32_t at = hash;; ++at) {
@@ -62,7 +62,7 @@ sec_acltree_t *sec_acltree_array::find(const acle_view &acle, std::uint32_t hash
     }
 }
 
-void sec_acltree_array::enter(slot entry) {
+void sec_acltree_array::enter_in_index(slot entry) {
     std::uint32_t at = entry.hash;
     while (index_[at & (index_size_ - 1)].number != 0)
         ++at;
@@ -70,7 +70,7 @@ void sec_acltree_array::enter(slot entry) {
 }
 
 // Makes sure of places for one more tree; a quarter of the index stays free.
-shortage sec_acltree_array::prepare() {
+shortage sec_acltree_array::make_room_for_tree() {
     if (count_ == capacity_) {
         const std::uint32_t capacity = std::max(capacity_ * 2, std::uint32_t{8});
         if (!reallocate(trees_, capacity))
@@ -87,13 +87,13 @@ shortage sec_acltree_array::prepare() {
     const std::uint32_t old_size = std::exchange(index_size_, size);
     for (std::uint32_t at = 0; at < old_size; ++at) {
         if (old[at].number != 0)
-            enter(old[at]);
+            enter_in_index(old[at]);
     }
     return {};
 }
 
-int sec_acltree_array::append(const acle_view &acle, std::uint32_t hash) {
-    if (const shortage lacking = prepare())
+int sec_acltree_array::append_tree(const acle_view &acle, std::uint32_t hash) {
+    if (const shortage lacking = make_room_for_tree())
         return report_no_memory("sec__add_acle_to_trees", lacking);
     if (const shortage lacking = memory_.make_room(sizeof(sec_acltree_t)))
         return report_no_memory("sec__add_acle_to_tree", lacking);
@@ -104,7 +104,7 @@ int sec_acltree_array::append(const acle_view &acle, std::uint32_t hash) {
     }
     memory_.keep(sizeof(sec_acltree_t));
     trees_[count_++] = tree;
-    enter({hash, count_});
+    enter_in_index({hash, count_});
     last_found_ = tree;
     return SEC_S_OK;
 }
@@ -124,9 +124,9 @@ int sec_acltree_array::add(const acle_view &acle) {
         return report(SEC_S_INTERNAL, msg::internal_failure, acl_source, __LINE__, SEC_S_INTERNAL);
     if (last_found_ == nullptr || !is_of_key(*last_found_, acle)) {
         const std::uint32_t hash = hash_of_key(acle, hash_key_);
-        sec_acltree_t *found = find(acle, hash);
+        sec_acltree_t *found = find_tree(acle, hash);
         if (found == nullptr)
-            return append(acle, hash);
+            return append_tree(acle, hash);
         last_found_ = found;
     }
     return add_to_tree(on_duplicate::report, acle, *last_found_);

@@ -45,10 +45,10 @@ private:
 
     static constexpr std::uint32_t waiting_max = 16;
 
-    sec_acltree_t *find(const qz::acle_view &acle, std::uint32_t hash);
-    int append(const qz::acle_view &acle, std::uint32_t hash);
-    qz::shortage prepare();
-    void enter(slot entry);
+    sec_acltree_t *find_tree(const qz::acle_view &acle, std::uint32_t hash);
+    int append_tree(const qz::acle_view &acle, std::uint32_t hash);
+    qz::shortage make_room_for_tree();
+    void enter_in_index(slot entry);
 
     std::span<char> text_;
     qz::owned<sec_acltree_t *[]> trees_;

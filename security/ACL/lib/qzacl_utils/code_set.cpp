@@ -35,8 +35,8 @@ void open_handle(std::uint32_t direction, cu_iconv_t *handle) {
 void acl__init_to_utf8_handle() { open_handle(to_utf8, &acl__to_utf8_hdl); }
 void acl__init_from_utf8_handle() { open_handle(CU_ICONV_FROM_UTF8, &acl__from_utf8_hdl); }
 
-int convert(const char *function, cu_iconv_t handle, const char *in, const std::size_t *in_length, char **out,
-            std::size_t *out_length) {
+int convert_string(const char *function, cu_iconv_t handle, const char *in, const std::size_t *in_length,
+                   char **out, std::size_t *out_length) {
     if (handle == nullptr)
         return report(SEC_S_CODESET, msg::conversion_unavailable);
     constexpr int line = __LINE__ + 1; // of the call that may fail
@@ -58,11 +58,11 @@ int convert(const char *function, cu_iconv_t handle, const char *in, const std::
 
 int acl__convert_to_utf8(const char *in, const std::size_t *in_length, char **out, std::size_t *out_length) {
     pthread_once(&acl__init_to_utf8_once_block, acl__init_to_utf8_handle);
-    return convert("acl__convert_to_utf8", acl__to_utf8_hdl, in, in_length, out, out_length);
+    return convert_string("acl__convert_to_utf8", acl__to_utf8_hdl, in, in_length, out, out_length);
 }
 
 int acl__convert_from_utf8(const char *in, const std::size_t *in_length, char **out,
                            std::size_t *out_length) {
     pthread_once(&acl__init_from_utf8_once_block, acl__init_from_utf8_handle);
-    return convert("acl__convert_from_utf8", acl__from_utf8_hdl, in, in_length, out, out_length);
+    return convert_string("acl__convert_from_utf8", acl__from_utf8_hdl, in, in_length, out, out_length);
 }
