@@ -1,4 +1,4 @@
-// The command qzaclfck: its options, and the decision between help, a usage error and a check.
+// The command qzaclfck: parses the options and shows help, reports a usage error, or runs a check.
 #include "bulk_aclfile.h"
 
 #include "report.h"
@@ -18,7 +18,7 @@ char *aclfname;
 char *username;
 char *ptplname;
 
-// What the options come to; each event overwrites the status, so the last one decides.
+// The parsed options. Each event overwrites the status, so the last one decides.
 struct option_state {
     static constexpr int help_wanted = 1;
 
@@ -49,12 +49,13 @@ void set_name(option_state &state, char *&name, const char *option) {
         state.fail(report_no_memory("main", std::strlen(optarg) + 1));
 }
 
-// The next option, also behind operands, where not every C library looks for more: the '-' has it hand operands out.
+// The next option, including those after operands. Not every C library permutes them, so the '-' makes getopt return
+// operands, too.
 constexpr int operand = 1;
 int next_option(int argc, char *argv[]) {
     for (;;) {
         const int option = getopt(argc, argv, "-cf:hsSt:u:v");
-        // Before a lone "-" some stop all the same.
+        // Some still stop at a lone "-".
         if (option != -1 || optind >= argc || std::strcmp(argv[optind], "-") != 0)
             return option;
         ++optind;
@@ -150,7 +151,7 @@ int check_file(unsigned flags) {
     return aclfck__bulk_aclfile(aclfname, username, flags);
 }
 
-// A file that is opened later must not become one of the standard streams, or a message would end up in it.
+// A file opened later must not become a standard stream, or messages would end up in it.
 void fill_standard_descriptors() {
     int fd = 0;
     do {
@@ -166,7 +167,7 @@ int main(int argc, char *argv[]) {
     fill_standard_descriptors();
     aclfck__keep_spare_memory();
     std::setlocale(LC_ALL, "");
-    // Entry lines are gathered, and failures of lines where nobody watches; other messages are flushed at once.
+    // Entry lines are buffered, and so are failures of lines unless a terminal shows them. Other messages are flushed.
     static char stream_buffer[1 << 16];
     std::setvbuf(stderr, stream_buffer, _IOFBF, sizeof stream_buffer);
 

@@ -1,4 +1,4 @@
-// Memory that is handed out piece by piece and given back as a whole.
+// Memory that is handed out in pieces and freed as a whole.
 #include "qzacl_acl/arena.h"
 
 #include <algorithm>

@@ -1,4 +1,4 @@
-// Memory that is handed out piece by piece and given back as a whole.
+// Memory that is handed out in pieces and freed as a whole.
 #ifndef QZACL_ARENA_H
 #define QZACL_ARENA_H
 
@@ -16,7 +16,7 @@ public:
     arena &operator=(const arena &) = delete;
     ~arena();
 
-    // Makes sure of `size` bytes, aligned for numbers of eight bytes. They are at room(), and keep() takes them.
+    // Makes room for `size` bytes, aligned to eight. They are at room() until keep() claims them.
     shortage make_room(std::size_t size);
     unsigned char *room() { return at_; }
     void keep(std::size_t size);

@@ -1,4 +1,4 @@
-// Compiling trees into the bytes of a buffer, and expanding those bytes back into trees and lists.
+// Compiling trees into the bytes of a buffer, and expanding the bytes into trees and lists.
 #include "qzacl_acl/compile.h"
 
 #include "qzacl_acl/buffer_format.h"
@@ -10,7 +10,7 @@ using namespace qz;
 
 namespace {
 
-// What a tree becomes: its header, measured before anything is allocated.
+// A tree and the header of its sub-ACL, measured before anything is allocated.
 struct measured_subacl {
     format::subacl head;
     const sec_acltree_t *tree = nullptr;
@@ -36,7 +36,7 @@ int measure_subacl(const sec_acltree_t &tree, measured_subacl &out) {
 }
 
 void write_subacl(byte_writer &writer, const measured_subacl &subacl) {
-    // The identities lie in the order of insertion; fetching ahead hides most of the jumps between them.
+    // Identities are stored in order of insertion. Prefetching hides most of the jumps between them.
     constexpr std::size_t ahead = 12;
     format::write_subacl_header(writer, subacl.head);
     const bool carries_identity = has_identity(subacl.head.type);
@@ -71,7 +71,7 @@ int measure_each(std::span<sec_acltree_t *const> trees, const Use &use) {
     return SEC_S_OK;
 }
 
-// The parts of an expanded entry that all entries of a sub-ACL share.
+// What all entries of a sub-ACL share: type and mechanism.
 int common_part(const format::subacl &head, acle_view &acle) {
     acle = {.type = head.type};
     if (!is_acle_type(head.type))
@@ -200,7 +200,7 @@ int sec__acltree_to_aclelist(sec_acltree_t *root, sec_aclelist_t *list) {
         const int result = sec__create_acle(held.type, held.perm_mask, held.mechanism.data(),
                                             held.identity.data(), strings_in::utf8, &made);
         if (result != SEC_S_OK) {
-            // A list without entries owns no array.
+            // An empty list owns no array.
             if (list->count == 0)
                 std::free(std::exchange(list->acles, nullptr));
             return result;

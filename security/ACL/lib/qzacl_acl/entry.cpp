@@ -15,12 +15,12 @@ namespace {
 
 using text = owned<char>;
 
-// The mechanisms whose identities end in a host, whose address is brought into one form.
+// True for mechanisms whose identities end in a host.
 bool names_hosts(const char *mechanism) {
     return std::strcmp(mechanism, "unix") == 0 || std::strcmp(mechanism, "hba2") == 0;
 }
 
-// One string with its NUL, converted by either direction's operation.
+// Converts one string and its NUL in either direction.
 template <class Conversion>
 int converted(Conversion conversion, const char *in, text &out) {
     const std::size_t length = std::strlen(in) + 1;
@@ -39,7 +39,7 @@ int set_mechanism(sec_acle_t &acle, const char *mechanism, strings_in code_set) 
     }
     const char *source = code_set == strings_in::locale ? utf8.get() : mechanism;
     const std::size_t length = std::strlen(source);
-    // A mnemonic that fitted before its conversion may have grown.
+    // Conversion may have lengthened it.
     if (length > mechanism_max)
         return report_bad_parameter("sec_create_acle", 3, shown_pointer(mechanism));
     std::memcpy(acle.mechanism, source, length + 1);
@@ -64,8 +64,8 @@ int bad_identity(const char *identity) {
     return report_bad_parameter("sec_create_acle", 4, shown_pointer(identity));
 }
 
-// Creates an entry of a mechanism that names hosts: an IPv6 address behind the '@' is written in its one
-// form, so that different spellings of one address are one identity. Everything else stays as it is.
+// Creates an entry of a mechanism with hosts. An IPv6 address after the '@' is normalized, so that different spellings
+// of one address are one identity. Everything else is kept.
 int create_with_host(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
                      sec_acle_t **acle) {
     const char *at = std::strchr(identity, '@');
@@ -159,7 +159,7 @@ void release_entries(sec_aclelist_t &list) {
 int sec__create_acle(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
                      strings_in code_set, sec_acle_t **acle) {
     *acle = nullptr;
-    // Its identity comes last; and an entry that nobody gets is none whose release is told.
+    // The identity is set last, so that a failure leaves only this block. Releasing it is not traced: no caller saw it.
     owned<sec_acle_t> made(static_cast<sec_acle_t *>(std::calloc(1, sizeof(sec_acle_t))));
     if (made == nullptr)
         return report_no_memory("sec__create_acle", sizeof(sec_acle_t));

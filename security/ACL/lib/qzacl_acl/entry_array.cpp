@@ -6,7 +6,7 @@
 namespace qz {
 
 shortage entry_array::reserve(std::uint32_t capacity) {
-    // Where a size has 32 bits, a long text may promise more entries than it can say: no memory has that many.
+    // With 32-bit sizes, more entries may be expected than a size can express. Allocating them fails in any case.
     constexpr std::size_t most = SIZE_MAX / sizeof(small_entry);
     const std::size_t size = std::min<std::size_t>(capacity, most) * sizeof(small_entry);
     void *const old = entries_ == &first_ ? nullptr : entries_;

@@ -1,4 +1,4 @@
-// Trees: the entries of one key, collected in the order in which they are compiled.
+// Trees: the entries of one key, collected for compilation.
 #include "qzacl_acl/tree.h"
 
 #include "qzacl_acl/buffer_format.h"
@@ -14,14 +14,14 @@ using namespace qz;
 
 namespace {
 
-// So few entries are compared one by one.
+// Up to this many entries are compared one by one.
 constexpr std::uint32_t few = 16;
 
 std::size_t packed_size_of(std::uint8_t type, std::size_t identity_length) {
     return format::entry_fixed_size + (has_identity(type) ? identity_length + 1 : 0);
 }
 
-// Grows something for the entries that are expected, or where there is no memory for so many for a fair number.
+// Grows a structure for the expected entries or, without memory for so many, for twice the present ones.
 template <class Grow>
 shortage grow_for(std::uint32_t expected, std::uint32_t count, const Grow &grow) {
     const std::uint32_t fair = std::max(count * 2, few);
@@ -45,7 +45,7 @@ bool sec_acltree::sorts_last(const candidate &wanted) const {
     return compare_identities(wanted.identity, identity(last)) > 0;
 }
 
-// Puts all entries into a new table with room for those that are expected.
+// Enters all entries into a new table with room for the expected ones.
 shortage sec_acltree::fill_table(std::uint32_t place) {
     const auto entries = std::as_const(entries_).all();
     const auto reset = [&](std::uint32_t room) { return table_.reset(room); };
@@ -109,7 +109,7 @@ sec_acltree::insertion sec_acltree::insert(const acle_view &acle) {
 }
 
 void sec_acltree::count_entry(std::size_t identity_length, int held) {
-    const auto times = static_cast<std::uint32_t>(held); // of which -1 counts down
+    const auto times = static_cast<std::uint32_t>(held); // -1 counts down
     held_count_ += times;
     overlong_count_ += identity_length > format::identity_max ? times : 0;
     packed_size_ += packed_size_of(type_, identity_length) * static_cast<std::uint64_t>(held);
@@ -120,7 +120,7 @@ small_entry *sec_acltree::find_entry(const char *wanted) {
     const auto is_wanted = [&](const small_entry &entry) {
         return entry.is_deleted == 0 && fold_compare(identity(entry), wanted) == 0;
     };
-    // Deleting is one step of an edit that has read all entries before; it must not need memory to hash a name.
+    // Without the table: this serves deletions, which have read all entries anyway and must not need memory to hash.
     const auto sorts_before = [&](const small_entry &entry, const char *other) {
         return fold_compare(identity(entry), other) < 0;
     };
@@ -137,7 +137,7 @@ void sec_acltree::erase(small_entry &entry) {
 void sec_acltree::put_in_order() const {
     if (is_ascending_)
         return;
-    table_.release(); // its numbers are those of another order, and what follows can use the memory
+    table_.release(); // its numbers become invalid, and sorting can use the memory
     if (type_ == SEC_ACLE_EXPANDED)
         return;
     has_whole_keys_ = sort_by_identity(entries_.all(), identities_) == 0;
@@ -175,7 +175,7 @@ sec_acle_t sec_acltree::record(const small_entry &entry) const {
 }
 
 std::string_view sec_acltree::compiled_mechanism() const {
-    // A text spells the mechanism of all its entries alike.
+    // In a text all entries of a key spell the mechanism the same way.
     return identities_.is_in_text() ? mechanism() : identities_.mechanism(topmost(in_order())->place);
 }
 

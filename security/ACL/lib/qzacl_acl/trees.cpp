@@ -1,4 +1,4 @@
-// The trees of one ACL, and finding the one of an entry's key among them.
+// The trees of one ACL, found by the keys of entries.
 #include "qzacl_acl/trees.h"
 
 #include "base/posix_fold.h"
@@ -69,7 +69,7 @@ void sec_acltree_array::enter_in_index(slot entry) {
     index_[at & (index_size_ - 1)] = entry;
 }
 
-// Makes sure of places for one more tree; a quarter of the index stays free.
+// Makes room for one more tree. A quarter of the index stays free.
 shortage sec_acltree_array::make_room_for_tree() {
     if (count_ == capacity_) {
         const std::uint32_t capacity = std::max(capacity_ * 2, std::uint32_t{8});
@@ -109,7 +109,7 @@ int sec_acltree_array::append_tree(const acle_view &acle, std::uint32_t hash) {
     return SEC_S_OK;
 }
 
-// Places in a text are found by subtraction, which must not be done with what is elsewhere.
+// Places in the text are computed by subtraction, which is valid only for strings inside it.
 bool sec_acltree_array::may_borrow(const acle_view &acle) const {
     const auto is_in_text = [this](std::string_view piece) {
         const auto start = reinterpret_cast<std::uintptr_t>(piece.data());
@@ -140,7 +140,7 @@ int sec_acltree_array::add_soon(const acle_view &acle) {
         result = add(oldest);
     else
         ++waiting_count_;
-    // Most entries are of the key that the one before them is of.
+    // Most entries have the key of the previous one.
     if (last_found_ != nullptr && is_of_key(*last_found_, acle))
         __builtin_prefetch(last_found_->first_look(acle), for_writing);
     oldest = acle;
