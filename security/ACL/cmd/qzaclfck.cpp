@@ -39,6 +39,12 @@ void set_flag(option_state &state, unsigned flag, const char *option) {
         state.flags |= flag;
 }
 
+void set_help(option_state &state) {
+    if ((state.flags & ACLFCK_OPT_HELP) == 0)
+        state.status = option_state::help_wanted;
+    set_flag(state, ACLFCK_OPT_HELP, "-h");
+}
+
 void set_name(option_state &state, char *&name, const char *option) {
     if (name != nullptr) {
         state.fail(report(SEC_S_BAD_PARAMETER, msg::option_repeated, option));
@@ -78,9 +84,7 @@ option_state read_options(int argc, char *argv[]) {
             set_name(state, aclfname, "-f");
             break;
         case 'h':
-            if ((state.flags & ACLFCK_OPT_HELP) == 0)
-                state.status = option_state::help_wanted;
-            set_flag(state, ACLFCK_OPT_HELP, "-h");
+            set_help(state);
             break;
         case 's':
             set_flag(state, ACLFCK_OPT_COMPILE, "-s");

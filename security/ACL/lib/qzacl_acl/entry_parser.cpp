@@ -73,18 +73,13 @@ std::uint8_t type_of_letter(char letter) {
     }
 }
 
-struct token {
-    char *text = nullptr;
-    std::size_t length = 0;
-};
-
 // Cuts the tokens out of one line of a text, ending each with a NUL in place.
 class line_tokens {
 public:
     line_tokens(char *begin, char *end, const char *limit) : at_(begin), end_(end), limit_(limit) {}
 
     // False when only blanks or a comment are left.
-    bool next(token &out) {
+    bool next(line_word &out) {
         while (at_ != end_ && is_blank(*at_))
             ++at_;
         if (at_ == end_ || *at_ == '#')
@@ -115,9 +110,14 @@ private:
     space_class is_space_;
 };
 
+void fold_in_place(const line_word &word) {
+    for (char &c : std::span(word.text, word.length))
+        c = static_cast<char>(fold(static_cast<unsigned char>(c)));
+}
+
 // Fills the entry from the tokens of a line. Without any, its type stays 0.
 int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, parsed_acle &entry) {
-    token type;
+    line_word type;
     if (!tokens.next(type))
         return SEC_S_OK;
     entry.type = type.length == 1 ? type_of_letter(type.text[0]) : std::uint8_t{0};
@@ -125,24 +125,22 @@ int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, parsed_a
         return report(SEC_S_BAD_ACL, msg::bad_type_token, line, type.text);
 
     if (has_mechanism(entry.type)) {
-        token mechanism;
+        line_word mechanism;
         if (!tokens.next(mechanism))
             return report(SEC_S_BAD_ACL, msg::tokens_missing, line);
         if (mechanism.length > mechanism_max)
             return report(SEC_S_BAD_ACL, msg::mechanism_too_long, mechanism.text, line);
-        for (std::size_t index = 0; index < mechanism.length; ++index)
-            mechanism.text[index] =
-                static_cast<char>(fold(static_cast<unsigned char>(mechanism.text[index])));
+        fold_in_place(mechanism);
         entry.mechanism = {mechanism.text, mechanism.length};
     }
     if (has_identity(entry.type)) {
-        token identity;
+        line_word identity;
         if (!tokens.next(identity))
             return report(SEC_S_BAD_ACL, msg::tokens_missing, line);
         entry.identity = {identity.text, identity.length};
     }
 
-    token permissions;
+    line_word permissions;
     if (!tokens.next(permissions))
         return SEC_S_OK;
     if (const int result = sec__translate_perms(permissions.text, &set, &entry.perm_mask);
@@ -152,7 +150,7 @@ int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, parsed_a
         report(result, msg::bad_permission_token, line, permissions.text);
         return result;
     }
-    token excess;
+    line_word excess;
     if (tokens.next(excess))
         return report(SEC_S_BAD_ACL, msg::tokens_in_excess, line);
     return SEC_S_OK;
