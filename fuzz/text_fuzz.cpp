@@ -1,6 +1,6 @@
-// Whole ACL texts, line by line against a second parser that is plain enough to be right at a glance: what is accepted
-// compiles to the model's bytes, which are sound, list what was written, and come out of trees again; also where memory
-// runs out meanwhile.
+// Compares whole ACL texts, line by line, with a second parser that is simple enough to be obviously right.
+// Accepted texts compile to the model's bytes, which are sound, list the entries written, and survive expansion
+// into trees, even if memory runs out in between.
 #include "faults.h"
 #include "fuzz.h"
 #include "model.h"
@@ -80,7 +80,7 @@ line_facts parse_plainly(const std::string &text, std::size_t at, int line) {
 
 // Compiles a text beside the model, which in the end is as the bytes are.
 model compile(const std::string &text, buffer &out) {
-    // What trees point into has readable bytes behind it.
+    // Trees need readable bytes after their text.
     const bool is_borrowed = text.size() % 3 != 0;
     const buffer copy(text_field(text) + std::string(is_borrowed ? 7 : 0, 'x'));
     char *const start = static_cast<char *>(copy.acl.data);

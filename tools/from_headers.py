@@ -11,8 +11,8 @@ import sys
 from mdoc import Prose, argument, folded, literal
 
 SOURCE, MAN = map(pathlib.Path, sys.argv[1:])
-DATE = "November 25, 2026"  # of the last change of contents, so that a build gives the same bytes on any day
-FAMILIES = {  # the sections of acl.h, with their pages and what these are about
+DATE = "November 25, 2026"  # of the last change of contents, so that builds are reproducible
+FAMILIES = {  # the sections of acl.h, with the names and subjects of their pages
     "Buffers": ("qzacl_buffers", "compiled access control lists as a whole"),
     "Entries": ("qzacl_entries", "entries of access control lists"),
     "Permissions": ("qzacl_permissions", "permission letters and masks"),
@@ -45,7 +45,7 @@ def starts_anew(line):
 
 
 def row_content(text, column, further):
-    """The content of one row: text, and a nested table if rows are indented further than the text."""
+    """The content of one row: text, and a nested table if the following rows are indented further than the text."""
     content = [("text", text)]
     for line in further:
         row = ROW.fullmatch(line)
@@ -134,7 +134,7 @@ def synopsis(header, items):
 
 
 def type_lines(prose, lines, code):
-    """A type with its fields, or as it is declared."""
+    """A type with its fields, or its declaration."""
     fields = re.findall(r"^ +([\w ]+ )(\**\w+(?:\[\d+\])?);(?: */\* (.*?) \*/)?$", code, re.M)
     name = re.search(r"\(\*(\w+)\)|(\w+);$", code)
     yield f".Ss {name[1] or name[2]}"
@@ -193,11 +193,12 @@ def page(name, section, names, about, body):
     folder = MAN / f"man{section}"
     folder.mkdir(parents=True, exist_ok=True)
     text = "\n".join([*title, *body]) + "\n"
-    (folder / f"{name}.{section}").write_text(folded(re.sub(r"(?m)^(\.S[hs] .*\n)\.Pp\n", r"\1", text)), encoding="utf-8")
+    text = re.sub(r"(?m)^(\.S[hs] .*\n)\.Pp\n", r"\1", text)
+    (folder / f"{name}.{section}").write_text(folded(text), encoding="utf-8")
 
 
 def opening_lines(prose, header):
-    """The opening comment: what the header is for, and the rules for every call, each under its name."""
+    """The opening comment: the purpose of the header, and the rules for every call under their names."""
     rules_at = next(i for i, line in enumerate(header.opening) if "----" in line)
     rules = []
     for kind, content in parsed(header.opening[rules_at + 1:]):
@@ -238,7 +239,7 @@ def write_acl_pages(acl):
 
 
 def write_platform_page(header, name, about, related):
-    """A library of the platform: one page for all its functions."""
+    """A platform library: one page for all its functions."""
     prose = Prose(name)
     purpose, rules = opening_lines(prose, header)
     body = [".Sh LIBRARY", f"lib{name} (link with", f".Fl l{name} )",

@@ -1,4 +1,4 @@
-"""The language of manual pages: words, displays and running text as mdoc."""
+"""Writes mdoc, the language of manual pages: words, displays and running text."""
 import re
 import textwrap
 
@@ -7,7 +7,7 @@ def escaped(text):
     return text.replace("\\", "\\e")
 
 
-def argument(text):  # quoted, so that no word of it is taken for a macro
+def argument(text):  # quoted, so that no word in it is taken for a macro
     return '"' + escaped(text).replace('"', '""') + '"'
 
 
@@ -57,7 +57,7 @@ class Prose:
             yield line
 
     def blocks(self, blocks, spaced=True):
-        """The content of a comment; `spaced` says whether a paragraph at its beginning is a new one."""
+        """The content of a comment. `spaced` says whether a paragraph at its beginning starts a new one."""
         before = ":"
         for kind, content in blocks:
             if spaced and (kind == "text" or kind == "table" and not re.match("Codes:|.*:$", before, re.S)):
@@ -81,7 +81,7 @@ class Prose:
 
 
 def folded(text):
-    """Text lines of at most 79 bytes; requests and literal displays are left alone."""
+    """Wraps text at 79 bytes. Requests and literal displays are unchanged."""
     lines, is_literal = [], False
     for line in text.split("\n"):
         is_literal = line.startswith(".Bd") or (is_literal and not line.startswith(".Ed"))

@@ -1,8 +1,7 @@
-// Adding entries to a compiled buffer and deleting them from it. An edit touches the sub-ACL of the entry's
-// key and no other.
+// Adding entries to a compiled buffer and deleting them from it. An edit changes only the sub-ACL of the entry's key.
 //
-// The plain way expands that sub-ACL into a tree, changes the tree and compiles it again. Most edits need not go
-// it: edit_packed.h says which.
+// The general method expands that sub-ACL into a tree, changes the tree and compiles it again. Most edits do not
+// need it: see edit_packed.h.
 #include "base/owned.h"
 #include "qzacl_acl/acle_report.h"
 #include "qzacl_acl/buffer.h"
@@ -35,8 +34,7 @@ int check_entry(const sec_acle_t &acle) {
 }
 
 int check_header(const sec_acl_buffer_t &acl) {
-    // What of the header the length does not cover counts as wrong in no way of its own, but as bytes that
-    // are missing.
+    // Header bytes beyond the length are reported as missing, not as wrong.
     byte_reader reader(format::bytes_of(acl));
     std::uint8_t type = format::buffer_type;
     std::uint8_t version = format::buffer_version;
@@ -53,7 +51,7 @@ int check_header(const sec_acl_buffer_t &acl) {
     return is_whole ? SEC_S_OK : report_corrupt(__LINE__);
 }
 
-// Finds the sub-ACL that an edit is about. The bytes that the edit replaces must all be there.
+// Finds the sub-ACL to edit. All bytes that the edit replaces must exist.
 int find_edited(const sec_acl_buffer_t &acl, const sec_acle_t &acle, stored_subacl &out) {
     out = find_subacl(acl, acle.type, acle.mechanism);
     if (out.is_there && out.head.length > static_cast<std::size_t>(acl.length) - out.offset)
@@ -61,7 +59,7 @@ int find_edited(const sec_acl_buffer_t &acl, const sec_acle_t &acle, stored_suba
     return SEC_S_OK;
 }
 
-// Puts what a changed tree compiled to in the place of the stored sub-ACL, or where a new one goes.
+// Replaces the stored sub-ACL with the compiled one, or inserts that as a new one.
 int replace_subacl(const loose_subacl &compiled, const stored_subacl &stored, const char *function,
                    sec_acl_buffer_t &acl) {
     const bool is_new = !stored.is_there;
@@ -97,8 +95,8 @@ int add_by_tree(const sec_acle_t &acle, on_duplicate handling, const stored_suba
         return result;
     if (compiled.length == 0)
         return report(SEC_S_INTERNAL, msg::internal_failure, acl_source, __LINE__, SEC_S_INTERNAL);
-    // Entries with equal identities may have become one; an entry that was added is no failure for want of
-    // less memory.
+    // Duplicates in the stored sub-ACL may have become one entry. If shrinking the memory fails, the addition still
+    // succeeded.
     const std::int32_t old_length = acl.length;
     const int replaced = replace_subacl(compiled, stored, add_function, acl);
     if (replaced == SEC_S_OK && acl.length < old_length)
