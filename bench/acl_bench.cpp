@@ -6,8 +6,8 @@
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/entry_parser.h"
 #include "qzacl_acl/trees.h"
-#include "trace_points.h"
 #include "qzacl_utils/file_bytes.h"
+#include "trace_points.h"
 
 #include <benchmark/benchmark.h>
 

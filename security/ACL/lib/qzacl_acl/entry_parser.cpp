@@ -80,9 +80,7 @@ public:
 
     // False when only blanks or a comment are left.
     bool next(line_word &out) {
-        while (at_ != end_ && is_blank(*at_))
-            ++at_;
-        if (at_ == end_ || *at_ == '#')
+        if (!find_word(at_, end_))
             return false;
         out.text = at_;
         at_ = find_token_end();

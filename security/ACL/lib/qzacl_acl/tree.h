@@ -93,7 +93,7 @@ private:
     std::uint32_t held_count_ = 0;
     std::uint32_t overlong_count_ = 0;
     mutable bool has_whole_keys_ = true; // false once sorting has dropped a common prefix from the keys
-    // True while every entry sorts after its predecessor. Until then no table is needed.
+    // True while every entry sorts after its predecessor. As long as it is, the table is unused.
     mutable bool is_ascending_ = true;
     std::uint8_t type_;
 };

@@ -14,18 +14,10 @@ using namespace qz;
 
 namespace {
 
-bool is_of_key(const sec_acltree_t &tree, const acle_view &acle) {
-    if (tree.type() != acle.type)
-        return false;
-    if (!has_mechanism(acle.type))
-        return true;
-    const std::string_view held = tree.mechanism();
-    const auto is_equal_folded = [](char a, char b) {
+bool equals_folded(std::string_view one, std::string_view other) {
+    return std::equal(one.begin(), one.end(), other.begin(), other.end(), [](char a, char b) {
         return fold(static_cast<unsigned char>(a)) == fold(static_cast<unsigned char>(b));
-    };
-    return held == acle.mechanism || // as texts spell it
-           std::equal(held.begin(), held.end(), acle.mechanism.begin(), acle.mechanism.end(),
-                      is_equal_folded);
+    });
 }
 
 std::uint32_t hash_of_key(const acle_view &acle, const identity_hash_key &key) {
@@ -48,6 +40,16 @@ sec_acltree_array::~sec_acltree_array() {
             tree.trace_release();
         tree.~sec_acltree();
     }
+}
+
+bool sec_acltree_array::is_of_key(const sec_acltree_t &tree, const acle_view &acle) const {
+    if (tree.type() != acle.type)
+        return false;
+    if (!has_mechanism(acle.type))
+        return true;
+    // The parser has folded the mechanisms of a text.
+    return text_.empty() ? equals_folded(tree.mechanism(), acle.mechanism)
+                         : tree.mechanism() == acle.mechanism;
 }
 
 sec_acltree_t *sec_acltree_array::find_tree(const acle_view &acle, std::uint32_t hash) {

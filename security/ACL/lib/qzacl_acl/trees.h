@@ -41,6 +41,7 @@ private:
         std::uint32_t number; // number of the tree plus one; 0 in a free slot
     };
 
+    bool is_of_key(const sec_acltree_t &tree, const qz::acle_view &acle) const;
     bool may_borrow(const qz::acle_view &acle) const;
 
     static constexpr std::uint32_t waiting_max = 16;
