@@ -1,4 +1,4 @@
-// Writing for a library, whose process may have a file size limit.
+// Writing files in a process that may have a file size limit.
 #ifndef QZ_LIMITED_WRITE_H
 #define QZ_LIMITED_WRITE_H
 
@@ -11,8 +11,8 @@
 
 namespace qz {
 
-// Writes once, as write() does. Past a file size limit it fails like on a full disk: SIGXFSZ, which would end a
-// process that does not expect it, is held back during the write, and taken away if this write raised it.
+// Writes once, as write() does. Past the file size limit it fails, as on a full disk: SIGXFSZ, which would kill an
+// unprepared process, is blocked during the write and consumed if this write raised it.
 inline ssize_t limited_write(int fd, const void *bytes, std::size_t count) {
     sigset_t limit_signal;
     sigset_t before;

@@ -11,7 +11,7 @@
 
 namespace qz {
 
-// Takes, for its scope, the numbers of the standard streams that are closed. Printing to them fails as it did.
+// Occupies the descriptors of closed standard streams for its scope. Printing to them still fails.
 class taken_streams {
 public:
     taken_streams() {
@@ -25,26 +25,26 @@ private:
     descriptor taken_[STDERR_FILENO + 1];
 };
 
-// Opens a file as open() does, on a descriptor that is none of a standard stream's: what another thread prints
-// must not end up in the file, nor what it reads come from there. The descriptor does not survive an exec, and a
-// terminal does not become the controlling one. On failure the descriptor is empty and errno set.
+// Opens a file as open() does, but never on the descriptor of a standard stream: another thread must neither print
+// into the file nor read from it. The descriptor is closed on exec, and a terminal does not become the controlling
+// one. On failure the descriptor is empty and errno is set.
 inline descriptor open_file(const char *path, int flags, mode_t mode = 0) {
     std::optional<taken_streams> streams;
     if ((flags & O_ACCMODE) != O_RDONLY)
         streams.emplace();
-    // Another thread that does the same may give the numbers back first.
+    // Another thread that occupies them too may have released them by now.
     descriptor low(open(path, flags | O_CLOEXEC | O_NOCTTY, mode));
     if (!low || low.get() > STDERR_FILENO)
         return low;
     descriptor high(fcntl(low.get(), F_DUPFD_CLOEXEC, STDERR_FILENO + 1));
     const int error = errno;
     low.close();
-    // Whoever read or printed meanwhile moved the place in the file, which both numbers share; moving back to its start
-    // waits for one who still does.
+    // A thread that read or printed meanwhile has moved the file offset, which both descriptors share. lseek waits for
+    // one that still does.
     const bool is_at_start = high && lseek(high.get(), 0, SEEK_SET) == 0;
     if ((flags & O_EXCL) != 0) {
-        // A file that was just made stays empty, whatever was printed into it meanwhile. If it cannot be kept open,
-        // nobody is to find it.
+        // A new file must be empty, even if another thread printed into it meanwhile. One that cannot be kept open must
+        // not stay.
         if (!high)
             unlink(path);
         else if (!is_at_start || ftruncate(high.get(), 0) != 0)

@@ -1,4 +1,4 @@
-// Owners of what must be given back: memory from malloc, and descriptors.
+// Owners of memory from malloc and of file descriptors.
 #ifndef QZ_OWNED_H
 #define QZ_OWNED_H
 
@@ -16,9 +16,22 @@ struct free_memory {
     void operator()(void *memory) const { std::free(memory); }
 };
 
-// Memory from malloc; release() hands it to a caller who frees it with free.
+// Memory from malloc. release() passes it to a caller, who frees it with free().
 template <class T>
 using owned = std::unique_ptr<T, free_memory>;
+
+// The size of an allocation that failed, for its message; none where all succeeded.
+class [[nodiscard]] shortage {
+public:
+    constexpr shortage() = default;
+    explicit constexpr shortage(std::size_t bytes) : bytes_(bytes) {}
+
+    explicit constexpr operator bool() const { return bytes_ != 0; }
+    constexpr std::size_t bytes() const { return bytes_; }
+
+private:
+    std::size_t bytes_ = 0;
+};
 
 // Uninitialised memory for `count` objects of a trivial type, or null.
 template <class T>
@@ -29,7 +42,7 @@ owned<T[]> allocate(std::size_t count) {
     return owned<T[]>(static_cast<T *>(std::malloc(count * sizeof(T))));
 }
 
-// Resizes an owned array; on failure the array is as it was and the result is false.
+// Resizes an owned array. On failure returns false and leaves the array unchanged.
 template <class T>
 bool reallocate(owned<T[]> &array, std::size_t count) {
     static_assert(std::is_trivial_v<T>);

@@ -1,4 +1,4 @@
-// Keeps a thread that is to be cancelled going until an operation has given back what it holds.
+// Defers the cancellation of a thread until an operation has released its resources.
 #ifndef QZ_UNCANCELLED_H
 #define QZ_UNCANCELLED_H
 
@@ -6,7 +6,7 @@
 
 namespace qz {
 
-// Disables the cancellation of the thread for its scope. Such scopes may lie within each other.
+// Disables cancellation of the thread for its scope. Scopes nest.
 class uncancelled {
 public:
     uncancelled() { pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, &before_); }

@@ -1,4 +1,4 @@
-// Strict UTF-8: no longer forms than needed, no surrogates, nothing above U+10FFFF.
+// Strict UTF-8: no overlong forms, no surrogates, nothing above U+10FFFF.
 #ifndef QZ_UTF8_H
 #define QZ_UTF8_H
 
@@ -8,8 +8,8 @@
 
 namespace qz {
 
-// Takes the first character off the bytes, of which there is at least one, and hands out its code point. False
-// where they do not start with one.
+// Removes the first character from a non-empty string and hands out its code point. False when the string does not
+// start with a valid one.
 constexpr bool take_utf8(std::string_view &bytes, std::uint32_t &point) {
     const auto lead = static_cast<unsigned char>(bytes.front());
     std::size_t followers = 0;
@@ -17,7 +17,7 @@ constexpr bool take_utf8(std::string_view &bytes, std::uint32_t &point) {
     point = lead;
     if (lead >= 0xf0) {
         followers = 3;
-        // A lead byte above 0xf7 leaves a bit too many and ends beyond the last code point.
+        // A lead byte above 0xf7 leaves one bit too many, so the result exceeds the last code point.
         point = lead & 0x0fU;
         least = 0x10000;
     } else if (lead >= 0xe0) {

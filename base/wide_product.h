@@ -1,4 +1,4 @@
-// Products of 128 bits, also where the compiler has no numbers that wide.
+// 128-bit products, also for compilers without a 128-bit type.
 #ifndef QZ_WIDE_PRODUCT_H
 #define QZ_WIDE_PRODUCT_H
 
@@ -17,7 +17,7 @@ constexpr wide_number wide_product(std::uint64_t a, std::uint64_t b) {
     const wide product = static_cast<wide>(a) * b;
     return {static_cast<std::uint64_t>(product >> 64), static_cast<std::uint64_t>(product)};
 #else
-    // The four products of halves; no sum of these exceeds 64 bits.
+    // The four products of halves. No sum of them exceeds 64 bits.
     constexpr std::uint64_t low_half = 0xffffffff;
     const std::uint64_t low = (a & low_half) * (b & low_half);
     const std::uint64_t first = (a >> 32) * (b & low_half) + (low >> 32);

@@ -1,4 +1,4 @@
-// Eight bytes at a time: loading them, their order, and which of them are zero.
+// Words of eight bytes: loading, byte order, and finding zero bytes.
 #ifndef QZ_WORDS_H
 #define QZ_WORDS_H
 
@@ -11,43 +11,43 @@ namespace qz {
 
 inline constexpr std::size_t word_size = sizeof(std::uint64_t);
 
-// A word that holds the value in each of its bytes.
+// A word with the value in each byte.
 constexpr std::uint64_t in_each_byte(unsigned char value) {
     return value * std::uint64_t{0x0101010101010101};
 }
 
-// Eight bytes from any address, in the order of the host.
+// Eight bytes from any address, in host order.
 inline std::uint64_t load8(const void *at) {
     std::uint64_t word;
     std::memcpy(&word, at, sizeof word);
     return word;
 }
 
-// Four bytes from any address, in the order of the host.
+// Four bytes from any address, in host order.
 inline std::uint32_t load4(const void *at) {
     std::uint32_t word;
     std::memcpy(&word, at, sizeof word);
     return word;
 }
 
-// A loaded word as a number of which the first byte in memory is the lowest.
+// A loaded word as a number whose lowest byte is the first in memory.
 constexpr std::uint64_t first_byte_lowest(std::uint64_t loaded) {
     return std::endian::native == std::endian::little ? loaded : __builtin_bswap64(loaded);
 }
 
-// A loaded word as a number of which the first byte in memory is the highest: it compares as the bytes do.
+// A loaded word as a number whose highest byte is the first in memory: it compares as the bytes do.
 constexpr std::uint64_t first_byte_highest(std::uint64_t loaded) {
     return std::endian::native == std::endian::little ? __builtin_bswap64(loaded) : loaded;
 }
 
-// The high bit of the lowest byte that is zero; 0 when none is. Bits above that one are cut off, where a borrow
-// may have set some that mean nothing.
+// The high bit of the lowest zero byte, or 0. Higher bits are masked off, because a borrow may have set some of them
+// by mistake.
 constexpr std::uint64_t lowest_zero(std::uint64_t word) {
     const std::uint64_t zeros = (word - in_each_byte(0x01)) & ~word & in_each_byte(0x80);
     return zeros & (~zeros + 1);
 }
 
-// The number of bytes of a loaded word before its first NUL; eight where it has none.
+// The number of bytes before the first NUL of a loaded word, or eight.
 constexpr unsigned bytes_before_nul(std::uint64_t loaded) {
     return static_cast<unsigned>(std::countr_zero(lowest_zero(first_byte_lowest(loaded)))) / 8;
 }

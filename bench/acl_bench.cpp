@@ -1,14 +1,13 @@
-// Measures what no service can reach on its own: a trace point that is switched off, and the phases that the
-// check of a file goes through.
+// Measures parts that a service cannot call separately: a disabled trace point, and the phases of checking a file.
 //
 // usage: acl_bench FOLDER [--benchmark_...]
 //
-// The folder holds files of generate.py; a size without its file is not measured.
+// The folder contains files made by generate.py. Sizes without a file are skipped.
 #include "qzacl_acl/compile.h"
 #include "qzacl_acl/entry_parser.h"
 #include "qzacl_acl/trees.h"
-#include "trace_points.h"
 #include "qzacl_utils/file_bytes.h"
+#include "trace_points.h"
 
 #include <benchmark/benchmark.h>
 
@@ -45,8 +44,8 @@ private:
     double last_ = 0;
 };
 
-// The phases one after the other for the whole file, where the check goes from line to line; all in
-// nanoseconds a line.
+// Runs each phase for the whole file, unlike the check, which goes line by line. All results are in nanoseconds per
+// line.
 void bench_phases(benchmark::State &state, const std::string &text) {
     double parsing = 0;
     double inserting = 0;
@@ -54,7 +53,7 @@ void bench_phases(benchmark::State &state, const std::string &text) {
     double releasing = 0;
     std::size_t lines = 0;
     for (auto _ : state) {
-        // With what a text that was read from a file has behind it, as trees point into it.
+        // With the padding of a text that was read from a file, because trees point into it.
         std::string consumed = text + std::string(qz::text_padding, '\0');
         const std::size_t size = text.size() + 1;
         std::vector<qz::parsed_acle> entries;

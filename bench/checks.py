@@ -1,4 +1,4 @@
-"""The check as whole processes: what is run, and what the table says of it."""
+"""The check as whole processes: what is run, and how the table shows it."""
 import math
 
 from measure import generate, progress
@@ -6,15 +6,15 @@ from table import as_memory
 
 ORDERS = ("sorted", "reversed", "bothends", "tworuns")
 FAMILIES = ("rand", "prefixed")
-LARGE = 100_000  # from here on the start of a process counts for little
+LARGE = 100_000  # from here on the start of a process hardly matters
 MILLION = 1_000_000
-# At most so many times the time of sort, and of its memory.
+# Limits, as multiples of the time and the memory of sort.
 TIME_OF_SORT = {("rand", LARGE): 0.48, ("rand", MILLION): 0.35, ("prefixed", MILLION): 0.33}
 MEMORY_OF_SORT = {"rand": 0.9, "prefixed": 1.1}
 
 
 class Files:
-    """The files of generate.py in a folder."""
+    """The files made by generate.py in a folder."""
 
     def __init__(self, folder):
         self.folder = folder
@@ -41,7 +41,7 @@ def add_largest(commands, checker, file, lines):
     commands.add("without -s", checker, "-f", file(lines))
     commands.add("verbose", checker, "-v", "-f", file(lines), stderr=output)
     commands.add("bad", checker, "-c", "-f", file(lines, kind="bad"), stderr=output)
-    # The first two have nothing to print, and their status may say so.
+    # The first two search for something absent, so that nothing is printed. The status may be nonzero.
     questioner = checker.with_name("qzacl")
     commands.add("ask", questioner, "ask", "-m", "unix", file(lines), "nobody@nowhere", statuses=(0, 1))
     commands.add("who", questioner, "who", file(lines), "rwcxCqledvsao", statuses=(0, 1))
@@ -117,7 +117,7 @@ def check_rows(table, commands, sizes):
     table.ratio(f"a line of {largest:,}", a_line, f"a line of {small:,}", a_small_line, 2.2)
     of_start = [(cpu[f"rand random {lines}"] - cpu["start"]) / lines for lines in (largest, small)]
     table.ratio("the same without the start of the process", of_start[0], f"a line of {small:,}", of_start[1])
-    # The kernel counts a process from the size of the one that starts it, so that only large ones can be told apart.
+    # The kernel counts the peak memory of a process from the size of its parent, so only large ones are meaningful.
     if largest == MILLION:
         for family, limit in MEMORY_OF_SORT.items():
             peak, sort_peak = memory[f"{family} random {largest}"], memory[f"sort {family} {largest}"]

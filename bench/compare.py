@@ -1,4 +1,4 @@
-"""Compares two builds: runs them in turn and says which figures differ by more than their noise."""
+"""Compares two builds: runs them alternately and reports figures that differ by more than the noise."""
 import math
 import statistics
 import tempfile
@@ -9,8 +9,8 @@ from measure import Commands, generate, progress, run_program
 from table import as_time
 
 ROUNDS = 6
-LEAST_CHANGE = 0.01  # what is below it is not worth a word
-# A process measures each figure once for so many seconds.
+LEAST_CHANGE = 0.01  # smaller changes are not reported
+# A process measures each figure once for this many seconds.
 SECONDS = 0.02
 LINES = (1000, 100_000)
 
@@ -51,13 +51,13 @@ def measure(build, file):
 
 
 def noise_of(pairs):
-    """What two runs of one build differ in: three quarters of the pairs differ by less."""
+    """The noise between runs of one build: three quarters of the pairs differ by less."""
     differences = sorted(abs(math.log(first / second)) for first, second in pairs)
     return differences[len(differences) * 3 // 4]
 
 
 def row(name, old, new):
-    """Old and new are the pairs of figures that each round took; the change is one of medians, which vary less."""
+    """Old and new are the pairs of figures of each round. Their medians are compared, because these vary less."""
     before, after = (statistics.median([figure for pair in pairs for figure in pair]) for pairs in (old, new))
     change, noise = math.log(after / before), max(noise_of(old + new), LEAST_CHANGE)
     said = "" if abs(change) <= noise else "faster" if change < 0 else "**slower**"
@@ -66,7 +66,7 @@ def row(name, old, new):
 
 
 def compare(build, other):
-    """Each round runs old, new, old, new, so that what changes slowly on the machine changes all of them alike."""
+    """Each round runs old, new, old, new, so that slow changes of the machine affect all of them equally."""
     figures = {other: {}, build: {}}
     with tempfile.TemporaryDirectory(prefix="qzacl-bench-") as folder:
         file = Files(Path(folder))

@@ -1,5 +1,5 @@
 #!/usr/bin/env python3
-"""Writes ACL files to measure with: the same arguments give the same bytes on every machine.
+"""Writes ACL files for measurements. The same arguments give the same bytes on every machine.
 
 One file for every order and type that is asked for, named FAMILY-ORDER-TYPE-LINES.acl in the folder. Besides the
 entry types u, e and g there are: bad (lines of which each has one of four mistakes), mech (user entries whose
@@ -14,7 +14,7 @@ FAMILIES = ("rand", "prefixed")
 ORDERS = ("random", "sorted", "reversed", "bothends", "tworuns")
 PERMISSIONS = ("r", "rw", "rwx", "", "q", "rl")
 FIRST_USER = 100_000
-# Every kind of line is filled in with a name, permissions, its place, the name in lower case, and a user number.
+# The fields of a line: a name, permissions, its number, the name in lower case, and a user number.
 LINES = {
     "u": ("u unix {0} {1}\n",),
     "e": ("e unix {0} {1}\n",),
@@ -28,7 +28,7 @@ LINES = {
 
 
 def random_names(source, count):
-    """Words of 6 to 12 letters of both cases, which differ in more than case."""
+    """Words of 6 to 12 letters in both cases that differ in more than case."""
     longest, lengths = 12, range(6, 13)
     to_letter = bytes(ord(string.ascii_letters[value % 52]) for value in range(256))
     names = {}
@@ -48,7 +48,7 @@ def prefixed_names(source, count):
 
 
 def in_order(names, order):
-    """The names, which come in random order, in another one."""
+    """The names, given in random order, in the requested order."""
     half = len(names) // 2
     if order == "random":
         return names

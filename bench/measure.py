@@ -1,4 +1,4 @@
-"""Measures: whole processes, and what the two programs measure inside one."""
+"""Measures whole processes, and runs the two programs that measure inside one."""
 import json
 import os
 import shutil
@@ -8,7 +8,7 @@ import sys
 from pathlib import Path
 
 BENCH = Path(__file__).resolve().parent
-# The command converts to the locale's code set, so that one must be named; nothing is traced.
+# The command converts to the locale's code set, so the locale is fixed. Tracing is off.
 ENVIRONMENT = {name: value for name, value in os.environ.items() if not name.startswith(("QZ_", "LC_", "LANG"))}
 ENVIRONMENT["PATH"] = os.environ.get("PATH", os.defpath) + ":/usr/sbin:/sbin"
 SECONDS = {"ns": 1e-9, "us": 1e-6, "ms": 1e-3, "s": 1}
@@ -24,12 +24,12 @@ def generate(folder, lines, *options):
 
 
 def in_turn(things, number):
-    """Every second round goes backwards, so that whatever disturbs the machine disturbs all alike."""
+    """Every second round goes backwards, so that disturbances affect all figures equally."""
     return things if number % 2 == 0 else things[::-1]
 
 
 def run_once(arguments, environment, stderr, statuses):
-    """Runs a process and gives its CPU seconds, user and system, and its peak memory in bytes."""
+    """Runs a process and returns its CPU seconds, user and system, and its peak memory in bytes."""
     nothing = os.open(os.devnull, os.O_RDWR)
     # Emptied here, so that the process is not charged for it.
     errors = os.open(stderr, os.O_WRONLY | os.O_CREAT | os.O_TRUNC)
@@ -44,7 +44,7 @@ def run_once(arguments, environment, stderr, statuses):
 
 
 class Commands:
-    """Whole processes: every figure that was taken of each, by the name that it was added under."""
+    """Whole processes: all figures of each, by the name under which it was added."""
 
     def __init__(self):
         self.jobs = {}
@@ -61,7 +61,7 @@ class Commands:
         self.jobs[name] = (arguments, {**ENVIRONMENT, "LC_ALL": locale}, stderr, statuses)
 
     def run(self, rounds):
-        """Runs what was added, once in each round."""
+        """Runs each process once per round."""
         jobs, self.jobs = list(self.jobs.items()), {}
         for number in range(rounds + 1):
             for name, job in in_turn(jobs, number):
@@ -78,7 +78,7 @@ class Commands:
 
 
 def figures_of(run):
-    """The names and seconds of one run: its time, and of some also the CPU time and the phases."""
+    """The names and seconds of one run: its time and, for some, the CPU time and the phases."""
     scale = SECONDS[run["time_unit"]]
     name = run["run_name"]
     if "/real_time" in name:

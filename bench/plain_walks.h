@@ -1,4 +1,4 @@
-// Compiled buffers, and the plainest ways through them, which decisions are measured against.
+// Compiled buffers, and the plainest walks through them, for comparison with decisions.
 #ifndef QZ_BENCH_PLAIN_WALKS_H
 #define QZ_BENCH_PLAIN_WALKS_H
 
@@ -43,7 +43,7 @@ inline const char *identity_of(const unsigned char *entry) {
     return reinterpret_cast<const char *>(entry + format::entry_fixed_size);
 }
 
-// The compiled form of a file whose entries all have one key.
+// The compiled form of a file with entries of one key.
 class compiled {
 public:
     explicit compiled(const std::string &path) {
@@ -98,7 +98,7 @@ inline int compare_by_table(const char *a, const char *b) {
     }
 }
 
-// The permissions of the identity, found by comparing with entry after entry; no bound is checked.
+// The permissions of the identity, found by comparing one entry after the other, without checking bounds.
 template <class Compare>
 std::uint32_t scan(const unsigned char *entry, std::uint32_t count, const char *wanted, Compare compare) {
     for (; count != 0; --count, entry = behind(entry)) {

@@ -1,4 +1,4 @@
-"""Draws docs/*.svg: the check by number of lines, beside checkers of other texts; decisions by number of entries."""
+"""Draws docs/*.svg: checks by number of lines, with checkers of other texts; decisions by number of entries."""
 import os
 import statistics
 import subprocess
@@ -8,7 +8,7 @@ from pathlib import Path
 import matplotlib
 
 matplotlib.use("svg")
-from matplotlib import pyplot  # after the choice of what draws
+from matplotlib import pyplot  # after choosing the backend
 
 from checks import Files
 from measure import BENCH, ENVIRONMENT, generate, medians, progress, run_once, run_program
@@ -17,10 +17,10 @@ DOCUMENTS = BENCH.parent / "docs"
 LINES = (1000, 3000, 10_000, 30_000, 100_000, 300_000, 1_000_000)
 ENTRIES = (10, 100, 1000, 10_000, 100_000)
 ROUNDS = 5
-TOO_LONG = 10  # seconds; a program that takes longer is run once and with no more lines
-# Measures memory as a process that is small itself, which the kernel counts with its children.
+TOO_LONG = 10  # seconds; a program that takes longer is run only once, and not with more lines
+# A small process that measures memory: the kernel counts the parent's size with its children.
 SMALL_PARENT = "/usr/bin/time"
-# The same on white and on black: neither background is drawn, and no colour is close to one.
+# Readable on white and on black: no background is drawn, and no colour is close to either.
 GREY = "#7f868e"
 COLOURS = ("#1f8fe0", "#e0761f", "#2aa35a", "#b56be0", "#d9455f")
 MARKS = "os^Dv"
@@ -42,7 +42,7 @@ STYLE = {
 
 
 def checkers(build, file, lines):
-    """What is drawn, by name: the command, and its locale."""
+    """The programs to draw, by name: the command and its locale."""
     return {
         "qzaclfck -s": ([build / "bin" / "qzaclfck", "-s", "-f", file(lines)], "C.UTF-8"),
         "sort -f -u": (["/usr/bin/sort", "-f", "-u", "--parallel=1", "-k3,3", file(lines)], "C"),
@@ -62,7 +62,7 @@ def peak_memory(command, environment):
 
 
 def measure_checkers(build, folder):
-    """For each program the points (lines, seconds) and (lines, bytes)."""
+    """For each program, the points (lines, seconds) and (lines, bytes)."""
     file, slow = Files(folder), set()
     times, memories = {}, {}
     for lines in LINES:

@@ -1,4 +1,4 @@
-// POSIX ACLs, where their library is there: the parse of a text, and the look-up of a user by number.
+// POSIX ACLs, if their library is installed: parsing a text, and looking up a user by number.
 #ifndef QZ_BENCH_POSIX_ACLS_H
 #define QZ_BENCH_POSIX_ACLS_H
 

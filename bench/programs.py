@@ -1,4 +1,4 @@
-"""What the two programs measure inside a process, and what the table says of it."""
+"""What the two programs measure inside a process, and how the table shows it."""
 from measure import PHASES, generate, medians, progress, run_program
 
 FAMILIES = ("rand", "prefixed")
@@ -6,7 +6,7 @@ PROGRAMS = ("service_bench", "acl_bench")
 
 
 def measure_programs(build, folder, repetitions, seconds):
-    """The median of everything, in seconds; the folder holds the larger files already."""
+    """The median of every figure, in seconds. The folder already contains the larger files."""
     progress("inside a process")
     for lines in (10, 100, 1000):
         for family in FAMILIES:

@@ -1,5 +1,5 @@
 #!/usr/bin/env python3
-"""Measures everything and prints one table: each figure beside its reference. See docs/performance.md.
+"""Measures everything and prints one table: each figure with its reference. See docs/performance.md.
 
 usage: run.py BUILD_FOLDER [quick | --plot | compare OTHER_BUILD_FOLDER]
   quick     no file above 100,000 lines, fewer repetitions
@@ -42,7 +42,7 @@ def main():
         sys.exit(__doc__)
     build, verb = Path(sys.argv[1]), sys.argv[2:]
     if verb[:1] == ["compare"] and len(verb) == 2:
-        from compare import compare  # what the others need is not needed here, and the other way round
+        from compare import compare  # each mode imports only what it needs
 
         compare(build, Path(verb[1]))
         return
@@ -56,7 +56,8 @@ def main():
     text, grown = measure_all(build, verb == ["quick"])
     print(text, end="")
     if not verb:
-        head = "# The last table\n\nOf `./dev bench`, which writes this file; docs/performance.md says how to read it.\n\n"
+        head = ("# The last table\n\n"
+                "Of `./dev bench`, which writes this file; docs/performance.md says how to read it.\n\n")
         LAST.write_text(head + text, encoding="utf-8")
     if grown:
         sys.exit("bench: faster than n log n grows " + "; ".join(grown))

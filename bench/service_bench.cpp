@@ -1,9 +1,9 @@
-// Measures what a service asks of the shared library: decisions, edits and reads, each beside the plainest
-// code that could do the same.
+// Measures what a service calls in the shared library: decisions, edits and reads, each next to the plainest code
+// that does the same.
 //
 // usage: service_bench FOLDER [--benchmark_...]
 //
-// The folder holds files of generate.py; a size or family without its file is not measured.
+// The folder contains files made by generate.py. Sizes and families without a file are skipped.
 #include "plain_walks.h"
 #include "posix_acls.h"
 #include "qz/acl.h"
@@ -78,7 +78,7 @@ void add_decisions(const std::string &family, std::uint32_t count, const std::st
     add("walk", bench_walk, middle);
     add("table_scan", bench_scan<decltype(&compare_by_table)>, identity, &compare_by_table);
     add("strcasecmp_scan", bench_scan<decltype(&strcasecmp)>, identity, &strcasecmp);
-    // Behind everything, and where the decision ends but just not there.
+    // Identities not in the ACL: after all others, and next to a stored one.
     add("denial_at_end", bench_decision, std::string(10, '~'), SEC_S_BAD_ACLE);
     std::string almost = identity;
     almost.pop_back();
@@ -86,7 +86,7 @@ void add_decisions(const std::string &family, std::uint32_t count, const std::st
     add("decision_at_end", bench_decision, respelled(held->entry(count - 1)), SEC_S_OK);
 }
 
-// 32 groups in no order, of which every other one has an entry.
+// 32 groups in no order. Every other one has an entry.
 void bench_groups(benchmark::State &state, const buffer &held) {
     constexpr std::uint32_t group_count = 32;
     std::vector<std::string> names;
@@ -111,10 +111,10 @@ void bench_groups(benchmark::State &state, const buffer &held) {
 
 // ---- Decisions through a handler, and in several threads on one buffer ----
 
-// As plain as one can be: it accepts what is the same.
+// The plainest handler: it accepts equal identities.
 int is_same(const char *requested, const char *entry) { return std::strcmp(requested, entry); }
 
-// Expanded entries of a mechanism with a handler, which is called for each up to the one that matches.
+// Expanded entries of a mechanism with a handler, which is called for each entry up to the match.
 buffer handled_buffer(const std::string &path) {
     require(sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, mechanism, is_same) == SEC_S_OK,
             "cannot register");
@@ -135,7 +135,7 @@ void bench_last_by_handler(benchmark::State &state, const buffer &held) {
     }
 }
 
-// What a decision with a handler does under the library's lock is less than this.
+// An upper bound for the work that a decision with a handler does under the library's lock.
 void bench_lock(benchmark::State &state) {
     static pthread_mutex_t lock = PTHREAD_MUTEX_INITIALIZER;
     for (auto _ : state) {
@@ -166,7 +166,7 @@ double thread_seconds() {
     return static_cast<double>(now.tv_sec) + static_cast<double>(now.tv_nsec) / 1e9;
 }
 
-// Adds an entry in the middle and deletes it again; one of the two is timed.
+// Adds an entry in the middle and deletes it again. One of the two is timed.
 void bench_edit(benchmark::State &state, const buffer &held, bool times_adding) {
     std::string identity = identity_of(held->entry(held->count / 2));
     identity += "x";
@@ -214,7 +214,7 @@ void bench_read(benchmark::State &state, const std::string &path, std::uint32_t 
     }
 }
 
-// Opens a file and reads all of it into memory of its size.
+// Opens a file and reads it into a block of its size.
 void bench_plain_read(benchmark::State &state, const std::string &path) {
     for (auto _ : state) {
         const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC);
@@ -234,7 +234,7 @@ void bench_plain_read(benchmark::State &state, const std::string &path) {
 }
 
 void add_reads(std::uint32_t count, const std::string &path) {
-    // The cache is used only when it is later in whole seconds.
+    // The cache is used only if it is newer in whole seconds.
     const timespec long_ago[2] = {{1, 0}, {1, 0}};
     require(utimensat(AT_FDCWD, path.c_str(), long_ago, 0) == 0, "cannot set the time of " + path);
     sec_acl_buffer_t acl = {};
@@ -250,7 +250,7 @@ void add_reads(std::uint32_t count, const std::string &path) {
     add("plain_read", bench_plain_read, path + ".cacl");
 }
 
-// ---- What is there to be measured ----
+// ---- Registration ----
 
 void add_all(const std::string &folder) {
     const auto file = [&](const std::string &family, const char *type, std::uint32_t count) {

@@ -1,4 +1,4 @@
-"""The table: each figure beside its reference, and whether the limit was kept where there is one."""
+"""The table: each figure with its reference and, if there is a limit, whether it was kept."""
 import os
 import platform
 
@@ -36,7 +36,7 @@ class Table:
         self.line(f"**{title}**", "", "", "", "", "")
 
     def ratio(self, work, figure, reference_name, reference, limit=None, show=as_time):
-        """A figure as a multiple of its reference; left out when one of them was not measured."""
+        """A figure as a multiple of its reference. Omitted if either was not measured."""
         if figure is None or reference is None:
             return
         value = figure / reference
@@ -57,7 +57,7 @@ class Table:
             self.line(work, as_time(figure), "–", "–", *verdict(figure, limit, as_time(limit or 0)))
 
     def growth(self, work, figure, reference_name, reference, limit):
-        """A figure of much work as a multiple of that of little; what grows faster than the limit fails the run."""
+        """A figure for much work as a multiple of that for little. Growing faster than the limit fails the run."""
         self.ratio(work, figure, reference_name, reference, limit)
         if figure / reference > limit:
             self.grown.append(f"{work}: {figure / reference:.0f} times {reference_name}")

@@ -1,5 +1,5 @@
-# What the compiler and the linker can do against faults that slip through, for everything that is built to be
-# installed: the library works as root on files that users own.
+# Compiler and linker hardening for everything that is installed, because the library runs as root on files that users
+# own.
 include(CheckCXXCompilerFlag)
 include(CheckPIESupported)
 check_pie_supported()
@@ -7,7 +7,7 @@ check_pie_supported()
 option(QZ_HARDENING "Compile with the checks of cmake/hardening.cmake" ON)
 add_link_options(-Wl,-z,relro,-z,now,-z,noexecstack)
 if(QZ_SANITIZE OR NOT QZ_HARDENING)
-  return() # the sanitizers see more, and some of these hide what they look for
+  return() # the sanitizers detect more, and some of these options hide what they look for
 endif()
 
 foreach(flag -fstack-protector-strong -fstack-clash-protection -fcf-protection=full -ftrivial-auto-var-init=zero)
@@ -18,7 +18,7 @@ foreach(flag -fstack-protector-strong -fstack-clash-protection -fcf-protection=f
   endif()
 endforeach()
 if(NOT has_ftrivial_auto_var_init_zero)
-  # An older Clang fills with a pattern instead.
+  # Older versions of Clang fill with a pattern.
   check_cxx_compiler_flag("-ftrivial-auto-var-init=pattern -Werror" has_pattern_init)
   if(has_pattern_init)
     add_compile_options(-ftrivial-auto-var-init=pattern)

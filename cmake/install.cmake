@@ -1,5 +1,5 @@
-# What is installed beside programs, libraries and headers, and the archives that CPack makes. The components are
-# command (what users of the commands have), library (what services run with) and development.
+# Installs everything but programs, libraries and headers, and configures the archives of CPack. The components are
+# command (for users of the commands), library (for running services) and development.
 set(QZ_ZSH_COMPLETIONS site-functions CACHE STRING
   "Folder below share/zsh for the completions: site-functions, or on Debian vendor-completions")
 
@@ -15,8 +15,8 @@ foreach(command IN LISTS commands)
   install(FILES completions/${command}.fish DESTINATION ${CMAKE_INSTALL_DATADIR}/fish/vendor_completions.d
     COMPONENT command)
 endforeach()
-# The documents, without links among each other: what a link leads to may be compressed there, in another package, or
-# not installed at all. Its text is the name of the file.
+# The documents, with links replaced by file names: their targets may be compressed, in another package, or not
+# installed.
 file(GLOB documents RELATIVE ${PROJECT_SOURCE_DIR} CONFIGURE_DEPENDS docs/*.md)
 foreach(document IN ITEMS README.md CHANGELOG.md SECURITY.md LISTS documents)
   set_property(DIRECTORY APPEND PROPERTY CMAKE_CONFIGURE_DEPENDS ${document})

@@ -1,7 +1,7 @@
-# The functions that the house is put together with.
+# The functions from which the build is made.
 
-# A layer: sources, the headers that the layers above may include, and the layers it uses. Its headers are reached
-# through a folder of links that holds nothing else; that is what keeps includes pointing down.
+# A layer: sources, the headers that higher layers may include, and the layers it uses. Its headers are linked into a
+# folder that contains nothing else. This keeps includes pointing down.
 function(qz_layer name)
   cmake_parse_arguments(arg "" "ROOT" "HEADERS;SOURCES;USES" ${ARGN})
   set(root ${PROJECT_SOURCE_DIR}/${arg_ROOT})
@@ -16,7 +16,7 @@ function(qz_layer name)
     set(scope PUBLIC)
     list(TRANSFORM arg_SOURCES PREPEND ${root}/)
     add_library(${name} STATIC ${arg_SOURCES})
-    # The libraries must load where only libc is: nothing that the C++ runtime would have to supply.
+    # The libraries need only libc, so nothing may require the C++ runtime.
     target_compile_options(${name} PRIVATE -fno-exceptions -fno-rtti -fno-threadsafe-statics -fvisibility=hidden)
   else()
     add_library(${name} INTERFACE)
@@ -25,8 +25,8 @@ function(qz_layer name)
   target_link_libraries(${name} ${scope} ${arg_USES})
 endfunction()
 
-# A shared library made of whole layers. It is linked as C because it may need libc alone, and exports what its map
-# names and nothing else. REQUIRES names the project's libraries whose headers and symbols its users need, too.
+# A shared library made of whole layers. It is linked as C, because it may need only libc, and exports only the names in
+# its map. REQUIRES lists the project's libraries whose headers and symbols its users need, too.
 function(qz_shared_library name)
   cmake_parse_arguments(arg "" "MAP;DESCRIPTION" "LAYERS;HEADERS;REQUIRES" ${ARGN})
   list(TRANSFORM arg_LAYERS REPLACE "(.+)" "$<TARGET_OBJECTS:\\1>" OUTPUT_VARIABLE objects)
@@ -39,8 +39,8 @@ function(qz_shared_library name)
   if(arg_REQUIRES)
     set_target_properties(${name} PROPERTIES INSTALL_RPATH $ORIGIN)
   endif()
-  # Never unloaded: threads that live on release what these libraries recorded for them when they end, and every
-  # fork holds their locks.
+  # Never unloaded: when a thread ends, it runs code of these libraries to free its records, and every fork takes their
+  # locks.
   target_link_options(${name} PRIVATE
     -Wl,--version-script=${CMAKE_CURRENT_SOURCE_DIR}/${arg_MAP} -Wl,-z,nodelete)
   if(NOT QZ_SANITIZE)
@@ -54,11 +54,10 @@ function(qz_shared_library name)
   qz_install_library(${name} "${arg_HEADERS}" "${requires}" "${arg_DESCRIPTION}")
 endfunction()
 
-# Installs a library for those who run with it and for those who build against it, by pkg-config or by CMake. The names
-# that it requires have blanks between them, as both packages want them.
+# Installs a library and its pkg-config and CMake packages. `requires` is separated by blanks, as both packages expect.
 function(qz_install_library name headers requires description)
   set(package_dir ${CMAKE_INSTALL_LIBDIR}/cmake/${name})
-  # Relative, so that an installed tree may be moved, unless the libraries have a place of their own.
+  # Relative, so that an installed tree can be moved, unless the libraries are installed to an absolute path.
   if(IS_ABSOLUTE ${CMAKE_INSTALL_LIBDIR})
     set(pc_prefix ${CMAKE_INSTALL_PREFIX})
   else()
@@ -84,7 +83,7 @@ function(qz_install_library name headers requires description)
     COMPONENT development)
 endfunction()
 
-# A program that is not installed: it finds the libraries in the build tree. It uses layers or libraries, and goes into a
+# A program that is not installed and finds the libraries in the build tree. It USES layers or libraries and is put into
 # FOLDER of the build tree.
 function(qz_program name)
   cmake_parse_arguments(arg "" "FOLDER" "SOURCES;USES" ${ARGN})

@@ -1,4 +1,4 @@
-# The message catalog: the texts as translators receive them, and the translations, which ./dev catalog checks.
+# The message catalog: the source for translators, and the translations. ./dev catalog checks these.
 if(Python3_FOUND)
   set(catalog_source ${PROJECT_BINARY_DIR}/share/qzseclib.msg)
   file(MAKE_DIRECTORY ${PROJECT_BINARY_DIR}/share)
@@ -9,9 +9,9 @@ if(Python3_FOUND)
   install(FILES ${catalog_source} DESTINATION ${CMAKE_INSTALL_DATADIR}/${PROJECT_NAME} COMPONENT development)
 endif()
 
-# Compiles the translations for catopen. Under /usr, its default search finds LANGUAGE/LC_MESSAGES in every locale of the
-# language, whatever the code set; elsewhere NLSPATH must name the folder. catgets converts nothing, so locales of an
-# older code set get a catalog in that code set under their own names, which are searched first.
+# Compiles the translations for catopen. Under /usr its default search finds LANGUAGE/LC_MESSAGES for every locale
+# of the language; elsewhere NLSPATH must name the folder. catgets does not convert, so locales with an older code
+# set get a catalog in that code set under their own names, which are searched first.
 find_program(GENCAT gencat)
 find_program(ICONV iconv)
 
@@ -27,7 +27,7 @@ function(qz_catalog locale source codeset)
       COMMAND sed "1s/UTF-8/${codeset}/" ${source} > ${converted}.utf8
       COMMAND ${ICONV} -f UTF-8 -t ${codeset} ${converted}.utf8 > ${converted})
   endif()
-  # Removed first, because gencat adds to a catalog that is there.
+  # Removed first, because gencat merges into an existing catalog.
   add_custom_command(OUTPUT ${folder}/qzseclib.cat DEPENDS ${converted} VERBATIM
     COMMAND ${CMAKE_COMMAND} -E rm -f ${folder}/qzseclib.cat
     COMMAND ${GENCAT} ${folder}/qzseclib.cat ${converted})

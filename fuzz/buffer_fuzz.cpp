@@ -1,7 +1,7 @@
-// Arbitrary bytes as a buffer, through every operation: none may look behind them, run for ever, fail otherwise than
-// it may, or fail and change them. What the check accepts is held against a second reading of it. An input is b and
-// the bytes, whose last ones are also asked for; or w and words, which become the users (mechanism m) and groups of
-// a buffer in the order in which they stand.
+// Passes arbitrary bytes as a buffer to every operation. None may read beyond them, run forever, return an
+// unexpected code, or change them and fail. Buffers that the check accepts are compared with a second reader. An
+// input is the letter b and the bytes, the last of which also serve as a request; or w and words, which become the
+// users (mechanism m) and groups of a buffer in the given order.
 #include "fuzz.h"
 #include "model.h"
 #include "qzacl_acl/validate.h"
@@ -168,7 +168,7 @@ void ask(const sec_acl_buffer_t &acl, const std::string &name) {
     decided(acl, {"staff", name.c_str(), "admins"});
 }
 
-// Dumps for people, who are not there.
+// Dumps print; send them to /dev/null.
 void dump_unseen(const sec_acl_buffer_t &acl) {
     static std::FILE *const nowhere = std::fopen("/dev/null", "w");
     std::FILE *const streams[] = {std::exchange(stdout, nowhere), std::exchange(stderr, nowhere)};

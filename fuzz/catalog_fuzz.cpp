@@ -1,5 +1,5 @@
-// Texts of catalogs against the text that they stand for: a line with the default text, and then the offered one, of up
-// to 300 bytes. Only what takes the same arguments is used, and no argument is read that was not given.
+// Checks catalog texts against the default text. An input is a line with the default text, then the offered text,
+// of up to 300 bytes. A text is used only if it takes the same arguments, and no missing argument is ever read.
 #include "fuzz.h"
 #include "libqz_cu/message_text.h"
 #include <map>
@@ -50,7 +50,7 @@ std::map<int, bool> strings_in(const std::string &text) {
     return is_string;
 }
 
-// The text that a conversion, a percent sign or a byte stands for.
+// The output for a conversion, a percent sign or a byte.
 std::string expanded(const std::smatch &piece, const qz::cu::arguments &given,
                      std::map<int, bool> &is_string) {
     const int at = piece[1].matched ? place_of(piece) : most_arguments;

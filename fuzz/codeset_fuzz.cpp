@@ -1,5 +1,5 @@
-// Conversion of any bytes to and from UTF-8 against that of the C library by way of UTF-32, in which it has nothing but
-// characters. An input is the code set, the flags and the bytes.
+// Compares conversions to and from UTF-8 with the C library's by way of UTF-32, which it validates strictly. An
+// input is the code set, the flags and the bytes.
 #include "fuzz.h"
 #include "qz/cu.h"
 

@@ -1,6 +1,6 @@
-// Adding and deleting against the plain model: many spellings of few keys, on buffers that edits made and on such as
-// no edit leaves them. A step is four letters: what to do (+ add, ! add if new, - delete), a type, a mechanism and an
-// identity.
+// Compares adding and deleting with a plain model: many spellings of few keys, on buffers made by edits and on
+// buffers that no edit would make. A step has four letters: the action (+ add, ! add if new, - delete), a type, a
+// mechanism and an identity.
 #include "fuzz.h"
 #include "model.h"
 

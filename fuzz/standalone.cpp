@@ -1,12 +1,12 @@
-// Runs a fuzzer as an ordinary test: over each file of its corpus cut short everywhere and changed everywhere, and
-// over many inputs that are made of them at random but always alike.
+// Runs a fuzzer as an ordinary test: on each file of its corpus, truncated and changed at every place, and on many
+// reproducible random inputs derived from them.
 #include "fuzz.h"
 #include <filesystem>
 #include <fstream>
 #include <random>
 
 static void run(const std::string &input) {
-    // A block of its own, so that a look behind it is seen where such are looked for.
+    // In a separate block, so that sanitizers detect reads beyond its end.
     const std::vector<std::uint8_t> bytes(input.begin(), input.end());
     try {
         LLVMFuzzerTestOneInput(bytes.data(), bytes.size());

@@ -1,6 +1,6 @@
-// Whole ACL texts, line by line against a second parser that is plain enough to be right at a glance: what is accepted
-// compiles to the model's bytes, which are sound, list what was written, and come out of trees again; also where memory
-// runs out meanwhile.
+// Compares whole ACL texts, line by line, with a second parser that is simple enough to be obviously right.
+// Accepted texts compile to the model's bytes, which are sound, list the entries written, and survive expansion
+// into trees, even if memory runs out in between.
 #include "faults.h"
 #include "fuzz.h"
 #include "model.h"

@@ -1,4 +1,5 @@
-// The level setting against a regular expression, and which texts are printable: a line with the setting, and the text.
+// Compares the parser of the level setting with a regular expression, and checks which texts count as printable. An
+// input is a line with the setting, then the text.
 #include "fuzz.h"
 #include "libqz_tr/levels.h"
 #include "libqz_tr/text.h"
@@ -18,7 +19,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
     const auto is_control = [](unsigned char byte, unsigned char next) {
         return byte < 0x20 || byte == 0x7f || (byte == 0xc2 && next < 0xa0);
     };
-    const char *const end = text.c_str() + text.size() + 1; // with a byte behind the last one
+    const char *const end = text.c_str() + text.size() + 1; // after the NUL
     const bool has_controls = std::adjacent_find(text.c_str(), end, is_control) != end;
     const bool is_utf8 = fuzz::recoded("UTF-32LE", "UTF-8", text).has_value();
     EXPECT_EQ(qz::tr::is_printable(text), is_utf8 && !has_controls);

@@ -1,8 +1,8 @@
-# Sourced by dev and packaging/build: runs what nobody wants to read about, and shows on a terminal how far it is.
+# Sourced by dev and packaging/build: runs commands quietly and shows their progress on a terminal.
 
-# shown_before: stands before each line that is shown, and says what is being done.
+# shown_before: a prefix for each line shown, which says what is being done.
 
-# logged LOG COMMAND...: what it prints goes to the log and, as long as it is the latest line, to a terminal.
+# logged LOG COMMAND...: logs the output and shows its latest line on a terminal.
 logged() {
     local log=$1
     shift
@@ -15,7 +15,7 @@ logged() {
 
 is_shown() { [[ -t 2 && ${TERM:-dumb} != dumb ]]; }
 
-# Shows each line of standard input in the place of the one before.
+# Shows each line of standard input in place of the previous one.
 show_latest() {
     local line
     while IFS= read -r line; do
@@ -24,7 +24,7 @@ show_latest() {
     show_line
 }
 
-# show_line [LINE]: in the place of the one before.
+# show_line [LINE]: in place of the previous one.
 show_line() {
     local width line=${1:+${shown_before-}$1}
     width=$(stty size <&2 | cut -d' ' -f2)

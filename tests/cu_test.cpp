@@ -116,7 +116,7 @@ TEST(Fold, AgreesWithTheCLibraryInItsOwnLocale) {
             ASSERT_EQ(sign(cu_strcasecmp_posix_1(a, b)), order);
             ASSERT_EQ(sign(cu_strncasecmp_posix_1(a, b, sizeof a)), order);
             ASSERT_EQ(cu_strncasecmp_posix_1(a, b, at), 0);
-            ASSERT_EQ(sign(qz::fold_compare(a, b, sizeof a)), order);
+            ASSERT_EQ(qz::fold8(qz::load8(a)) == qz::fold8(qz::load8(b)), strncasecmp(a, b, 8) == 0);
         }
 }
 

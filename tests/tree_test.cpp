@@ -47,9 +47,9 @@ TEST(tree, is_named_by_its_topmost_entry) {
         sec_acltree_t *root = nullptr;
         for (const std::string &name : words(inserted)) {
             const sec_acle_t acle = acle_of(type, name.c_str());
-            EXPECT_EQ(
-                faults::patiently([&] { return sec__add_acle_to_tree(report_duplicates, &acle, &root); }),
-                SEC_S_OK);
+            EXPECT_EQ(faults::patiently(
+                          [&] { return sec__add_acle_to_tree(qz::on_duplicate::report, &acle, &root); }),
+                      SEC_S_OK);
         }
         const qz::owned_acltree owner(root);
         buffer most, refused;
@@ -101,7 +101,7 @@ TEST(tree, takes_more_entries_after_it_was_compiled) {
         sec_acltree_t *root = nullptr;
         const auto add = [&](const std::string &name) {
             const sec_acle_t acle = entry(SEC_ACLE_GROUP, "", name.c_str(), 1);
-            return sec__add_acle_to_tree(report_duplicates, &acle, &root);
+            return sec__add_acle_to_tree(qz::on_duplicate::report, &acle, &root);
         };
         const auto name_of = [](int number) { return "common-" + std::to_string(1000 + number); };
         for (int number = count; number != 0; --number)
@@ -134,12 +134,12 @@ TEST(tree, is_released_from_its_leaves_up) {
         sec_acltree_t *root = nullptr;
         for (const std::string &name : words(inserted)) {
             const sec_acle_t acle = entry(type, mechanism, name.c_str(), 1);
-            EXPECT_EQ(sec__add_acle_to_tree(report_duplicates, &acle, &root), SEC_S_OK);
+            EXPECT_EQ(sec__add_acle_to_tree(qz::on_duplicate::report, &acle, &root), SEC_S_OK);
         }
         const std::string first = inserted.substr(0, 1);
         sec_acle_t again = entry(type, mechanism, first.c_str(), 2);
         again.mechanism[sizeof mechanism - 1] = 'x'; // in place of the NUL, as a caller may fill the array
-        EXPECT_EQ(sec__add_acle_to_tree(replace_duplicates, &again, &root), SEC_S_OK);
+        EXPECT_EQ(sec__add_acle_to_tree(qz::on_duplicate::replace_mask, &again, &root), SEC_S_OK);
         sec__free_acltree(root);
     }
 }
@@ -150,16 +150,13 @@ TEST(tree, asks_for_no_less_memory_than_it_means) {
     constexpr std::uint64_t least_slot_size = 5; // a tag and a number
     for (const std::uint32_t count : {0x10000001u, 0x30000000u, 0x7fffffffu}) {
         SCOPED_TRACE(count);
-        std::size_t refused = 0;
         qz::entry_array entries;
         faults::allocations = {0, 1};
-        EXPECT_FALSE(entries.reserve(count, refused));
-        EXPECT_GE(refused, std::min<std::uint64_t>(count * entry_size, PTRDIFF_MAX));
+        EXPECT_GE(entries.reserve(count).bytes(), std::min<std::uint64_t>(count * entry_size, PTRDIFF_MAX));
 
         qz::identity_table table;
         faults::allocations = {0, 1};
-        EXPECT_FALSE(table.reset(count, refused));
-        EXPECT_GE(refused, std::min<std::uint64_t>(count * least_slot_size, PTRDIFF_MAX));
+        EXPECT_GE(table.reset(count).bytes(), std::min<std::uint64_t>(count * least_slot_size, PTRDIFF_MAX));
         faults::allocations = {};
     }
 }

@@ -1,8 +1,8 @@
-"""The message catalog for translators: its source for gencat, made of the library's texts, and a check of what comes back.
+"""The message catalog for translators: makes its source for gencat from the library's texts, and checks translations.
 
 usage: catalog.py write        prints the source
-       catalog.py check FILE   prints FILE:LINE: for whatever would leave a message untranslated or its text unlike what it
-                               translates, and exits with 1 when there is anything
+       catalog.py check FILE   prints FILE:LINE: for everything that would leave a message untranslated or with wrong
+                               conversions, and exits with 1 if there is anything
 """
 import pathlib
 import re
@@ -12,7 +12,7 @@ TABLE = (pathlib.Path(__file__).resolve().parents[1] / "security/msg/qzseclib_ms
 HEADING = """$ Messages of the ACL library and its checker. The conversions (%1$s and the like) of a text must stay;
 $ their order may change. A text whose conversions differ is not used.
 """
-ESCAPES = {"n": "\n", "t": "\t", "\\": "\\", '"': '"'}  # those of gencat's that a text may need
+ESCAPES = {"n": "\n", "t": "\t", "\\": "\\", '"': '"'}  # the escapes of gencat that a text may need
 CONVERSION = re.compile(r"%(?:%|([1-9])\$(0?)((?:[1-9][0-9]{0,2})?)([sduxc]))")
 
 
@@ -29,19 +29,19 @@ def write():
     print(f'{HEADING}$set {SET}\n$quote "')
     for number, text in TEXTS.items():
         escaped = re.sub(r'["\\]', r"\\\g<0>", text).replace("\t", "\\t")
-        # A text line ends its source line too, which a backslash continues.
+        # A line of text also ends its source line, which a backslash continues.
         print(f'{number} "' + escaped.replace("\n", "\\n\\\n") + '"')
 
 
 def conversions(text):
-    """Those of a text, in an order of their own; None when a percent sign begins none."""
+    """The sorted conversions of a text; None if a percent sign begins none."""
     if "%" in CONVERSION.sub("", text):
         return None
     return sorted(match.groups() for match in CONVERSION.finditer(text) if match[1])
 
 
 def logical_lines(lines):
-    """Lines with the numbers at which they begin: a backslash at the end continues one, a pair is one of the text."""
+    """Lines with their starting numbers. A backslash at the end continues a line; a pair is a literal backslash."""
     first, logical = 1, ""
     for number, line in enumerate(lines, 1):
         backslashes = len(line) - len(line.rstrip("\\"))
@@ -115,13 +115,13 @@ class Check:
             self.complain(f"{name} does not have the conversions of the English text")
         if not text.endswith("\n"):
             self.complain(f"{name} does not end with a line feed (\\n)")
-        # Whatever the language, the number is what people look a message up by.
+        # People look up a message by its number in every language.
         printed = re.match(r"(?:3417-\S* )?", english)[0]
         if not text.startswith(printed):
             self.complain(f"{name} does not begin with its number {printed}")
 
     def text_in(self, rest):
-        """The text as gencat reads it, which begins behind one blank."""
+        """The text as gencat reads it: it begins after one blank."""
         if rest[:1] not in (" ", "\t"):
             raise Complaint("a blank and a text must follow the id")
         quote = self.quote if rest[1:2] == self.quote else ""
@@ -139,7 +139,7 @@ def main(arguments):
         write()
     elif arguments[:1] == ["check"] and len(arguments) == 2:
         try:
-            # Whatever its code set is, byte by byte.
+            # Byte by byte, in any code set.
             source = pathlib.Path(arguments[1]).read_bytes().decode("latin-1")
         except OSError as error:
             print(f"catalog.py: cannot read the translation: {error}", file=sys.stderr)

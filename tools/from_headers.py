@@ -1,17 +1,18 @@
 """Generates the manual pages of sections 3 and 7 from the sources, so that the two always agree.
 
-Usage: from_headers.py SOURCE_DIR MAN_DIR. Section 3 comes from the C headers of include/qz, where each declaration follows
-its comment; section 7 from the message table and remedies.txt, which must have a block for every message.
+Usage: from_headers.py SOURCE_DIR MAN_DIR. Section 3 comes from the C headers in include/qz, where each declaration
+follows its comment. Section 7 comes from the message table and remedies.txt, which must have a block for every message.
 """
 import pathlib
 import re
 import shutil
 import sys
-import textwrap
+
+from mdoc import Prose, argument, folded, literal
 
 SOURCE, MAN = map(pathlib.Path, sys.argv[1:])
-DATE = "November 25, 2026"  # of the last change of contents, so that a build gives the same bytes on any day
-FAMILIES = {  # the sections of acl.h, with their pages and what these are about
+DATE = "November 25, 2026"  # of the last change of contents, so that builds are reproducible
+FAMILIES = {  # the sections of acl.h, with the names and subjects of their pages
     "Buffers": ("qzacl_buffers", "compiled access control lists as a whole"),
     "Entries": ("qzacl_entries", "entries of access control lists"),
     "Permissions": ("qzacl_permissions", "permission letters and masks"),
@@ -23,107 +24,6 @@ FAMILIES = {  # the sections of acl.h, with their pages and what these are about
 }
 EVERYWHERE = ("3417-101", "3417-102")  # messages of almost every operation
 DECLARATION = re.compile(r"QZ_\w+_API (extern )?([\w *]+?)(\w+)(?:\((.*)\)|(\[\d+\]))?;")
-
-
-# ---- mdoc ----------------------------------------------------------------------------------------------------------
-
-def escaped(text):
-    return text.replace("\\", "\\e")
-
-
-def argument(text):  # quoted, so that no word of it is taken for a macro
-    return '"' + escaped(text).replace('"', '""') + '"'
-
-
-def literal(text):
-    lines = (escaped(line).replace("-", "\\-").replace("'", "\\(aq").expandtabs(8) for line in text.splitlines())
-    return [".Bd -literal -offset indent", *("\\&" + line if line[:1] in (".", "'") else line for line in lines), ".Ed"]
-
-
-class Prose:
-    """Turns running text into lines of mdoc that mark functions, constants and headers."""
-    page_of, constants = {}, set()
-
-    def __init__(self, page):
-        self.page = page
-
-    def marked(self, word):
-        if match := re.fullmatch(r"(\w+)\(([1-8])\)([.,;:]*)", word):
-            return " ".join([".Xr", *match.groups()]).rstrip()
-        match = re.fullmatch(r"(\(?)(<?)([\w/.]*\w)(>?)([).,;:]*)", word)
-        if not match:
-            return None
-        before, _, core, _, after = match.groups()
-        if core in self.page_of and not match[2]:
-            macro = f"Fn {core}" if self.page_of[core] == self.page else f"Xr {core} 3"
-        elif core in self.constants and not match[2]:
-            macro = f"Dv {core}"
-        elif match[2] and match[4]:
-            macro = f"In {core}"
-        else:
-            return None
-        return " ".join([f".Pf ( {macro}" if before else "." + macro, *after])
-
-    def lines(self, text):
-        line = ""
-        for word in text.split():
-            macro = self.marked(word)
-            if macro or len(line) + len(word) > 98 or re.search(r"[\w)\"][.]$", line):
-                if line:
-                    yield line
-                line = ""
-            if macro:
-                yield macro
-                continue
-            word = re.sub("^-", r"\\-", escaped(word))
-            line = f"{line} {word}" if line else "\\&" + word if word[0] in ".'" else word
-        if line:
-            yield line
-
-    def blocks(self, blocks, spaced=True):
-        """The content of a comment; `spaced` says whether a paragraph at its beginning is a new one."""
-        before = ":"
-        for kind, content in blocks:
-            if spaced and (kind == "text" or kind == "table" and not re.match("Codes:|.*:$", before, re.S)):
-                yield ".Pp"
-            before, spaced = content if kind == "text" else "", True
-            if kind == "text":
-                yield from self.lines(content)
-            elif kind == "points":
-                yield ".Bl -bullet -compact"
-                for point in content:
-                    yield ".It"
-                    yield from self.lines(point)
-                yield ".El"
-            else:
-                wide = max((name for name, _ in content if len(name) <= 16), key=len, default="Ds")
-                yield f".Bl -tag -width {argument(wide)} -compact -offset indent"
-                for name, inner in content:
-                    yield f".It {argument(name)}"
-                    yield from self.blocks(inner, spaced=False)
-                yield ".El"
-
-
-def folded(text):
-    """Text lines of at most 79 bytes; requests and literal displays are left alone."""
-    lines, is_literal = [], False
-    for line in text.split("\n"):
-        is_literal = line.startswith(".Bd") or (is_literal and not line.startswith(".Ed"))
-        if is_literal or line.startswith((".", "'")) or len(line) < 80:
-            lines.append(line)
-            continue
-        made = textwrap.wrap(line, 79, break_long_words=False, break_on_hyphens=False)
-        lines += made[:1] + [("\\&" if each[0] in ".'" else "") + each for each in made[1:]]
-    return "\n".join(lines)
-
-
-def page(name, section, names, about, body):
-    title = [f".Dd {DATE}", f".Dt {name.upper()} {section}", ".Os", ".Sh NAME"]
-    title += [f".Nm {each} ," for each in names[:-1]] + [f".Nm {names[-1]}", f".Nd {about}"]
-    folder = MAN / f"man{section}"
-    folder.mkdir(parents=True, exist_ok=True)
-    text = "\n".join([*title, *body]) + "\n"
-    (folder / f"{name}.{section}").write_text(folded(re.sub(r"(?m)^(\.S[hs] .*\n)\.Pp\n", r"\1", text)), encoding="utf-8")
 
 
 # ---- Headers -------------------------------------------------------------------------------------------------------
@@ -144,22 +44,12 @@ def starts_anew(line):
     return not line or line.startswith(("- ", "Codes:", "Threads:"))
 
 
-def straightened(lines):
-    """Lines that clang-format broke to the left margin, moved back to the table row that they continue."""
-    in_codes, before = False, ""
-    for line in lines:
-        in_codes = bool(line) and (in_codes or line.startswith("Codes:"))
-        is_broken = indent(before) > 1 and not before.lstrip().startswith("- ") and not in_codes
-        before = " " * 99 + line if is_broken and indent(line) == 0 and not starts_anew(line) else line
-        yield before
-
-
 def row_content(text, column, further):
-    """The content of one row: text, and a nested table if rows are indented further than the text."""
+    """The content of one row: text, and a nested table if the following rows are indented further than the text."""
     content = [("text", text)]
     for line in further:
         row = ROW.fullmatch(line)
-        if row and column < indent(line) < 99:
+        if row and column < indent(line):
             content += [] if content[-1][0] == "table" else [("table", [])]
             content[-1][1].append((row[2], [("text", row[3])]))
         elif content[-1][0] == "table" and indent(line) > column:
@@ -174,7 +64,7 @@ def row_content(text, column, further):
 
 def parsed(lines):
     """A comment as (kind, content): "text", "points", or a "table" of (tag, content)."""
-    lines, blocks, kind = list(straightened(lines)), [], ""
+    lines, blocks, kind = list(lines), [], ""
     while lines:
         line = lines.pop(0)
         further, base = [], indent(line)
@@ -244,7 +134,7 @@ def synopsis(header, items):
 
 
 def type_lines(prose, lines, code):
-    """A type with its fields, or as it is declared."""
+    """A type with its fields, or its declaration."""
     fields = re.findall(r"^ +([\w ]+ )(\**\w+(?:\[\d+\])?);(?: */\* (.*?) \*/)?$", code, re.M)
     name = re.search(r"\(\*(\w+)\)|(\w+);$", code)
     yield f".Ss {name[1] or name[2]}"
@@ -297,8 +187,18 @@ def link_pages(header, page_of):
 
 # ---- The pages -----------------------------------------------------------------------------------------------------
 
+def page(name, section, names, about, body):
+    title = [f".Dd {DATE}", f".Dt {name.upper()} {section}", ".Os", ".Sh NAME"]
+    title += [f".Nm {each} ," for each in names[:-1]] + [f".Nm {names[-1]}", f".Nd {about}"]
+    folder = MAN / f"man{section}"
+    folder.mkdir(parents=True, exist_ok=True)
+    text = "\n".join([*title, *body]) + "\n"
+    text = re.sub(r"(?m)^(\.S[hs] .*\n)\.Pp\n", r"\1", text)
+    (folder / f"{name}.{section}").write_text(folded(text), encoding="utf-8")
+
+
 def opening_lines(prose, header):
-    """The opening comment: what the header is for, and the rules for every call, each under its name."""
+    """The opening comment: the purpose of the header, and the rules for every call under their names."""
     rules_at = next(i for i, line in enumerate(header.opening) if "----" in line)
     rules = []
     for kind, content in parsed(header.opening[rules_at + 1:]):
@@ -339,7 +239,7 @@ def write_acl_pages(acl):
 
 
 def write_platform_page(header, name, about, related):
-    """A library of the platform: one page for all its functions."""
+    """A platform library: one page for all its functions."""
     prose = Prose(name)
     purpose, rules = opening_lines(prose, header)
     body = [".Sh LIBRARY", f"lib{name} (link with", f".Fl l{name} )",
@@ -351,8 +251,8 @@ def write_platform_page(header, name, about, related):
     page(name, 3, [name, *header.all_names()], about, [*body, *see_also(related)])
 
 
-def write_messages(acl):
-    """Section 7. A block of remedies.txt: the number, who reports it, and then "cause:" and "remedy:" with texts."""
+def message_texts():
+    """The texts of the message table by their printed numbers."""
     table = (SOURCE / "security/msg/qzseclib_msg.h").read_text(encoding="utf-8")
     texts = {}
     for literals in re.findall(r'\{\d+,((?:\s*"(?:[^"\\]|\\.)*")+)\}', table):
@@ -360,22 +260,37 @@ def write_messages(acl):
         text = re.sub(r"\\(.)", lambda match: {"n": "\n", "t": "\t"}.get(match[1], match[1]), text)
         if number := re.match(r"3417-\d{3}", text):
             texts[number[0]] = text
+    return texts
+
+
+def remedies():
+    """The blocks of remedies.txt by number: who reports it, its cause and its remedy."""
     blocks = {}
     file = (SOURCE / "docs/man/remedies.txt").read_text(encoding="utf-8")
     for block in re.split(r"\n\n+", re.sub(r"^#.*\n", "", file, flags=re.M).strip()):
         match = re.fullmatch(r"(\S+) (command|library|both)\ncause: (.+?)\nremedy: (.+)", block, re.S)
         if not match or match[1] in blocks:
-            sys.exit(f"remedies.txt: not understood, or there already: {block}")
+            sys.exit(f"remedies.txt: malformed or duplicate block: {block}")
         blocks[match[1]] = match.groups()[1:]
-    if blocks.keys() != texts.keys():
-        sys.exit("remedies.txt: without block or without message: " + " ".join(sorted(blocks.keys() ^ texts.keys())))
+    return blocks
 
-    named_at = {}
+
+def reporting_functions(acl):
+    """The functions whose comments list a message, by its number."""
+    functions = {}
     for _, _, items in acl.sections:
         for name, _, _, lines in acl.declared(items):
             codes = " ".join(lines).partition("Codes:")[2]
             for number in re.findall(r"3417-\d{3}", codes):
-                named_at.setdefault(number, {})[name] = True
+                functions.setdefault(number, {})[name] = True
+    return functions
+
+
+def write_messages(acl):
+    """Section 7."""
+    texts, blocks, named_at = message_texts(), remedies(), reporting_functions(acl)
+    if blocks.keys() != texts.keys():
+        sys.exit("remedies.txt: without block or without message: " + " ".join(sorted(blocks.keys() ^ texts.keys())))
     prose = Prose("qzacl_messages")
     body = []
     for number, text in sorted(texts.items()):

@@ -109,7 +109,7 @@ extern "C" {
 #define SEC_S_WARNING 99        /* a warning of the command; no operation below returns it */
 #define SEC_S_BAD_FILENAME 105  /* the path of an ACL file cannot be determined */
 
-/* Types of an entry: whom it applies to, and whether it has a mechanism and an identity. */
+/* Types of an entry: to whom it applies, and whether it has a mechanism and an identity. */
 #define SEC_ACLE_UNAUTHENTICATED 1 /* n: anyone who did not authenticate; neither; one per ACL */
 #define SEC_ACLE_ANYOTHER 2        /* o: anyone else who did; neither; one per ACL */
 #define SEC_ACLE_USER 4            /* u: one identity of a mechanism; both */
@@ -162,7 +162,7 @@ typedef struct sec_acl_buffer {
     void *data;     /* from malloc, owned; at any alignment */
 } sec_acl_buffer_t;
 
-/* A group of which a requester is a member. */
+/* A group to which a requester belongs. */
 typedef struct sec_group_ref {
     uint64_t id;      /* the caller's own; ignored */
     const char *name; /* as in group entries, UTF-8; must not be null */
@@ -373,7 +373,7 @@ QZ_ACL_API int sec_translate_bitmask(uint32_t mask, const sec_perm_set_t *set, c
  *   set         the permissions of the text; null: acl__default_perm_set
  *   flags       SEC_READ_ACL_...; other bits are returned unchanged
  *   acl         out: the buffer, owned by the caller; zeros after a failure and for a file without entries
- *               (empty, or only blank and comment lines), of which no cache file is written. Listing and
+ *               (empty, or only blank and comment lines), for which no cache file is written. Listing and
  *               editing take such an ACL; evaluation refuses it (42, 3417-109), so it grants nothing.
  *   out_flags   out, may be null: the resulting flags, written after failures too
  *

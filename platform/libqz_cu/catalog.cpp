@@ -1,5 +1,5 @@
-// The message catalogs of the process: opened at the first text fetched, and kept open because handed-out
-// texts lie in them.
+// The process's message catalogs. Each is opened when its first text is fetched, and stays open because callers keep
+// pointers to its texts.
 #include "libqz_cu/catalog.h"
 
 #include "base/uncancelled.h"
@@ -14,7 +14,7 @@ namespace {
 
 struct opened_catalog {
     char name[64];
-    nl_catd descriptor; // what catopen gave, a failure too, so that the files are not searched again
+    nl_catd descriptor; // from catopen; a failure is kept, too, so that it does not search again
 };
 
 constinit opened_catalog catalogs[8] = {};
@@ -24,8 +24,8 @@ pthread_mutex_t catalogs_mutex = PTHREAD_MUTEX_INITIALIZER;
 void lock() { pthread_mutex_lock(&catalogs_mutex); }
 void unlock() { pthread_mutex_unlock(&catalogs_mutex); }
 
-// A child forked while another thread opens a catalog would otherwise wait for ever for a thread that it does
-// not have.
+// Otherwise a child forked while another thread opens a catalog would wait forever for a thread that it does not
+// have.
 [[gnu::constructor]] void keep_free_over_fork() { pthread_atfork(lock, unlock, unlock); }
 
 const nl_catd no_catalog = reinterpret_cast<nl_catd>(-1);

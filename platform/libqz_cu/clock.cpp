@@ -1,4 +1,4 @@
-// The clock: a counter of nanoseconds, which the kernel lets us read without a system call, as a time.
+// The clock: a nanosecond counter that can be read without a system call, and its conversion to a time.
 #include "base/wide_product.h"
 #include "qz/cu.h"
 
@@ -9,7 +9,7 @@ namespace {
 
 constexpr std::uint64_t second = 1000000000;
 
-// Turns a number into its quotient, a bit at a time, and returns the remainder.
+// Replaces a number by its quotient, bit by bit, and returns the remainder.
 std::uint64_t divide(qz::wide_number &number, std::uint64_t divisor) {
     std::uint64_t rest = 0;
     for (unsigned bit = 0; bit < 128; ++bit) {
@@ -37,7 +37,7 @@ int cu_get_ctr_1(uint64_t *counter) {
     return CU_OK;
 }
 
-// The record is the length of a tick as a fraction: nanoseconds, in how many ticks.
+// The record is the length of a tick as a fraction: nanoseconds per number of ticks.
 int cu_get_procspeed_1(cu_timeinfo_t *timeinfo) {
     if (timeinfo == nullptr)
         return CU_BAD_PARAMETER;

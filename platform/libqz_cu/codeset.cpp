@@ -1,10 +1,10 @@
-// Code-set conversion over the system's iconv. A handle is only ever read; what a conversion changes, the
-// system's converter with its shift state, each thread has of its own for each handle.
+// Code-set conversion on top of iconv. Handles are read-only after opening. The mutable part, an iconv converter with
+// its shift state, exists once per thread and handle.
+#include "base/kept_errno.h"
 #include "base/owned.h"
 #include "base/posix_fold.h"
 #include "base/uncancelled.h"
 #include "base/utf8.h"
-#include "libqz_cu/kept_errno.h"
 #include "qz/cu.h"
 
 #include <algorithm>
@@ -15,18 +15,18 @@
 #include <string_view>
 
 struct cu_iconv {
-    pthread_key_t converters; // of the threads; unused when both code sets are UTF-8
+    pthread_key_t converters; // one per thread; unused when both code sets are UTF-8
     bool from_utf8;
-    bool utf8_alone; // both code sets are UTF-8, and the system's converter has nothing to do
-    bool unmodified; // then bytes pass as they are
+    bool utf8_alone; // both code sets are UTF-8: no converter is needed
+    bool unmodified; // UTF-8 is not validated
     bool bmp_only;
-    bool ascii_as_it_is; // strings of ASCII alone come out as they went in
-    char codeset[1];     // the name, in a block as long as it takes
+    bool ascii_as_it_is; // pure ASCII converts to itself
+    char codeset[1];     // the name; the block extends to its end
 };
 
 namespace {
 
-using qz::cu::kept_errno;
+using qz::kept_errno;
 
 const iconv_t no_converter = reinterpret_cast<iconv_t>(-1);
 constexpr std::size_t failed = static_cast<std::size_t>(-1);
@@ -35,7 +35,7 @@ struct result {
     qz::owned<char[]> block;
     std::size_t length = 0;
 
-    // On failure the block stays as it was. No bytes are a block too, so that null always means failure.
+    // On failure the block is unchanged. Zero bytes get a block, too, so that null always means failure.
     bool resize(std::size_t size) { return qz::reallocate(block, std::max<std::size_t>(size, 1)); }
 };
 
@@ -48,10 +48,10 @@ bool is_ascii(const char *in, std::size_t length) {
     return (seen & qz::in_each_byte(0x80)) == 0;
 }
 
-// Characters above U+FFFF are the ones that begin with such a byte in UTF-8.
+// In UTF-8 exactly the characters above U+FFFF start with such a byte.
 bool leaves_bmp(unsigned char lead) { return lead >= 0xf0; }
 
-// The system's converters let surrogates, longer forms and what is above U+10FFFF pass.
+// iconv accepts surrogates, overlong forms and code points above U+10FFFF.
 bool is_valid_utf8(std::string_view bytes) {
     for (std::uint32_t point = 0; !bytes.empty();) {
         if (!qz::take_utf8(bytes, point))
@@ -69,11 +69,11 @@ int copy_unchanged(const char *in, std::size_t length, result &out) {
 }
 
 int run_converter(iconv_t converter, const char *in, std::size_t in_left, result &out) {
-    // Most conversions keep the length or lose some; the others grow the block as they go.
+    // Most conversions do not lengthen a string; the others grow the block.
     std::size_t size = in_left + 16;
     if (size < in_left || !out.resize(size))
         return CU_ICONV_NO_MEMORY;
-    // An earlier conversion may have failed amid a shift.
+    // An earlier conversion may have failed in a shifted state.
     iconv(converter, nullptr, nullptr, nullptr, nullptr);
     char *from = const_cast<char *>(in);
     for (bool ending = false;;) {
@@ -87,7 +87,7 @@ int run_converter(iconv_t converter, const char *in, std::size_t in_left, result
                 break;
             ending = true;
         } else if (answer != failed || errno == EILSEQ || errno == EINVAL) {
-            // A positive answer counts characters that were replaced by others: they did not convert either.
+            // A positive result counts characters that iconv replaced by others: a failure for us.
             return CU_ICONV_UNCONVERTIBLE;
         } else if (errno != E2BIG) {
             return CU_INTERNAL;
@@ -97,7 +97,7 @@ int run_converter(iconv_t converter, const char *in, std::size_t in_left, result
             size *= 2;
         }
     }
-    // Should the smaller block be refused, the larger one serves.
+    // If shrinking fails, the larger block serves.
     if (out.length != size)
         out.resize(out.length);
     return CU_OK;
@@ -105,7 +105,7 @@ int run_converter(iconv_t converter, const char *in, std::size_t in_left, result
 
 void close_converter(void *converter) { iconv_close(converter); }
 
-// The calling thread's converter for the handle, opened at its first use.
+// The calling thread's converter for the handle, opened on first use.
 int converter_of(const cu_iconv &handle, iconv_t &converter) {
     converter = pthread_getspecific(handle.converters);
     if (converter != nullptr)
@@ -123,8 +123,8 @@ int converter_of(const cu_iconv &handle, iconv_t &converter) {
     return CU_OK;
 }
 
-// All of ASCII, and behind it a taste of each way in which a code set can hide other characters in ASCII: by
-// escape sequences, by shifts, and by printable marks.
+// All of ASCII, then one sample of each scheme that encodes other characters in ASCII: escape sequences, shifts, and
+// printable marks.
 struct ascii_probe {
     static constexpr char tricks[] = "\x1b$BF|\x1b(B" // as ISO-2022-JP has it
                                      "\x1b$)C\x0eF|\x0f"
@@ -140,7 +140,7 @@ struct ascii_probe {
 };
 constexpr ascii_probe probe;
 
-// Finds out whether the code set can be opened at all, and whether ASCII is only itself in it.
+// Checks that the code set can be opened, and whether ASCII converts to itself.
 int examine(cu_iconv &handle) {
     iconv_t converter;
     if (const int code = converter_of(handle, converter); code != CU_OK)
@@ -158,7 +158,7 @@ bool is_utf8(const char *codeset) {
     return qz::fold_compare(codeset, "utf-8") == 0 || qz::fold_compare(codeset, "utf8") == 0;
 }
 
-// Whether the handle lets the UTF-8 of a conversion, be it what goes in or what comes out, pass.
+// True when the handle's restrictions allow this UTF-8, which is the input or the output of a conversion.
 bool allows(const cu_iconv &handle, const char *utf8, std::size_t length) {
     return (handle.unmodified || is_valid_utf8({utf8, length})) &&
            !(handle.bmp_only && std::any_of(utf8, utf8 + length, leaves_bmp));
@@ -177,7 +177,7 @@ int convert_for(const cu_iconv &handle, const char *in, std::size_t length, resu
         code = run_converter(converter, in, length, out);
     if (code == CU_OK && !handle.from_utf8 && !allows(handle, out.block.get(), out.length))
         return CU_ICONV_UNCONVERTIBLE;
-    // The code set was there when the handle was opened.
+    // The code set was known when the handle was opened.
     return code == CU_ICONV_UNKNOWN_CODESET ? CU_NO_RESOURCE : code;
 }
 
@@ -187,7 +187,7 @@ int cu_iconv_open_1(const char *codeset, uint32_t flags, cu_iconv_t *handle) {
     if (handle == nullptr)
         return CU_BAD_PARAMETER;
     *handle = nullptr;
-    // The empty name, and what a name may have behind a slash, would mean more to the system than a code set.
+    // iconv gives an empty name, and a suffix after a slash, a meaning beyond that of a code set.
     if (codeset == nullptr || *codeset == 0 || std::strchr(codeset, '/') != nullptr ||
         (flags & ~(CU_ICONV_FROM_UTF8 | CU_ICONV_UTF8_UNMODIFIED | CU_ICONV_BMP_ONLY)) != 0)
         return CU_BAD_PARAMETER;

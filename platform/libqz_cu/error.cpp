@@ -1,6 +1,6 @@
-// The error facility: each thread's current error, recorded as it comes and made into a text when fetched.
+// The error facility: each thread's current error, recorded unformatted. Its text is made when it is fetched.
+#include "base/kept_errno.h"
 #include "libqz_cu/catalog.h"
-#include "libqz_cu/kept_errno.h"
 #include "libqz_cu/message_text.h"
 #include "qz/cu.h"
 
@@ -18,7 +18,7 @@ namespace {
 
 struct recorded_error {
     cu_error_t head; // first, because a handle points to it
-    bool present;    // false: the no-error state, whatever else stands here
+    bool present;    // false: no error; ignore the rest
     int set;
     const char *catalog;
     const char *default_text;
@@ -28,12 +28,12 @@ static_assert(std::is_standard_layout_v<recorded_error>);
 
 struct thread_record {
     recorded_error error;
-    char *spill; // the strings, when they do not fit into the room
+    char *spill; // the strings that do not fit into the room
     char room[512];
 };
 
-// Initial-exec: reaching the record is one instruction, and the library needs nothing of the dynamic linker
-// for it. Such storage is scarce in libraries loaded late, hence the small room.
+// With initial-exec, accessing the record takes one instruction and no call into the dynamic linker. Such storage is
+// scarce for libraries loaded late, hence the small room.
 constinit thread_local thread_record current [[gnu::tls_model("initial-exec")]] = {};
 
 pthread_once_t spill_once = PTHREAD_ONCE_INIT;
@@ -45,7 +45,7 @@ void drop_spill() {
     current.spill = nullptr;
 }
 
-// Runs as the thread exits, perhaps before other cleanups that look at the current error.
+// Runs at thread exit, perhaps before other destructors that use the current error.
 void end_of_thread(void *) {
     current.error.present = false;
     drop_spill();
@@ -62,10 +62,10 @@ void make_spill_key() { has_spill_key = pthread_key_create(&spill_key, end_of_th
     return current.spill != nullptr;
 }
 
-// Bytes that a string takes with its NUL. A null string takes none.
+// The size of a string with its NUL. A null string takes none.
 std::size_t bytes_of(const char *text) { return text != nullptr ? std::strlen(text) + 1 : 0; }
 
-// Moves strings into the room, those of the positions from `first` on, cutting what does not fit.
+// Copies the strings from position `first` on into the room, truncating what does not fit.
 void pack_strings(arguments &given, unsigned first, char *room, std::size_t left) {
     for (unsigned i = first; i < given.count; ++i) {
         if (!given.is_string(i) || given.values[i].text == nullptr)
@@ -91,7 +91,7 @@ std::size_t string_bytes(const arguments &given, unsigned first) {
     return total;
 }
 
-// The strings from `first` on, for which the rest of the room does not suffice.
+// Stores the strings from `first` on, which exceed the rest of the room.
 [[gnu::cold, gnu::noinline]] void keep_long_strings(unsigned first, char *room, std::size_t left) {
     const std::size_t total = string_bytes(current.error.given, first);
     if (take_spill(total))
@@ -100,7 +100,7 @@ std::size_t string_bytes(const arguments &given, unsigned first) {
         pack_strings(current.error.given, first, room, left);
 }
 
-// Completes a record whose strings still lie elsewhere.
+// Copies the strings that a new record points to.
 void keep_strings() {
     if (current.spill != nullptr) [[unlikely]]
         drop_spill();
@@ -126,13 +126,13 @@ const recorded_error &record_of(const cu_error_t *handle) {
     return *reinterpret_cast<const recorded_error *>(handle);
 }
 
-// The text that a recorded error shows: the catalog's if it can be trusted to fit the arguments.
+// The text of a recorded error: the catalog's if its conversions fit the arguments, else the default.
 const char *text_of(const recorded_error &error) {
     const char *by_default = error.default_text != nullptr ? error.default_text : "";
     if (error.catalog == nullptr)
         return by_default;
     const char *offered = catalog_text(error.catalog, error.set, error.head.message_id);
-    // An empty text, which a translation may have left behind, tells nobody anything.
+    // A translation may leave a text empty. The default is more use.
     return offered != nullptr && *offered != '\0' && has_conversions_of(offered, by_default) ? offered
                                                                                              : by_default;
 }
@@ -141,12 +141,13 @@ const char *text_of(const recorded_error &error) {
 } // namespace qz::cu
 
 using namespace qz::cu;
+using qz::kept_errno;
 
 int cu_set_error_1(int code, int, const char *catalog, int set, int message_id, const char *default_text,
                    ...) {
     recorded_error &error = current.error;
-    // A message of a catalog has one text for the life of the process: what arguments it took the last time
-    // is still known when it comes again, as that of denials does.
+    // A catalog message has one text for the life of the process, so its arguments need not be found again when it
+    // recurs, as those of denials do.
     const bool is_known = catalog != nullptr && default_text != nullptr && catalog == error.catalog &&
                           set == error.set && message_id == error.head.message_id &&
                           default_text == error.default_text;
@@ -203,7 +204,7 @@ int cu_get_errmsg_1(const cu_error_t *error, char **text) {
     const kept_errno kept;
     const recorded_error &from = record_of(error);
     const char *shown = from.present ? text_of(from) : "";
-    // Most texts fit in here, and are made only once.
+    // Most texts fit here and are formatted only once.
     char room[1024];
     const std::size_t size = format_text(shown, from.given, room, sizeof room);
     char *made = static_cast<char *>(std::malloc(size));

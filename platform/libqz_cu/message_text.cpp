@@ -1,4 +1,4 @@
-// Message texts: reading, comparing and carrying out their positional conversions.
+// Message texts: parsing, comparing and applying their positional conversions.
 #include "libqz_cu/message_text.h"
 
 #include <algorithm>
@@ -13,7 +13,7 @@ struct conversion {
     bool zeros;
     unsigned width;
     char kind;
-    std::size_t length; // bytes of the text that it takes up
+    std::size_t length; // in the text
 
     bool is_string() const { return kind == 's'; }
     bool operator==(const conversion &) const = default;
@@ -21,7 +21,7 @@ struct conversion {
 
 bool is_digit(char c) { return c >= '0' && c <= '9'; }
 
-// Reads the conversion that a percent sign begins; false when it begins none.
+// Reads the conversion at a percent sign. False when there is none.
 bool read_conversion(const char *percent, conversion &found) {
     const char *at = percent + 1;
     if (*at < '1' || *at > '9' || at[1] != '$')
@@ -41,7 +41,7 @@ bool read_conversion(const char *percent, conversion &found) {
     return true;
 }
 
-// Adds up what a text comes to, and writes of it the parts that end within the room.
+// Counts all bytes put, and writes the parts that end within the room.
 class sink {
 public:
     sink(char *out, std::size_t room) : out_(out), room_(room) {}
@@ -70,7 +70,7 @@ private:
     std::size_t length_ = 0;
 };
 
-// The shown bytes of one value, apart from what fills it up to the width.
+// A value as shown, without padding.
 struct shown {
     const char *sign = "";
     const char *bytes = nullptr;
@@ -115,7 +115,7 @@ void put_value(sink &to, const conversion &how, const arguments::value &value) {
     to.put(what.bytes, what.count);
 }
 
-// The conversions of one text, for comparing. A text with more of them than this is not one to be trusted.
+// The conversions of a text, for comparison. A text with too many of them is not trusted.
 struct conversion_list {
     static constexpr unsigned capacity = 32;
 
@@ -166,7 +166,7 @@ bool has_conversions_of(const char *text, const char *default_text) {
     if (!offered.well_formed || !wanted.well_formed || offered.count != wanted.count)
         return false;
     for (unsigned i = 0; i < offered.count; ++i) {
-        // Each match is taken out, so that a conversion which stands twice is wanted twice.
+        // Each match is removed, so that a repeated conversion must be repeated, too.
         conversion *end = wanted.items + wanted.count;
         conversion *match = std::find(wanted.items, end, offered.items[i]);
         if (match == end)

@@ -1,5 +1,5 @@
-// Message texts and their positional conversions: which arguments a text takes, whether two texts take the
-// same, and the text with the arguments put in. No text, wherever it is from, becomes the format of a printf.
+// Message texts and their positional conversions: which arguments a text takes, whether two texts take the same ones,
+// and formatting. No text ever becomes a printf format.
 #ifndef QZ_CU_MESSAGE_TEXT_H
 #define QZ_CU_MESSAGE_TEXT_H
 
@@ -10,7 +10,7 @@ namespace qz::cu {
 
 inline constexpr unsigned max_arguments = 9;
 
-// The arguments of a text by position. A position of which no bit is set in `strings` holds a number.
+// The arguments of a text by position. A position holds a number unless its bit in `strings` is set.
 struct arguments {
     union value {
         const char *text;
@@ -24,14 +24,14 @@ struct arguments {
     bool is_string(unsigned index) const { return ((strings >> index) & 1) != 0; }
 };
 
-// Sets `count` and `strings` to what the text takes; the values are left to the caller.
+// Sets `count` and `strings` to the arguments that the text takes. The caller sets the values.
 void find_arguments(const char *text, arguments &found);
 
-// Whether a text holds exactly the conversions of the default text, in any order, and is well formed besides.
+// True when a text is well formed and has exactly the conversions of the default text, in any order.
 bool has_conversions_of(const char *text, const char *default_text);
 
-// Writes the text with the arguments put in and a final NUL to `out`, and returns the bytes of that. Where
-// there is less room, nothing is written beyond it, and what was written is of no use.
+// Writes the formatted text and a NUL to `out` and returns their size. If that exceeds `room`, the output is
+// incomplete, but nothing is written beyond it.
 std::size_t format_text(const char *text, const arguments &given, char *out, std::size_t room);
 
 } // namespace qz::cu

@@ -1,4 +1,4 @@
-// Strings by the rules of the POSIX locale, as calls.
+// String functions of the POSIX locale.
 #include "base/posix_fold.h"
 #include "qz/cu.h"
 

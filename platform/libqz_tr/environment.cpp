@@ -1,4 +1,4 @@
-// Copies the two variables, because the program may change its environment while other threads trace.
+// Copies the two variables: the program may change its environment while other threads trace.
 #include "libqz_tr/environment.h"
 
 #include <cstdlib>
@@ -16,8 +16,8 @@ const char *copy_of(const char *name) {
     return value == nullptr || *value == '\0' ? nullptr : strdup(value);
 }
 
-// A variable for which there is no memory counts as not set: no tracing, and no harm to the traced program.
-void read() {
+// Without memory for its copy, a variable counts as not set: no tracing, and no harm to the traced program.
+void read_environment() {
     if (const char *levels = copy_of("QZ_TRACE_LEVELS"))
         settings.levels = levels;
     settings.file = copy_of("QZ_TRACE_FILE");
@@ -26,7 +26,7 @@ void read() {
 } // namespace
 
 const trace_settings &environment() {
-    pthread_once(&once, read);
+    pthread_once(&once, read_environment);
     return settings;
 }
 

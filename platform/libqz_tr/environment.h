@@ -1,4 +1,4 @@
-// What the administrator asks for, as it stood in the environment when tracing first needed it.
+// The administrator's settings, from the environment as it was when tracing first needed them.
 #ifndef QZ_TR_ENVIRONMENT_H
 #define QZ_TR_ENVIRONMENT_H
 
@@ -9,7 +9,7 @@ struct trace_settings {
     const char *file;   // QZ_TRACE_FILE, null when not set or empty
 };
 
-// Read once in the life of the process; the copies stay to its end.
+// Read once per process and never freed.
 const trace_settings &environment();
 
 } // namespace qz::tr

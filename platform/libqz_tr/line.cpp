@@ -1,4 +1,4 @@
-// Forms a trace line as JSON. Nothing here allocates, locks, or depends on locale or time zone.
+// Formats a trace line as JSON. Nothing here allocates, locks, or depends on locale or time zone.
 #include "libqz_tr/line.h"
 
 #include "libqz_tr/text.h"
@@ -10,8 +10,8 @@
 
 namespace qz::tr {
 
-// The place for `count` more bytes, or null when they can only be counted. The room is compared by what is
-// left in it, because the bytes of an item can change between a counting try and the next.
+// Where to write `count` more bytes, or null when they can only be counted. The second try checks the room as well,
+// because an item's bytes may have changed since the first.
 char *trace_line::extend(std::size_t count) {
     if (too_long_ || count > TR_LINE_LIMIT - size_) {
         too_long_ = true;
@@ -27,7 +27,7 @@ void trace_line::put(std::string_view text) {
         std::copy(text.begin(), text.end(), to);
 }
 
-// Puts printable text between quotation marks; only these and the backslash need an escape in JSON.
+// Puts printable text between quotation marks. Only these and the backslash need escapes in JSON.
 void trace_line::put_escaped(std::string_view text) {
     put("\"");
     for (const char &character : text) {
@@ -56,7 +56,7 @@ void trace_line::put_digits(long long value, std::size_t width) {
     put({digits.data(), width});
 }
 
-// gmtime_r would do, but it takes the C library's time zone lock and may read files under it.
+// Not gmtime_r: it takes the C library's time zone lock and may read files while holding it.
 void trace_line::put_time(const timespec &time) {
     const std::chrono::seconds since_epoch(time.tv_sec);
     const auto days = std::chrono::floor<std::chrono::days>(since_epoch);
@@ -95,7 +95,7 @@ void trace_line::start(const timespec &time, pid_t pid, pid_t tid, std::string_v
 void trace_line::item(const void *address, std::size_t length) {
     if (address == nullptr)
         length = 0;
-    // Before any byte is looked at: a length that cannot be recorded is likely no length at all.
+    // Checked before any byte is read: such a length is probably garbage.
     if (too_long_ || length > TR_LINE_LIMIT / 2) {
         too_long_ = true;
         return;

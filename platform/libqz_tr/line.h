@@ -1,4 +1,4 @@
-// One line of the trace file in the making, within memory of a fixed size.
+// Builds one line of the trace file in a fixed amount of memory.
 #ifndef QZ_TR_LINE_H
 #define QZ_TR_LINE_H
 
@@ -10,21 +10,21 @@
 
 namespace qz::tr {
 
-// Collects the line in `room`. What does not fit is counted all the same, so that a first try tells
-// the size that the next one needs.
+// Builds the line in `room`. Bytes that do not fit are still counted, so that a first try yields the size that the
+// next one needs.
 class trace_line {
 public:
     explicit trace_line(std::span<char> room) : room_(room) {}
 
-    // The line's parts, in this order: one start, any number of items, one end.
+    // To be called in this order: one start, any number of items, one end.
     void start(const timespec &time, pid_t pid, pid_t tid, std::string_view component, int id);
     void item(const void *address, std::size_t length);
     void end();
 
-    // The size of the whole line, whether it fitted or not.
+    // The size of the whole line, even if it does not fit.
     std::size_t size() const { return size_; }
     bool fits() const { return size_ <= room_.size(); }
-    // Longer than a line may be; size() is not to be trusted then.
+    // True when the line exceeds TR_LINE_LIMIT. Then size() is meaningless.
     bool too_long() const { return too_long_; }
     std::string_view text() const { return {room_.data(), size_}; }
 

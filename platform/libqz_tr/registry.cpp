@@ -1,5 +1,5 @@
-// A table of a fixed number of places. A place once named keeps its name for the life of the process, so that
-// recording threads look components up without a lock; whatever changes a place is done under the mutex.
+// A table of fixed size. A named place keeps its name for the life of the process, so that recording threads can look
+// components up without a lock. Places change only under the mutex.
 #include "libqz_tr/registry.h"
 
 #include "libqz_tr/environment.h"
@@ -31,8 +31,8 @@ pthread_mutex_t mutex = PTHREAD_MUTEX_INITIALIZER;
 void lock() { pthread_mutex_lock(&mutex); }
 void unlock() { pthread_mutex_unlock(&mutex); }
 
-// A child forked while another thread held the mutex would otherwise wait for ever for a thread that it does
-// not have. Done at load time, because a once-guard that a fork interrupts would do it twice.
+// Otherwise a child forked while another thread holds the mutex would wait forever for a thread that it does not have.
+// Done at load time, because a once-guard that a fork interrupts would do it twice.
 [[gnu::constructor]] void keep_free_over_fork() { pthread_atfork(lock, unlock, unlock); }
 
 class table_lock {
@@ -43,7 +43,7 @@ public:
     table_lock &operator=(const table_lock &) = delete;
 };
 
-component_place *find(std::string_view name) {
+component_place *find_component(std::string_view name) {
     const auto end = places.begin() + named.load(std::memory_order_acquire);
     const auto found = std::find_if(places.begin(), end,
                                     [&](const component_place &place) { return place.name_view() == name; });
@@ -52,7 +52,7 @@ component_place *find(std::string_view name) {
 
 // Under the mutex.
 component_place *find_or_name(std::string_view name) {
-    if (component_place *place = find(name))
+    if (component_place *place = find_component(name))
         return place;
     const std::size_t next = named.load(std::memory_order_relaxed);
     if (next == places.size())
@@ -63,17 +63,17 @@ component_place *find_or_name(std::string_view name) {
     return &places[next];
 }
 
-// The component reads its levels in any thread without a lock.
-void set(std::uint8_t &level, std::uint8_t value) { __atomic_store_n(&level, value, __ATOMIC_RELAXED); }
+// Atomic, because components read their levels without a lock.
+void set_level(std::uint8_t &level, std::uint8_t value) { __atomic_store_n(&level, value, __ATOMIC_RELAXED); }
 
 void clear(std::span<std::uint8_t> levels) {
     for (std::uint8_t &level : levels)
-        set(level, 0);
+        set_level(level, 0);
 }
 
 } // namespace
 
-int enter(std::string_view name, std::span<std::uint8_t> levels, std::span<const tr_category_t> categories) {
+int add(std::string_view name, std::span<std::uint8_t> levels, std::span<const tr_category_t> categories) {
     if (name.empty() || name.size() >= component_place{}.name.size() || !is_printable(name))
         return TR_BAD_PARAMETER;
     const table_lock locked;
@@ -82,22 +82,22 @@ int enter(std::string_view name, std::span<std::uint8_t> levels, std::span<const
         clear(levels);
         return TR_NO_MEMORY;
     }
-    // Registered before the first level rises, so that no thread records too early.
+    // Registered before any level is raised, so that no thread records too early.
     place->levels = levels;
     place->registered.store(true, std::memory_order_release);
     for (std::size_t index = 0; index < categories.size(); ++index) {
         const char *category = categories[index].name;
         const std::uint8_t level =
             category == nullptr ? std::uint8_t{0} : configured_level(environment().levels, name, category);
-        // A level that nobody raised must not make the file appear.
-        set(levels[index], level != 0 && trace_file::size() >= 0 ? level : std::uint8_t{0});
+        // Without a level there must be no file.
+        set_level(levels[index], level != 0 && trace_file::size() >= 0 ? level : std::uint8_t{0});
     }
     return TR_OK;
 }
 
-int leave(std::string_view name) {
+int remove(std::string_view name) {
     const table_lock locked;
-    component_place *place = find(name);
+    component_place *place = find_component(name);
     if (place == nullptr || !place->registered.load(std::memory_order_relaxed))
         return TR_NOT_REGISTERED;
     clear(place->levels);
@@ -107,7 +107,7 @@ int leave(std::string_view name) {
 }
 
 bool contains(std::string_view name) {
-    const component_place *place = find(name);
+    const component_place *place = find_component(name);
     return place != nullptr && place->registered.load(std::memory_order_acquire);
 }
 

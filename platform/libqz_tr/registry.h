@@ -10,12 +10,12 @@
 
 namespace qz::tr::registry {
 
-// Registers a component, anew or again, and fills its levels, of which there are as many as categories:
-// TR_OK, TR_BAD_PARAMETER (the name cannot be one) or TR_NO_MEMORY (no place is left).
-int enter(std::string_view name, std::span<std::uint8_t> levels, std::span<const tr_category_t> categories);
+// Registers a component, or registers it again, and sets its levels, one per category. Returns TR_OK, TR_BAD_PARAMETER
+// (invalid name) or TR_NO_MEMORY (table full).
+int add(std::string_view name, std::span<std::uint8_t> levels, std::span<const tr_category_t> categories);
 
-// Sets the component's levels to 0 and forgets them: TR_OK or TR_NOT_REGISTERED.
-int leave(std::string_view name);
+// Sets the component's levels to 0 and forgets them. Returns TR_OK or TR_NOT_REGISTERED.
+int remove(std::string_view name);
 
 bool contains(std::string_view name);
 

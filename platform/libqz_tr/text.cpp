@@ -1,4 +1,4 @@
-// A trace line shown on a terminal must not carry control characters in, in whatever disguise.
+// A trace line shown on a terminal must not smuggle in control characters.
 #include "libqz_tr/text.h"
 
 #include "base/utf8.h"

@@ -1,4 +1,4 @@
-// Which bytes a reader of the trace file may see as text.
+// Which bytes the trace file may show as text.
 #ifndef QZ_TR_TEXT_H
 #define QZ_TR_TEXT_H
 
@@ -6,7 +6,7 @@
 
 namespace qz::tr {
 
-// Whether the bytes are well-formed UTF-8 without control characters. No bytes at all are.
+// True for well-formed UTF-8 without control characters, including the empty string.
 bool is_printable(std::string_view bytes);
 
 } // namespace qz::tr

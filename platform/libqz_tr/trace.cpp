@@ -1,6 +1,7 @@
-// The public operations: they check arguments and keep the caller's thread undisturbed.
+// The public operations. They check arguments and leave the calling thread undisturbed.
 #include "qz/tr.h"
 
+#include "base/kept_errno.h"
 #include "base/owned.h"
 #include "base/uncancelled.h"
 #include "libqz_tr/line.h"
@@ -9,7 +10,6 @@
 
 #include <algorithm>
 #include <array>
-#include <cerrno>
 #include <cstdarg>
 #include <cstring>
 #include <unistd.h>
@@ -20,21 +20,13 @@ using qz::tr::trace_line;
 namespace registry = qz::tr::registry;
 namespace trace_file = qz::tr::trace_file;
 
-// Tracing goes on in the middle of other people's operations: they must find errno as it was, and must not
-// become a point where their thread can be cancelled.
-class undisturbed_caller {
-public:
-    undisturbed_caller() = default;
-    ~undisturbed_caller() { errno = errno_; }
-    undisturbed_caller(const undisturbed_caller &) = delete;
-    undisturbed_caller &operator=(const undisturbed_caller &) = delete;
-
-private:
-    int errno_ = errno;
-    qz::uncancelled uncancelled_;
+// Trace calls sit in the middle of other operations. They must preserve errno and must not be cancellation points.
+struct undisturbed_caller {
+    const qz::kept_errno error_number{};
+    const qz::uncancelled cancellation{};
 };
 
-// What a line says besides its items, so that it can be formed twice alike.
+// What a line says besides its items, kept so that a second try gives the same line.
 struct record_head {
     timespec time{};
     pid_t pid = getpid();
@@ -43,7 +35,7 @@ struct record_head {
     int id;
 };
 
-void form(trace_line &line, const record_head &head, int count, va_list items) {
+void format_record(trace_line &line, const record_head &head, int count, va_list items) {
     line.start(head.time, head.pid, head.tid, head.component, head.id);
     for (; count > 0 && !line.too_long(); --count) {
         const void *address = va_arg(items, const void *);
@@ -53,21 +45,21 @@ void form(trace_line &line, const record_head &head, int count, va_list items) {
     line.end();
 }
 
-// Most lines fit on the stack; only a larger one, whose size is known by then, is allocated.
+// Most lines fit on the stack. Only a larger one is allocated, once its size is known.
 int record(const record_head &head, int count, va_list items, va_list items_again) {
     std::array<char, 4096> small;
     trace_line line{small};
-    form(line, head, count, items);
+    format_record(line, head, count, items);
     if (line.too_long())
         return TR_TOO_LARGE;
     if (line.fits())
-        return trace_file::append(line.text());
+        return trace_file::append_line(line.text());
     const auto memory = qz::allocate<char>(line.size());
     if (memory == nullptr)
         return TR_NO_MEMORY;
     trace_line large{{memory.get(), line.size()}};
-    form(large, head, count, items_again);
-    return large.fits() && !large.too_long() ? trace_file::append(large.text()) : TR_BAD_PARAMETER;
+    format_record(large, head, count, items_again);
+    return large.fits() && !large.too_long() ? trace_file::append_line(large.text()) : TR_BAD_PARAMETER;
 }
 
 } // namespace
@@ -78,14 +70,14 @@ int tr_register_component_1(const char *component, uint8_t *levels, const tr_cat
         return TR_BAD_PARAMETER;
     const undisturbed_caller undisturbed;
     const auto size = static_cast<std::size_t>(count);
-    return registry::enter(component, {levels, size}, {categories, size});
+    return registry::add(component, {levels, size}, {categories, size});
 }
 
 int tr_unregister_component_1(const char *component) {
     if (component == nullptr)
         return TR_BAD_PARAMETER;
     const undisturbed_caller undisturbed;
-    return registry::leave(component);
+    return registry::remove(component);
 }
 
 int tr_record_id_1(const char *component, int id) { return tr_record_data_1(component, id, 0); }

@@ -1,5 +1,5 @@
-// Opens the trace file with care, because whoever can reach its folder may have prepared something in its
-// place, and writes to it such that nothing which befalls the file reaches the traced program.
+// Opens the trace file with care, because anyone with access to its folder may have planted something there, and
+// writes so that no trouble with the file affects the traced program.
 #include "libqz_tr/trace_file.h"
 
 #include "base/limited_write.h"
@@ -22,8 +22,8 @@ int descriptor = -1;
 dev_t device;
 ino_t inode;
 
-// A file that was there already may have been made by somebody who waits to read it or write into it, or be a second
-// name of a file that is not meant. A POSIX ACL shows in the bits of the group. One just made passes.
+// An existing file may have been planted by somebody who wants to read or write it, or be a second link to another
+// file. A POSIX ACL shows in the group bits. A newly created file passes.
 bool is_of_caller_alone(const struct stat &status) {
     return S_ISREG(status.st_mode) && status.st_uid == geteuid() && status.st_nlink == 1 &&
            (status.st_mode & (S_IWGRP | S_IWOTH)) == 0;
@@ -33,7 +33,7 @@ void open_trace_file() {
     const char *file = environment().file;
     if (file == nullptr)
         return;
-    // O_NONBLOCK keeps a FIFO without a reader from stopping the program before it can be seen to be one.
+    // With O_NONBLOCK, opening a FIFO without a reader does not block.
     qz::descriptor opened =
         open_file(file, O_WRONLY | O_APPEND | O_CREAT | O_NOFOLLOW | O_NONBLOCK, S_IRUSR | S_IWUSR);
     struct stat status;
@@ -44,7 +44,7 @@ void open_trace_file() {
     descriptor = opened.release();
 }
 
-// A daemon may close every descriptor it finds, and the number of ours may then name another file.
+// A daemon may have closed all its descriptors, and ours may then be another file.
 bool is_ours(struct stat &status) {
     pthread_once(&once, open_trace_file);
     return descriptor >= 0 && fstat(descriptor, &status) == 0 && status.st_dev == device &&
@@ -73,7 +73,7 @@ const char *name() {
     return is_ours(status) ? environment().file : nullptr;
 }
 
-int append(std::string_view line) {
+int append_line(std::string_view line) {
     struct stat status;
     if (!is_ours(status))
         return TR_NO_FILE;

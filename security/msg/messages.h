@@ -1,5 +1,5 @@
-// The messages of the library and the command, each declared once with the types of its arguments. Recording
-// a message with other arguments does not compile, nor does a declaration that its text contradicts.
+// The messages of the library and the command, each declared once with the types of its arguments. Recording a message
+// with other arguments does not compile, nor does a declaration that contradicts its text.
 #ifndef QZ_MESSAGES_H
 #define QZ_MESSAGES_H
 
@@ -9,8 +9,8 @@
 
 namespace qz::msg {
 
-// The conversion letter of a position such as "%2$d" or "0x%1$08x": 0 when the text does not mention the
-// position, '!' when it mentions it with different letters.
+// The conversion letter for a position, such as the d in "%2$d" or the x in "0x%1$08x". 0 if the text does not use the
+// position, '!' if it uses it with different letters.
 constexpr char conversion_of(std::string_view text, std::size_t position) {
     char found = 0;
     for (std::size_t at = 0; at + 3 < text.size(); ++at) {

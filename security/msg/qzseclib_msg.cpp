@@ -1,4 +1,4 @@
-// The message table, laid out by the compiler from the list of texts: no code runs to fill it.
+// The message table. It is made at compile time, so no code runs to fill it.
 #include "msg/qzseclib_msg.h"
 
 using namespace qz;

@@ -1,6 +1,6 @@
-// The default texts of message set 1 of the catalog qzseclib.cat: one list in the order of the message ids,
-// one source line for each line of text, so that a line feed is never lost unseen. The table, the catalog
-// source for translators and the checks of every message's arguments are all made from this list.
+// The default texts of message set 1 of the catalog qzseclib.cat, in id order, with one source line per line of
+// text, so that every line feed is visible. The message table, the catalog source for translators and the checks of
+// message arguments are all made from this list.
 #ifndef QZSECLIB_MSG_H
 #define QZSECLIB_MSG_H
 
@@ -562,7 +562,7 @@ inline constexpr text_entry texts[] = {
 
 inline constexpr std::size_t text_count = sizeof texts / sizeof texts[0];
 
-// The default text of an id, empty for an id that the library does not raise.
+// The default text of an id, empty for an id that the library does not use.
 constexpr std::string_view default_text(int id) {
     for (const text_entry &entry : texts) {
         if (entry.id == id)
@@ -585,11 +585,11 @@ static_assert(text_count == 79);
 
 } // namespace qz::msg
 
-// The message table that the error facility is given default texts from; null where no text is raised.
+// The table of default texts for the error facility; null for ids without a text.
 extern const std::array<const char *, qz::msg::table_size> cu_mesgtbl_qzseclib_msg;
 
-// What is shown for a message id outside the table or without a text. The ids of this library are checked when it is
-// compiled, so none of its messages comes to this; other users of the table may.
+// Shown for a message id outside the table or without a text. The library's own ids are checked at compile time, so
+// only other users of the table see this.
 extern const char cu_badid_qzseclib_msg[];
 
 namespace qz::msg {

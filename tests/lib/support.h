@@ -28,7 +28,6 @@ using arguments = std::vector<std::string>;
 
 // What operations are asked for by a number.
 enum check_choice : int { without_check, with_check };
-enum duplicates : int { replace_duplicates, report_duplicates };
 inline constexpr int by_handler = SEC_ACLE_USER | SEC_ACLE_USE_ID_HANDLER;
 
 // ---- Texts ----

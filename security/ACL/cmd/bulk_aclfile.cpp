@@ -1,5 +1,5 @@
-// The check of one ACL file: vet it, read it whole, parse every line, collect the entries, and cache what
-// they compile to.
+// The check of one ACL file: vet it, read it whole, parse every line, collect the entries, compile them, and write the
+// cache.
 #include "bulk_aclfile.h"
 
 #include "base/owned.h"
@@ -20,7 +20,7 @@ using namespace qz;
 
 namespace {
 
-// Given back when there is none left to say so.
+// Released when an error cannot be printed for lack of memory.
 owned<void> spare_memory;
 
 constexpr acl_file_use by_command = {
@@ -39,7 +39,7 @@ int aclfck__get_aclfile(const char *aclfname, const char *username, vetted_file 
     });
 }
 
-// Prints the current error and passes its code on.
+// Prints the current error, if any, and returns its code.
 int printed(int code) {
     if (code != SEC_S_OK)
         aclfck__print_error();
@@ -53,7 +53,7 @@ void warn_of_skipped_cache(unsigned flags) {
     aclfck__print_error();
 }
 
-// Prints the current error and an empty line, sooner or later.
+// Prints the current error and an empty line, without flushing.
 void print_recorded_error() {
     if (!print_recorded(stderr, "\n")) {
         spare_memory.reset();
@@ -63,9 +63,9 @@ void print_recorded_error() {
 
 volatile std::sig_atomic_t noted_signal = 0;
 
-// Prints the failures of lines. A terminal shows each at once; for a file or a pipe they are gathered, since a
-// write costs more than the check of a line. From the first gathered one on, a signal that ends the command
-// does so behind the line at hand, when everything is printed; a second one ends it as it comes.
+// Prints the failures of lines. A terminal shows each at once. For a file or a pipe they are buffered, because a write
+// costs more than checking a line. From the first buffered one on, a terminating signal takes effect after the current
+// line, when everything is printed; a second one takes effect at once.
 class line_failures {
 public:
     explicit line_failures(bool may_gather) : may_gather_(may_gather && isatty(STDERR_FILENO) == 0) {}
@@ -96,7 +96,7 @@ private:
     void note_signals() {
         struct sigaction noting = {};
         noting.sa_handler = [](int signal) { noted_signal = signal; };
-        // What is written goes on where it was interrupted.
+        // An interrupted write continues.
         noting.sa_flags = static_cast<int>(SA_RESTART | SA_RESETHAND);
         for (std::size_t i = 0; i != count; ++i) {
             sigaction(ending_signals[i], nullptr, &before_[i]);
@@ -111,8 +111,8 @@ private:
     struct sigaction before_[count] = {};
 };
 
-// Collects the entries of every line. Returns the failure that ends the check; failures that are passed over
-// clear `is_clean` instead.
+// Collects the entries of every line. Returns the failure that ends the check. Failures that do not end it clear
+// `is_clean`.
 int read_entries(acl_text &text, unsigned flags, sec_acltree_array &trees, bool &is_clean) {
     const bool goes_on = (flags & ACLFCK_OPT_CONTINUE) != 0;
     const bool is_verbose = (flags & ACLFCK_OPT_VERBOSE) != 0;
@@ -148,8 +148,8 @@ int read_entries(acl_text &text, unsigned flags, sec_acltree_array &trees, bool 
     return SEC_S_OK;
 }
 
-// Holds back every signal that can be, so that one that ends the command neither leaves half a cache nor the
-// temporary file; it does its work at the end of the scope. The library leaves the signals of a service alone.
+// Blocks all signals for its scope, so that a terminating one leaves neither half a cache nor the temporary file.
+// This is the command's business: the library does not touch the signals of a service.
 class held_signals {
 public:
     held_signals() {

@@ -10,18 +10,17 @@ enum : unsigned {
     ACLFCK_OPT_HELP = 16,
 };
 
-// Checks the file, printing each failure on standard error: on a terminal when it happens, otherwise those of lines
-// gathered. `username` may be null; of the
-// flags, compile, continue and verbose have an effect. Returns the exit status of the command.
+// Checks the file and prints each failure on standard error; failures of lines are buffered unless it is a terminal.
+// `username` may be null. The flags compile, continue and verbose have an effect. Returns the command's exit status.
 int aclfck__bulk_aclfile(const char *aclfname, const char *username, unsigned flags);
 
-// Stands for a check that does not hold the whole file in memory; it does nothing and returns 0.
+// Placeholder for a check that does not hold the whole file in memory. Does nothing and returns 0.
 int aclfck__stream_aclfile(const char *aclfname, const char *username);
 
-// Sets memory aside for printing an error when there is no other left; called once, at the start.
+// Reserves memory for printing an error when there is none left. Call it once, at the start.
 void aclfck__keep_spare_memory();
 
-// Prints the current error and an empty line, at once.
+// Prints the current error and an empty line, and flushes.
 void aclfck__print_error();
 
 #endif

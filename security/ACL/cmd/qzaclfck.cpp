@@ -1,4 +1,4 @@
-// The command qzaclfck: its options, and the decision between help, a usage error and a check.
+// The command qzaclfck: parses the options and shows help, reports a usage error, or runs a check.
 #include "bulk_aclfile.h"
 
 #include "report.h"
@@ -18,7 +18,7 @@ char *aclfname;
 char *username;
 char *ptplname;
 
-// What the options come to; each event overwrites the status, so the last one decides.
+// The parsed options. Each event overwrites the status, so the last one decides.
 struct option_state {
     static constexpr int help_wanted = 1;
 
@@ -39,6 +39,12 @@ void set_flag(option_state &state, unsigned flag, const char *option) {
         state.flags |= flag;
 }
 
+void set_help(option_state &state) {
+    if ((state.flags & ACLFCK_OPT_HELP) == 0)
+        state.status = option_state::help_wanted;
+    set_flag(state, ACLFCK_OPT_HELP, "-h");
+}
+
 void set_name(option_state &state, char *&name, const char *option) {
     if (name != nullptr) {
         state.fail(report(SEC_S_BAD_PARAMETER, msg::option_repeated, option));
@@ -49,12 +55,13 @@ void set_name(option_state &state, char *&name, const char *option) {
         state.fail(report_no_memory("main", std::strlen(optarg) + 1));
 }
 
-// The next option, also behind operands, where not every C library looks for more: the '-' has it hand operands out.
+// The next option, including those after operands. Not every C library permutes them, so the '-' makes getopt return
+// operands, too.
 constexpr int operand = 1;
 int next_option(int argc, char *argv[]) {
     for (;;) {
         const int option = getopt(argc, argv, "-cf:hsSt:u:v");
-        // Before a lone "-" some stop all the same.
+        // Some still stop at a lone "-".
         if (option != -1 || optind >= argc || std::strcmp(argv[optind], "-") != 0)
             return option;
         ++optind;
@@ -77,9 +84,7 @@ option_state read_options(int argc, char *argv[]) {
             set_name(state, aclfname, "-f");
             break;
         case 'h':
-            if ((state.flags & ACLFCK_OPT_HELP) == 0)
-                state.status = option_state::help_wanted;
-            set_flag(state, ACLFCK_OPT_HELP, "-h");
+            set_help(state);
             break;
         case 's':
             set_flag(state, ACLFCK_OPT_COMPILE, "-s");
@@ -127,7 +132,7 @@ void warn_not_implemented() {
     cu_set_no_error_1();
 }
 
-int check(unsigned flags) {
+int check_file(unsigned flags) {
     if (aclfname == nullptr) {
         report(SEC_S_BAD_PARAMETER, msg::file_option_missing);
         aclfck__print_error();
@@ -150,7 +155,7 @@ int check(unsigned flags) {
     return aclfck__bulk_aclfile(aclfname, username, flags);
 }
 
-// A file that is opened later must not become one of the standard streams, or a message would end up in it.
+// A file opened later must not become a standard stream, or messages would end up in it.
 void fill_standard_descriptors() {
     int fd = 0;
     do {
@@ -166,12 +171,12 @@ int main(int argc, char *argv[]) {
     fill_standard_descriptors();
     aclfck__keep_spare_memory();
     std::setlocale(LC_ALL, "");
-    // Entry lines are gathered, and failures of lines where nobody watches; other messages are flushed at once.
+    // Entry lines are buffered, and so are failures of lines unless a terminal shows them. Other messages are flushed.
     static char stream_buffer[1 << 16];
     std::setvbuf(stderr, stream_buffer, _IOFBF, sizeof stream_buffer);
 
     const option_state state = read_options(argc, argv);
-    const int status = state.status != 0 ? finish_without_check(state) : check(state.flags);
+    const int status = state.status != 0 ? finish_without_check(state) : check_file(state.flags);
     std::fflush(stderr);
     return status;
 }

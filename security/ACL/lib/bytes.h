@@ -1,5 +1,5 @@
-// The one reader of bytes that somebody else made and the one writer of ours. All of them step through byte_cursor,
-// which checks that what is wanted is at most what is left; nothing adds two lengths and hopes.
+// The one reader of foreign bytes and the one writer of our own. Both step through byte_cursor, which checks "wanted <=
+// left". Lengths are never added, so nothing can wrap.
 #ifndef QZ_BYTES_H
 #define QZ_BYTES_H
 
@@ -13,7 +13,7 @@ namespace qz {
 
 using byte_span = std::span<const unsigned char>;
 
-// Steps over bytes from their start to their end. A step that does not fit takes nothing and returns false.
+// Steps over bytes from start to end. A step that does not fit moves nothing and returns false.
 template <class Byte>
 class byte_cursor {
 public:
@@ -23,7 +23,7 @@ public:
     std::size_t left() const { return static_cast<std::size_t>(end_ - at_); }
     Byte *position() const { return at_; }
 
-    // Steps over bytes and hands out where they start.
+    // Steps over `count` bytes and hands out their start.
     bool take(std::size_t count, Byte *&start) {
         if (count > left())
             return false;
@@ -65,12 +65,12 @@ public:
     }
 };
 
-// Walks over bytes of the other byte order, turning each field it is asked for into host order in place.
+// Walks over bytes of the other byte order and converts fields to host order in place.
 class byte_swapper : public byte_cursor<unsigned char> {
 public:
     using byte_cursor::byte_cursor;
 
-    // A byte, which has no order.
+    // A single byte needs no conversion.
     bool byte(std::uint8_t &out) {
         unsigned char *start = nullptr;
         if (!take(sizeof out, start))
@@ -79,7 +79,7 @@ public:
         return true;
     }
 
-    // Swaps a field and hands out its value in host order.
+    // Converts a field and hands out its value.
     template <class Field>
     bool swap(Field &out) {
         unsigned char *start = nullptr;
@@ -91,7 +91,7 @@ public:
     }
 };
 
-// Fills memory that was measured beforehand; what would not fit is not written and makes the writer failed.
+// Fills memory that was measured beforehand. A write that does not fit is dropped and recorded as a failure.
 class byte_writer {
 public:
     explicit byte_writer(std::span<unsigned char> memory) : free_(memory) {}
@@ -104,7 +104,7 @@ public:
         unsigned char *start = nullptr;
         if (!free_.take(count, start))
             failed_ = true;
-        else if (count != 0) // what is absent has no address
+        else if (count != 0) // the source of nothing may be null
             std::memcpy(start, source, count);
     }
 
@@ -118,8 +118,8 @@ private:
     bool failed_ = false;
 };
 
-// Where a field is whose offset a reader found or the format fixes. One out of bounds is a fault of the code that
-// computed it: the process ends, since to go on would be to decide by bytes that nobody wrote.
+// The place of a field whose offset a reader found or the format fixes. An offset out of bounds is a bug: the process
+// aborts, because otherwise it would decide by bytes that nobody wrote.
 template <class Field, class Byte>
 Byte *proven_place(std::span<Byte> bytes, std::size_t offset) {
     byte_cursor<Byte> cursor(bytes);

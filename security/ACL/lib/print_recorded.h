@@ -1,4 +1,4 @@
-// Printing the recorded error, for dumps and commands: the library itself prints nothing else.
+// Printing the recorded error, for dumps and commands. The library prints nothing else.
 #ifndef QZ_PRINT_RECORDED_H
 #define QZ_PRINT_RECORDED_H
 
@@ -6,8 +6,8 @@
 
 namespace qz {
 
-// Writes the text of the thread's current error and then `ending`; the error stays current. False when there
-// is no memory for the text, and nothing was written.
+// Writes the text of the thread's current error, which stays current, and then `ending`. Without memory for the text it
+// writes nothing and returns false.
 bool print_recorded(std::FILE *stream, const char *ending);
 
 } // namespace qz

@@ -1,4 +1,4 @@
-// The state that the library keeps for its process.
+// The library's one process-wide state.
 #include "qzacl_init.h"
 
 acl_state_t acl__state;
@@ -11,15 +11,15 @@ void acl__state_init() {
 
 namespace {
 
-// Makes the state first, so that no thread is about to while the process forks.
+// Initializes the state first, so that no thread is doing so while the process forks.
 void lock() {
     pthread_once(&acl__init_once_block, acl__state_init);
     pthread_mutex_lock(&acl__state.lock);
 }
 void unlock() { pthread_mutex_unlock(&acl__state.lock); }
 
-// A child forked while another thread looks up a handler would otherwise wait for ever for a thread that it does
-// not have.
+// Otherwise a child forked while another thread looks up a handler would wait forever for a thread that it does not
+// have.
 [[gnu::constructor]] void keep_free_over_fork() { pthread_atfork(lock, unlock, unlock); }
 
 } // namespace

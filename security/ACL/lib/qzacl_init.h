@@ -1,4 +1,4 @@
-// The state that the library keeps for its process: the table of identity handlers and its lock.
+// The library's one process-wide state: the table of identity handlers and its lock.
 #ifndef QZACL_INIT_H
 #define QZACL_INIT_H
 
@@ -16,13 +16,13 @@ struct sec_id_handler_t {
 struct acl_state_t {
     pthread_mutex_t lock;
     std::int32_t handler_count;
-    sec_id_handler_t *handlers; // in the order of registration; grows and is never freed
+    sec_id_handler_t *handlers; // in order of registration; grows and is never freed
 };
 
 extern acl_state_t acl__state;
 extern pthread_once_t acl__init_once_block;
 
-// Makes the state ready; run through acl__init_once_block by every operation that uses it.
+// Initializes the state. Every operation that uses it calls this through acl__init_once_block.
 void acl__state_init();
 
 #endif

@@ -1,4 +1,4 @@
-// Registration of the trace component and the category table that it is registered with.
+// Registration of the trace component and its category table.
 #include "qzacl_trace.h"
 
 #include "trace_points.h"
@@ -16,11 +16,11 @@ constexpr tr_category_t acl__trace_categories[trace_category_count] = {
     {0, "Errors", 0}, {1, "Info", 0}, {2, "API", 0}, {3, "Buffer", 0}, {4, "Perf", 0},
 };
 
-// The levels of the Perf category at which registration leaves a record of it.
+// The levels of the Perf category at which registration is recorded.
 bool perf_level_is_recorded(unsigned level) { return (level >= 1 && level <= 4) || level == 7 || level == 8; }
 
-// The facility is asked before the first time is recorded; the record carries the level alone, as the file's own
-// size and name are no news to whoever reads it.
+// Queries the facility before the first timing is recorded. The record carries only the level: readers of the file know
+// its size and name.
 void ask_about_trace_file() {
     std::uint32_t size = 0;
     char name[TR_FILENAME_SIZE] = {};
@@ -31,7 +31,7 @@ void ask_about_trace_file() {
 } // namespace
 
 int acl__trace_register_component() {
-    // Whoever reached the first trace point must find its recorded error as it left it.
+    // The operation that reached the first trace point must keep its recorded error.
     cu_error_t *error = nullptr;
     const int saved = cu_get_error_1(&error);
     const int result = tr_register_component_1(trace_component, acl__trace_detail_levels,

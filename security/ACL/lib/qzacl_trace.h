@@ -1,6 +1,6 @@
-// Tracing: registration, the level tests, and how points, operations and timings are described and recorded. A point
-// that is switched off costs a once-guard and a comparison of one byte; nothing is measured for it. The points
-// themselves are in trace_points.h.
+// Tracing: registration, level tests, and how points, timings and operations are described and recorded. A disabled
+// point costs a once-guard and the comparison of one byte; nothing is measured for it. The points themselves are in
+// trace_points.h.
 #ifndef QZACL_TRACE_H
 #define QZACL_TRACE_H
 
@@ -26,7 +26,7 @@ inline constexpr char trace_component[] = "_SEL";
 
 extern std::uint8_t acl__trace_detail_levels[qz::trace_category_count];
 extern pthread_once_t acl__trace_register_once;
-// Set when registration is complete, so that later trace points need not call into the once-guard.
+// Set once registration is complete, so that later trace points skip the once-guard.
 extern bool acl__trace_is_registered;
 extern cu_timeinfo_t timeinfo;
 
@@ -35,7 +35,7 @@ int acl__trace_unregister_component();
 
 namespace qz {
 
-// The category's detail level; registers the component when this is the first trace point of the process.
+// The category's detail level. The first call in the process registers the component.
 inline unsigned trace_level(trace_category category) {
     if (!__atomic_load_n(&acl__trace_is_registered, __ATOMIC_ACQUIRE)) [[unlikely]]
         pthread_once(&acl__trace_register_once, [] { static_cast<void>(acl__trace_register_component()); });
@@ -44,7 +44,7 @@ inline unsigned trace_level(trace_category category) {
 
 inline bool traces(trace_category category) { return trace_level(category) != 0; }
 
-// Records a number with its items, whatever the level.
+// Records a number with its items, without a level test.
 template <class... Items>
 void record(int id, const Items &...items) {
     if constexpr (sizeof...(Items) == 0) {
@@ -61,7 +61,7 @@ void record(int id, const Items &...items) {
 
 // ---- Points ----
 
-// The levels of a category at which a point is recorded.
+// The category and levels at which a point is recorded.
 struct traced_at {
     trace_category category;
     unsigned first = 1;
@@ -70,7 +70,7 @@ struct traced_at {
     constexpr bool includes(unsigned level) const { return level >= first && level <= last; }
 };
 
-// A point with its items: what is recorded at it must be these, in number and kind.
+// A point and the items that it takes, by number and kind.
 template <int Id, traced_at At, class... Items>
 struct trace_point {
     static constexpr traced_at at = At;
@@ -89,7 +89,7 @@ bool traces(Point) {
     return Point::at.includes(trace_level(Point::at.category));
 }
 
-// Records a point at its levels.
+// Records a point if its level is set.
 template <class Point, class... Args>
 requires(Point::template takes<Args...>) void trace(Point point, const Args &...args) {
     if (traces(point)) [[unlikely]]
@@ -104,10 +104,10 @@ inline std::uint64_t read_counter() {
     return counter;
 }
 
-// The time between two counter values, with a nanosecond part that is never negative.
+// The time between two counter values. Its nanoseconds are never negative.
 cu_time_t elapsed_time(std::uint64_t start, std::uint64_t end);
 
-// A point that records what a step took, after the items of its own: ticks, seconds and nanoseconds.
+// A point that records the duration of a step after its own items: ticks, seconds and nanoseconds.
 template <int Id, traced_at At, class... Items>
 struct timed_point {
     static constexpr traced_at at = At;
@@ -124,7 +124,7 @@ struct timed_point {
     }
 };
 
-// Times a step from here to stop(), at the levels of its point. An `is_wanted` of false switches it off.
+// Times a step from construction to stop(), if the level of its point is set and `is_wanted`.
 template <auto Point>
 class trace_timer {
 public:
@@ -137,8 +137,6 @@ public:
             Point.record_since(start_, args...);
     }
 
-    bool is_running() const { return is_running_; }
-
 private:
     bool is_running_;
     std::uint64_t start_;
@@ -146,10 +144,10 @@ private:
 
 // ---- Operations ----
 
-// The recorded error when an operation is entered.
+// What entering an operation does to the recorded error.
 enum class error_at_entry { cleared, kept };
 
-// What an operation records of its arguments at level 8.
+// The arguments that an operation records at level 8.
 template <class... Items>
 struct with_arguments {
     static constexpr int numbers = 1;
@@ -163,8 +161,8 @@ struct with_arguments {
     }
 };
 
-// The same of an operation on an ACL, given first: where there is none, its address is recorded under a number of its
-// own, in place of its bytes.
+// The same for an operation whose first argument is an ACL. A null one is recorded as an address, under a number of its
+// own.
 template <class... Items>
 struct with_acl_and {
     static constexpr int numbers = 2;
@@ -182,7 +180,7 @@ struct with_acl_and {
     }
 };
 
-// What it records when it is left. A release: the number of leaving at every level.
+// What an operation records when it is left. A release records its exit number at every level.
 struct leaves_bare {};
 // The result.
 struct leaves_result {};
@@ -198,8 +196,8 @@ struct leaves_outputs {
     }
 };
 
-// A public operation. All of its numbers follow from that of entering it: that of its arguments is two above, and
-// another one two above that where there are two; then leaving, failure and success in a row.
+// A public operation. Its numbers follow from its entry number: plus 2 for the arguments, plus 4 for their second form
+// if there is one, then consecutive numbers for exit, result after a failure, and result after success.
 template <int Entry, error_at_entry Error, class Arguments, class Leaving>
 struct traced_operation {
     using arguments = Arguments;
@@ -213,7 +211,7 @@ struct traced_operation {
 };
 
 inline constexpr unsigned bare_level = 1; // of the API category: numbers without items
-inline constexpr unsigned full_level = 8; // arguments and results instead
+inline constexpr unsigned full_level = 8; // with arguments and results
 
 template <class Operation, class... Args>
 void trace_entry(Operation, const std::tuple<Args &...> &arguments) {
@@ -228,7 +226,7 @@ void trace_entry(Operation, const std::tuple<Args &...> &arguments) {
             arguments);
 }
 
-// `outputs` gives a tuple of the outputs, and is asked after success alone.
+// `outputs` returns a tuple of the outputs. It is called only after success.
 template <class Operation, class Outputs>
 void trace_exit(Operation, int result, const Outputs &outputs) {
     using leaving = typename Operation::leaving;
@@ -253,8 +251,8 @@ void trace_exit(Operation, int result, const Outputs &outputs) {
     }
 }
 
-// Runs a public operation: records that it is entered, clears the recorded error where it does, runs the body and
-// records its result.
+// Runs a public operation: records its entry, clears the recorded error if the operation does so, runs the body and
+// records the exit.
 template <class Operation, class... Args, class Body, class Outputs = std::nullptr_t>
 requires(Operation::arguments::template takes<std::remove_cv_t<Args>...>) int run(
     Operation operation, const std::tuple<Args &...> &arguments, const Body &body,
@@ -262,7 +260,7 @@ requires(Operation::arguments::template takes<std::remove_cv_t<Args>...>) int ru
     static_assert(std::is_same_v<Outputs, std::nullptr_t> ==
                       (std::is_same_v<typename Operation::leaving, leaves_bare> ||
                        std::is_same_v<typename Operation::leaving, leaves_result>),
-                  "outputs are given where the operation records them");
+                  "outputs are given if and only if the operation records them");
     trace_entry(operation, arguments);
     if constexpr (Operation::clears_error)
         cu_set_no_error_1();

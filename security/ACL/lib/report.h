@@ -1,8 +1,9 @@
-// Recording an error: every failing operation records exactly one message and returns its code. Nothing is
-// formatted here; the text is made when somebody fetches it.
+// Recording an error: every failing operation records exactly one message and returns its code. Nothing is formatted
+// until somebody fetches the text.
 #ifndef QZ_REPORT_H
 #define QZ_REPORT_H
 
+#include "base/owned.h"
 #include "msg/messages.h"
 #include "qz/acl.h"
 #include "qz/cu.h"
@@ -14,7 +15,7 @@
 
 namespace qz {
 
-// Where located messages say that they come from; the line beside it is that of the failing check.
+// The source paths in located messages. The line next to a path is that of the failing check.
 inline constexpr char acl_source[] = "security/ACL/lib/qzacl_acl";
 inline constexpr char utils_source[] = "security/ACL/lib/qzacl_utils";
 
@@ -25,7 +26,7 @@ int report(int code, msg::message<Id, Args...>, std::type_identity_t<Args>... ar
     return code;
 }
 
-// A code and its message, where those of several users of one function differ but take the same arguments.
+// A code and its message, for functions whose callers report the same failure under different ones.
 template <class... Args>
 struct failure_kind {
     template <int Id>
@@ -42,7 +43,7 @@ int report(const failure_kind<Args...> &kind, std::type_identity_t<Args>... args
     return kind.code;
 }
 
-// A size as a message shows it: the conversions take an int, and a size beyond it is shown as the largest.
+// A size as a message shows it: conversions take an int, so larger sizes are shown as INT_MAX.
 template <class Size>
 constexpr int shown_size(Size size) {
     static_assert(std::is_integral_v<Size>);
@@ -56,15 +57,19 @@ inline int report_no_memory(const char *function, std::uint64_t bytes) {
     return report(SEC_S_NO_MEMORY, msg::no_memory, function, shown_size(bytes));
 }
 
+inline int report_no_memory(const char *function, shortage lacking) {
+    return report_no_memory(function, lacking.bytes());
+}
+
 inline int report_bad_parameter(const char *function, int position, int value) {
     return report(SEC_S_BAD_PARAMETER, msg::incorrect_parameter, function, position, value);
 }
 
-// A buffer that is wrong in a way without a message of its own: a part does not end where it should, or the
-// bytes end early.
+// For structural faults without a message of their own: a part does not end where it should, or the bytes end
+// early.
 inline int report_corrupt(int line) { return report(SEC_S_BAD_ACL, msg::buffer_corrupted, acl_source, line); }
 
-// A pointer as the parameter message shows it, cut to the width of its conversion.
+// A pointer as the parameter message shows it, truncated to the width of its conversion.
 inline int shown_pointer(const void *pointer) {
     return static_cast<int>(static_cast<std::uint32_t>(reinterpret_cast<std::uintptr_t>(pointer)));
 }

@@ -1,5 +1,5 @@
-// The items of trace records by their kinds. An item is built behind the level test, from the argument that it shows,
-// and hands the facility an address and a number of bytes for each part that it has.
+// The kinds of items in trace records. An item is built from the argument that it shows, after the level test, and
+// passes the facility an address and a size for each of its parts.
 #ifndef QZACL_TRACE_ITEMS_H
 #define QZACL_TRACE_ITEMS_H
 
@@ -14,13 +14,13 @@
 
 namespace qz::traced {
 
-// An address and a number of bytes, exactly as the facility takes them.
+// An address and a size, in the exact types that the facility takes.
 inline std::tuple<const void *, std::size_t> part(const void *start, std::size_t size_in_bytes) {
     return {start, size_in_bytes};
 }
 
-// A string with its NUL, an empty one standing for null. Of one in an array that a caller filled no more than the
-// array, whether a NUL ends it or not.
+// A string with its NUL; null is recorded as an empty one. A string in an array that a caller filled may lack its NUL
+// and ends with the array.
 class text {
 public:
     template <class Pointer>
@@ -31,7 +31,7 @@ public:
     template <std::size_t Size>
     explicit text(const char (&array)[Size]) : start_(array), size_(strnlen(array, Size - 1) + 1) {}
 
-    // One whose length is known.
+    // A string of known length, with a NUL after it.
     explicit text(std::string_view string) : start_(string.data()), size_(string.size() + 1) {}
 
     auto parts() const { return part(start_, size_); }
@@ -41,13 +41,13 @@ private:
     std::size_t size_;
 };
 
-// The same, where a missing string shows as such.
+// The same, but null is recorded as "<nil>".
 class text_or_nil : public text {
 public:
     explicit text_or_nil(const char *string) : text(string == nullptr ? "<nil>" : string) {}
 };
 
-// A number with the width of its type: 4 bytes, or 8 for sizes and times.
+// A number in the width of its type: 4 bytes, or 8 for sizes and times.
 template <class Number>
 struct number {
     static_assert(std::is_integral_v<Number> && (sizeof(Number) == 4 || sizeof(Number) == 8));
@@ -63,7 +63,7 @@ using unsigned_number = number<std::uint32_t>;
 using size = number<std::size_t>;
 using signed_size = number<std::ptrdiff_t>;
 
-// A pointer by its value. One to characters is a text.
+// The value of a pointer. Pointers to characters are texts.
 class address {
 public:
     template <class Object>
@@ -76,7 +76,7 @@ private:
     std::uintptr_t value_;
 };
 
-// The length of an ACL and the address of its bytes; 0 and null where there is no ACL.
+// The length of an ACL and the address of its bytes; 0 and null without an ACL.
 class acl_bytes {
 public:
     explicit acl_bytes(const sec_acl_buffer_t *acl)
@@ -89,7 +89,7 @@ private:
     address data_;
 };
 
-// The same after the address of the ACL.
+// The address of the ACL, then the same.
 class acl {
 public:
     explicit acl(const sec_acl_buffer_t *shown) : address_(shown), bytes_(shown) {}
@@ -101,7 +101,7 @@ private:
     acl_bytes bytes_;
 };
 
-// An entry: its address, type, permission mask, mechanism and identity; nothing of a missing one.
+// An entry: its address, type, permission mask, mechanism and identity; zeros and empty strings without one.
 class acle {
 public:
     explicit acle(const sec_acle_t *shown)
@@ -110,7 +110,7 @@ public:
           mechanism_(shown == nullptr ? text("") : text(shown->mechanism)),
           identity_(shown == nullptr ? text("") : text(shown->identity)) {}
 
-    // One that is held in another form at a place.
+    // An entry that is stored at `place` in another form.
     acle(const void *place, std::uint32_t type, std::uint32_t mask, std::string_view mechanism,
          std::string_view identity)
         : address_(place), type_{type}, mask_{mask}, mechanism_(mechanism), identity_(identity) {}
@@ -128,7 +128,7 @@ private:
     text identity_;
 };
 
-// A list of entries: its address, and their number.
+// A list of entries: its address and length.
 class aclelist {
 public:
     explicit aclelist(const sec_aclelist_t *shown)
@@ -144,13 +144,13 @@ private:
 template <class... Each>
 struct list {};
 
-// An item can be made of the argument, without cutting a number.
+// The item can be made from the argument, without narrowing a number.
 template <class Item, class Arg>
 concept made_of = requires(const Arg &arg) {
     Item{arg};
 };
 
-// Each of the items can be made of the argument at its place, and none is missing.
+// Items and arguments match in number, and each item can be made from its argument.
 template <class Items, class Args>
 inline constexpr bool fit = false;
 

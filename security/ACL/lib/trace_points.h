@@ -1,5 +1,5 @@
-// The trace points of the library, each declared once with its number, its levels and its items. Recording one with
-// other items does not compile. docs/tracing.md says what they mean to those who read a trace.
+// The trace points of the library, each declared once with its number, levels and items. Recording one with other items
+// does not compile. docs/tracing.md explains them to readers of a trace.
 #ifndef QZACL_TRACE_POINTS_H
 #define QZACL_TRACE_POINTS_H
 
@@ -19,10 +19,10 @@ inline constexpr traced_at perf = {trace_category::perf};
 inline constexpr traced_at perf_at_1 = {trace_category::perf, 1, 1};
 inline constexpr traced_at perf_at_2 = {trace_category::perf, 2, 2};
 
-// Registration, which tests the level for itself: the level of timings.
+// Registration, which does its own level test. Item: the level of timings.
 inline constexpr trace_point<0, perf, unsigned_number> registered;
 
-// Times. Names are those of files.
+// Timings. Texts are file names unless noted.
 inline constexpr timed_point<1, perf_at_1, text> choosing_file;
 inline constexpr timed_point<2, perf_at_1, text> reading_file;
 inline constexpr timed_point<3, perf_at_1, text, unsigned_number> parsing; // line counter

@@ -144,8 +144,7 @@ void compare_sorted(const tree_entries &before, const tree_entries &after, diffe
 class identity_index {
 public:
     identity_index(const tree_entries &entries, std::size_t first) : entries_(entries) {
-        std::size_t refused = 0;
-        if (!table_.reset(static_cast<std::uint32_t>(entries.size() - first + 1), refused))
+        if (const shortage lacking = table_.reset(static_cast<std::uint32_t>(entries.size() - first + 1)))
             throw std::bad_alloc();
         for (std::size_t place = first; place < entries.size(); ++place)
             table_.enter(hash_of(entries.identity(place)), static_cast<std::uint32_t>(place));
@@ -235,7 +234,7 @@ void compare_all(side &before, side &after, difference_list &found) {
         compare_trees(entries_of(before, tree), entries_of(after, other ? other.mapped() : nullptr), found);
     }
     for (const sec_acltree_t *tree : after.document.trees()) {
-        if (only_after.count(key_of_tree(*tree)) != 0)
+        if (only_after.contains(key_of_tree(*tree)))
             compare_trees({}, entries_of(after, tree), found);
     }
 }

@@ -1,4 +1,4 @@
-// The text of an ACL file: found and vetted, read whole, and handed out line after line.
+// The text of an ACL file: found, vetted, read whole, and handed out line by line.
 #include "qzacl_acl/acl_text.h"
 
 #include "base/open_file.h"
@@ -36,7 +36,7 @@ int open_and_read(const vetted_file &file, const vetted_file *text_of_cache, con
         trace(point::opening, path);
     const trace_timer<point::reading_file> reading(use.is_traced);
     const trace_timer<point::opening_file> opening(use.is_traced);
-    // A file that turned into a FIFO must not block.
+    // O_NONBLOCK: the file may be a FIFO by now.
     descriptor opened = open_file(path, O_RDONLY | O_NONBLOCK);
     if (!opened) {
         const int error = errno;
@@ -60,7 +60,7 @@ int read_cache_of(const vetted_file &text, const vetted_file &cache, const acl_f
     return open_and_read(cache, &text, use, bytes);
 }
 
-void acl_text::stand_before_first_line() {
+void acl_text::rewind() {
     cursor_ = bytes_.data.get();
     remaining_ = bytes_.length + 1;
     line_ = 1;
@@ -76,7 +76,7 @@ int acl_text::take(std::string_view bytes) {
         std::memset(bytes_.data.get() + bytes.size(), '\0', text_padding);
         bytes_.length = bytes.size();
     }
-    stand_before_first_line();
+    rewind();
     return SEC_S_OK;
 }
 
@@ -84,7 +84,7 @@ int acl_text::open(const vetted_file &file, const acl_file_use &use) {
     origin_.emplace(file.status);
     if (const int result = open_and_read(file, nullptr, use, bytes_); result != SEC_S_OK)
         return result;
-    stand_before_first_line();
+    rewind();
     return SEC_S_OK;
 }
 

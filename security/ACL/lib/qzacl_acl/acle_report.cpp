@@ -1,4 +1,4 @@
-// What trees and packed sub-ACLs tell alike of an entry that they hold already, or do not hold.
+// Reports about entries that trees and packed sub-ACLs share: duplicates and missing entries.
 #include "qzacl_acl/acle_report.h"
 
 #include "report.h"

@@ -1,4 +1,4 @@
-// Memory that is handed out piece by piece and given back as a whole.
+// Memory that is handed out in pieces and freed as a whole.
 #include "qzacl_acl/arena.h"
 
 #include <algorithm>
@@ -23,21 +23,19 @@ arena::~arena() {
     }
 }
 
-unsigned char *arena::room(std::size_t size) {
+shortage arena::make_room(std::size_t size) {
     constexpr std::size_t largest_chunk = std::size_t{1} << 20;
     if (aligned(size) <= static_cast<std::size_t>(end_ - at_))
-        return at_;
+        return {};
     const std::size_t chunk_size = std::max(next_size_, aligned(size) + sizeof(chunk));
     auto *memory = static_cast<unsigned char *>(std::malloc(chunk_size));
-    if (memory == nullptr) {
-        refused_ = chunk_size;
-        return nullptr;
-    }
+    if (memory == nullptr)
+        return shortage(chunk_size);
     last_ = new (memory) chunk{last_};
     at_ = memory + sizeof(chunk);
     end_ = memory + chunk_size;
     next_size_ = std::min(next_size_ * 2, largest_chunk);
-    return at_;
+    return {};
 }
 
 void arena::keep(std::size_t size) { at_ += aligned(size); }

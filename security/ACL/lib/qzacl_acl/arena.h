@@ -1,6 +1,8 @@
-// Memory that is handed out piece by piece and given back as a whole.
+// Memory that is handed out in pieces and freed as a whole.
 #ifndef QZACL_ARENA_H
 #define QZACL_ARENA_H
+
+#include "base/owned.h"
 
 #include <cstddef>
 #include <cstdint>
@@ -14,12 +16,10 @@ public:
     arena &operator=(const arena &) = delete;
     ~arena();
 
-    // Room for `size` bytes, aligned for numbers of eight bytes, or null; only keep() takes it.
-    unsigned char *room(std::size_t size);
+    // Makes room for `size` bytes, aligned to eight. They are at room() until keep() claims them.
+    shortage make_room(std::size_t size);
+    unsigned char *room() { return at_; }
     void keep(std::size_t size);
-
-    // What a failed room() asked for.
-    std::size_t refused() const { return refused_; }
 
 private:
     struct alignas(std::uint64_t) chunk {
@@ -30,7 +30,6 @@ private:
     unsigned char *end_ = nullptr;
     chunk *last_ = nullptr;
     std::size_t next_size_ = 512;
-    std::size_t refused_ = 0;
 };
 
 } // namespace qz

@@ -1,4 +1,4 @@
-// Whole compiled buffers: making, taking over, releasing, and finding one sub-ACL in them.
+// Whole compiled buffers: creating, copying, releasing, and finding a sub-ACL.
 #include "qzacl_acl/buffer.h"
 
 #include "base/owned.h"
@@ -32,7 +32,7 @@ int read_checked(int length, const void *data, sec_acl_buffer_t *acl) {
 int release_checked(sec_acl_buffer_t *acl) {
     if (acl == nullptr || acl->data == nullptr)
         return SEC_S_OK;
-    // Memory that is held has a first byte, whatever the length says.
+    // The first byte exists even if the length is wrong.
     if (*static_cast<const unsigned char *>(acl->data) != format::buffer_type)
         return report(SEC_S_BAD_ACL, msg::acl_corrupted);
     std::free(acl->data);
@@ -40,7 +40,7 @@ int release_checked(sec_acl_buffer_t *acl) {
     return SEC_S_OK;
 }
 
-// True when a sub-ACL's field holds the mechanism, in any letter case.
+// True when a mechanism field holds the mechanism, in any letter case.
 bool holds_mechanism(byte_span field, const char *mechanism) {
     for (std::size_t index = 0; index < field.size(); ++index) {
         if (fold(field[index]) != fold(static_cast<unsigned char>(mechanism[index])))

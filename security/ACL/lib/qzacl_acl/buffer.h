@@ -1,4 +1,4 @@
-// Whole compiled buffers: finding one sub-ACL in them.
+// Whole compiled buffers: finding a sub-ACL.
 #ifndef QZACL_BUFFER_H
 #define QZACL_BUFFER_H
 
@@ -8,24 +8,24 @@
 #include <cstddef>
 #include <cstdint>
 
-// Finds the first sub-ACL of a type and, for types 4 and 8, of a mechanism in any letter case; for the other
-// types `mechanism` is not looked at. `*subacl` becomes the sub-ACL's start or null, also where the bytes end
-// before it is found. Always returns SEC_S_OK.
+// Finds the first sub-ACL of a type and, for types 4 and 8, of a mechanism in any letter case; other types ignore
+// `mechanism`. Sets `*subacl` to its start, or to null if it is not found before the bytes end. Always returns
+// SEC_S_OK.
 int sec__find_subacl(const sec_acl_buffer_t *acl, std::uint8_t type, const char *mechanism,
                      const unsigned char **subacl);
 
 namespace qz {
 
-// A sub-ACL where it stands in a buffer.
+// A sub-ACL in a buffer.
 struct stored_subacl {
     bool is_there = false;
     std::size_t offset = 0; // of its start
     format::subacl head;
 };
 
-// The same with what its header says; `entries` then stands before the first entry, and reaches to the end of the
-// buffer. Inline, and the header is read once more: a decision among few entries would spend a third of its time on
-// fetching from memory what the search has just put there.
+// The same, and reads its header. `entries` then starts at the first entry and reaches to the end of the buffer.
+// Inline, and the header is read again: a decision among few entries would otherwise spend a third of its time on
+// loading what the search has just stored.
 [[gnu::always_inline]] inline bool find_subacl(const sec_acl_buffer_t &acl, std::uint8_t type,
                                                const char *mechanism, format::subacl &head,
                                                byte_reader &entries) {
@@ -38,7 +38,7 @@ struct stored_subacl {
     return format::read(entries, head);
 }
 
-// The same for those who change or copy the sub-ACL.
+// The same for functions that change or copy the sub-ACL.
 inline stored_subacl find_subacl(const sec_acl_buffer_t &acl, std::uint8_t type, const char *mechanism) {
     stored_subacl found;
     byte_reader entries;

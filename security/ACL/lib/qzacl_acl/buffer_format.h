@@ -1,10 +1,9 @@
-// The byte format of a compiled ACL, and the walk over its sub-ACLs and entries: the one file that knows an
-// offset.
+// The byte format of a compiled ACL, and walks over its sub-ACLs and entries. No other file knows an offset.
 //
 //   Header             0  1  buffer type, 0x85
 //                      1  1  version, 1
 //                      2  1  byte order of all fields: 2 low byte first, 1 high byte first; a host takes
-//                            whatever is not its own for the other
+//                            any value but its own for the other order
 //                      3  2  number of sub-ACLs
 //
 //   Sub-ACL            0  4  its length: this header, the mechanism and the entries
@@ -18,8 +17,8 @@
 //                      5  2  bytes of the identity with its NUL; 0 for types 1 and 2
 //                      7     identity
 //
-// Records follow each other without padding. One user entry, mechanism abcd, identity xyz, mask 3, takes
-// 31 bytes, on a host that puts the low byte first:
+// There is no padding. An ACL with one user entry, mechanism abcd, identity xyz, mask 3, takes 31 bytes. On a host with
+// the low byte first:
 //
 //   85 01 02 01 00 | 1a 00 00 00  04  01 00 00 00  05  61 62 63 64 00 | 01  03 00 00 00  04 00  78 79 7a 00
 #ifndef QZACL_BUFFER_FORMAT_H
@@ -54,7 +53,7 @@ inline constexpr std::size_t entry_fixed_size = 7;
 inline constexpr std::size_t entry_mask_offset = 1;
 inline constexpr std::size_t entry_length_offset = 5;
 
-// Limits of the fields' widths.
+// Limits by the widths of fields.
 inline constexpr std::size_t identity_max = std::numeric_limits<std::uint16_t>::max() - 1;
 inline constexpr std::size_t subacls_max = std::numeric_limits<std::uint16_t>::max();
 inline constexpr std::size_t buffer_max = std::numeric_limits<std::int32_t>::max();
@@ -82,7 +81,7 @@ struct entry {
     byte_span identity; // with its NUL
 };
 
-// The bytes of a descriptor; none where its length is not positive or it holds no buffer.
+// The bytes of a descriptor; none without a buffer or a positive length.
 inline byte_span bytes_of(const sec_acl_buffer_t &acl) {
     if (acl.data == nullptr || acl.length <= 0)
         return {};
@@ -94,18 +93,18 @@ inline bool read(byte_reader &reader, header &out) {
            reader.field(out.subacl_count);
 }
 
-// Reads the fixed fields of a sub-ACL; the reader then stands before its mechanism.
+// Reads the fixed fields of a sub-ACL, up to its mechanism.
 inline bool read_fixed_part(byte_reader &reader, subacl &out) {
     return reader.field(out.length) && reader.field(out.type) && reader.field(out.entry_count) &&
            reader.field(out.mechanism_length);
 }
 
-// Reads a sub-ACL's fixed fields and mechanism; the reader then stands before its first entry.
+// Reads the fixed fields and the mechanism of a sub-ACL, up to its first entry.
 inline bool read(byte_reader &reader, subacl &out) {
     return read_fixed_part(reader, out) && reader.bytes(out.mechanism_length, out.mechanism);
 }
 
-// Reads the fixed fields of an entry; the reader then stands before its identity.
+// Reads the fixed fields of an entry, up to its identity.
 inline bool read_fixed_part(byte_reader &reader, entry &out, std::uint16_t &identity_length) {
     byte_span fixed;
     if (!reader.bytes(entry_fixed_size, fixed))
@@ -126,14 +125,14 @@ inline bool holds_exact_string(byte_span field) {
     return !field.empty() && std::memchr(field.data(), '\0', field.size()) == &field.back();
 }
 
-// A string field as a C string, or null when no NUL ends it inside the field.
+// A string field as a C string, or null if it has no NUL.
 inline const char *string_in(byte_span field) {
     if (field.empty() || std::memchr(field.data(), '\0', field.size()) == nullptr)
         return nullptr;
     return reinterpret_cast<const char *>(field.data());
 }
 
-// The same with its length. Without an address where string_in gives null.
+// The same with its length. A null view if it has no NUL.
 inline std::string_view text_in(byte_span field) {
     const void *end = field.empty() ? nullptr : std::memchr(field.data(), '\0', field.size());
     if (end == nullptr)
@@ -142,24 +141,23 @@ inline std::string_view text_in(byte_span field) {
     return {reinterpret_cast<const char *>(field.data()), length};
 }
 
-// The entries of a sub-ACL that are still to be looked at.
+// The entries of a sub-ACL that are still to be read.
 struct entry_walk {
     byte_reader entries;
     std::uint32_t left = 0;
 };
 
-// Steps over entries while `is_passed` says so of their version and identity, of which `readable` bytes may be read
-// even if it is shorter. Stops as well before an entry that reaches beyond the end, whose field does not end in
-// NUL, or that has fewer bytes behind it than another one would take with the readable bytes of its identity:
-// those, and so the last ones of a buffer, are left to the checked reader. This is the loop that a decision
-// spends its time in, so each step makes do with one test for where the bytes end and one for the field.
+// Skips entries while `is_passed` returns true for their version and identity, of which `readable` bytes may be
+// read even if it is shorter. Also stops before an entry that reaches beyond the end, whose field does not end in
+// NUL, or that has fewer bytes after it than another entry with `readable` bytes of identity takes. Such entries,
+// and so the last ones of a buffer, are left to the checked reader. Decisions spend their time in this loop, so
+// each step has only one test for the end of the bytes and one for the field.
 template <class Passed>
 void skip_entries_while(entry_walk &walk, std::size_t readable, const Passed &is_passed) {
     if (walk.entries.left() < entry_fixed_size + readable)
         return;
     const unsigned char *const start = walk.entries.position();
-    // Where an entry may start at the latest, as a number: sums of these do not wrap, and form no pointer to
-    // where nothing is.
+    // The last place at which an entry may start, as a number: sums do not wrap and form no invalid pointer.
     const auto number_of = [](const unsigned char *place) {
         return std::uint64_t{reinterpret_cast<std::uintptr_t>(place)};
     };
@@ -181,7 +179,7 @@ void skip_entries_while(entry_walk &walk, std::size_t readable, const Passed &is
     walk.left = left;
 }
 
-// Steps over entries, whatever they hold. False where one reaches beyond the end.
+// Skips entries without looking at their contents. False if one reaches beyond the end.
 inline bool skip_entries(byte_reader &reader, std::uint32_t count) {
     entry_walk walk{reader, count};
     for (;;) {
@@ -196,7 +194,7 @@ inline bool skip_entries(byte_reader &reader, std::uint32_t count) {
     }
 }
 
-// Steps through the sub-ACLs of a buffer in host order, from each to the next by its length field.
+// Steps through the sub-ACLs of a buffer in host order by their length fields.
 class subacl_walk {
 public:
     enum class step : std::uint8_t { found, end, corrupt };
@@ -210,7 +208,7 @@ public:
     step next() {
         if (left_ == 0)
             return step::end;
-        // A length that does not cover the sub-ACL's own header would lead back into it.
+        // A shorter length would lead back into the sub-ACL's own header.
         if (is_started_ && (current_.length < subacl_header_size || !next_.skip(current_.length)))
             return step::corrupt;
         is_started_ = true;
@@ -220,9 +218,8 @@ public:
     }
 
     const subacl &current() const { return current_; }
-    // The bytes that the current sub-ACL may take: up to where the next one starts, and for the last up to
-    // the end of the buffer. So however sub-ACLs are made to overlap, walking over all their entries takes no
-    // more than the bytes can hold.
+    // The bytes that the current sub-ACL may use: up to the next sub-ACL or, for the last one, to the end of the
+    // buffer. So even if forged sub-ACLs overlap, walking over all entries takes time linear in the bytes.
     byte_span bytes() const {
         return {next_.position(),
                 left_ == 0 ? next_.left() : std::min<std::size_t>(current_.length, next_.left())};
@@ -235,9 +232,9 @@ private:
     bool is_started_ = false;
 };
 
-// Finds where the sub-ACLs that a buffer counts end, and so where a further one goes: what may follow stays behind
-// it, where no count reaches. False where one reaches beyond the end of the buffer, and where the length of the last
-// does not lead to the end of its entries: a walk would look for the further one elsewhere.
+// Finds the end of the counted sub-ACLs, where a new one is inserted; any bytes after that remain uncounted. False
+// if a sub-ACL reaches beyond the end of the buffer, or if the length of the last one does not lead to the end of
+// its entries, because a walk would look for the new one elsewhere.
 inline bool find_end(byte_span buffer, std::size_t &offset) {
     byte_reader behind(buffer);
     header head;
@@ -274,7 +271,7 @@ inline void write_subacl_header(byte_writer &writer, const subacl &head) {
     writer.bytes(head.mechanism.data(), head.mechanism.size());
 }
 
-// Writes an entry; `identity_size` counts the NUL, and is 0 for an entry without identity.
+// Writes an entry. `identity_size` counts the NUL and is 0 for an entry without an identity.
 inline void write_entry(byte_writer &writer, std::uint32_t perm_mask, const char *identity,
                         std::size_t identity_size) {
     writer.field(entry_version);

@@ -1,4 +1,4 @@
-// The cached form of an ACL file: the compiled buffer beside it, owned and protected like it.
+// Writing the cache of an ACL file: a compiled buffer next to it, with the same owner, mode and POSIX ACL.
 #include "qzacl_acl/cache_file.h"
 
 #include "base/limited_write.h"
@@ -20,8 +20,8 @@ using namespace qz;
 
 namespace {
 
-// A file under a name that this call made. It is removed at the end of the scope unless it was kept, and only
-// while the name still leads to the file that is held open.
+// A file that this call created. It is removed at the end of the scope unless it is kept, and only if its name still
+// leads to the file that is open.
 class made_file {
 public:
     made_file(const char *name, descriptor file) : name_(name), file_(std::move(file)) {}
@@ -52,8 +52,8 @@ int cannot_protect(const char *cache_name, const struct stat &text) {
     return report(SEC_S_FILE_ERROR, msg::cannot_set_mode, cache_name, bits);
 }
 
-// Creates the temporary file under the ACL file's name, a '.', and groups of four digits, one more for each
-// name that is taken. On failure `name` is the one that could not be had.
+// Creates the temporary file. Its name is the ACL file's, a '.', and four digits, plus four more for each name that is
+// taken. On failure `name` is the last one tried.
 descriptor create_temporary(const char *aclfname, path_buffer &name) {
     constexpr std::size_t digits = 4;
     std::size_t length = std::strlen(aclfname);
@@ -72,7 +72,7 @@ descriptor create_temporary(const char *aclfname, path_buffer &name) {
         if (errno != ENOENT)
             return {};
         descriptor file = open_file(name.text, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW);
-        // Somebody may have taken the name since, or a link that leads nowhere stands under it.
+        // The name may have been taken since, or be that of a dangling symbolic link.
         if (file || errno != EEXIST)
             return file;
     }
@@ -83,7 +83,7 @@ int cannot_write(ssize_t count, const sec_acl_buffer_t &acl) {
     return report(SEC_S_FILE_ERROR, msg::short_write, static_cast<int>(count), acl.length, errno);
 }
 
-// Writes one cache, step by step. Each step returns SEC_S_OK, or what the operation ends with.
+// Writes one cache, step by step. Each step returns SEC_S_OK, or the result of the whole operation.
 class cache_writer {
 public:
     cache_writer(const char *aclfname, const text_origin &origin) : aclfname_(aclfname), origin_(origin) {}
@@ -138,7 +138,7 @@ descriptor cache_writer::open_cache() const {
     return open_file(cache_name_.text, O_WRONLY | O_CREAT | O_EXCL);
 }
 
-// Of a cache that is new, the empty file that holds its name until it is complete.
+// For a new cache this is the empty file that holds its name until it is complete.
 int cache_writer::vet_opened_cache(int fd) const {
     if (is_new_)
         return remove_posix_acl(fd) ? SEC_S_OK : cannot_protect(cache_name_.text, text_.status);
@@ -173,7 +173,8 @@ int cache_writer::write_and_rename(const sec_acl_buffer_t &acl) {
     return SEC_S_OK;
 }
 
-// Has the bytes on disk before the file gets its final name; that takes long, so all that may fail comes before.
+// The bytes must be on disk before the file gets its final name. Syncing takes long, so it comes after all that may
+// fail.
 int cache_writer::fill(int fd, const sec_acl_buffer_t &acl) const {
     const timespec times[2] = {origin_.time, origin_.time};
     errno = 0; // a write that is cut short sets none
@@ -185,9 +186,9 @@ int cache_writer::fill(int fd, const sec_acl_buffer_t &acl) const {
     return fdatasync(fd) == 0 ? SEC_S_OK : cannot_write(count, acl);
 }
 
-// Nobody but its owner may ever write the file who could not write the text: it has no rights at all while the
-// entries inherited from the folder go and while it changes hands. The mode comes last, since giving a file away
-// clears bits of it; its group bits are those of the entries' mask already.
+// At no time may anyone but the owner write the file who cannot write the text. So its mode is 0 while the POSIX ACL
+// inherited from the directory is removed and the owner changes. The mode comes last, because fchown clears some of its
+// bits. Its group bits already match the mask of the POSIX ACL.
 int cache_writer::protect(int fd) const {
     if (!remove_posix_acl(fd))
         return cannot_protect(cache_name_.text, text_.status);

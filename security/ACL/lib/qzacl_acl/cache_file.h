@@ -1,4 +1,4 @@
-// The cached form of an ACL file: the compiled buffer beside it, owned and protected like it.
+// Writing the cache of an ACL file: a compiled buffer next to it, with the same owner, mode and POSIX ACL.
 #ifndef QZACL_CACHE_FILE_H
 #define QZACL_CACHE_FILE_H
 
@@ -10,18 +10,17 @@
 
 namespace qz {
 
-// For an ACL file's path that is as long as this, or longer, no cache is written.
+// No cache is written for paths of this length or longer.
 inline constexpr std::size_t uncached_path_length = path_max - sizeof cache_extension;
 
-// Which caches are written anew: a cache that is later than its ACL file is current.
+// Which caches are rewritten. A cache that is newer than its ACL file is current.
 enum class cache_rewriting { unless_current, always };
 
 } // namespace qz
 
-// Writes the buffer to the ACL file's cache, through a temporary file that takes the cache's place whole.
-// Returns SEC_S_OK when a new cache is in place; SEC_S_ADVISORY, without a message, when the buffer is empty or the
-// cache current and left alone; else SEC_S_FILE_ERROR, leaving a cache that was there as it was and nothing else
-// behind.
+// Writes the buffer to the ACL file's cache through a temporary file, which replaces the cache atomically. Returns
+// SEC_S_OK when a new cache is in place; SEC_S_ADVISORY, without a message, when the buffer is empty or the cache is
+// current and was left alone; otherwise SEC_S_FILE_ERROR: an existing cache is unchanged, and no other file is left.
 int sec__cache_aclbuffer(const char *aclfname, const sec_acl_buffer_t *acl, qz::cache_rewriting rewriting,
                          const qz::text_origin &origin);
 

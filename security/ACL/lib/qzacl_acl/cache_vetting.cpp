@@ -20,8 +20,8 @@ bool has_same_permissions(const struct stat &text, const struct stat &cache) {
     return ((text.st_mode ^ cache.st_mode) & permission_bits) == 0;
 }
 
-// True when the name still leads to the file that was examined, which is protected as it was then; else errno is
-// set, to ESTALE for another file.
+// True when the name still leads to the examined file, with the same owner, group and mode. Otherwise sets errno, to
+// ESTALE for another file.
 bool is_unchanged(const char *path, const struct stat &examined) {
     struct stat now = {};
     if (stat(path, &now) != 0)
@@ -30,8 +30,8 @@ bool is_unchanged(const char *path, const struct stat &examined) {
     return same_file(now, examined) && has_same_owner(now, examined) && now.st_mode == examined.st_mode;
 }
 
-// True when the text says what was read, or is so late that a cache of what was read is not believed: who copies an
-// old file over it may keep its number, and gives it the old time.
+// True when the text is the one that was read, or is so new that a cache of what was read will not be used. Copying an
+// old file over it with its time keeps the inode but sets the time back.
 bool is_text_of(const struct stat &status, const text_origin &origin) {
     return same_file(status, origin.file) && S_ISREG(status.st_mode) &&
            (status.st_mtime == origin.file.st_mtime || status.st_mtime >= origin.time.tv_sec);
@@ -60,7 +60,7 @@ void trace_unlike(const vetted_file &text, const vetted_file &cache) {
 namespace qz {
 
 text_origin::text_origin(const struct stat &vetted) : file(vetted), time() {
-    // The coarse clock: the kernel stamps files from it or from a finer one, never earlier than it.
+    // The kernel takes file times from this clock or a finer one, so none is earlier than it.
     clock_gettime(CLOCK_REALTIME_COARSE, &time);
 }
 
@@ -85,8 +85,8 @@ bool cache_is_current(const vetted_file &text, vetted_file &cache) {
 bool cache_has_entries_of_text(const vetted_file &text, const vetted_file &cache, int cache_fd) {
     posix_acl of_cache;
     posix_acl of_text;
-    // Where the group bits, the entries' mask, let nobody write, nobody but the owner can have written the cache,
-    // whatever the entries are; elsewhere they must be those of the very file that was vetted.
+    // The group bits are the mask of the POSIX ACL. If they deny writing, only the owner can have written the cache.
+    // Otherwise the POSIX ACL must be that of the very file that was vetted.
     const bool is_writable = (text.status.st_mode & S_IWGRP) != 0;
     if (of_cache.read(cache_fd) && of_text.read(text.path.text) && of_cache == of_text &&
         (!is_writable || is_unchanged(text.path.text, text.status)))
@@ -102,7 +102,7 @@ int text_protection::examine(const char *aclfname, const text_origin &origin) {
         return query_failed(aclfname, "stat()", aclfname, ESTALE);
     if (!entries.read(aclfname))
         return query_failed(aclfname, "getxattr()", aclfname, errno);
-    // The entries must be those of the file whose owner and mode the cache gets.
+    // The POSIX ACL must be of the same file as the owner and mode that the cache gets.
     if (!is_unchanged(aclfname, status))
         return query_failed(aclfname, "stat()", aclfname, errno);
     return SEC_S_OK;
@@ -120,7 +120,7 @@ int text_protection::vet_opened_cache(const char *aclfname, const char *cache_na
     posix_acl of_cache;
     if (of_cache.read(cache_fd) && of_cache == entries)
         return SEC_S_OK;
-    // The entries are part of the mode, whose bits are alike.
+    // The mode bits are the same, but the POSIX ACL is part of the mode.
     return mode_differs(aclfname, cache_name, status, status);
 }
 

@@ -1,4 +1,4 @@
-// Compiling trees into the bytes of a buffer, and expanding those bytes back into trees and lists.
+// Compiling trees into the bytes of a buffer, and expanding the bytes into trees and lists.
 #include "qzacl_acl/compile.h"
 
 #include "qzacl_acl/buffer_format.h"
@@ -10,13 +10,13 @@ using namespace qz;
 
 namespace {
 
-// What a tree becomes: its header, measured before anything is allocated.
+// A tree and the header of its sub-ACL, measured before anything is allocated.
 struct measured_subacl {
     format::subacl head;
     const sec_acltree_t *tree = nullptr;
 };
 
-int measure(const sec_acltree_t &tree, measured_subacl &out) {
+int measure_subacl(const sec_acltree_t &tree, measured_subacl &out) {
     if (has_identity(tree.type()) && tree.has_overlong_identity())
         return report(SEC_S_BAD_ACLE, msg::acle_lacks_key, tree.type());
 
@@ -35,8 +35,8 @@ int measure(const sec_acltree_t &tree, measured_subacl &out) {
     return SEC_S_OK;
 }
 
-void write(byte_writer &writer, const measured_subacl &subacl) {
-    // The identities lie in the order of insertion; fetching ahead hides most of the jumps between them.
+void write_subacl(byte_writer &writer, const measured_subacl &subacl) {
+    // Identities are stored in order of insertion. Prefetching hides most of the jumps between them.
     constexpr std::size_t ahead = 12;
     format::write_subacl_header(writer, subacl.head);
     const bool carries_identity = has_identity(subacl.head.type);
@@ -55,7 +55,23 @@ void write(byte_writer &writer, const measured_subacl &subacl) {
 
 bool has_entries(const sec_acltree_t *root) { return root != nullptr && root->held_count() != 0; }
 
-// The parts of an expanded entry that all entries of a sub-ACL share.
+// Measures the trees that have entries, the last one first, and hands each result to `use`, up to the first failure.
+template <class Use>
+int measure_each(std::span<sec_acltree_t *const> trees, const Use &use) {
+    for (std::size_t index = trees.size(); index > 0; --index) {
+        const sec_acltree_t *tree = trees[index - 1];
+        if (!has_entries(tree))
+            continue;
+        measured_subacl subacl;
+        if (const int result = measure_subacl(*tree, subacl); result != SEC_S_OK)
+            return result;
+        if (const int result = use(subacl); result != SEC_S_OK)
+            return result;
+    }
+    return SEC_S_OK;
+}
+
+// What all entries of a sub-ACL share: type and mechanism.
 int common_part(const format::subacl &head, acle_view &acle) {
     acle = {.type = head.type};
     if (!is_acle_type(head.type))
@@ -73,7 +89,7 @@ int common_part(const format::subacl &head, acle_view &acle) {
     return SEC_S_OK;
 }
 
-int expand(byte_reader reader, const format::subacl &head, sec_acltree_t **root) {
+int expand_entries(byte_reader reader, const format::subacl &head, sec_acltree_t **root) {
     const bool is_traced = traces(trace_category::api);
     acle_view acle;
     if (const int result = common_part(head, acle); result != SEC_S_OK)
@@ -88,7 +104,8 @@ int expand(byte_reader reader, const format::subacl &head, sec_acltree_t **root)
             if (acle.identity.data() == nullptr)
                 return report_corrupt(__LINE__);
         }
-        if (const int result = sec__add_acle_to_tree(0, acle, root); result != SEC_S_OK)
+        if (const int result = sec__add_acle_to_tree(on_duplicate::replace_mask, acle, root);
+            result != SEC_S_OK)
             return result;
         if (is_traced)
             sec__trace_release(&acle, acle);
@@ -103,13 +120,13 @@ int sec__acltree_to_subacl(const sec_acltree_t *root, loose_subacl &out) {
     if (!has_entries(root))
         return SEC_S_OK;
     measured_subacl subacl;
-    if (const int result = measure(*root, subacl); result != SEC_S_OK)
+    if (const int result = measure_subacl(*root, subacl); result != SEC_S_OK)
         return result;
     auto memory = allocate<unsigned char>(subacl.head.length);
     if (memory == nullptr)
         return report_no_memory("sec__add_acle_to_subacl", subacl.head.length);
     byte_writer writer({memory.get(), subacl.head.length});
-    write(writer, subacl);
+    write_subacl(writer, subacl);
     if (!writer.is_full())
         return report_corrupt(__LINE__);
     out = {std::move(memory), subacl.head.length};
@@ -121,32 +138,26 @@ int sec__acltrees_to_acl(std::span<sec_acltree_t *const> trees, sec_acl_buffer_t
     *acl = {};
     std::uint64_t size = format::header_size;
     std::size_t count = 0;
-    for (std::size_t index = trees.size(); index > 0; --index) {
-        const sec_acltree_t *tree = trees[index - 1];
-        if (!has_entries(tree))
-            continue;
-        measured_subacl subacl;
-        if (const int result = measure(*tree, subacl); result != SEC_S_OK)
-            return result;
+    int result = measure_each(trees, [&](const measured_subacl &subacl) {
         size += subacl.head.length;
         if (++count > format::subacls_max || size > format::buffer_max)
             return report_no_memory(function, size);
-    }
+        return SEC_S_OK;
+    });
+    if (result != SEC_S_OK)
+        return result;
     const auto whole = static_cast<std::size_t>(size);
     auto memory = allocate<unsigned char>(whole);
     if (memory == nullptr)
         return report_no_memory(function, size);
     byte_writer writer({memory.get(), whole});
     format::write_header(writer, static_cast<std::uint16_t>(count));
-    for (std::size_t index = trees.size(); index > 0; --index) {
-        const sec_acltree_t *tree = trees[index - 1];
-        if (!has_entries(tree))
-            continue;
-        measured_subacl subacl;
-        if (const int result = measure(*tree, subacl); result != SEC_S_OK)
-            return result;
-        write(writer, subacl);
-    }
+    result = measure_each(trees, [&](const measured_subacl &subacl) {
+        write_subacl(writer, subacl);
+        return SEC_S_OK;
+    });
+    if (result != SEC_S_OK)
+        return result;
     if (!writer.is_full())
         return report_corrupt(__LINE__);
     *acl = {static_cast<std::int32_t>(size), memory.release()};
@@ -161,7 +172,7 @@ int sec__subacl_to_acltree(byte_span bytes, sec_acltree_t **root) {
         return report_corrupt(__LINE__);
     if (is_single_type(head.type) && head.entry_count > 1)
         return report(SEC_S_BAD_ACL, msg::single_acle_repeated);
-    const int result = expand(reader, head, root);
+    const int result = expand_entries(reader, head, root);
     if (result != SEC_S_OK) {
         sec__free_acltree(*root);
         *root = nullptr;
@@ -187,9 +198,9 @@ int sec__acltree_to_aclelist(sec_acltree_t *root, sec_aclelist_t *list) {
         const acle_view held = root->view(entry);
         sec_acle_t *made = nullptr;
         const int result = sec__create_acle(held.type, held.perm_mask, held.mechanism.data(),
-                                            held.identity.data(), 0, &made);
+                                            held.identity.data(), strings_in::utf8, &made);
         if (result != SEC_S_OK) {
-            // A list without entries owns no array.
+            // An empty list owns no array.
             if (list->count == 0)
                 std::free(std::exchange(list->acles, nullptr));
             return result;

@@ -1,5 +1,5 @@
-// Readable printing of entries, trees and buffers. Every line is a message of the catalog, recorded, printed
-// and cleared; nothing stays recorded behind it.
+// Printing entries, trees and buffers for people. Every line is a catalog message that is recorded, printed and
+// cleared.
 #include "base/owned.h"
 #include "base/uncancelled.h"
 #include "print_recorded.h"
@@ -76,7 +76,7 @@ void sec__dump_acle(const sec_acle_t *acle, const sec_perm_set_t *set, const cha
         else
             report(SEC_S_ADVISORY, msg::dump_single_acle, indentation, letter, permissions);
     }
-    // Either the entry's line, or the message that says why there is none.
+    // Either the entry's line, or the reason why there is none.
     print_and_clear(stderr, as_it_stands);
 }
 
@@ -93,7 +93,7 @@ void sec__dump_acltree(const sec_acltree_t *node, const char *indentation) {
 void sec__dump_subacl(const void *subacl, const char *indentation) {
     if (subacl == nullptr)
         return;
-    // The caller vouches for the header; all else must lie within the length that stands in it.
+    // The caller guarantees that the header is readable. The rest must be within the length that it gives.
     const auto *start = static_cast<const unsigned char *>(subacl);
     std::uint32_t length = 0;
     byte_reader(byte_span(start, format::subacl_header_size)).field(length);

@@ -1,8 +1,7 @@
-// Adding entries to a compiled buffer and deleting them from it. An edit touches the sub-ACL of the entry's
-// key and no other.
+// Adding entries to a compiled buffer and deleting them from it. An edit changes only the sub-ACL of the entry's key.
 //
-// The plain way expands that sub-ACL into a tree, changes the tree and compiles it again. Most edits need not go
-// it: edit_packed.h says which.
+// The general method expands that sub-ACL into a tree, changes the tree and compiles it again. Most edits do not
+// need it: see edit_packed.h.
 #include "base/owned.h"
 #include "qzacl_acl/acle_report.h"
 #include "qzacl_acl/buffer.h"
@@ -35,8 +34,7 @@ int check_entry(const sec_acle_t &acle) {
 }
 
 int check_header(const sec_acl_buffer_t &acl) {
-    // What of the header the length does not cover counts as wrong in no way of its own, but as bytes that
-    // are missing.
+    // Header bytes beyond the length are reported as missing, not as wrong.
     byte_reader reader(format::bytes_of(acl));
     std::uint8_t type = format::buffer_type;
     std::uint8_t version = format::buffer_version;
@@ -53,7 +51,7 @@ int check_header(const sec_acl_buffer_t &acl) {
     return is_whole ? SEC_S_OK : report_corrupt(__LINE__);
 }
 
-// Finds the sub-ACL that an edit is about. The bytes that the edit replaces must all be there.
+// Finds the sub-ACL to edit. All bytes that the edit replaces must exist.
 int find_edited(const sec_acl_buffer_t &acl, const sec_acle_t &acle, stored_subacl &out) {
     out = find_subacl(acl, acle.type, acle.mechanism);
     if (out.is_there && out.head.length > static_cast<std::size_t>(acl.length) - out.offset)
@@ -61,7 +59,7 @@ int find_edited(const sec_acl_buffer_t &acl, const sec_acle_t &acle, stored_suba
     return SEC_S_OK;
 }
 
-// Puts what a changed tree compiled to in the place of the stored sub-ACL, or where a new one goes.
+// Replaces the stored sub-ACL with the compiled one, or inserts that as a new one.
 int replace_subacl(const loose_subacl &compiled, const stored_subacl &stored, const char *function,
                    sec_acl_buffer_t &acl) {
     const bool is_new = !stored.is_there;
@@ -80,7 +78,7 @@ int replace_subacl(const loose_subacl &compiled, const stored_subacl &stored, co
     return SEC_S_OK;
 }
 
-int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_subacl &stored,
+int add_by_tree(const sec_acle_t &acle, on_duplicate handling, const stored_subacl &stored,
                 sec_acl_buffer_t &acl) {
     sec_acltree_t *root = nullptr;
     if (stored.is_there) {
@@ -88,7 +86,7 @@ int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_suba
         if (result != SEC_S_OK)
             return result;
     }
-    int result = sec__add_acle_to_tree(report_duplicates, &acle, &root);
+    int result = sec__add_acle_to_tree(handling, &acle, &root);
     const owned_acltree tree(root);
     loose_subacl compiled;
     if (result == SEC_S_OK)
@@ -97,8 +95,8 @@ int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_suba
         return result;
     if (compiled.length == 0)
         return report(SEC_S_INTERNAL, msg::internal_failure, acl_source, __LINE__, SEC_S_INTERNAL);
-    // Entries with equal identities may have become one; an entry that was added is no failure for want of
-    // less memory.
+    // Duplicates in the stored sub-ACL may have become one entry. If shrinking the memory fails, the addition still
+    // succeeded.
     const std::int32_t old_length = acl.length;
     const int replaced = replace_subacl(compiled, stored, add_function, acl);
     if (replaced == SEC_S_OK && acl.length < old_length)
@@ -106,7 +104,7 @@ int add_by_tree(const sec_acle_t &acle, int report_duplicates, const stored_suba
     return replaced;
 }
 
-int add_to_buffer(const sec_acle_t &acle, int report_duplicates, sec_acl_buffer_t &acl) {
+int add_to_buffer(const sec_acle_t &acle, on_duplicate handling, sec_acl_buffer_t &acl) {
     stored_subacl stored;
     if (const int result = find_edited(acl, acle, stored); result != SEC_S_OK)
         return result;
@@ -115,11 +113,11 @@ int add_to_buffer(const sec_acle_t &acle, int report_duplicates, sec_acl_buffer_
     packed_place place;
     if (stored.is_there && find_packed(acl, stored, acle, place) &&
         std::strlen(acle.identity) <= format::identity_max)
-        return add_packed(acle, report_duplicates, stored, place, acl);
-    return add_by_tree(acle, report_duplicates, stored, acl);
+        return add_packed(acle, handling, stored, place, acl);
+    return add_by_tree(acle, handling, stored, acl);
 }
 
-int add_checked(const sec_acle_t *acle, int report_duplicates, sec_acl_buffer_t *acl) {
+int add_checked(const sec_acle_t *acle, on_duplicate handling, sec_acl_buffer_t *acl) {
     if (acle == nullptr)
         return report_bad_parameter(add_function, 1, 0);
     if (acl == nullptr)
@@ -128,7 +126,7 @@ int add_checked(const sec_acle_t *acle, int report_duplicates, sec_acl_buffer_t 
         return result;
     if (acl->data != nullptr) {
         const int result = check_header(*acl);
-        return result == SEC_S_OK ? add_to_buffer(*acle, report_duplicates, *acl) : result;
+        return result == SEC_S_OK ? add_to_buffer(*acle, handling, *acl) : result;
     }
 
     auto memory = allocate<unsigned char>(format::header_size);
@@ -136,7 +134,7 @@ int add_checked(const sec_acle_t *acle, int report_duplicates, sec_acl_buffer_t 
         return report_no_memory(add_function, format::header_size);
     std::memcpy(memory.get(), format::empty_acl, format::header_size);
     sec_acl_buffer_t made = {format::header_size, memory.release()};
-    const int result = add_to_buffer(*acle, report_duplicates, made);
+    const int result = add_to_buffer(*acle, handling, made);
     if (result != SEC_S_OK) {
         std::free(made.data);
         made = {};
@@ -186,19 +184,19 @@ int delete_checked(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
     return delete_by_tree(*acle, stored, *acl);
 }
 
-int sec__add_acle_to_acl(int report_duplicates, const sec_acle_t *acle, sec_acl_buffer_t *acl) {
+int sec__add_acle_to_acl(on_duplicate handling, const sec_acle_t *acle, sec_acl_buffer_t *acl) {
     return run(operation::add_acle_to_acl, std::tie(acle, acl),
-               [&] { return add_checked(acle, report_duplicates, acl); });
+               [&] { return add_checked(acle, handling, acl); });
 }
 
 } // namespace
 
 int sec_add_acle_to_acl(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
-    return sec__add_acle_to_acl(0, acle, acl);
+    return sec__add_acle_to_acl(on_duplicate::replace_mask, acle, acl);
 }
 
 int sec_add_acle_to_acl2(const sec_acle_t *acle, sec_acl_buffer_t *acl) {
-    return sec__add_acle_to_acl(1, acle, acl);
+    return sec__add_acle_to_acl(on_duplicate::report, acle, acl);
 }
 
 int sec_del_acle_from_acl(const sec_acle_t *acle, sec_acl_buffer_t *acl) {

@@ -1,7 +1,6 @@
-// The proof that entries are as compiling gives them, and the changes that it allows.
+// Checks that stored entries are in compiled form, and edits them in place.
 #include "qzacl_acl/edit_packed.h"
 
-#include "qzacl_acl/acle_report.h"
 #include "qzacl_acl/packed_identity.h"
 #include "qzacl_acl/splice.h"
 #include "qzacl_trace.h"
@@ -20,20 +19,20 @@ bool has_sorted_form(const format::subacl &head) {
     return head.type == SEC_ACLE_GROUP && head.mechanism_length == 0;
 }
 
-// Skips entries that are clearly what compiling gives, each behind the one before it: up to where the wanted
-// identity may stand, or all of them once its place is known. `previous` is the identity before the next entry.
+// Skips entries that are clearly in compiled form and ascending order, up to the possible place of the wanted
+// identity or, once its place is known, to the end. `previous` is the identity before the next entry.
 void skip_ascending(const wanted_identity &wanted, bool is_placed, byte_span &previous,
                     format::entry_walk &walk) {
     constexpr std::size_t block_size = identity_block::size;
     if (walk.left == 0 || previous.size() + walk.entries.left() < block_size)
         return;
-    const wanted_identity held_in_registers = wanted; // a copy, which nothing else can change meanwhile
+    const wanted_identity held_in_registers = wanted; // a copy that nothing else can change
     identity_block before(previous.data());
     std::size_t before_size = previous.size();
     const unsigned char *last = previous.data();
     format::skip_entries_while(walk, block_size, [&](std::uint8_t version, byte_span identity) {
         const identity_block block(identity.data());
-        // Behind the NUL of the one before stand other fields, which say nothing of the order.
+        // Only bytes up to the previous identity's NUL count; other fields follow it.
         if (version != format::entry_version || !before.sorts_before_within(before_size, block))
             return false;
         if (!is_placed && !held_in_registers.is_clearly_behind(block))
@@ -48,8 +47,8 @@ void skip_ascending(const wanted_identity &wanted, bool is_placed, byte_span &pr
     previous = {last, before_size};
 }
 
-// Looks for an identity in a user or group sub-ACL. False unless the bytes are exactly what compiling a tree
-// of these entries gives: only then does changing one entry's bytes give what the plain way would.
+// Finds the place of an identity in a user or group sub-ACL. False unless the bytes are exactly what compiling a
+// tree of these entries gives: only then do an edit in place and the general method give the same bytes.
 bool find_sorted(byte_span subacl, const format::subacl &head, const char *identity, packed_place &place) {
     if (!has_sorted_form(head))
         return false;
@@ -83,8 +82,8 @@ bool find_sorted(byte_span subacl, const format::subacl &head, const char *ident
     return walk.entries.left() == 0;
 }
 
-// Traces show each entry of the tree that the plain way makes. And an identity that lies in the buffer
-// itself, as the ones that handlers are shown do, would move while it is being added.
+// Not while tracing: traces show each entry of the tree that the general method makes. Not if the identity is in
+// the buffer itself, as those passed to handlers are: it would move while being added.
 bool may_edit_packed(const sec_acle_t &acle, const sec_acl_buffer_t &acl) {
     const byte_span bytes = format::bytes_of(acl);
     const auto place =
@@ -107,10 +106,10 @@ bool find_packed(const sec_acl_buffer_t &acl, const stored_subacl &stored, const
                        acle.identity, place);
 }
 
-int add_packed(const sec_acle_t &acle, int report_duplicates, const stored_subacl &stored,
+int add_packed(const sec_acle_t &acle, on_duplicate handling, const stored_subacl &stored,
                const packed_place &place, sec_acl_buffer_t &acl) {
     if (place.size != 0) {
-        if (report_duplicates != 0)
+        if (handling == on_duplicate::report)
             return sec__report_duplicate(view_of(acle));
         store_field(writable_bytes(acl), stored.offset + place.offset + format::entry_mask_offset,
                     acle.perm_mask);

@@ -15,12 +15,12 @@ namespace {
 
 using text = owned<char>;
 
-// The mechanisms whose identities end in a host, whose address is brought into one form.
+// True for mechanisms whose identities end in a host.
 bool names_hosts(const char *mechanism) {
     return std::strcmp(mechanism, "unix") == 0 || std::strcmp(mechanism, "hba2") == 0;
 }
 
-// One string with its NUL, converted by either direction's operation.
+// Converts one string and its NUL in either direction.
 template <class Conversion>
 int converted(Conversion conversion, const char *in, text &out) {
     const std::size_t length = std::strlen(in) + 1;
@@ -31,24 +31,24 @@ int converted(Conversion conversion, const char *in, text &out) {
     return result;
 }
 
-int set_mechanism(sec_acle_t &acle, const char *mechanism, bool convert) {
+int set_mechanism(sec_acle_t &acle, const char *mechanism, strings_in code_set) {
     text utf8;
-    if (convert) {
+    if (code_set == strings_in::locale) {
         if (const int result = converted(acl__convert_to_utf8, mechanism, utf8); result != SEC_S_OK)
             return result;
     }
-    const char *source = convert ? utf8.get() : mechanism;
+    const char *source = code_set == strings_in::locale ? utf8.get() : mechanism;
     const std::size_t length = std::strlen(source);
-    // A mnemonic that fitted before its conversion may have grown.
+    // Conversion may have lengthened it.
     if (length > mechanism_max)
         return report_bad_parameter("sec_create_acle", 3, shown_pointer(mechanism));
     std::memcpy(acle.mechanism, source, length + 1);
     return SEC_S_OK;
 }
 
-int set_identity(sec_acle_t &acle, const char *identity, bool convert) {
+int set_identity(sec_acle_t &acle, const char *identity, strings_in code_set) {
     text made;
-    if (convert) {
+    if (code_set == strings_in::locale) {
         if (const int result = converted(acl__convert_to_utf8, identity, made); result != SEC_S_OK)
             return result;
     } else {
@@ -64,8 +64,8 @@ int bad_identity(const char *identity) {
     return report_bad_parameter("sec_create_acle", 4, shown_pointer(identity));
 }
 
-// Creates an entry of a mechanism that names hosts: an IPv6 address behind the '@' is written in its one
-// form, so that different spellings of one address are one identity. Everything else stays as it is.
+// Creates an entry of a mechanism with hosts. An IPv6 address after the '@' is normalized, so that different spellings
+// of one address are one identity. Everything else is kept.
 int create_with_host(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
                      sec_acle_t **acle) {
     const char *at = std::strchr(identity, '@');
@@ -77,7 +77,7 @@ int create_with_host(std::uint8_t type, std::uint32_t perm_mask, const char *mec
 
     in6_addr address = {};
     if (inet_pton(AF_INET6, host, &address) != 1)
-        return sec__create_acle(type, perm_mask, mechanism, identity, 1, acle);
+        return sec__create_acle(type, perm_mask, mechanism, identity, strings_in::locale, acle);
 
     char formatted[INET6_ADDRSTRLEN] = {};
     static_cast<void>(cu_ipaddr_ntop_1(&address, formatted));
@@ -88,7 +88,7 @@ int create_with_host(std::uint8_t type, std::uint32_t perm_mask, const char *mec
         return report_no_memory("sec_create_acle", size);
     std::memcpy(normalised.get(), identity, prefix);
     std::memcpy(normalised.get() + prefix, formatted, size - prefix);
-    return sec__create_acle(type, perm_mask, mechanism, normalised.get(), 1, acle);
+    return sec__create_acle(type, perm_mask, mechanism, normalised.get(), strings_in::locale, acle);
 }
 
 int create_checked(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
@@ -108,7 +108,7 @@ int create_checked(std::uint8_t type, std::uint32_t perm_mask, const char *mecha
         return report_bad_parameter("sec_create_acle", 5, 0);
     if (has_mechanism(type) && names_hosts(mechanism))
         return create_with_host(type, perm_mask, mechanism, identity, acle);
-    return sec__create_acle(type, perm_mask, mechanism, identity, 1, acle);
+    return sec__create_acle(type, perm_mask, mechanism, identity, strings_in::locale, acle);
 }
 
 int display_checked(const sec_acle_t *acle, char **mechanism, char **identity) {
@@ -157,20 +157,20 @@ void release_entries(sec_aclelist_t &list) {
 } // namespace
 
 int sec__create_acle(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
-                     int convert, sec_acle_t **acle) {
+                     strings_in code_set, sec_acle_t **acle) {
     *acle = nullptr;
-    // Its identity comes last; and an entry that nobody gets is none whose release is told.
+    // The identity is set last, so that a failure leaves only this block. Releasing it is not traced: no caller saw it.
     owned<sec_acle_t> made(static_cast<sec_acle_t *>(std::calloc(1, sizeof(sec_acle_t))));
     if (made == nullptr)
         return report_no_memory("sec__create_acle", sizeof(sec_acle_t));
     made->perm_mask = perm_mask;
     made->type = type;
     if (has_mechanism(type)) {
-        if (const int result = set_mechanism(*made, mechanism, convert != 0); result != SEC_S_OK)
+        if (const int result = set_mechanism(*made, mechanism, code_set); result != SEC_S_OK)
             return result;
     }
     if (has_identity(type)) {
-        if (const int result = set_identity(*made, identity, convert != 0); result != SEC_S_OK)
+        if (const int result = set_identity(*made, identity, code_set); result != SEC_S_OK)
             return result;
     }
     *acle = made.release();

@@ -1,4 +1,4 @@
-// Entries of an ACL: their types, the record that owns one, and the view of one whose texts lie elsewhere.
+// Entries of an ACL: their types, the record that owns one, and a view that borrows one.
 #ifndef QZACL_ENTRY_H
 #define QZACL_ENTRY_H
 
@@ -21,7 +21,7 @@ constexpr bool is_acle_type(unsigned type) {
            type == SEC_ACLE_EXPANDED || type == SEC_ACLE_GROUP;
 }
 
-// Types of which an ACL holds at most one entry.
+// Types with at most one entry per ACL.
 constexpr bool is_single_type(unsigned type) {
     return type == SEC_ACLE_UNAUTHENTICATED || type == SEC_ACLE_ANYOTHER;
 }
@@ -30,7 +30,7 @@ constexpr bool has_mechanism(unsigned type) { return type == SEC_ACLE_USER || ty
 
 constexpr bool has_identity(unsigned type) { return has_mechanism(type) || type == SEC_ACLE_GROUP; }
 
-// The letter of a type in an ACL file, always in lower case; '?' for a value that is no type.
+// The letter of a type in an ACL file, in lower case; '?' for an invalid type.
 constexpr int type_letter(unsigned type) {
     switch (type) {
     case SEC_ACLE_UNAUTHENTICATED:
@@ -50,8 +50,8 @@ constexpr int type_letter(unsigned type) {
 
 inline constexpr char no_text[] = "";
 
-// An entry that is borrowed. A NUL, which the lengths do not count, ends the identity always and the mechanism
-// in entries of the types that have one.
+// A borrowed entry. A NUL, which the lengths do not count, follows the identity and, for types that have one, the
+// mechanism.
 struct acle_view {
     std::uint32_t perm_mask = 0;
     std::uint8_t type = 0;
@@ -67,17 +67,20 @@ inline acle_view view_of(const sec_acle_t &acle) {
             acle.identity == nullptr ? no_text : acle.identity};
 }
 
+// The code set of the strings that an entry is made from.
+enum class strings_in : std::uint8_t { utf8, locale };
+
 } // namespace qz
 
 // Records the trace points of releasing an entry, which may be null.
 void sec__trace_release(const sec_acle_t *acle);
-// The same for an entry that has no record: it stands at `place`.
+// The same for an entry without a record, which is stored at `place`.
 void sec__trace_release(const void *place, const qz::acle_view &acle);
 
-// Makes an entry whose arguments were checked by the caller: a mechanism of at most 16 bytes for types 4 and
-// 8, an identity for types 4, 8 and 16. With `convert` non-zero both are converted to UTF-8. Returns SEC_S_OK
-// with a new entry in `*acle`, or the code of the failed allocation or conversion with null there.
+// Makes an entry from arguments that the caller has checked: a mechanism of at most 16 bytes for types 4 and 8, an
+// identity for types 4, 8 and 16. The entry holds both in UTF-8. Returns SEC_S_OK with a new entry in `*acle`, or the
+// code of the failed allocation or conversion with null there.
 int sec__create_acle(std::uint8_t type, std::uint32_t perm_mask, const char *mechanism, const char *identity,
-                     int convert, sec_acle_t **acle);
+                     qz::strings_in code_set, sec_acle_t **acle);
 
 #endif

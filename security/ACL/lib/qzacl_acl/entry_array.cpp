@@ -5,21 +5,19 @@
 
 namespace qz {
 
-bool entry_array::reserve(std::uint32_t capacity, std::size_t &refused) {
-    // Where a size has 32 bits, a long text may promise more entries than it can say: no memory has that many.
+shortage entry_array::reserve(std::uint32_t capacity) {
+    // With 32-bit sizes, more entries may be expected than a size can express. Allocating them fails in any case.
     constexpr std::size_t most = SIZE_MAX / sizeof(small_entry);
     const std::size_t size = std::min<std::size_t>(capacity, most) * sizeof(small_entry);
     void *const old = entries_ == &first_ ? nullptr : entries_;
     auto *grown = static_cast<small_entry *>(std::realloc(old, size));
-    if (grown == nullptr) {
-        refused = size;
-        return false;
-    }
+    if (grown == nullptr)
+        return shortage(size);
     if (old == nullptr)
         *grown = first_;
     entries_ = grown;
     capacity_ = capacity;
-    return true;
+    return {};
 }
 
 } // namespace qz

@@ -1,8 +1,9 @@
-// A growing array of small entries. One entry, which is all that most trees of many mechanisms hold, takes no memory
-// of its own.
+// A growing array of small entries. Its first entry needs no allocation: with many mechanisms, most trees hold just
+// one.
 #ifndef QZACL_ENTRY_ARRAY_H
 #define QZACL_ENTRY_ARRAY_H
 
+#include "base/owned.h"
 #include "qzacl_acl/entry_sort.h"
 
 #include <cstddef>
@@ -24,9 +25,8 @@ public:
 
     std::uint32_t count() const { return count_; }
     bool is_full() const { return count_ == capacity_; }
-    // False, the bytes asked for in `refused`, when memory is lacking.
-    bool reserve(std::uint32_t capacity, std::size_t &refused);
-    // Appends an entry, for which there is room.
+    shortage reserve(std::uint32_t capacity);
+    // Appends an entry. There must be room.
     small_entry &append(const small_entry &entry) { return entries_[count_++] = entry; }
 
     std::span<small_entry> all() { return {entries_, count_}; }
@@ -34,7 +34,7 @@ public:
 
 private:
     small_entry first_ = {};
-    small_entry *entries_ = &first_; // or memory of their own
+    small_entry *entries_ = &first_; // or a block
     std::uint32_t count_ = 0;
     std::uint32_t capacity_ = 1;
 };

@@ -1,10 +1,10 @@
-// The syntax of an ACL file: one line of its text at a time becomes an entry.
+// The syntax of an ACL file: parses one line into one entry.
 //
-//   n|o            [permissions]              letters of either case
+//   n|o            [permissions]              letters in either case
 //   u|e  mechanism identity [permissions]
 //   g    identity  [permissions]
 //
-// Blanks separate tokens; '#' where a token would start begins a comment.
+// Blanks separate tokens. A '#' at the start of a token begins a comment.
 #include "qzacl_acl/entry_parser.h"
 
 #include "base/posix_fold.h"
@@ -26,9 +26,9 @@ namespace {
 
 constexpr bool is_line_end(char c) { return c == '\n' || c == '\f' || c == '\r'; }
 
-// The first byte at or after `at` that ends what is looked for. One that does lies before `limit`. Eight bytes at a
-// time are tested for any that may end it, as `may_end` says with their high bits, the first byte being the lowest.
-// It may name more of them behind one that does end it, but miss none.
+// The first byte at or after `at` that satisfies `ends`; there must be one before `limit`. `may_end` tests eight
+// bytes at a time and sets the high bits of candidates, the first byte being the lowest. After the first true
+// candidate it may set too many bits, but it never misses one.
 template <class MayEnd, class Ends>
 char *find_end(char *at, const char *limit, const MayEnd &may_end, const Ends &ends) {
     for (; limit - at >= static_cast<std::ptrdiff_t>(word_size); at += word_size) {
@@ -73,36 +73,29 @@ std::uint8_t type_of_letter(char letter) {
     }
 }
 
-struct token {
-    char *text = nullptr;
-    std::size_t length = 0;
-};
-
 // Cuts the tokens out of one line of a text, ending each with a NUL in place.
 class line_tokens {
 public:
     line_tokens(char *begin, char *end, const char *limit) : at_(begin), end_(end), limit_(limit) {}
 
-    // False when only blanks and a comment are left.
-    bool next(token &out) {
-        while (at_ != end_ && is_blank(*at_))
-            ++at_;
-        if (at_ == end_ || *at_ == '#')
+    // False when only blanks or a comment are left.
+    bool next(line_word &out) {
+        if (!find_word(at_, end_))
             return false;
         out.text = at_;
         at_ = find_token_end();
         out.length = static_cast<std::size_t>(at_ - out.text);
         *at_ = '\0';
-        // A token that ended at the line end was the last one.
+        // A token that ends at the line end is the last one.
         if (at_ != end_)
             ++at_;
         return true;
     }
 
 private:
-    // White space or the end of the line, which is a line end or a NUL.
+    // White space, a line end, or a NUL.
     char *find_token_end() const {
-        const auto is_no_sign = [](std::uint64_t word) { // a blank, a control character or beyond ASCII
+        const auto is_no_sign = [](std::uint64_t word) { // blanks, control characters and non-ASCII bytes
             return ((word - in_each_byte(' ' + 1)) | word) & in_each_byte(0x80);
         };
         return find_end(at_, limit_, is_no_sign,
@@ -115,9 +108,14 @@ private:
     space_class is_space_;
 };
 
-// Fills the entry from the tokens of a line; a line without any leaves its type 0.
+void fold_in_place(const line_word &word) {
+    for (char &c : std::span(word.text, word.length))
+        c = static_cast<char>(fold(static_cast<unsigned char>(c)));
+}
+
+// Fills the entry from the tokens of a line. Without any, its type stays 0.
 int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, parsed_acle &entry) {
-    token type;
+    line_word type;
     if (!tokens.next(type))
         return SEC_S_OK;
     entry.type = type.length == 1 ? type_of_letter(type.text[0]) : std::uint8_t{0};
@@ -125,34 +123,32 @@ int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, parsed_a
         return report(SEC_S_BAD_ACL, msg::bad_type_token, line, type.text);
 
     if (has_mechanism(entry.type)) {
-        token mechanism;
+        line_word mechanism;
         if (!tokens.next(mechanism))
             return report(SEC_S_BAD_ACL, msg::tokens_missing, line);
         if (mechanism.length > mechanism_max)
             return report(SEC_S_BAD_ACL, msg::mechanism_too_long, mechanism.text, line);
-        for (std::size_t index = 0; index < mechanism.length; ++index)
-            mechanism.text[index] =
-                static_cast<char>(fold(static_cast<unsigned char>(mechanism.text[index])));
+        fold_in_place(mechanism);
         entry.mechanism = {mechanism.text, mechanism.length};
     }
     if (has_identity(entry.type)) {
-        token identity;
+        line_word identity;
         if (!tokens.next(identity))
             return report(SEC_S_BAD_ACL, msg::tokens_missing, line);
         entry.identity = {identity.text, identity.length};
     }
 
-    token permissions;
+    line_word permissions;
     if (!tokens.next(permissions))
         return SEC_S_OK;
     if (const int result = sec__translate_perms(permissions.text, &set, &entry.perm_mask);
         result != SEC_S_OK) {
-        // The message about the letter gives way to the one that names the line.
+        // This message replaces the one about the letter, because it names the line.
         cu_set_no_error_1();
         report(result, msg::bad_permission_token, line, permissions.text);
         return result;
     }
-    token excess;
+    line_word excess;
     if (tokens.next(excess))
         return report(SEC_S_BAD_ACL, msg::tokens_in_excess, line);
     return SEC_S_OK;
@@ -191,7 +187,7 @@ int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size
     } else {
         result = parse_line(line_tokens(begin, end, limit), set == nullptr ? acl__default_perm_set : *set,
                             shown_line, *entry);
-        // A NUL that is not the text's own end hides whatever follows it.
+        // A NUL before the end of the text would hide what follows.
         if (result == SEC_S_OK && ends_at_nul && *remaining != length) {
             *cursor = nullptr;
             ++*line;

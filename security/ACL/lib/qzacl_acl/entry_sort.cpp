@@ -1,4 +1,4 @@
-// Sorting entries by identity: by their keys, and where those are equal by the texts.
+// Sorting entries by identity: by their keys and, if those are equal, by their texts.
 #include "qzacl_acl/entry_sort.h"
 
 #include "qzacl_acl/identity_order.h"
@@ -20,13 +20,13 @@ struct sorts_before {
     }
 };
 
-// The length of the folded prefix that all identities share.
+// The length of the folded prefix common to all identities.
 std::size_t common_prefix(std::span<const small_entry> entries, const identity_store &identities) {
     const small_entry &first = entries.front();
     std::uint64_t difference = 0;
     for (const small_entry &entry : entries)
         difference |= entry.key ^ first.key;
-    // Names of which one is whole in its key share no more than that.
+    // If one identity fits in its key, the prefix ends there.
     std::size_t prefix = static_cast<std::size_t>(std::countl_zero(difference)) / 8;
     if (difference != 0 || ends_within(first.key))
         return prefix;
@@ -44,16 +44,16 @@ std::size_t common_prefix(std::span<const small_entry> entries, const identity_s
     return prefix;
 }
 
-// Up to so many entries comparing costs less than counting digits.
+// Up to this many entries, a comparison sort is faster than a radix sort.
 constexpr std::size_t comparison_sort_max = 48;
 
-// Sorts by one byte of the key after the other, the highest first, from one array into the other and back; the
-// recursion is as deep as a key has bytes.
+// Sorts by one byte of the key after the other, the highest first, moving the entries between two arrays. The recursion
+// is at most as deep as a key has bytes.
 class radix_sort {
 public:
     explicit radix_sort(const identity_store &identities) : before_{identities} {}
 
-    // The result ends in `from`, or in `to` when that is asked for.
+    // The result is in `to` if `ends_in_to`, else in `from`.
     void sort(std::span<small_entry> from, std::span<small_entry> to, unsigned shift, bool ends_in_to) {
         if (from.size() <= comparison_sort_max || shift >= 64) {
             std::sort(from.begin(), from.end(), before_);
@@ -99,13 +99,15 @@ std::size_t sort_by_identity(std::span<small_entry> entries, const identity_stor
         for (small_entry &entry : entries)
             entry.key = ordered_word(identities.identity(entry.place) + prefix);
     }
+    constexpr unsigned first_byte = 0;
+    constexpr bool ends_in_scratch = false;
     owned<small_entry[]> scratch;
     if (entries.size() > comparison_sort_max)
         scratch = allocate<small_entry>(entries.size());
     if (scratch == nullptr)
         std::sort(entries.begin(), entries.end(), sorts_before{identities});
     else
-        radix_sort(identities).sort(entries, {scratch.get(), entries.size()}, 0, false);
+        radix_sort(identities).sort(entries, {scratch.get(), entries.size()}, first_byte, ends_in_scratch);
     return prefix;
 }
 

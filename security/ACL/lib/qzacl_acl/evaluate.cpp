@@ -1,4 +1,4 @@
-// Access decisions: which permissions a compiled ACL grants one party, or the groups of one.
+// Access decisions: the permissions that a compiled ACL grants to one party, or to a requester's groups.
 //
 //   permissions of one party:
 //       the sub-ACL is the first one of the type and, for user and expanded entries, of the mechanism
@@ -6,19 +6,19 @@
 //       unauthenticated or any other:        its one entry matches
 //       expanded, and no handler known:      nothing matches
 //       for each entry, in the order stored:
-//           order = handler(wanted, entry)   for expanded entries, and for users where it is asked for and known
-//                 = wanted <=> entry         else, without regard to case
+//           order = handler(wanted, entry)   for expanded entries, and for users if requested and known
+//                 = wanted <=> entry         otherwise, without regard to case
 //           order is equal:                  the entry matches
-//           order is less, not expanded:     nothing matches; what follows sorts behind, too
+//           order is less, not expanded:     nothing matches; all later entries sort after it, too
 //       nothing matches
 //
 //   permissions of groups:
-//       each group as one party, without a handler; the masks of all that match, joined
+//       each group as one party, without a handler; the masks of all matches are combined
 //
-// The order of the entries is taken as it is stored: one that is not ascending hides entries.
+// The stored order is not checked: if it is not ascending, it hides entries.
 //
-// The buffer is read in place. Nothing is allocated but what recording a long identity takes, and the one lock is held
-// only while a handler is looked up.
+// The buffer is read in place. Only recording a long identity allocates memory, and the one lock is held only while
+// looking up a handler.
 #include "qzacl_acl/buffer.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/entry.h"
@@ -51,7 +51,7 @@ struct single_request {
     std::uint8_t type_argument;
     const char *mechanism;
     const char *identity;
-    std::int32_t walked = -1; // entries of the user sub-ACL that was walked
+    std::int32_t walked = -1; // number of entries in the user sub-ACL that was searched
 
     std::uint8_t type() const { return type_argument & type_bits; }
     bool uses_handler() const { return (type_argument & SEC_ACLE_USE_ID_HANDLER) != 0; }
@@ -75,7 +75,7 @@ int evaluate_single_entry(const single_request &request, const format::subacl &h
     return SEC_S_OK;
 }
 
-// A look-up that fails is none of the decision's failures: it is made with what was found.
+// A failed look-up does not fail the decision, which uses what was found.
 sec_id_compare_fn find_handler(std::uint32_t kind, const char *mechanism) {
     sec_id_compare_fn handler = nullptr;
     if (sec__get_id_handler(kind, mechanism, &handler) != SEC_S_OK)
@@ -83,8 +83,7 @@ sec_id_compare_fn find_handler(std::uint32_t kind, const char *mechanism) {
     return handler;
 }
 
-// Asks a handler about each entry in turn. Whatever the handler recorded about an entry that does not match
-// is its own affair and is cleared.
+// Calls a handler for each entry. An error that it records for an entry that does not match is cleared.
 int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler, bool is_sorted,
                         const format::subacl &head, byte_reader entries, std::uint32_t &mask) {
     for (std::uint32_t left = head.entry_count; left != 0; --left) {
@@ -106,16 +105,16 @@ int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler
     return no_match(request, request.identity);
 }
 
-// Skips the entries that sort before the wanted identity, all but those whose order is not clear at first sight.
+// Skips entries that clearly sort before the wanted identity.
 [[gnu::noinline]] void skip_before(const wanted_identity &wanted, format::entry_walk &walk) {
-    const wanted_identity held_in_registers = wanted; // a copy, which nothing else can change meanwhile
+    const wanted_identity held_in_registers = wanted; // a copy that nothing else can change
     format::skip_entries_while(walk, identity_block::size, [&](std::uint8_t, byte_span identity) {
         return held_in_registers.is_clearly_behind(identity_block(identity.data()));
     });
 }
 
-// Compares the wanted identity with the entries from the next one on, up to the one that decides about it,
-// before which the walk then stands. When none is left the wanted identity sorts behind all.
+// Compares the wanted identity with the entries from the next one on, and leaves the walk before the entry that
+// decides. Without one, the wanted identity sorts after all of them.
 identity_order compare_next(const wanted_identity &wanted, format::entry_walk &walk, format::entry &entry) {
     for (;;) {
         skip_before(wanted, walk);
@@ -190,9 +189,8 @@ int evaluate_single(const sec_acl_buffer_t *acl, single_request &request, const 
 
 // Evaluates some of the requester's groups with one pass over the entries.
 //
-// A group's walk goes up to the first entry that does not sort before it, and that entry decides. So the
-// groups are taken in ascending order: while one waits, every entry that passed sorts before it and thus
-// before all behind it.
+// The first entry that does not sort before a group decides about it. So the groups are evaluated in ascending
+// order: all entries before one group's deciding entry sort before every later group, too.
 class group_batch {
 public:
     static constexpr std::size_t capacity = 64;

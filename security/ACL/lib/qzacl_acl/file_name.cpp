@@ -1,4 +1,4 @@
-// Where an ACL file is: the full path for a name, the user whose home directory holds it, and its cache.
+// Where an ACL file is: its full path, the user whose home directory holds it, and the name of its cache.
 #include "qzacl_acl/file_name.h"
 
 #include "base/owned.h"
@@ -13,13 +13,12 @@ using namespace qz;
 
 namespace {
 
-// True when a directory, a separator and a name fit into a path; the separator counts even where none is
-// needed.
+// True when a directory, a separator and a name fit into a path. The separator counts even if none is needed.
 bool fits(std::size_t directory_length, std::size_t name_length) {
     return directory_length + 1 <= path_max && name_length <= path_max - (directory_length + 1);
 }
 
-// Appends a name to a directory that it fits behind.
+// Appends a name, which must fit, to a directory.
 void join(path_buffer &path, std::size_t directory_length, const char *name) {
     if (directory_length == 0 || path.text[directory_length - 1] != '/')
         path.text[directory_length++] = '/';
@@ -54,7 +53,7 @@ bool make_cache_name(const char *aclfname, path_buffer &name) {
 } // namespace qz
 
 int sec__get_user_info(const char *username, std::uint32_t *uid, path_buffer &home) {
-    constexpr long usual_size = 1024; // where the system suggests none
+    constexpr long usual_size = 1024; // if the system suggests none
     const long suggested = sysconf(_SC_GETPW_R_SIZE_MAX);
     const auto entry_size = static_cast<std::size_t>(suggested > 0 ? suggested : usual_size);
     const std::size_t size = entry_size * 2;
@@ -66,11 +65,11 @@ int sec__get_user_info(const char *username, std::uint32_t *uid, path_buffer &ho
     passwd *found = nullptr;
     if (getpwnam_r(username, &user, buffer.get(), size, &found) != 0 || found == nullptr)
         return report(SEC_S_UNKNOWN_USER, msg::unknown_user, username);
-    // A user database may answer with an entry of another name.
+    // A user database may return an entry with another name.
     if (*username != '\0' && std::strncmp(username, user.pw_name, entry_size) != 0)
         return report(SEC_S_UNKNOWN_USER, msg::unknown_user, username);
     *uid = user.pw_uid;
-    // A directory that is cut here is too long for any file name behind it, so no caller goes on with it.
+    // A directory truncated here leaves no room for a file name, so callers reject it.
     const std::size_t length = strnlen(user.pw_dir, path_max);
     std::memcpy(home.text, user.pw_dir, length);
     home.text[length] = '\0';

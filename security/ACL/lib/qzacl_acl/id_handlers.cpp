@@ -14,14 +14,14 @@ using namespace qz;
 
 namespace {
 
-// Callers know the registration's messages by this name.
+// The name by which callers know the messages of registration.
 constexpr char function[] = "acl__register_id_handler";
 
 int report_lock_failure(int line, int error) {
     return report(SEC_S_INTERNAL, msg::state_lock_failed, acl_source, line, error);
 }
 
-// Appends one registration; the lock is held.
+// Appends a registration. The caller holds the lock.
 int append(std::uint32_t kind, const char *mechanism, std::size_t length, sec_id_compare_fn handler) {
     const auto count = static_cast<std::size_t>(acl__state.handler_count);
     const std::size_t size = (count + 1) * sizeof(sec_id_handler_t);

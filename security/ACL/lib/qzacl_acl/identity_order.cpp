@@ -1,4 +1,4 @@
-// The secret part of the hashes of identities.
+// The secret key for hashing identities.
 #include "qzacl_acl/identity_order.h"
 
 #include <sys/auxv.h>
@@ -6,7 +6,7 @@
 namespace qz {
 
 identity_hash_key make_identity_hash_key() {
-    // Sixteen random bytes that the kernel gives every process: no system call, and nothing that can fail.
+    // The kernel gives every process sixteen random bytes. Reading them needs no system call and cannot fail.
     std::uint64_t first = 0;
     std::uint64_t second = 0;
     const auto *random = reinterpret_cast<const char *>(getauxval(AT_RANDOM));

@@ -1,7 +1,7 @@
-// Identities as words of eight bytes: comparing and hashing them. Case folds as in the POSIX locale everywhere.
+// Comparing and hashing identities in words of eight bytes. Case folds as in the POSIX locale.
 //
-// An identity ends in a NUL. Whoever hands one to these functions lets them read the seven bytes behind that NUL,
-// so that every word can be loaded whole.
+// An identity ends in a NUL. The seven bytes after the NUL must be readable, too, so that every word can be loaded
+// whole.
 #ifndef QZACL_IDENTITY_ORDER_H
 #define QZACL_IDENTITY_ORDER_H
 
@@ -17,14 +17,14 @@ namespace qz {
 
 inline constexpr std::size_t identity_word_size = word_size;
 
-// The first eight bytes of an identity, folded, as a number that compares as they do: the first byte is the highest,
-// and zeros stand from the NUL on.
+// The first eight bytes of an identity, folded, as a number that compares as they do: the first byte is the
+// highest, and bytes from the NUL on are zero.
 inline std::uint64_t ordered_word(const char *identity) {
     const std::uint64_t word = first_byte_lowest(load8(identity));
     return __builtin_bswap64(fold8(word & (lowest_zero(word) - 1)));
 }
 
-// True when the identity ends among the eight bytes of its ordered word.
+// True when the identity ends within this ordered word.
 constexpr bool ends_within(std::uint64_t ordered) { return (ordered & 0xff) == 0; }
 
 // The number of bytes before the NUL.
@@ -36,7 +36,7 @@ inline std::size_t identity_length(const char *identity) {
     }
 }
 
-// Negative, zero or positive as the first identity sorts before, with or after the second.
+// Negative, zero or positive as the first identity sorts before, equal to or after the second.
 inline int compare_identities(const char *a, const char *b) {
     for (;; a += identity_word_size, b += identity_word_size) {
         const std::uint64_t left = ordered_word(a);
@@ -48,14 +48,14 @@ inline int compare_identities(const char *a, const char *b) {
     }
 }
 
-// Secret multipliers: the writer of an ACL file cannot choose names that collide.
+// Secret multipliers, so that the writer of an ACL file cannot choose names that collide.
 struct identity_hash_key {
     std::uint64_t first = 0;
     std::uint64_t second = 0;
 };
 identity_hash_key make_identity_hash_key();
 
-// Mixes one more word into the state of a hash, which starts as the second multiplier and ends with one more mix.
+// Mixes a word into the state of a hash. The state starts as the second multiplier and is finished by mixing that in.
 inline std::uint64_t hash_word(std::uint64_t state, std::uint64_t word, const identity_hash_key &key) {
     const wide_number product = wide_product(state ^ word, key.first);
     return product.low ^ product.high;

@@ -1,4 +1,4 @@
-// Where the mechanisms and identities of a tree are.
+// Storage of a tree's mechanisms and identities.
 #include "qzacl_acl/identity_store.h"
 
 #include <algorithm>
@@ -9,7 +9,7 @@
 namespace qz {
 namespace {
 
-// A copied mechanism stands before its identity, and NULs behind either up to the next whole word.
+// A copied mechanism precedes its identity. NULs pad both to whole words.
 constexpr std::size_t own_unit = sizeof(std::uint64_t);
 constexpr std::uint32_t mechanism_units = 3;
 constexpr std::size_t mechanism_size = mechanism_units * own_unit;
@@ -32,47 +32,47 @@ identity_store::~identity_store() {
         std::free(base_);
 }
 
-bool identity_store::place(const acle_view &acle, std::uint32_t &place, std::size_t &refused) {
+shortage identity_store::place(const acle_view &acle, std::uint32_t &place) {
     if (is_in_text()) {
         if (mechanism_length_ == 0 && has_mechanism(acle.type)) {
             mechanism_ = static_cast<std::uint32_t>(acle.mechanism.data() - base_);
             mechanism_length_ = static_cast<std::uint8_t>(acle.mechanism.size());
         }
         place = static_cast<std::uint32_t>(acle.identity.data() - base_);
-        return true;
+        return {};
     }
-    return copy(acle, place, refused);
+    return copy(acle, place);
 }
 
-bool identity_store::copy(const acle_view &acle, std::uint32_t &place, std::size_t &refused) {
-    // The word behind the last one is there to be read, too; the next copy takes it.
+shortage identity_store::copy(const acle_view &acle, std::uint32_t &place) {
+    // One more word must be readable after the last one. The next copy overwrites it.
     const std::uint64_t units = mechanism_units + units_of(acle.identity.size());
-    if (used_ + units >= size_ && !grow(used_ + units + 1, refused))
-        return false;
+    if (used_ + units >= size_) {
+        if (const shortage lacking = grow(used_ + units + 1))
+            return lacking;
+    }
     place = used_ + mechanism_units;
     char *const at = identity(place);
     std::memset(at - mechanism_size, 0, mechanism_size);
     std::memcpy(at - mechanism_size, acle.mechanism.data(), acle.mechanism.size());
     std::memset(at + (units_of(acle.identity.size()) - 1) * own_unit, 0, 2 * own_unit);
     std::memcpy(at, acle.identity.data(), acle.identity.size());
-    return true;
+    return {};
 }
 
-bool identity_store::grow(std::uint64_t units, std::size_t &refused) {
+shortage identity_store::grow(std::uint64_t units) {
     constexpr std::uint64_t first_units = 16;
     const std::uint64_t size = std::max({units, std::uint64_t{size_} * 2, first_units});
-    // On a 32-bit machine more may be asked for than memory can be.
+    // On a 32-bit machine the size may exceed the address space.
     constexpr std::size_t most_bytes = std::numeric_limits<std::ptrdiff_t>::max();
     const bool fits = size <= last_place && size <= most_bytes / own_unit;
     const std::size_t bytes = fits ? static_cast<std::size_t>(size) * own_unit : most_bytes;
     void *grown = fits ? std::realloc(base_, bytes) : nullptr;
-    if (grown == nullptr) {
-        refused = bytes;
-        return false;
-    }
+    if (grown == nullptr)
+        return shortage(bytes);
     base_ = static_cast<char *>(grown);
     size_ = static_cast<std::uint32_t>(size);
-    return true;
+    return {};
 }
 
 void identity_store::keep(std::uint32_t place, std::size_t identity_length) {
@@ -86,7 +86,7 @@ std::string_view identity_store::mechanism(std::uint32_t place) const {
 
 std::string_view identity_store::first_mechanism() const {
     if (!is_in_text())
-        return base_; // which starts with it
+        return base_; // starts with it
     return mechanism_length_ == 0 ? "" : std::string_view{identity(mechanism_), mechanism_length_};
 }
 
@@ -94,8 +94,8 @@ std::uint32_t identity_store::expected_count(std::uint32_t count, std::uint32_t 
     constexpr std::uint64_t least = 16;
     std::uint64_t expected = std::max(std::uint64_t{count} * 2, least);
     if (is_in_text() && count >= least) {
-        // A little more than the part that was read promises, and whatever it promises a fair step: a few entries
-        // before a long comment must not get room that others lack.
+        // Extrapolate from the part of the text that was read, plus a little, but within limits: a few entries before a
+        // long comment must not claim memory that other trees need.
         const std::uint64_t promised = std::uint64_t{count} * size_ / place;
         expected =
             std::clamp(promised + promised / 8, std::uint64_t{count} + count / 4, std::uint64_t{count} * 16);

@@ -1,4 +1,4 @@
-// The numbers of entries by the hashes of their identities.
+// A hash table from identities to entry numbers.
 #include "qzacl_acl/identity_table.h"
 
 #include <algorithm>
@@ -6,23 +6,21 @@
 
 namespace qz {
 
-bool identity_table::reset(std::uint32_t count, std::size_t &refused) {
+shortage identity_table::reset(std::uint32_t count) {
     unsigned bits = 0;
     while (room_of(bits) < count)
         ++bits;
-    // Where a size has 32 bits, it may be too small to say it; an allocation of that much fails.
+    // With 32-bit sizes this may not fit. Allocating SIZE_MAX bytes fails in any case.
     const std::uint64_t wanted = alignof(head) + sizeof(head) + (std::uint64_t{sizeof(group)} << bits);
     const auto size = static_cast<std::size_t>(std::min<std::uint64_t>(wanted, SIZE_MAX));
     owned<void> memory(std::calloc(size, 1));
-    if (memory == nullptr) {
-        refused = size;
-        return false;
-    }
+    if (memory == nullptr)
+        return shortage(size);
     release();
     const std::size_t misaligned = reinterpret_cast<std::uintptr_t>(memory.get()) % alignof(head);
     void *const aligned = static_cast<char *>(memory.get()) + (alignof(head) - misaligned);
     head_ = new (aligned) head{std::move(memory), make_identity_hash_key(), bits};
-    return true;
+    return {};
 }
 
 void identity_table::release() {

@@ -1,8 +1,7 @@
-// The numbers of entries by the hashes of their identities.
+// A hash table from identities to entry numbers.
 //
-// Twelve slots make a group, which fills a line of the processor's cache. Each slot has a tag of one byte, a part of the
-// hash, and a number. The tags of a group are tested at once, so that a look-up that finds nothing hardly ever has to
-// look at an entry.
+// A group of twelve slots fills a cache line. Each slot has a number and a one-byte tag, which is a part of the
+// hash. The tags of a group are compared at once, so a look-up that finds nothing rarely touches an entry.
 #ifndef QZACL_IDENTITY_TABLE_H
 #define QZACL_IDENTITY_TABLE_H
 
@@ -28,22 +27,21 @@ public:
     identity_table &operator=(const identity_table &) = delete;
     ~identity_table() { release(); }
 
-    // Makes an empty table with room for `count` entries. False, the bytes asked for in `refused`, when memory is
-    // lacking; then the table is as before.
-    bool reset(std::uint32_t count, std::size_t &refused);
+    // Makes an empty table with room for `count` entries. Without memory the table stays as it is.
+    shortage reset(std::uint32_t count);
     void release();
-    // How many entries it has room for; 0 without a table.
+    // How many entries it has room for; 0 before reset().
     std::uint64_t room() const { return head_ == nullptr ? 0 : room_of(head_->group_bits); }
 
-    // `first_word` is the identity's first ordered word. There is a table.
+    // `first_word` is the identity's first ordered word. Requires a table.
     std::uint64_t hash(const char *identity, std::uint64_t first_word) const {
         return hash_identity(identity, first_word, head_->key);
     }
 
-    // What a look-up of the hash looks at first. There is a table.
+    // The memory that a look-up of the hash reads first. Requires a table.
     const void *first_look(std::uint64_t hash) const { return &groups()[first_group(hash)]; }
 
-    // The number among those with the given hash that `is_wanted` says yes to, or none. There is a table.
+    // The number with the given hash that `is_wanted` accepts, or none. Requires a table.
     template <class Wanted>
     std::uint32_t find(std::uint64_t hash, const Wanted &is_wanted) const {
         for (std::size_t at = first_group(hash);; at = next_group(at)) {
@@ -58,7 +56,7 @@ public:
         }
     }
 
-    // Enters a number; there is room for it.
+    // Enters a number. There must be room.
     void enter(std::uint64_t hash, std::uint32_t number);
 
 private:
@@ -66,7 +64,7 @@ private:
     static constexpr unsigned char free_slot = 0;
 
     struct alignas(64) group {
-        unsigned char tags[16]; // of which the last ones are not used
+        unsigned char tags[16]; // the last four are unused
         std::uint32_t numbers[slot_count];
 
         // The slots that have the tag, as bits.
@@ -86,12 +84,12 @@ private:
     };
     static_assert(sizeof(group) == 64);
 
-    // One slot of eight stays free.
+    // One slot in eight stays free.
     static constexpr std::uint64_t room_of(unsigned group_bits) {
         return (std::uint64_t{slot_count} << group_bits) / 8 * 7;
     }
 
-    // The high bits of a hash choose the group, the low ones the tag.
+    // The high bits of a hash select the group, the low ones are the tag.
     std::size_t first_group(std::uint64_t hash) const {
         return static_cast<std::size_t>((hash >> 1) >> (63 - head_->group_bits));
     }
@@ -103,7 +101,7 @@ private:
         return tag == free_slot ? 1 : tag;
     }
 
-    // Stands before the groups, so that a tree without a table, as most of many are, spends one pointer on it.
+    // Precedes the groups, so that the many trees without a table spend only one pointer on it.
     struct alignas(group) head {
         owned<void> memory; // of the head and the groups
         identity_hash_key key;

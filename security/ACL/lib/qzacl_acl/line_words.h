@@ -1,4 +1,4 @@
-// The words of a line of an ACL file, and what separates them.
+// The words of a line of an ACL file and their separators.
 #ifndef QZACL_LINE_WORDS_H
 #define QZACL_LINE_WORDS_H
 
@@ -9,8 +9,8 @@ namespace qz {
 
 constexpr bool is_blank(char c) { return c == ' ' || c == '\t' || c == '\v'; }
 
-// White space by the locale of the process. The class table is fetched once for a line, because one call for
-// each byte would cost more than all the rest of the parse.
+// White space in the process's locale. The class table is fetched once per line, because a call per byte would cost
+// more than the rest of the parse.
 class space_class {
 public:
 #ifdef __GLIBC__
@@ -23,29 +23,34 @@ private:
 #endif
 };
 
-// A word where it stands in the line.
+// Moves to the next word. False when only blanks or a comment are left.
+inline bool find_word(char *&at, const char *end) {
+    while (at != end && is_blank(*at))
+        ++at;
+    return at != end && *at != '#';
+}
+
+// A word in the line.
 struct line_word {
     char *text = nullptr;
     std::size_t length = 0;
 };
 
-// Finds the words of one line as the parser does, which also ends each with a NUL; here the line stays as it is.
+// Finds the words of one line as the parser does, but leaves the line unchanged: the parser ends each word with a NUL.
 class line_words {
 public:
-    // The line end, or the NUL that takes its place, is at `end`.
+    // `end` is at the line end or the final NUL.
     line_words(char *begin, char *end) : at_(begin), end_(end) {}
 
-    // False when only blanks and a comment are left.
+    // False when only blanks or a comment are left.
     bool next(line_word &out) {
-        while (at_ != end_ && is_blank(*at_))
-            ++at_;
-        if (at_ == end_ || *at_ == '#')
+        if (!find_word(at_, end_))
             return false;
         out.text = at_;
         while (at_ != end_ && !is_space_(*at_))
             ++at_;
         out.length = static_cast<std::size_t>(at_ - out.text);
-        // A word that ended at the line end was the last one.
+        // A word that ends at the line end is the last one.
         if (at_ != end_)
             ++at_;
         return true;

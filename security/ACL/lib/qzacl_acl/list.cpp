@@ -19,7 +19,7 @@ int append_subacl(byte_span bytes, sec_aclelist_t &list) {
     return result == SEC_S_OK ? sec__acltree_to_aclelist(root, &list) : result;
 }
 
-// The empty ACL and every buffer whose first two bytes are right.
+// True for an empty ACL and for a buffer with the right type and version.
 bool is_acl(const sec_acl_buffer_t &acl) {
     if (acl.length == 0)
         return acl.data == nullptr;
@@ -27,10 +27,10 @@ bool is_acl(const sec_acl_buffer_t &acl) {
     return bytes.size() > 1 && bytes[0] == format::buffer_type && bytes[1] == format::buffer_version;
 }
 
-// The empty ACL may have no bytes; what has some has a header.
+// An empty ACL may have no bytes, but any others must have a header.
 bool is_cut_short(byte_span bytes) { return !bytes.empty() && bytes.size() < format::header_size; }
 
-// Lists the sub-ACLs that are wanted, in the order in which they stand.
+// Appends the entries of the wanted sub-ACLs, in stored order.
 template <class Wanted>
 int append_wanted(const sec_acl_buffer_t &acl, sec_aclelist_t &list, const Wanted &is_wanted) {
     const byte_span bytes = format::bytes_of(acl);

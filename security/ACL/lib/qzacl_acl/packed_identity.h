@@ -1,5 +1,4 @@
-// Identities as they stand packed in a buffer, compared at little more than the cost of the step from one to
-// the next.
+// Comparing identities packed in a buffer, at little more than the cost of stepping from one to the next.
 #ifndef QZACL_PACKED_IDENTITY_H
 #define QZACL_PACKED_IDENTITY_H
 
@@ -20,8 +19,8 @@
 
 namespace qz {
 
-// The first sixteen bytes of an identity, folded. Behind the NUL of a shorter one stand whatever bytes follow
-// it in the buffer, or NULs where it was made of a string.
+// The first sixteen bytes of an identity, folded. After the NUL of a shorter one come the bytes that follow it in the
+// buffer, or NULs if it was made from a string.
 class identity_block {
 public:
     static constexpr std::size_t size = 16;
@@ -30,8 +29,8 @@ public:
     explicit identity_block(const unsigned char *bytes)
         : identity_block(_mm_loadu_si128(reinterpret_cast<const __m128i *>(bytes))) {}
 
-    // The block of a string, padded with NULs. It is put together in registers: to read sixteen bytes right
-    // after fewer were stored would stall a decision for as long as comparing some entries takes.
+    // The block of a string, padded with NULs. It is assembled in registers: loading sixteen bytes right after storing
+    // fewer would stall as long as comparing several entries takes.
     static identity_block of_string(const char *text) {
         const std::size_t length = strnlen(text, size);
         std::uint64_t low = 0;
@@ -49,13 +48,13 @@ public:
         return identity_block(_mm_set_epi64x(static_cast<long long>(high), static_cast<long long>(low)));
     }
 
-    // The two halves as numbers of which the lesser is that of the string that sorts first.
+    // The two halves as numbers that compare as their bytes do.
     std::uint64_t first() const { return ordered(_mm_cvtsi128_si64(bytes_)); }
     std::uint64_t second() const { return ordered(_mm_cvtsi128_si64(_mm_unpackhi_epi64(bytes_, bytes_))); }
 
 private:
     explicit identity_block(__m128i raw) {
-        // Moved to where 'A' is the least of all signed values, the letters are those below a limit.
+        // With 'A' moved to the least signed value, upper-case letters are the values below a limit.
         constexpr int least = -128;
         const __m128i moved = _mm_add_epi8(raw, _mm_set1_epi8(static_cast<char>(least - 'A')));
         const __m128i is_upper = _mm_cmplt_epi8(moved, _mm_set1_epi8(static_cast<char>(least + 26)));
@@ -95,7 +94,7 @@ public:
         return mine < others;
     }
 
-    // True when this block sorts before the other, and one of its first `count` bytes shows it.
+    // True when this block sorts before the other within its first `count` bytes.
     bool sorts_before_within(std::size_t count, const identity_block &other) const {
         const std::uint64_t front = first() ^ other.first();
         if (front != 0)
@@ -105,7 +104,7 @@ public:
     }
 };
 
-// The place of the first NUL among the sixteen bytes of a block; sixteen where there is none.
+// The index of the first NUL in the sixteen bytes of a block, or sixteen.
 inline unsigned nul_in_block(const unsigned char *bytes) {
 #ifdef __x86_64__
     const __m128i raw = _mm_loadu_si128(reinterpret_cast<const __m128i *>(bytes));
@@ -117,34 +116,34 @@ inline unsigned nul_in_block(const unsigned char *bytes) {
 #endif
 }
 
-// True when the string of a field of which a whole block may be read ends where the field does. Most end within
-// two blocks, and a call for each would cost more than all the rest of a walk.
+// True when the string ends where its field does. A whole block of the field must be readable. Most strings end
+// within two blocks; a call for each would cost more than the rest of a walk.
 inline bool ends_exactly(byte_span field) {
     constexpr std::size_t size = identity_block::size;
     if (const std::size_t nul = nul_in_block(field.data()); nul != size) [[likely]]
         return nul + 1 == field.size();
-    // The block that ends with the field: no NUL is before it.
+    // No NUL precedes the block that ends with the field.
     if (field.size() > size && field.size() <= 2 * size)
         return nul_in_block(field.data() + field.size() - size) == size - 1;
     return format::holds_exact_string(field);
 }
 
-// How one identity stands to another, without regard to letter case.
+// How one identity compares with another, without regard to letter case.
 enum class identity_order : std::uint8_t {
     before,
     same,
     behind,
-    unknown, // the stored field holds no string that ends inside it
+    unknown, // the stored field has no NUL
 };
 
-// An identity that is looked for among many.
+// An identity to find among many.
 class wanted_identity {
 public:
     explicit wanted_identity(const char *text) : text_(text), block_(identity_block::of_string(text)) {}
 
-    // True for most entries that the wanted identity sorts behind, and for no others. `block` is the start of an
-    // entry's field, which ends in NUL: what stands behind that NUL takes no part, as the wanted identity
-    // differs before, or ends there too and is padded with bytes that nothing sorts before.
+    // True for most entries that sort before the wanted identity, and for no others. `block` is the start of an
+    // entry's field, which ends in NUL. Bytes after that NUL do not matter: the wanted identity differs before it,
+    // or ends there, too, and is padded with NULs, before which nothing sorts.
     bool is_clearly_behind(const identity_block &block) const { return block.sorts_before(block_); }
 
     identity_order compare(byte_span stored) const {

@@ -1,4 +1,4 @@
-// Permission templates: the default set, and the translation of characters to a mask and back.
+// Permission templates: the default set, and the translation between letters and masks.
 #include "qzacl_acl/permission.h"
 
 #include "report.h"
@@ -77,13 +77,13 @@ int sec_translate_perms(const char *text, const sec_perm_set_t *set, std::uint32
 }
 
 int sec_translate_bitmask(std::uint32_t mask, const sec_perm_set_t *set, char *out) {
-    // Before the entry point, whose record shows the output.
+    // Cleared first, because the record of the entry point shows the output.
     if (out != nullptr)
         out[0] = '\0';
     return run(
         operation::translate_bitmask, std::tie(mask, set, out),
         [&] {
-            // The name in this message differs from the operation's; callers match on it as it stands.
+            // This name differs from the operation's, but callers match on it.
             if (out == nullptr)
                 return report_bad_parameter("sec_translate_mask", 3, 0);
             if (mask == 0)

@@ -1,4 +1,4 @@
-// The entries of a file's POSIX ACL, which give named users and groups rights beside the mode.
+// A file's POSIX ACL, which grants rights to named users and groups in addition to the mode.
 #include "qzacl_acl/posix_acl.h"
 
 #include <cerrno>
@@ -9,14 +9,14 @@ namespace {
 
 constexpr char attribute[] = "system.posix_acl_access";
 
-// A file without entries, or a file system on which no file has any.
+// The file has no POSIX ACL, or its file system has none.
 bool means_none(int error) { return error == ENODATA || error == EOPNOTSUPP; }
 
 } // namespace
 
 namespace qz {
 
-// The usual file has no entries, which takes one call to see.
+// Most files have none, which takes one call to find out.
 template <class Query>
 bool posix_acl::read_with(Query query) {
     length_ = 0;

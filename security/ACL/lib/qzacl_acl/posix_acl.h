@@ -1,4 +1,4 @@
-// The entries of a file's POSIX ACL, which give named users and groups rights beside the mode.
+// A file's POSIX ACL, which grants rights to named users and groups in addition to the mode.
 #ifndef QZACL_POSIX_ACL_H
 #define QZACL_POSIX_ACL_H
 
@@ -8,16 +8,15 @@
 
 namespace qz {
 
-// The entries as the kernel hands them out. There are none on a file whose mode says everything, and on a file
-// system without POSIX ACLs.
+// A POSIX ACL in the kernel's form. It is empty for a file whose mode says everything, and on a file system without
+// POSIX ACLs.
 class posix_acl {
 public:
-    // Read the entries of an open file, or of the file that a name leads to. False, with errno set, when it
-    // cannot be told whose rights they are.
+    // Read the POSIX ACL of an open file or of a path. On failure they return false and set errno.
     bool read(int fd);
     bool read(const char *path);
 
-    // Gives the entries to a file that has none. False, with errno set, when the file cannot take them.
+    // Sets it on a file without one. On failure returns false and sets errno.
     bool give_to(int fd) const;
 
     bool operator==(const posix_acl &other) const;
@@ -30,7 +29,7 @@ private:
     std::size_t length_ = 0;
 };
 
-// Takes away the entries that a new file inherits from its folder. False, with errno set, when they stay.
+// Removes the POSIX ACL that a new file inherits from its directory. On failure returns false and sets errno.
 bool remove_posix_acl(int fd);
 
 } // namespace qz

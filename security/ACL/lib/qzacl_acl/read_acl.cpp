@@ -1,4 +1,4 @@
-// Reading an ACL file as a compiled buffer: from its cache when that is current, else from its text.
+// Reading an ACL file into a compiled buffer: from its cache if that is current, else from its text.
 #include "base/uncancelled.h"
 #include "qzacl_acl/acl_text.h"
 #include "qzacl_acl/buffer_format.h"
@@ -24,7 +24,7 @@ constexpr acl_file_use by_library = {
     .is_traced = true,
 };
 
-// Brings the bytes of a cache into host order and checks them, also those that had to be converted.
+// Converts the bytes of a cache to host order if necessary, and checks them in either case.
 int convert_and_check(sec_acl_buffer_t &acl) {
     const byte_span bytes = format::bytes_of(acl);
     const bool is_foreign =
@@ -34,7 +34,7 @@ int convert_and_check(sec_acl_buffer_t &acl) {
     return sec__check_acl_buffer(&acl);
 }
 
-// One call's work: from the arguments to the buffer and the flags that the caller gets.
+// The work of one call, from its arguments to the buffer and the flags returned.
 class acl_file_reader {
 public:
     acl_file_reader(const char *username, const sec_perm_set_t *set, std::uint32_t flags)
@@ -60,13 +60,13 @@ private:
 
     const char *username_;
     std::uint32_t asked_;
-    std::uint32_t flags_; // of the attempt at hand
+    std::uint32_t flags_; // of the current attempt
     acl_text text_;
     vetted_file acl_;
     vetted_file cache_;
 };
 
-// Takes the buffer from the cache. False, with nothing recorded, when anything about it is wrong.
+// Takes the buffer from the cache. If anything is wrong with it, records nothing and returns false.
 bool acl_file_reader::read_cache(sec_acl_buffer_t &out) {
     file_bytes bytes;
     int result = read_cache_of(acl_, cache_, by_library, bytes);
@@ -86,7 +86,7 @@ bool acl_file_reader::read_cache(sec_acl_buffer_t &out) {
 
 int acl_file_reader::parse_lines(sec_acltree_array &trees) {
     const bool traces_lines = traces(point::line_read);
-    const bool may_wait = !traces_lines && !traces(point::parsing); // traces show the line of the failure
+    const bool may_wait = !traces_lines && !traces(point::parsing); // traces show the line of a failure
     parsed_acle entry;
     for (;;) {
         const acl_line line = text_.next(entry);
@@ -123,7 +123,7 @@ int acl_file_reader::read_text(sec_acl_buffer_t &out) {
     if ((flags_ & SEC_READ_ACL_CACHE) != 0 &&
         sec__cache_aclbuffer(acl_.path.text, &out, cache_rewriting::unless_current, text_.origin()) !=
             SEC_S_OK) {
-        // A cache that cannot be written is no failure of the read.
+        // Failing to write the cache does not fail the read.
         cu_set_no_error_1();
         flags_ &= ~std::uint32_t{SEC_READ_ACL_CACHE};
     }

@@ -1,4 +1,4 @@
-// Parts of a compiled buffer that grow, shrink and go.
+// The byte operations that all edits of a compiled buffer share.
 #include "qzacl_acl/splice.h"
 
 #include "qzacl_acl/buffer_format.h"

@@ -1,4 +1,4 @@
-// What edits do to the bytes of a compiled buffer, whichever way they take.
+// The byte operations that all edits of a compiled buffer share.
 #ifndef QZACL_SPLICE_H
 #define QZACL_SPLICE_H
 
@@ -10,29 +10,29 @@
 
 namespace qz {
 
-// The functions that messages about edits name.
+// The function names in messages about edits.
 namespace edit_function {
 inline constexpr char adding[] = "sec_add_acle_to_acl";
 inline constexpr char deleting[] = "sec_del_acle_from_acl";
 } // namespace edit_function
 
-// The bytes of a buffer that holds some.
+// The bytes of a non-empty buffer.
 std::span<unsigned char> writable_bytes(const sec_acl_buffer_t &acl);
 
-// The number of sub-ACLs, as the header of a whole buffer has it.
+// The number of sub-ACLs in the header of a complete buffer.
 std::uint16_t subacl_count(const sec_acl_buffer_t &acl);
 void set_subacl_count(const sec_acl_buffer_t &acl, std::size_t count);
 
-// Makes `new_size` bytes of the `old_size` bytes at `offset`, which the caller fills; what follows moves. Only growing
-// can fail, and then nothing has changed: the message names `function`. What shrank keeps its memory until it is
-// given back.
+// Resizes the part at `offset` from `old_size` to `new_size` bytes, which the caller fills, and moves what follows.
+// Only growing can fail: then nothing has changed, and the message names `function`. A buffer that shrank keeps its
+// memory until give_back().
 int resize_part(sec_acl_buffer_t &acl, std::size_t offset, std::size_t old_size, std::size_t new_size,
                 const char *function);
 
-// Gives back the memory that a buffer shrank by. False leaves the buffer sound, with more memory than it needs.
+// Frees the memory that a buffer no longer needs. On failure returns false; the buffer stays valid.
 bool give_back(sec_acl_buffer_t &acl);
 
-// The end of every deletion: the entry is gone, and a failure tells no more than that the memory was kept.
+// Ends every deletion. A failure only means that the memory was kept: the entry is gone.
 int finish_deletion(sec_acl_buffer_t &acl);
 
 } // namespace qz

@@ -1,7 +1,6 @@
-// Trees: the entries of one key, collected in the order in which they are compiled.
+// Trees: the entries of one key, collected for compilation.
 #include "qzacl_acl/tree.h"
 
-#include "qzacl_acl/acle_report.h"
 #include "qzacl_acl/buffer_format.h"
 #include "qzacl_acl/identity_order.h"
 #include "qzacl_acl/tree_shape.h"
@@ -15,18 +14,19 @@ using namespace qz;
 
 namespace {
 
-// So few entries are compared one by one.
+// Up to this many entries are compared one by one.
 constexpr std::uint32_t few = 16;
 
 std::size_t packed_size_of(std::uint8_t type, std::size_t identity_length) {
     return format::entry_fixed_size + (has_identity(type) ? identity_length + 1 : 0);
 }
 
-// Grows something for the entries that are expected, or where there is no memory for so many for a fair number.
+// Grows a structure for the expected entries or, without memory for so many, for twice the present ones.
 template <class Grow>
-bool grow_for(std::uint32_t expected, std::uint32_t count, const Grow &grow) {
+shortage grow_for(std::uint32_t expected, std::uint32_t count, const Grow &grow) {
     const std::uint32_t fair = std::max(count * 2, few);
-    return grow(expected) || (expected > fair && grow(fair));
+    const shortage lacking = grow(expected);
+    return lacking && expected > fair ? grow(fair) : lacking;
 }
 
 } // namespace
@@ -45,15 +45,16 @@ bool sec_acltree::sorts_last(const candidate &wanted) const {
     return compare_identities(wanted.identity, identity(last)) > 0;
 }
 
-// Puts all entries into a new table with room for those that are expected.
-bool sec_acltree::fill_table(std::uint32_t place, std::size_t &refused) {
+// Enters all entries into a new table with room for the expected ones.
+shortage sec_acltree::fill_table(std::uint32_t place) {
     const auto entries = std::as_const(entries_).all();
-    const auto reset = [&](std::uint32_t room) { return table_.reset(room, refused); };
-    if (!grow_for(identities_.expected_count(entries_.count(), place), entries_.count(), reset))
-        return false;
+    const auto reset = [&](std::uint32_t room) { return table_.reset(room); };
+    const std::uint32_t expected = identities_.expected_count(entries_.count(), place);
+    if (const shortage lacking = grow_for(expected, entries_.count(), reset))
+        return lacking;
     for (std::uint32_t number = 0; number < entries.size(); ++number)
         table_.enter(table_.hash(identity(entries[number]), entries[number].key), number);
-    return true;
+    return {};
 }
 
 small_entry *sec_acltree::find_equal(const candidate &wanted, std::uint64_t hash) {
@@ -71,47 +72,55 @@ small_entry *sec_acltree::find_equal(const candidate &wanted, std::uint64_t hash
 sec_acltree::insertion sec_acltree::insert(const acle_view &acle) {
     const std::uint32_t count = entries_.count();
     if (is_single_type(type_) && count != 0)
-        return {outcome::duplicate, &entries_.all().front(), 0};
+        return {outcome::duplicate, &entries_.all().front(), {}};
     restore_keys();
     std::uint32_t place = 0;
-    std::size_t refused = 0;
-    const auto reserve = [&](std::uint32_t room) { return entries_.reserve(room, refused); };
-    if (!identities_.place(acle, place, refused) ||
-        (entries_.is_full() && !grow_for(identities_.expected_count(count, place), count, reserve)))
-        return {outcome::no_memory, nullptr, refused};
+    if (const shortage lacking = identities_.place(acle, place))
+        return {outcome::no_memory, nullptr, lacking};
+    if (entries_.is_full()) {
+        const auto reserve = [&](std::uint32_t room) { return entries_.reserve(room); };
+        if (const shortage lacking = grow_for(identities_.expected_count(count, place), count, reserve))
+            return {outcome::no_memory, nullptr, lacking};
+    }
 
     const char *const identity = identities_.identity(place);
     const candidate wanted = {identity, ordered_word(identity)};
     if (is_ascending_ && count != 0)
         is_ascending_ = sorts_last(wanted);
     if (!is_ascending_) {
-        if (count >= few && table_.room() <= count && !fill_table(place, refused))
-            return {outcome::no_memory, nullptr, refused};
+        if (count >= few && table_.room() <= count) {
+            if (const shortage lacking = fill_table(place))
+                return {outcome::no_memory, nullptr, lacking};
+        }
         const std::uint64_t hash = table_.room() == 0 ? 0 : table_.hash(identity, wanted.key);
         if (small_entry *held = find_equal(wanted, hash); held != nullptr)
-            return {outcome::duplicate, held, 0};
+            return {outcome::duplicate, held, {}};
         if (table_.room() != 0)
             table_.enter(hash, count);
     }
     identities_.keep(place, acle.identity.size());
     count_entry(acle.identity.size(), 1);
     return {outcome::inserted,
-            &entries_.append({wanted.key, place & identity_store::last_place, 0, acle.perm_mask}), 0};
+            &entries_.append({.key = wanted.key,
+                              .place = place & identity_store::last_place,
+                              .is_deleted = 0,
+                              .perm_mask = acle.perm_mask}),
+            {}};
 }
 
 void sec_acltree::count_entry(std::size_t identity_length, int held) {
-    const auto times = static_cast<std::uint32_t>(held); // of which -1 counts down
+    const auto times = static_cast<std::uint32_t>(held); // -1 counts down
     held_count_ += times;
     overlong_count_ += identity_length > format::identity_max ? times : 0;
     packed_size_ += packed_size_of(type_, identity_length) * static_cast<std::uint64_t>(held);
 }
 
-small_entry *sec_acltree::find(const char *wanted) {
+small_entry *sec_acltree::find_entry(const char *wanted) {
     const auto entries = entries_.all();
     const auto is_wanted = [&](const small_entry &entry) {
         return entry.is_deleted == 0 && fold_compare(identity(entry), wanted) == 0;
     };
-    // Deleting is one step of an edit that has read all entries before; it must not need memory to hash a name.
+    // Without the table: this serves deletions, which have read all entries anyway and must not need memory to hash.
     const auto sorts_before = [&](const small_entry &entry, const char *other) {
         return fold_compare(identity(entry), other) < 0;
     };
@@ -128,7 +137,7 @@ void sec_acltree::erase(small_entry &entry) {
 void sec_acltree::put_in_order() const {
     if (is_ascending_)
         return;
-    table_.release(); // its numbers are those of another order, and what follows can use the memory
+    table_.release(); // its numbers become invalid, and sorting can use the memory
     if (type_ == SEC_ACLE_EXPANDED)
         return;
     has_whole_keys_ = sort_by_identity(entries_.all(), identities_) == 0;
@@ -166,7 +175,7 @@ sec_acle_t sec_acltree::record(const small_entry &entry) const {
 }
 
 std::string_view sec_acltree::compiled_mechanism() const {
-    // A text spells the mechanism of all its entries alike.
+    // In a text all entries of a key spell the mechanism the same way.
     return identities_.is_in_text() ? mechanism() : identities_.mechanism(topmost(in_order())->place);
 }
 
@@ -181,46 +190,46 @@ void sec_acltree::trace_release() {
 
 namespace qz {
 
-int add_to_tree(bool reports_duplicates, const acle_view &acle, sec_acltree &tree) {
+int add_to_tree(on_duplicate handling, const acle_view &acle, sec_acltree &tree) {
     const sec_acltree::insertion done = tree.insert(acle);
     switch (done.result) {
     case sec_acltree::outcome::inserted:
         break;
     case sec_acltree::outcome::duplicate:
-        if (reports_duplicates)
+        if (handling == on_duplicate::report)
             return sec__report_duplicate(acle);
         done.entry->perm_mask = acle.perm_mask;
         sec__trace_replacement(acle);
         break;
     case sec_acltree::outcome::no_memory:
-        return report_no_memory("sec__add_acle_to_tree", done.refused);
+        return report_no_memory("sec__add_acle_to_tree", done.lacking);
     }
     return SEC_S_OK;
 }
 
 } // namespace qz
 
-int sec__add_acle_to_tree(int report_duplicates, const acle_view &acle, sec_acltree_t **slot) {
+int sec__add_acle_to_tree(on_duplicate handling, const acle_view &acle, sec_acltree_t **slot) {
     if (*slot != nullptr)
-        return add_to_tree(report_duplicates != 0, acle, **slot);
+        return add_to_tree(handling, acle, **slot);
     void *memory = std::malloc(sizeof(sec_acltree_t));
     if (memory == nullptr)
         return report_no_memory("sec__add_acle_to_tree", sizeof(sec_acltree_t));
     owned_acltree made(new (memory) sec_acltree_t(acle.type, {}));
-    const int result = add_to_tree(report_duplicates != 0, acle, *made);
+    const int result = add_to_tree(handling, acle, *made);
     if (result == SEC_S_OK)
         *slot = made.release();
     return result;
 }
 
-int sec__add_acle_to_tree(int report_duplicates, const sec_acle_t *acle, sec_acltree_t **slot) {
-    return sec__add_acle_to_tree(report_duplicates, view_of(*acle), slot);
+int sec__add_acle_to_tree(on_duplicate handling, const sec_acle_t *acle, sec_acltree_t **slot) {
+    return sec__add_acle_to_tree(handling, view_of(*acle), slot);
 }
 
 int sec__del_acle_from_tree(const sec_acle_t *acle, sec_acltree_t *root) {
     small_entry *held = nullptr;
     if (!is_single_type(acle->type))
-        held = root->find(acle->identity);
+        held = root->find_entry(acle->identity);
     else if (root->held_count() != 0)
         held = &root->in_order().front();
     if (held == nullptr)

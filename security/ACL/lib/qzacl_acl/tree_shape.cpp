@@ -1,4 +1,4 @@
-// The shape of the tree that plain insertion makes.
+// The shape of a linked tree built by plain insertion.
 #include "qzacl_acl/tree_shape.h"
 
 #include <algorithm>
@@ -10,8 +10,9 @@ const small_entry *topmost(std::span<const small_entry> in_order) {
     auto at = std::find_if(in_order.begin(), in_order.end(), is_held);
     if (at == in_order.end())
         return nullptr;
-    // The walk goes left wherever something is left there, so down to this first one. What heads it from the right was
-    // inserted before everything in between; all that heads it from the left was deleted.
+    // A pre-order walk heads for the first held entry, because all entries before it were deleted. An entry after
+    // it is its ancestor if it was inserted before everything in between. The last such entry that is held is met
+    // first.
     const small_entry *found = &*at;
     std::uint32_t earliest = at->place;
     for (; at != in_order.end(); ++at) {

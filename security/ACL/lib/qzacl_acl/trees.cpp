@@ -1,4 +1,4 @@
-// The trees of one ACL, and finding the one of an entry's key among them.
+// The trees of one ACL, found by the keys of entries.
 #include "qzacl_acl/trees.h"
 
 #include "base/posix_fold.h"
@@ -14,15 +14,10 @@ using namespace qz;
 
 namespace {
 
-bool is_of_key(const sec_acltree_t &tree, const acle_view &acle) {
-    if (tree.type() != acle.type)
-        return false;
-    if (!has_mechanism(acle.type))
-        return true;
-    const std::string_view held = tree.mechanism();
-    return held == acle.mechanism || // as texts spell it
-           (held.size() == acle.mechanism.size() &&
-            fold_compare(held.data(), acle.mechanism.data(), held.size()) == 0);
+bool equals_folded(std::string_view one, std::string_view other) {
+    return std::equal(one.begin(), one.end(), other.begin(), other.end(), [](char a, char b) {
+        return fold(static_cast<unsigned char>(a)) == fold(static_cast<unsigned char>(b));
+    });
 }
 
 std::uint32_t hash_of_key(const acle_view &acle, const identity_hash_key &key) {
@@ -47,7 +42,17 @@ sec_acltree_array::~sec_acltree_array() {
     }
 }
 
-sec_acltree_t *sec_acltree_array::find(const acle_view &acle, std::uint32_t hash) {
+bool sec_acltree_array::is_of_key(const sec_acltree_t &tree, const acle_view &acle) const {
+    if (tree.type() != acle.type)
+        return false;
+    if (!has_mechanism(acle.type))
+        return true;
+    // The parser has folded the mechanisms of a text.
+    return text_.empty() ? equals_folded(tree.mechanism(), acle.mechanism)
+                         : tree.mechanism() == acle.mechanism;
+}
+
+sec_acltree_t *sec_acltree_array::find_tree(const acle_view &acle, std::uint32_t hash) {
     if (index_ == nullptr)
         return nullptr;
     for (std::uint32_t at = hash;; ++at) {
@@ -59,60 +64,54 @@ sec_acltree_t *sec_acltree_array::find(const acle_view &acle, std::uint32_t hash
     }
 }
 
-void sec_acltree_array::enter(slot entry) {
+void sec_acltree_array::enter_in_index(slot entry) {
     std::uint32_t at = entry.hash;
     while (index_[at & (index_size_ - 1)].number != 0)
         ++at;
     index_[at & (index_size_ - 1)] = entry;
 }
 
-// Makes sure of places for one more tree; a quarter of the index stays free.
-bool sec_acltree_array::prepare(std::size_t &refused) {
+// Makes room for one more tree. A quarter of the index stays free.
+shortage sec_acltree_array::make_room_for_tree() {
     if (count_ == capacity_) {
         const std::uint32_t capacity = std::max(capacity_ * 2, std::uint32_t{8});
-        if (!reallocate(trees_, capacity)) {
-            refused = capacity * sizeof(sec_acltree_t *);
-            return false;
-        }
+        if (!reallocate(trees_, capacity))
+            return shortage(capacity * sizeof(sec_acltree_t *));
         capacity_ = capacity;
     }
     if (count_ < index_size_ / 4 * 3)
-        return true;
+        return {};
     const std::uint32_t size = std::max(index_size_ * 4, std::uint32_t{16});
     owned<slot[]> grown(static_cast<slot *>(std::calloc(size, sizeof(slot))));
-    if (grown == nullptr) {
-        refused = size * sizeof(slot);
-        return false;
-    }
+    if (grown == nullptr)
+        return shortage(size * sizeof(slot));
     const owned<slot[]> old = std::exchange(index_, std::move(grown));
     const std::uint32_t old_size = std::exchange(index_size_, size);
     for (std::uint32_t at = 0; at < old_size; ++at) {
         if (old[at].number != 0)
-            enter(old[at]);
+            enter_in_index(old[at]);
     }
-    return true;
+    return {};
 }
 
-int sec_acltree_array::append(const acle_view &acle, std::uint32_t hash) {
-    std::size_t refused = 0;
-    if (!prepare(refused))
-        return report_no_memory("sec__add_acle_to_trees", refused);
-    void *room = memory_.room(sizeof(sec_acltree_t));
-    if (room == nullptr)
-        return report_no_memory("sec__add_acle_to_tree", memory_.refused());
-    auto *tree = new (room) sec_acltree_t(acle.type, text_);
-    if (const int result = add_to_tree(true, acle, *tree); result != SEC_S_OK) {
+int sec_acltree_array::append_tree(const acle_view &acle, std::uint32_t hash) {
+    if (const shortage lacking = make_room_for_tree())
+        return report_no_memory("sec__add_acle_to_trees", lacking);
+    if (const shortage lacking = memory_.make_room(sizeof(sec_acltree_t)))
+        return report_no_memory("sec__add_acle_to_tree", lacking);
+    auto *tree = new (memory_.room()) sec_acltree_t(acle.type, text_);
+    if (const int result = add_to_tree(on_duplicate::report, acle, *tree); result != SEC_S_OK) {
         tree->~sec_acltree();
         return result;
     }
     memory_.keep(sizeof(sec_acltree_t));
     trees_[count_++] = tree;
-    enter({hash, count_});
+    enter_in_index({hash, count_});
     last_found_ = tree;
     return SEC_S_OK;
 }
 
-// Places in a text are found by subtraction, which must not be done with what is elsewhere.
+// Places in the text are computed by subtraction, which is valid only for strings inside it.
 bool sec_acltree_array::may_borrow(const acle_view &acle) const {
     const auto is_in_text = [this](std::string_view piece) {
         const auto start = reinterpret_cast<std::uintptr_t>(piece.data());
@@ -127,12 +126,12 @@ int sec_acltree_array::add(const acle_view &acle) {
         return report(SEC_S_INTERNAL, msg::internal_failure, acl_source, __LINE__, SEC_S_INTERNAL);
     if (last_found_ == nullptr || !is_of_key(*last_found_, acle)) {
         const std::uint32_t hash = hash_of_key(acle, hash_key_);
-        sec_acltree_t *found = find(acle, hash);
+        sec_acltree_t *found = find_tree(acle, hash);
         if (found == nullptr)
-            return append(acle, hash);
+            return append_tree(acle, hash);
         last_found_ = found;
     }
-    return add_to_tree(true, acle, *last_found_);
+    return add_to_tree(on_duplicate::report, acle, *last_found_);
 }
 
 int sec_acltree_array::add_soon(const acle_view &acle) {
@@ -143,7 +142,7 @@ int sec_acltree_array::add_soon(const acle_view &acle) {
         result = add(oldest);
     else
         ++waiting_count_;
-    // Most entries are of the key that the one before them is of.
+    // Most entries have the key of the previous one.
     if (last_found_ != nullptr && is_of_key(*last_found_, acle))
         __builtin_prefetch(last_found_->first_look(acle), for_writing);
     oldest = acle;

@@ -1,4 +1,4 @@
-// Checking the structure of a compiled buffer, and bringing one into host byte order.
+// Checking the structure of a compiled buffer, and converting one to host byte order.
 #include "qzacl_acl/validate.h"
 
 #include "qzacl_acl/buffer_format.h"
@@ -17,8 +17,8 @@ int report_shorter_than_header(std::int32_t length, int line) {
 
 enum class field_fault : std::uint8_t { none, inexact, cut_short };
 
-// Checks that the string which starts here ends exactly with its field, and steps behind it. Bytes that are
-// too few are a fault of their own only where the string does not end before them either.
+// Checks that the string here ends exactly with its field, and skips it. A field cut short counts as such only if its
+// string does not end early, either.
 field_fault skip_exact_string(byte_reader &reader, std::size_t length) {
     const void *nul = reader.left() == 0 ? nullptr : std::memchr(reader.position(), '\0', reader.left());
     if (nul == nullptr)
@@ -31,8 +31,8 @@ field_fault skip_exact_string(byte_reader &reader, std::size_t length) {
     return field_fault::none;
 }
 
-// A mechanism that does not end with its field, shown up to the first NUL that follows; where none does, as
-// much of what is left as a mechanism's field can hold.
+// Reports a mechanism that does not end with its field. It is shown up to the next NUL or, without one, truncated
+// to the largest size of the field.
 int report_bad_mechanism(byte_reader at_mechanism, int line) {
     const byte_span left(at_mechanism.position(), at_mechanism.left());
     char cut[256] = {};
@@ -68,7 +68,7 @@ int check_mechanism(byte_reader &reader, format::subacl &head) {
     return SEC_S_OK;
 }
 
-// Checks one entry and steps behind it.
+// Checks one entry and skips it.
 int check_entry(byte_reader &reader, std::uint8_t type) {
     format::entry entry;
     std::uint16_t identity_length = 0;
@@ -90,14 +90,14 @@ int check_entry(byte_reader &reader, std::uint8_t type) {
     return SEC_S_OK;
 }
 
-// Skips sound entries with identities, save for those close to the end.
+// Skips sound entries with identities, except close to the end.
 void skip_sound_entries(format::entry_walk &walk) {
     format::skip_entries_while(walk, identity_block::size, [](std::uint8_t version, byte_span identity) {
         return version == format::entry_version && ends_exactly(identity);
     });
 }
 
-// Checks the entries of one sub-ACL. A faulty one ends its walk, with the reader standing before it.
+// Checks the entries of one sub-ACL, up to the first faulty one, and leaves the reader before that.
 int check_entries(byte_reader &reader, const format::subacl &head) {
     format::entry_walk walk{reader, head.entry_count};
     for (;;) {
@@ -112,7 +112,7 @@ int check_entries(byte_reader &reader, const format::subacl &head) {
     }
 }
 
-// Where a sub-ACL's length says that it ends, against where the walk arrived.
+// Compares the end of a sub-ACL by its length with the position that the walk has reached.
 class expected_end {
 public:
     void set(const unsigned char *start, std::uint32_t length) {
@@ -158,7 +158,7 @@ int convert_to_host(std::span<unsigned char> bytes) {
 int convert_checked(int check, sec_acl_buffer_t *acl) {
     if (acl == nullptr)
         return report_bad_parameter("sec_convert_acl_to_host", 2, 0);
-    // Bytes that the length does not cover are not looked at; what of the header it covers must be right.
+    // Bytes beyond the length are not read. The part of the header within it must be right.
     const byte_span bytes = format::bytes_of(*acl);
     byte_reader reader(bytes);
     std::uint8_t type = format::buffer_type;

@@ -4,8 +4,8 @@
 
 #include "qz/acl.h"
 
-// Walks over a buffer in host order. Returns SEC_S_OK; SEC_S_BAD_ACL at the first structural fault;
-// SEC_S_BAD_ACLE when only entries are at fault. Never looks outside the descriptor's bytes.
+// Checks a buffer in host order. Returns SEC_S_OK, SEC_S_BAD_ACL for the first structural fault, or SEC_S_BAD_ACLE
+// if only entries are faulty. Never reads outside the descriptor's bytes.
 int sec__check_acl_buffer(const sec_acl_buffer_t *acl);
 
 #endif

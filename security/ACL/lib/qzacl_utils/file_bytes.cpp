@@ -1,4 +1,4 @@
-// Opening a file that was vetted by its name, and reading it whole.
+// Opening a vetted file and reading it whole.
 #include "qzacl_utils/file_bytes.h"
 
 #include "base/open_file.h"
@@ -16,7 +16,7 @@ using namespace qz;
 
 namespace {
 
-// Whether the file is the one that was vetted by its name, and still owned and protected as it was then.
+// True when the opened file is the vetted one, with the same owner, group and mode.
 bool is_as_vetted(const struct stat &opened, const struct stat &vetted) {
     return same_file(opened, vetted) && S_ISREG(opened.st_mode) && opened.st_mode == vetted.st_mode &&
            opened.st_uid == vetted.st_uid && opened.st_gid == vetted.st_gid;
@@ -37,7 +37,7 @@ int read_file(const char *file_name, int fd, const struct stat &vetted, file_byt
     }
     if (status.st_size == 0)
         return SEC_S_OK;
-    // On a 32-bit machine a file may be larger than memory can be, and its size wrap to that of a small one.
+    // On a 32-bit machine a file may exceed the address space, and its size wrap to a small number.
     const auto size = static_cast<std::size_t>(std::min<std::uintmax_t>(
         static_cast<std::uintmax_t>(status.st_size), std::numeric_limits<std::ptrdiff_t>::max()));
     auto text = allocate<char>(size + text_padding);

@@ -1,10 +1,10 @@
-// Keeps errno as the caller left it, in operations that call what may change it.
-#ifndef QZ_CU_KEPT_ERRNO_H
-#define QZ_CU_KEPT_ERRNO_H
+// Restores errno at the end of a scope, for functions that must not change it.
+#ifndef QZ_KEPT_ERRNO_H
+#define QZ_KEPT_ERRNO_H
 
 #include <cerrno>
 
-namespace qz::cu {
+namespace qz {
 
 class kept_errno {
 public:
@@ -17,6 +17,6 @@ private:
     const int saved_ = errno;
 };
 
-} // namespace qz::cu
+} // namespace qz
 
 #endif
