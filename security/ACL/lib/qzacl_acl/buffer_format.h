@@ -48,7 +48,9 @@ inline constexpr std::size_t order_offset = 2;
 inline constexpr std::size_t count_offset = 3;
 
 inline constexpr std::size_t subacl_header_size = 10;
+inline constexpr std::size_t subacl_type_offset = 4;
 inline constexpr std::size_t subacl_count_offset = 5;
+inline constexpr std::size_t subacl_mechanism_length_offset = 9;
 
 inline constexpr std::size_t entry_fixed_size = 7;
 inline constexpr std::size_t entry_mask_offset = 1;
@@ -90,14 +92,26 @@ inline byte_span bytes_of(const sec_acl_buffer_t &acl) {
 }
 
 inline bool read(byte_reader &reader, header &out) {
-    return reader.field(out.type) && reader.field(out.version) && reader.field(out.order) &&
-           reader.field(out.subacl_count);
+    byte_span fixed;
+    if (!reader.bytes(header_size, fixed))
+        return false;
+    out.type = fixed[0];
+    out.version = fixed[1];
+    out.order = fixed[order_offset];
+    out.subacl_count = load_field<std::uint16_t>(fixed, count_offset);
+    return true;
 }
 
 // Reads the fixed fields of a sub-ACL; the reader then stands before its mechanism.
 inline bool read_fixed_part(byte_reader &reader, subacl &out) {
-    return reader.field(out.length) && reader.field(out.type) && reader.field(out.entry_count) &&
-           reader.field(out.mechanism_length);
+    byte_span fixed;
+    if (!reader.bytes(subacl_header_size, fixed))
+        return false;
+    out.length = load_field<std::uint32_t>(fixed, 0);
+    out.type = fixed[subacl_type_offset];
+    out.entry_count = load_field<std::uint32_t>(fixed, subacl_count_offset);
+    out.mechanism_length = fixed[subacl_mechanism_length_offset];
+    return true;
 }
 
 // Reads a sub-ACL's fixed fields and mechanism; the reader then stands before its first entry.
@@ -126,9 +140,13 @@ inline bool holds_exact_string(byte_span field) {
     return !field.empty() && std::memchr(field.data(), '\0', field.size()) == &field.back();
 }
 
+// True when a field surely holds a string: its last byte is a NUL, whether or not that is the first one.
+inline bool ends_in_nul(byte_span field) { return !field.empty() && field.back() == '\0'; }
+
 // A string field as a C string, or null when no NUL ends it inside the field.
 inline const char *string_in(byte_span field) {
-    if (field.empty() || std::memchr(field.data(), '\0', field.size()) == nullptr)
+    // Most fields end with their string, and need no call to tell.
+    if (!ends_in_nul(field) && (field.empty() || std::memchr(field.data(), '\0', field.size()) == nullptr))
         return nullptr;
     return reinterpret_cast<const char *>(field.data());
 }
@@ -142,43 +160,58 @@ inline std::string_view text_in(byte_span field) {
     return {reinterpret_cast<const char *>(field.data()), length};
 }
 
-// The entries of a sub-ACL that are still to be looked at.
-struct entry_walk {
-    byte_reader entries;
+// How far a step over some entries went.
+struct passed_entries {
+    std::size_t bytes = 0;
     std::uint32_t left = 0;
 };
 
-// Steps over entries while `is_passed` says so of their version and identity, of which `readable` bytes may be read
-// even if it is shorter. Stops as well before an entry that reaches beyond the end, whose field does not end in
-// NUL, or that has fewer bytes behind it than another one would take with the readable bytes of its identity:
-// those, and so the last ones of a buffer, are left to the checked reader. This is the loop that a decision
-// spends its time in, so each step makes do with one test for where the bytes end and one for the field.
+// Passes entries while `is_passed` says so of their version and identity, of which `readable` bytes may be read
+// even if it is shorter. Stops as well before an entry that reaches beyond the end, or that has fewer bytes behind it
+// than another one would take with the readable bytes of its identity: those, and so the last ones of a buffer, are
+// left to the checked reader. This is the loop that a decision spends its time in, so each step makes do with one test
+// for where the bytes end.
 template <class Passed>
-void skip_entries_while(entry_walk &walk, std::size_t readable, const Passed &is_passed) {
-    if (walk.entries.left() < entry_fixed_size + readable)
-        return;
-    const unsigned char *const start = walk.entries.position();
+passed_entries pass_entries_while(byte_reader entries, std::uint32_t left, std::size_t readable,
+                                  const Passed &is_passed) {
+    if (entries.left() < entry_fixed_size + readable)
+        return {0, left};
+    const unsigned char *const start = entries.position();
     // Where an entry may start at the latest, as a number: sums of these do not wrap, and form no pointer to
     // where nothing is.
     const auto number_of = [](const unsigned char *place) {
         return std::uint64_t{reinterpret_cast<std::uintptr_t>(place)};
     };
-    const std::uint64_t last = number_of(start) + (walk.entries.left() - (entry_fixed_size + readable));
+    const std::uint64_t last = number_of(start) + (entries.left() - (entry_fixed_size + readable));
     const unsigned char *at = start;
-    std::uint32_t left = walk.left;
     for (; left != 0; --left) {
         std::uint16_t length = 0;
         std::memcpy(&length, at + entry_length_offset, sizeof length);
         const unsigned char *const identity = at + entry_fixed_size;
         const std::size_t size = length;
-        if (size == 0 || number_of(identity) + size > last || identity[size - 1] != '\0')
+        if (number_of(identity) + size > last) [[unlikely]]
             break;
-        if (!is_passed(*at, byte_span(identity, size)))
+        if (!is_passed(*at, byte_span(identity, size))) [[unlikely]]
             break;
         at = identity + size;
     }
-    walk.entries.skip(static_cast<std::size_t>(at - start));
-    walk.left = left;
+    return {static_cast<std::size_t>(at - start), left};
+}
+
+// The entries of a sub-ACL that are still to be looked at.
+struct entry_walk {
+    byte_reader entries;
+    std::uint32_t left = 0;
+
+    void step(const passed_entries &passed) {
+        entries.skip(passed.bytes);
+        left = passed.left;
+    }
+};
+
+template <class Passed>
+void skip_entries_while(entry_walk &walk, std::size_t readable, const Passed &is_passed) {
+    walk.step(pass_entries_while(walk.entries, walk.left, readable, is_passed));
 }
 
 // Steps over entries, whatever they hold. False where one reaches beyond the end.
@@ -220,6 +253,12 @@ public:
     }
 
     const subacl &current() const { return current_; }
+    // Stands before the first entry of the current sub-ACL, and reaches to the end of the buffer.
+    byte_reader entries() const {
+        byte_reader behind_header = next_;
+        behind_header.skip(subacl_header_size + current_.mechanism_length);
+        return behind_header;
+    }
     // The bytes that the current sub-ACL may take: up to where the next one starts, and for the last up to
     // the end of the buffer. So however sub-ACLs are made to overlap, walking over all their entries takes no
     // more than the bytes can hold.

@@ -27,7 +27,7 @@ void skip_ascending(const wanted_identity &wanted, bool is_placed, byte_span &pr
     constexpr std::size_t block_size = identity_block::size;
     if (walk.left == 0 || previous.size() + walk.entries.left() < block_size)
         return;
-    const wanted_identity held_in_registers = wanted; // a copy, which nothing else can change meanwhile
+    const identity_start held_in_registers = wanted.start(); // a copy, which nothing else can change meanwhile
     identity_block before(previous.data());
     std::size_t before_size = previous.size();
     const unsigned char *last = previous.data();

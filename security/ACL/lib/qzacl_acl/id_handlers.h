@@ -7,7 +7,7 @@
 #include <cstdint>
 
 // Finds the handler that was registered first for a kind and a mechanism in any letter case; null when there
-// is none. The state's once-guard has run before. Returns SEC_S_OK, or SEC_S_INTERNAL when the state cannot
+// is none. Returns SEC_S_OK, or SEC_S_INTERNAL when the state cannot
 // be locked or unlocked, in the latter case with the handler in place.
 int sec__get_id_handler(std::uint32_t kind, const char *mechanism, sec_id_compare_fn *handler);
 

@@ -20,8 +20,8 @@
 
 namespace qz {
 
-// The first sixteen bytes of an identity, folded. Behind the NUL of a shorter one stand whatever bytes follow
-// it in the buffer, or NULs where it was made of a string.
+// The first sixteen bytes of a packed identity, folded. Behind the NUL of a shorter one stand whatever bytes follow
+// it in the buffer.
 class identity_block {
 public:
     static constexpr std::size_t size = 16;
@@ -29,25 +29,6 @@ public:
 #ifdef __x86_64__
     explicit identity_block(const unsigned char *bytes)
         : identity_block(_mm_loadu_si128(reinterpret_cast<const __m128i *>(bytes))) {}
-
-    // The block of a string, padded with NULs. It is put together in registers: to read sixteen bytes right
-    // after fewer were stored would stall a decision for as long as comparing some entries takes.
-    static identity_block of_string(const char *text) {
-        const std::size_t length = strnlen(text, size);
-        std::uint64_t low = 0;
-        std::uint64_t high = 0;
-        if (length >= 8) {
-            low = load8(text);
-            if (length > 8)
-                high = load8(text + length - 8) >> (8 * (size - length));
-        } else if (length >= 4) {
-            low = load4(text) | std::uint64_t{load4(text + length - 4)} << (8 * (length - 4));
-        } else {
-            for (std::size_t index = 0; index < length; ++index)
-                low |= std::uint64_t{static_cast<unsigned char>(text[index])} << (8 * index);
-        }
-        return identity_block(_mm_set_epi64x(static_cast<long long>(high), static_cast<long long>(low)));
-    }
 
     // The two halves as numbers of which the lesser is that of the string that sorts first.
     std::uint64_t first() const { return ordered(_mm_cvtsi128_si64(bytes_)); }
@@ -73,12 +54,6 @@ private:
         words_[1] = fold8(load8(bytes + word_size));
     }
 
-    static identity_block of_string(const char *text) {
-        unsigned char padded[size] = {};
-        std::memcpy(padded, text, strnlen(text, size));
-        return identity_block(padded);
-    }
-
     std::uint64_t first() const { return first_byte_highest(words_[0]); }
     std::uint64_t second() const { return first_byte_highest(words_[1]); }
 
@@ -87,14 +62,6 @@ private:
 #endif
 
 public:
-    bool sorts_before(const identity_block &other) const {
-        const std::uint64_t mine = first();
-        const std::uint64_t others = other.first();
-        if (mine == others)
-            return second() < other.second();
-        return mine < others;
-    }
-
     // True when this block sorts before the other, and one of its first `count` bytes shows it.
     bool sorts_before_within(std::size_t count, const identity_block &other) const {
         const std::uint64_t front = first() ^ other.first();
@@ -137,31 +104,81 @@ enum class identity_order : std::uint8_t {
     unknown, // the stored field holds no string that ends inside it
 };
 
+// The first sixteen bytes of an identity that is looked for, folded and padded with NULs, as two numbers that compare as
+// they do.
+class identity_start {
+public:
+    identity_start(const char *text, std::size_t length)
+        : first_(fold8(first_word(text, length))), second_(fold8(second_word(text, length))) {}
+
+    // True for most entries that the wanted identity sorts behind, and for no others. Two words of `stored`, the
+    // identity of an entry, can be read even if it is shorter.
+    //
+    // The letters are not folded, but all bytes get the bit that tells lower case from upper case. That takes no
+    // byte below its folded form. And what stands behind a short identity counts as the highest of all. So what
+    // sorts before the wanted identity even so does sort before it.
+    bool is_far_behind(byte_span stored) const {
+        constexpr std::uint64_t case_bits = in_each_byte('a' - 'A');
+        const std::uint64_t behind = stored.size() < word_size ? UINT64_MAX >> (8 * stored.size()) : 0;
+        const std::uint64_t first = first_byte_highest(load8(stored.data()) | case_bits) | behind;
+        if (first < first_) [[likely]]
+            return true;
+        return first == first_ && stored.size() >= 2 * word_size &&
+               first_byte_highest(load8(stored.data() + word_size) | case_bits) < second_;
+    }
+
+    // The same at a closer look. `block` is the start of a field that ends in NUL: what stands behind that NUL takes no
+    // part, as the wanted identity differs before, or ends there too and is padded with bytes that nothing sorts before.
+    bool is_clearly_behind(const identity_block &block) const {
+        const std::uint64_t first = block.first();
+        return first == first_ ? block.second() < second_ : first < first_;
+    }
+
+private:
+    // The words are put together in registers: to load one right after fewer bytes were stored would stall a decision
+    // for as long as comparing some entries takes.
+    static std::uint64_t first_word(const char *text, std::size_t length) {
+        if (length >= word_size)
+            return first_byte_highest(load8(text));
+        std::uint64_t word = 0;
+        for (std::size_t index = 0; index < length; ++index)
+            word |= std::uint64_t{static_cast<unsigned char>(text[index])} << (8 * (word_size - 1 - index));
+        return word;
+    }
+
+    static std::uint64_t second_word(const char *text, std::size_t length) {
+        if (length <= word_size)
+            return 0;
+        // The last eight bytes; those that the first word has are shifted out.
+        const std::size_t end = std::min(length, 2 * word_size);
+        return first_byte_highest(load8(text + end - word_size)) << (8 * (2 * word_size - end));
+    }
+
+    std::uint64_t first_;
+    std::uint64_t second_;
+};
+
 // An identity that is looked for among many.
 class wanted_identity {
 public:
-    explicit wanted_identity(const char *text) : text_(text), block_(identity_block::of_string(text)) {}
+    explicit wanted_identity(const char *text)
+        : text_(text), length_(std::strlen(text)), start_(text, length_) {}
 
-    // True for most entries that the wanted identity sorts behind, and for no others. `block` is the start of an
-    // entry's field, which ends in NUL: what stands behind that NUL takes no part, as the wanted identity
-    // differs before, or ends there too and is padded with bytes that nothing sorts before.
-    bool is_clearly_behind(const identity_block &block) const { return block.sorts_before(block_); }
+    const identity_start &start() const { return start_; }
 
     identity_order compare(byte_span stored) const {
-        for (std::size_t index = 0; index < stored.size(); ++index) {
-            const unsigned wanted = fold(static_cast<unsigned char>(text_[index]));
-            const unsigned held = fold(stored[index]);
-            if (wanted != held)
-                return wanted < held ? identity_order::before : identity_order::behind;
-            if (wanted == 0)
-                return identity_order::same;
-        }
-        return identity_order::unknown;
+        // As many bytes as both have, the NUL that ends the wanted identity among its own.
+        const std::size_t shared = std::min(stored.size(), length_ + 1);
+        const int order = fold_compare(text_, reinterpret_cast<const char *>(stored.data()), shared);
+        if (order != 0)
+            return order < 0 ? identity_order::before : identity_order::behind;
+        return shared > length_ ? identity_order::same : identity_order::unknown;
     }
 
 private:
     const char *text_;
-    identity_block block_;
+    std::size_t length_;
+    identity_start start_;
 };
 
 } // namespace qz
