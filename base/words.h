@@ -40,6 +40,11 @@ constexpr std::uint64_t first_byte_highest(std::uint64_t loaded) {
     return std::endian::native == std::endian::little ? __builtin_bswap64(loaded) : loaded;
 }
 
+// Every bit behind the first `count` bytes of a number of which the first byte is the highest; none behind eight.
+constexpr std::uint64_t bits_behind(std::size_t count) {
+    return count < word_size ? UINT64_MAX >> (8 * count) : 0;
+}
+
 // The high bit of the lowest byte that is zero; 0 when none is. Bits above that one are cut off, where a borrow
 // may have set some that mean nothing.
 constexpr std::uint64_t lowest_zero(std::uint64_t word) {

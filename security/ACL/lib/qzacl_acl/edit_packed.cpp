@@ -22,30 +22,23 @@ bool has_sorted_form(const format::subacl &head) {
 
 // Skips entries that are clearly what compiling gives, each behind the one before it: up to where the wanted
 // identity may stand, or all of them once its place is known. `previous` is the identity before the next entry.
-void skip_ascending(const wanted_identity &wanted, bool is_placed, byte_span &previous,
-                    format::entry_walk &walk) {
+// A function of its own, so that all that its loop works with fits into registers.
+[[gnu::noinline]] void skip_ascending(identity_start wanted, byte_span &previous, format::entry_walk &walk) {
     constexpr std::size_t block_size = identity_block::size;
     if (walk.left == 0 || previous.size() + walk.entries.left() < block_size)
         return;
-    const identity_start held_in_registers = wanted.start(); // a copy, which nothing else can change meanwhile
-    identity_block before(previous.data());
-    std::size_t before_size = previous.size();
-    const unsigned char *last = previous.data();
+    byte_span last = previous;
+    identity_block before(last);
     format::skip_entries_while(walk, block_size, [&](std::uint8_t version, byte_span identity) {
-        const identity_block block(identity.data());
-        // Behind the NUL of the one before stand other fields, which say nothing of the order.
-        if (version != format::entry_version || !before.sorts_before_within(before_size, block))
-            return false;
-        if (!is_placed && !held_in_registers.is_clearly_behind(block))
-            return false;
-        if (!ends_exactly(identity))
+        const identity_block block(identity);
+        if (version != format::entry_version || !before.sorts_before(block) ||
+            !wanted.is_clearly_behind(block) || !ends_exactly(identity))
             return false;
         before = block;
-        before_size = identity.size();
-        last = identity.data();
+        last = identity;
         return true;
     });
-    previous = {last, before_size};
+    previous = last;
 }
 
 // Looks for an identity in a user or group sub-ACL. False unless the bytes are exactly what compiling a tree
@@ -76,7 +69,7 @@ bool find_sorted(byte_span subacl, const format::subacl &head, const char *ident
         }
         previous = entry.identity;
         --walk.left;
-        skip_ascending(wanted, is_placed, previous, walk);
+        skip_ascending(is_placed ? identity_start::behind_all() : wanted.start(), previous, walk);
     }
     if (!is_placed)
         place = {subacl.size() - walk.entries.left(), 0};

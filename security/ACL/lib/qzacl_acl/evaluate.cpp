@@ -111,29 +111,24 @@ int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler
     return no_match(request, request.identity);
 }
 
-// Passes entries that sort before a wanted identity: up to one of which that is not clear at first sight. A function of
-// its own whose arguments and result fit into registers, as all that the loop works with should.
-[[gnu::noinline]] format::passed_entries pass_far_before(identity_start wanted, byte_reader entries,
-                                                         std::uint32_t left) {
-    return format::pass_entries_while(
-        entries, left, identity_block::size, [&](std::uint8_t, byte_span identity) {
-            return wanted.is_far_behind(identity);
-        });
-}
-
-// The same at a closer look, for entries whose start the wanted identity shares.
+// Passes entries that sort before the wanted identity, at a closer look than most need.
 [[gnu::noinline]] format::passed_entries pass_before(identity_start wanted, byte_reader entries,
                                                      std::uint32_t left) {
     return format::pass_entries_while(
         entries, left, identity_block::size, [&](std::uint8_t, byte_span identity) {
-            return wanted.is_clearly_behind(identity_block(identity.data())) && format::ends_in_nul(identity);
+            return wanted.is_clearly_behind(identity_block(identity)) && format::ends_in_nul(identity);
         });
 }
 
 // Compares the wanted identity with the entries from the next one on, up to the one that decides about it,
-// before which the walk then stands. When none is left the wanted identity sorts behind all.
-identity_order compare_next(const wanted_identity &wanted, format::entry_walk &walk, format::entry &entry) {
-    walk.step(pass_far_before(wanted.start(), walk.entries, walk.left));
+// before which the walk then stands. When none is left the wanted identity sorts behind all. Inline, so that what
+// the first loop works with stays in registers.
+[[gnu::always_inline]] inline identity_order compare_next(const wanted_identity &wanted,
+                                                          format::entry_walk &walk, format::entry &entry) {
+    const identity_start start = wanted.start();
+    walk.step(format::pass_entries_while(
+        walk.entries, walk.left, identity_block::size,
+        [&](std::uint8_t, byte_span identity) { return start.is_far_behind(identity); }));
     while (walk.left != 0) {
         byte_reader next = walk.entries;
         if (!format::read(next, entry))
@@ -142,7 +137,7 @@ identity_order compare_next(const wanted_identity &wanted, format::entry_walk &w
         if (order != identity_order::behind)
             return order;
         walk = {next, walk.left - 1};
-        walk.step(pass_before(wanted.start(), walk.entries, walk.left));
+        walk.step(pass_before(start, walk.entries, walk.left));
     }
     return identity_order::behind;
 }
@@ -266,7 +261,8 @@ int evaluate_groups(const sec_acl_buffer_t *acl, std::int32_t count, const sec_g
         if (groups[index].name != nullptr)
             batch.add(groups[index].name);
         if (batch.is_full() || index == count - 1) {
-            if (const int result = batch.evaluate(walk.current(), walk.entries(), granted, is_found); result != SEC_S_OK)
+            if (const int result = batch.evaluate(walk.current(), walk.entries(), granted, is_found);
+                result != SEC_S_OK)
                 return result;
         }
     }

@@ -20,67 +20,71 @@
 
 namespace qz {
 
-// The first sixteen bytes of a packed identity, folded. Behind the NUL of a shorter one stand whatever bytes follow
-// it in the buffer.
+// The first sixteen bytes of a packed identity, folded, and NULs behind a shorter one. Sixteen bytes can be read.
 class identity_block {
 public:
     static constexpr std::size_t size = 16;
 
 #ifdef __x86_64__
-    explicit identity_block(const unsigned char *bytes)
-        : identity_block(_mm_loadu_si128(reinterpret_cast<const __m128i *>(bytes))) {}
-
-    // The two halves as numbers of which the lesser is that of the string that sorts first.
-    std::uint64_t first() const { return ordered(_mm_cvtsi128_si64(bytes_)); }
-    std::uint64_t second() const { return ordered(_mm_cvtsi128_si64(_mm_unpackhi_epi64(bytes_, bytes_))); }
-
-private:
-    explicit identity_block(__m128i raw) {
+    explicit identity_block(byte_span identity) {
+        static constexpr unsigned char kept[2 * size] = {255, 255, 255, 255, 255, 255, 255, 255,
+                                                         255, 255, 255, 255, 255, 255, 255, 255};
+        const __m128i is_kept = load(kept + (identity.size() < size ? size - identity.size() : 0));
+        const __m128i raw = _mm_and_si128(load(identity.data()), is_kept);
         // Moved to where 'A' is the least of all signed values, the letters are those below a limit.
         constexpr int least = -128;
         const __m128i moved = _mm_add_epi8(raw, _mm_set1_epi8(static_cast<char>(least - 'A')));
         const __m128i is_upper = _mm_cmplt_epi8(moved, _mm_set1_epi8(static_cast<char>(least + 26)));
-        bytes_ = _mm_or_si128(raw, _mm_and_si128(is_upper, _mm_set1_epi8('a' - 'A')));
+        const __m128i folded = _mm_or_si128(raw, _mm_and_si128(is_upper, _mm_set1_epi8('a' - 'A')));
+        first_ = ordered(_mm_cvtsi128_si64(folded));
+        second_ = ordered(_mm_cvtsi128_si64(_mm_unpackhi_epi64(folded, folded)));
     }
 
+private:
+    static __m128i load(const unsigned char *bytes) {
+        return _mm_loadu_si128(reinterpret_cast<const __m128i *>(bytes));
+    }
     static std::uint64_t ordered(long long word) {
         return first_byte_highest(static_cast<std::uint64_t>(word));
     }
-
-    __m128i bytes_;
 #else
-    explicit identity_block(const unsigned char *bytes) {
-        words_[0] = fold8(load8(bytes));
-        words_[1] = fold8(load8(bytes + word_size));
-    }
-
-    std::uint64_t first() const { return first_byte_highest(words_[0]); }
-    std::uint64_t second() const { return first_byte_highest(words_[1]); }
+    explicit identity_block(byte_span identity)
+        : first_(folded(identity.data(), identity.size())),
+          second_(
+              folded(identity.data() + word_size, identity.size() - std::min(identity.size(), word_size))) {}
 
 private:
-    std::uint64_t words_[2];
+    static std::uint64_t folded(const unsigned char *bytes, std::size_t count) {
+        return fold8(first_byte_highest(load8(bytes))) & ~bits_behind(count);
+    }
 #endif
 
 public:
-    // True when this block sorts before the other, and one of its first `count` bytes shows it.
-    bool sorts_before_within(std::size_t count, const identity_block &other) const {
-        const std::uint64_t front = first() ^ other.first();
-        if (front != 0)
-            return first() < other.first() && static_cast<unsigned>(std::countl_zero(front)) / 8 < count;
-        const std::uint64_t back = second() ^ other.second();
-        return second() < other.second() && 8 + static_cast<unsigned>(std::countl_zero(back)) / 8 < count;
+    // The two halves as numbers of which the lesser is that of the string that sorts first.
+    std::uint64_t first() const { return first_; }
+    std::uint64_t second() const { return second_; }
+
+    bool sorts_before(const identity_block &other) const {
+        if (first_ != other.first_) [[likely]]
+            return first_ < other.first_;
+        return second_ < other.second_;
     }
+
+private:
+    std::uint64_t first_;
+    std::uint64_t second_;
 };
 
-// The place of the first NUL among the sixteen bytes of a block; sixteen where there is none.
-inline unsigned nul_in_block(const unsigned char *bytes) {
+// The NULs among the sixteen bytes of a block as bits, of which the lowest is that of the first byte: all of them or at
+// least the first.
+inline unsigned nuls_in_block(const unsigned char *bytes) {
 #ifdef __x86_64__
     const __m128i raw = _mm_loadu_si128(reinterpret_cast<const __m128i *>(bytes));
-    const int nuls = _mm_movemask_epi8(_mm_cmpeq_epi8(raw, _mm_setzero_si128()));
-    return static_cast<unsigned>(std::countr_zero(static_cast<unsigned>(nuls) | 1U << identity_block::size));
+    return static_cast<unsigned>(_mm_movemask_epi8(_mm_cmpeq_epi8(raw, _mm_setzero_si128())));
 #else
-    const unsigned nul = bytes_before_nul(load8(bytes));
-    return nul < word_size ? nul : nul + bytes_before_nul(load8(bytes + word_size));
+    const unsigned front = bytes_before_nul(load8(bytes));
+    const unsigned nul = front < word_size ? front : front + bytes_before_nul(load8(bytes + word_size));
+    return nul < identity_block::size ? 1U << nul : 0;
 #endif
 }
 
@@ -88,11 +92,12 @@ inline unsigned nul_in_block(const unsigned char *bytes) {
 // two blocks, and a call for each would cost more than all the rest of a walk.
 inline bool ends_exactly(byte_span field) {
     constexpr std::size_t size = identity_block::size;
-    if (const std::size_t nul = nul_in_block(field.data()); nul != size) [[likely]]
-        return nul + 1 == field.size();
+    const unsigned nuls = nuls_in_block(field.data());
+    if (field.size() <= size) [[likely]]
+        return static_cast<std::size_t>(std::countr_zero(nuls | 1U << size)) + 1 == field.size();
     // The block that ends with the field: no NUL is before it.
-    if (field.size() > size && field.size() <= 2 * size)
-        return nul_in_block(field.data() + field.size() - size) == size - 1;
+    if (field.size() <= 2 * size)
+        return nuls == 0 && nuls_in_block(field.data() + field.size() - size) == 1U << (size - 1);
     return format::holds_exact_string(field);
 }
 
@@ -111,6 +116,9 @@ public:
     identity_start(const char *text, std::size_t length)
         : first_(fold8(first_word(text, length))), second_(fold8(second_word(text, length))) {}
 
+    // Of an identity that sorts behind all that can be.
+    static identity_start behind_all() { return identity_start(UINT64_MAX, UINT64_MAX); }
+
     // True for most entries that the wanted identity sorts behind, and for no others. Two words of `stored`, the
     // identity of an entry, can be read even if it is shorter.
     //
@@ -119,22 +127,25 @@ public:
     // sorts before the wanted identity even so does sort before it.
     bool is_far_behind(byte_span stored) const {
         constexpr std::uint64_t case_bits = in_each_byte('a' - 'A');
-        const std::uint64_t behind = stored.size() < word_size ? UINT64_MAX >> (8 * stored.size()) : 0;
-        const std::uint64_t first = first_byte_highest(load8(stored.data()) | case_bits) | behind;
+        const std::uint64_t first =
+            first_byte_highest(load8(stored.data()) | case_bits) | bits_behind(stored.size());
         if (first < first_) [[likely]]
             return true;
         return first == first_ && stored.size() >= 2 * word_size &&
                first_byte_highest(load8(stored.data() + word_size) | case_bits) < second_;
     }
 
-    // The same at a closer look. `block` is the start of a field that ends in NUL: what stands behind that NUL takes no
-    // part, as the wanted identity differs before, or ends there too and is padded with bytes that nothing sorts before.
-    bool is_clearly_behind(const identity_block &block) const {
-        const std::uint64_t first = block.first();
-        return first == first_ ? block.second() < second_ : first < first_;
+    // The same at a closer look, of an entry whose field ends in NUL.
+    bool is_clearly_behind(const identity_block &stored) const {
+        const std::uint64_t first = stored.first();
+        if (first < first_) [[likely]]
+            return true;
+        return first == first_ && stored.second() < second_;
     }
 
 private:
+    identity_start(std::uint64_t first, std::uint64_t second) : first_(first), second_(second) {}
+
     // The words are put together in registers: to load one right after fewer bytes were stored would stall a decision
     // for as long as comparing some entries takes.
     static std::uint64_t first_word(const char *text, std::size_t length) {
