@@ -26,6 +26,9 @@ public:
 
     std::span<sec_acltree_t *const> trees() const { return {trees_.get(), count_}; }
 
+    // Fetches the memory that inserting an entry of a text looks at, for those who have something else to do first.
+    void expect(const qz::acle_view &acle) const;
+
     // What sec__add_acle_to_trees does.
     int add(const qz::acle_view &acle);
 
