@@ -164,7 +164,8 @@ int evaluate_single(const sec_acl_buffer_t *acl, single_request &request, const 
         return report_bad_parameter(function, 1, 0);
     if (mask == nullptr)
         return report_bad_parameter(function, 5, 0);
-    if (const int result = check_buffer(format::bytes_of(*acl)); result != SEC_S_OK)
+    const byte_span bytes = format::bytes_of(*acl);
+    if (const int result = check_buffer(bytes); result != SEC_S_OK)
         return result;
     const std::uint8_t type = request.type();
     if (!is_single_type(type) && !has_mechanism(type))
@@ -177,7 +178,7 @@ int evaluate_single(const sec_acl_buffer_t *acl, single_request &request, const 
     }
     *mask = 0;
 
-    format::subacl_walk walk(format::bytes_of(*acl));
+    format::subacl_walk walk(bytes);
     if (!find_subacl(walk, type, subacl_mechanism == nullptr ? request.mechanism : subacl_mechanism))
         return no_match(request, "");
     const format::subacl &head = walk.current();
@@ -245,12 +246,13 @@ int evaluate_groups(const sec_acl_buffer_t *acl, std::int32_t count, const sec_g
         return report_bad_parameter(function, 3, 0);
     if (mask == nullptr)
         return report_bad_parameter(function, 4, 0);
-    if (const int result = check_buffer(format::bytes_of(*acl)); result != SEC_S_OK)
+    const byte_span bytes = format::bytes_of(*acl);
+    if (const int result = check_buffer(bytes); result != SEC_S_OK)
         return result;
     *mask = 0;
     if (count == 0)
         return SEC_S_OK;
-    format::subacl_walk walk(format::bytes_of(*acl));
+    format::subacl_walk walk(bytes);
     if (!find_subacl(walk, SEC_ACLE_GROUP, nullptr) || count < 0)
         return no_group();
 
