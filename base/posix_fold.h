@@ -24,6 +24,33 @@ constexpr std::uint64_t fold8(std::uint64_t word) {
     return word | (upper >> 2);
 }
 
+// Orders the folded words at two places: below 0, 0 or above 0.
+inline int fold_compare8(const char *a, const char *b) {
+    const std::uint64_t left = first_byte_highest(fold8(load8(a)));
+    const std::uint64_t right = first_byte_highest(fold8(load8(b)));
+    return left == right ? 0 : left < right ? -1 : 1;
+}
+
+// Orders two runs of n bytes without regard to case, NUL being a byte like any other: below 0, 0 or above 0.
+inline int fold_compare(const char *a, const char *b, std::size_t n) {
+    if (n >= word_size) {
+        // The last word may overlap the one before it, whose bytes are then known to be alike.
+        const std::size_t last = n - word_size;
+        for (std::size_t at = 0; at < last; at += word_size) {
+            if (const int order = fold_compare8(a + at, b + at); order != 0)
+                return order;
+        }
+        return fold_compare8(a + last, b + last);
+    }
+    for (; n != 0; ++a, ++b, --n) {
+        const int left = fold(static_cast<unsigned char>(*a));
+        const int right = fold(static_cast<unsigned char>(*b));
+        if (left != right)
+            return left - right;
+    }
+    return 0;
+}
+
 // Compares two NUL-terminated strings without regard to case: below 0, 0 or above 0. It reads single bytes, because a
 // word could reach past the end of the storage.
 constexpr int fold_compare(const char *a, const char *b) {

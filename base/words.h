@@ -40,6 +40,11 @@ constexpr std::uint64_t first_byte_highest(std::uint64_t loaded) {
     return std::endian::native == std::endian::little ? __builtin_bswap64(loaded) : loaded;
 }
 
+// The bits after the first `count` bytes of a number whose first byte is the highest; none for eight bytes.
+constexpr std::uint64_t bits_behind(std::size_t count) {
+    return count < word_size ? UINT64_MAX >> (8 * count) : 0;
+}
+
 // The high bit of the lowest zero byte, or 0. Higher bits are masked off, because a borrow may have set some of them
 // by mistake.
 constexpr std::uint64_t lowest_zero(std::uint64_t word) {

@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 
 #include <string>
+#include <utility>
 
 namespace {
 
@@ -26,17 +27,79 @@ TEST(PackedIdentity, EndsExactlyWhereItsFirstNulIsTheLastByte) {
     }
 }
 
-// What differs only after the strings, in the bytes of the next entry, says nothing of their order.
-TEST(PackedIdentity, SortsBeforeWithinItsOwnBytesAlone) {
-    for (std::size_t differing = 0; differing < readable; ++differing) {
-        std::string lesser(readable, 'b');
-        std::string greater(readable, 'B');
-        lesser[differing] = 'a';
-        const qz::identity_block first(reinterpret_cast<const unsigned char *>(lesser.data()));
-        const qz::identity_block second(reinterpret_cast<const unsigned char *>(greater.data()));
-        EXPECT_TRUE(first.sorts_before_within(differing + 1, second)) << differing;
-        EXPECT_FALSE(first.sorts_before_within(differing, second)) << differing;
-        EXPECT_FALSE(second.sorts_before_within(readable, first)) << differing;
+// Around the limits of words and blocks, with bytes that folding changes, leaves alone, or that are higher than letters.
+const std::string identities[] = {"",
+                                  "A",
+                                  "a_",
+                                  "a`",
+                                  "AB",
+                                  "abcdef",
+                                  "abcdefg",
+                                  "abcdefg_",
+                                  "abcdefg`",
+                                  "abcdefgH",
+                                  "abcdefghi",
+                                  "user_000@",
+                                  "USER_001",
+                                  "user_0010",
+                                  "z",
+                                  "[",
+                                  "\xff\xff",
+                                  "same-start-of-16",
+                                  "same-start-of-16x"};
+
+// The field of an identity with what may follow it in a buffer.
+struct field {
+    field(const std::string &identity, char behind)
+        : size(identity.size() + 1), bytes(identity + '\0' + std::string(readable, behind)) {}
+
+    qz::byte_span span() const { return {reinterpret_cast<const unsigned char *>(bytes.data()), size}; }
+
+    std::size_t size;
+    std::string bytes;
+};
+
+void expect_behind_only_what_sorts_before(const std::string &wanted, const std::string &stored, char behind) {
+    const field held(stored, behind);
+    const qz::identity_start start(wanted.c_str(), wanted.size());
+    const bool sorts_before = qz::fold_compare(stored.c_str(), wanted.c_str()) < 0;
+    const bool differs_early =
+        qz::fold_compare(stored.substr(0, readable).c_str(), wanted.substr(0, readable).c_str()) != 0;
+    const qz::identity_block block(held.span());
+    EXPECT_EQ(start.is_clearly_behind(block), sorts_before && differs_early)
+        << stored << " before " << wanted;
+    EXPECT_EQ(block.sorts_before(qz::identity_block(field(wanted, 'a').span())),
+              sorts_before && differs_early);
+    EXPECT_TRUE(sorts_before || !start.is_far_behind(held.span())) << stored << " before " << wanted;
+}
+
+TEST(PackedIdentity, SortsBehindOthersWhateverFollowsThem) {
+    for (const char behind : {'\0', '\1', 'a', '\xff'}) {
+        for (const std::string &wanted : identities) {
+            for (const std::string &stored : identities)
+                expect_behind_only_what_sorts_before(wanted, stored, behind);
+        }
+    }
+}
+
+TEST(PackedIdentity, IsFarBehindWhereNoOtherByteThanLettersAndDigitsDiffers) {
+    const std::pair<std::string, std::string> rows[] = {{"bob", "Alice"},
+                                                        {"BOB", "alice"},
+                                                        {"user0002@corp.com", "USER0001@corp.com"},
+                                                        {"abcdefghijklmnZ", "ABCDEFGHIJKLMNA"}};
+    for (const auto &[wanted, stored] : rows)
+        EXPECT_TRUE(
+            qz::identity_start(wanted.c_str(), wanted.size()).is_far_behind(field(stored, 'x').span()))
+            << stored << " before " << wanted;
+}
+
+// A field that no NUL ends says nothing of what would follow it, whatever bytes do.
+TEST(PackedIdentity, IsNotFarBehindWhatItStartsWith) {
+    const std::string wanted = "abcdefghijklmnopq";
+    const qz::identity_start start(wanted.c_str(), wanted.size());
+    for (std::size_t size = 0; size <= readable; ++size) {
+        const field held(wanted.substr(0, size), '\0');
+        EXPECT_FALSE(start.is_far_behind(held.span().first(size))) << size;
     }
 }
 

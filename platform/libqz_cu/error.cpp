@@ -205,7 +205,7 @@ int cu_get_errmsg_1(const cu_error_t *error, char **text) {
     const recorded_error &from = record_of(error);
     const char *shown = from.present ? text_of(from) : "";
     // Most texts fit here and are formatted only once.
-    char room[1024];
+    char room[512];
     const std::size_t size = format_text(shown, from.given, room, sizeof room);
     char *made = static_cast<char *>(std::malloc(size));
     if (made == nullptr)

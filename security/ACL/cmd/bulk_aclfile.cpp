@@ -126,11 +126,12 @@ int read_entries(acl_text &text, unsigned flags, sec_acltree_array &trees, bool 
         int result = SEC_S_OK;
         bool may_go_on = goes_on;
         if (line == acl_line::entry) {
+            const acle_view acle = view_of(entry);
             if (is_verbose) {
+                trees.expect(acle);
                 const sec_acle_t shown = record_of(entry);
                 sec__dump_acle(&shown, nullptr, "");
             }
-            const acle_view acle = view_of(entry);
             result = may_wait ? trees.add_soon(acle) : trees.add(acle);
             may_go_on = goes_on && result == SEC_S_BAD_ACLE;
         } else {

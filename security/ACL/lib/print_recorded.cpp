@@ -11,7 +11,8 @@ bool print_recorded(std::FILE *stream, const char *ending) {
     const bool has_text = cu_get_error_1(&error) == SEC_S_OK && cu_get_errmsg_1(error, &text) == SEC_S_OK;
     if (has_text) {
         std::fputs(text, stream);
-        std::fputs(ending, stream);
+        if (*ending != '\0')
+            std::fputs(ending, stream);
     }
     cu_rel_error_1(error);
     cu_rel_errmsg_1(text);

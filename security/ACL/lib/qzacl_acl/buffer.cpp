@@ -1,10 +1,6 @@
-// Whole compiled buffers: creating, copying, releasing, and finding a sub-ACL.
-#include "qzacl_acl/buffer.h"
-
+// Whole compiled buffers: making, taking over and releasing.
 #include "base/owned.h"
-#include "base/posix_fold.h"
 #include "qzacl_acl/buffer_format.h"
-#include "qzacl_acl/entry.h"
 #include "report.h"
 #include "trace_points.h"
 
@@ -40,17 +36,6 @@ int release_checked(sec_acl_buffer_t *acl) {
     return SEC_S_OK;
 }
 
-// True when a mechanism field holds the mechanism, in any letter case.
-bool holds_mechanism(byte_span field, const char *mechanism) {
-    for (std::size_t index = 0; index < field.size(); ++index) {
-        if (fold(field[index]) != fold(static_cast<unsigned char>(mechanism[index])))
-            return false;
-        if (field[index] == '\0')
-            return true;
-    }
-    return false;
-}
-
 } // namespace
 
 int sec_create_empty_acl(sec_acl_buffer_t *acl) {
@@ -72,18 +57,4 @@ int sec_read_acl_from_data(int length, const void *data, sec_acl_buffer_t *acl) 
 
 int sec_release_acl(sec_acl_buffer_t *acl) {
     return run(operation::release_acl, std::tie(acl), [&] { return release_checked(acl); });
-}
-
-int sec__find_subacl(const sec_acl_buffer_t *acl, std::uint8_t type, const char *mechanism,
-                     const unsigned char **subacl) {
-    *subacl = nullptr;
-    format::subacl_walk walk(format::bytes_of(*acl));
-    while (walk.next() == format::subacl_walk::step::found) {
-        const format::subacl &head = walk.current();
-        if (head.type == type && (!has_mechanism(type) || holds_mechanism(head.mechanism, mechanism))) {
-            *subacl = walk.bytes().data();
-            break;
-        }
-    }
-    return SEC_S_OK;
 }

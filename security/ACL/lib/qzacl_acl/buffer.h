@@ -2,19 +2,28 @@
 #ifndef QZACL_BUFFER_H
 #define QZACL_BUFFER_H
 
+#include "base/posix_fold.h"
 #include "qz/acl.h"
 #include "qzacl_acl/buffer_format.h"
+#include "qzacl_acl/entry.h"
 
 #include <cstddef>
 #include <cstdint>
 
-// Finds the first sub-ACL of a type and, for types 4 and 8, of a mechanism in any letter case; other types ignore
-// `mechanism`. Sets `*subacl` to its start, or to null if it is not found before the bytes end. Always returns
-// SEC_S_OK.
-int sec__find_subacl(const sec_acl_buffer_t *acl, std::uint8_t type, const char *mechanism,
-                     const unsigned char **subacl);
-
 namespace qz {
+
+// True when a sub-ACL's field holds the mechanism, in any letter case.
+inline bool holds_mechanism(byte_span field, const char *mechanism) {
+    for (std::size_t index = 0; index < field.size(); ++index) {
+        const auto wanted = static_cast<unsigned char>(mechanism[index]);
+        // Most have the same letter case.
+        if (field[index] != wanted && fold(field[index]) != fold(wanted))
+            return false;
+        if (wanted == '\0')
+            return true;
+    }
+    return false;
+}
 
 // A sub-ACL in a buffer.
 struct stored_subacl {
@@ -23,32 +32,31 @@ struct stored_subacl {
     format::subacl head;
 };
 
-// The same, and reads its header. `entries` then starts at the first entry and reaches to the end of the buffer.
-// Inline, and the header is read again: a decision among few entries would otherwise spend a third of its time on
-// loading what the search has just stored.
-[[gnu::always_inline]] inline bool find_subacl(const sec_acl_buffer_t &acl, std::uint8_t type,
-                                               const char *mechanism, format::subacl &head,
-                                               byte_reader &entries) {
-    const unsigned char *start = nullptr;
-    sec__find_subacl(&acl, type, mechanism, &start);
-    if (start == nullptr)
-        return false;
-    const byte_span bytes = format::bytes_of(acl);
-    entries = byte_reader(bytes.subspan(static_cast<std::size_t>(start - bytes.data())));
-    return format::read(entries, head);
+} // namespace qz
+
+// Steps to the first sub-ACL of a type and, for types 4 and 8, of a mechanism in any letter case; other types ignore
+// `mechanism`. False if it is not found before the bytes end.
+inline bool sec__find_subacl(qz::format::subacl_walk &walk, std::uint8_t type, const char *mechanism) {
+    while (walk.next() == qz::format::subacl_walk::step::found) {
+        const qz::format::subacl &head = walk.current();
+        if (head.type == type && (!qz::has_mechanism(type) || qz::holds_mechanism(head.mechanism, mechanism)))
+            return true;
+    }
+    return false;
 }
 
 // The same for functions that change or copy the sub-ACL.
-inline stored_subacl find_subacl(const sec_acl_buffer_t &acl, std::uint8_t type, const char *mechanism) {
-    stored_subacl found;
-    byte_reader entries;
-    found.is_there = find_subacl(acl, type, mechanism, found.head, entries);
-    if (found.is_there)
-        found.offset = format::bytes_of(acl).size() - entries.left() - format::subacl_header_size -
-                       found.head.mechanism_length;
+inline qz::stored_subacl sec__find_subacl(const sec_acl_buffer_t &acl, std::uint8_t type,
+                                          const char *mechanism) {
+    const qz::byte_span bytes = qz::format::bytes_of(acl);
+    qz::format::subacl_walk walk(bytes);
+    qz::stored_subacl found;
+    found.is_there = sec__find_subacl(walk, type, mechanism);
+    if (found.is_there) {
+        found.offset = static_cast<std::size_t>(walk.bytes().data() - bytes.data());
+        found.head = walk.current();
+    }
     return found;
 }
-
-} // namespace qz
 
 #endif

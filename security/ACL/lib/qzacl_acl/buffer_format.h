@@ -47,7 +47,9 @@ inline constexpr std::size_t order_offset = 2;
 inline constexpr std::size_t count_offset = 3;
 
 inline constexpr std::size_t subacl_header_size = 10;
+inline constexpr std::size_t subacl_type_offset = 4;
 inline constexpr std::size_t subacl_count_offset = 5;
+inline constexpr std::size_t subacl_mechanism_length_offset = 9;
 
 inline constexpr std::size_t entry_fixed_size = 7;
 inline constexpr std::size_t entry_mask_offset = 1;
@@ -89,14 +91,26 @@ inline byte_span bytes_of(const sec_acl_buffer_t &acl) {
 }
 
 inline bool read(byte_reader &reader, header &out) {
-    return reader.field(out.type) && reader.field(out.version) && reader.field(out.order) &&
-           reader.field(out.subacl_count);
+    byte_span fixed;
+    if (!reader.bytes(header_size, fixed))
+        return false;
+    out.type = fixed[0];
+    out.version = fixed[1];
+    out.order = fixed[order_offset];
+    out.subacl_count = load_field<std::uint16_t>(fixed, count_offset);
+    return true;
 }
 
 // Reads the fixed fields of a sub-ACL, up to its mechanism.
 inline bool read_fixed_part(byte_reader &reader, subacl &out) {
-    return reader.field(out.length) && reader.field(out.type) && reader.field(out.entry_count) &&
-           reader.field(out.mechanism_length);
+    byte_span fixed;
+    if (!reader.bytes(subacl_header_size, fixed))
+        return false;
+    out.length = load_field<std::uint32_t>(fixed, 0);
+    out.type = fixed[subacl_type_offset];
+    out.entry_count = load_field<std::uint32_t>(fixed, subacl_count_offset);
+    out.mechanism_length = fixed[subacl_mechanism_length_offset];
+    return true;
 }
 
 // Reads the fixed fields and the mechanism of a sub-ACL, up to its first entry.
@@ -125,9 +139,13 @@ inline bool holds_exact_string(byte_span field) {
     return !field.empty() && std::memchr(field.data(), '\0', field.size()) == &field.back();
 }
 
+// True when a field's last byte is a NUL, whether or not it is the first one. Such a field holds a string.
+inline bool ends_in_nul(byte_span field) { return !field.empty() && field.back() == '\0'; }
+
 // A string field as a C string, or null if it has no NUL.
 inline const char *string_in(byte_span field) {
-    if (field.empty() || std::memchr(field.data(), '\0', field.size()) == nullptr)
+    // Most fields end with their string, which takes no call to see.
+    if (!ends_in_nul(field) && (field.empty() || std::memchr(field.data(), '\0', field.size()) == nullptr))
         return nullptr;
     return reinterpret_cast<const char *>(field.data());
 }
@@ -141,42 +159,57 @@ inline std::string_view text_in(byte_span field) {
     return {reinterpret_cast<const char *>(field.data()), length};
 }
 
-// The entries of a sub-ACL that are still to be read.
-struct entry_walk {
-    byte_reader entries;
+// How far a walk got: the bytes skipped, and the entries that are left.
+struct skipped_entries {
+    std::size_t bytes = 0;
     std::uint32_t left = 0;
 };
 
 // Skips entries while `is_passed` returns true for their version and identity, of which `readable` bytes may be
-// read even if it is shorter. Also stops before an entry that reaches beyond the end, whose field does not end in
-// NUL, or that has fewer bytes after it than another entry with `readable` bytes of identity takes. Such entries,
-// and so the last ones of a buffer, are left to the checked reader. Decisions spend their time in this loop, so
-// each step has only one test for the end of the bytes and one for the field.
+// read even if it is shorter. Also stops before an entry that reaches beyond the end, or that has fewer bytes after
+// it than another entry with `readable` bytes of identity takes. Such entries, and so the last ones of a buffer, are
+// left to the checked reader. Decisions spend their time in this loop, so each step has only one test for the end
+// of the bytes.
 template <class Passed>
-void skip_entries_while(entry_walk &walk, std::size_t readable, const Passed &is_passed) {
-    if (walk.entries.left() < entry_fixed_size + readable)
-        return;
-    const unsigned char *const start = walk.entries.position();
+skipped_entries skip_entries_while(byte_reader entries, std::uint32_t left, std::size_t readable,
+                                   const Passed &is_passed) {
+    if (entries.left() < entry_fixed_size + readable)
+        return {0, left};
+    const unsigned char *const start = entries.position();
     // The last place at which an entry may start, as a number: sums do not wrap and form no invalid pointer.
     const auto number_of = [](const unsigned char *place) {
         return std::uint64_t{reinterpret_cast<std::uintptr_t>(place)};
     };
-    const std::uint64_t last = number_of(start) + (walk.entries.left() - (entry_fixed_size + readable));
+    const std::uint64_t last = number_of(start) + (entries.left() - (entry_fixed_size + readable));
     const unsigned char *at = start;
-    std::uint32_t left = walk.left;
     for (; left != 0; --left) {
         std::uint16_t length = 0;
         std::memcpy(&length, at + entry_length_offset, sizeof length);
         const unsigned char *const identity = at + entry_fixed_size;
         const std::size_t size = length;
-        if (size == 0 || number_of(identity) + size > last || identity[size - 1] != '\0')
+        if (number_of(identity) + size > last) [[unlikely]]
             break;
-        if (!is_passed(*at, byte_span(identity, size)))
+        if (!is_passed(*at, byte_span(identity, size))) [[unlikely]]
             break;
         at = identity + size;
     }
-    walk.entries.skip(static_cast<std::size_t>(at - start));
-    walk.left = left;
+    return {static_cast<std::size_t>(at - start), left};
+}
+
+// The entries of a sub-ACL that are still to be read.
+struct entry_walk {
+    byte_reader entries;
+    std::uint32_t left = 0;
+
+    void step(const skipped_entries &skipped) {
+        entries.skip(skipped.bytes);
+        left = skipped.left;
+    }
+};
+
+template <class Passed>
+void skip_entries_while(entry_walk &walk, std::size_t readable, const Passed &is_passed) {
+    walk.step(skip_entries_while(walk.entries, walk.left, readable, is_passed));
 }
 
 // Skips entries without looking at their contents. False if one reaches beyond the end.
@@ -218,6 +251,12 @@ public:
     }
 
     const subacl &current() const { return current_; }
+    // From the first entry of the current sub-ACL to the end of the buffer.
+    byte_reader entries() const {
+        byte_reader behind_header = next_;
+        behind_header.skip(subacl_header_size + current_.mechanism_length);
+        return behind_header;
+    }
     // The bytes that the current sub-ACL may use: up to the next sub-ACL or, for the last one, to the end of the
     // buffer. So even if forged sub-ACLs overlap, walking over all entries takes time linear in the bytes.
     byte_span bytes() const {

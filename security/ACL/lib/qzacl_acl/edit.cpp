@@ -53,7 +53,7 @@ int check_header(const sec_acl_buffer_t &acl) {
 
 // Finds the sub-ACL to edit. All bytes that the edit replaces must exist.
 int find_edited(const sec_acl_buffer_t &acl, const sec_acle_t &acle, stored_subacl &out) {
-    out = find_subacl(acl, acle.type, acle.mechanism);
+    out = sec__find_subacl(acl, acle.type, acle.mechanism);
     if (out.is_there && out.head.length > static_cast<std::size_t>(acl.length) - out.offset)
         return report_corrupt(__LINE__);
     return SEC_S_OK;

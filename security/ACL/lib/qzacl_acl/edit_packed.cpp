@@ -20,31 +20,24 @@ bool has_sorted_form(const format::subacl &head) {
 }
 
 // Skips entries that are clearly in compiled form and ascending order, up to the possible place of the wanted
-// identity or, once its place is known, to the end. `previous` is the identity before the next entry.
-void skip_ascending(const wanted_identity &wanted, bool is_placed, byte_span &previous,
-                    format::entry_walk &walk) {
+// identity. `previous` is the identity before the next entry. Not inline, so that the loop's variables fit into
+// registers.
+[[gnu::noinline]] void skip_ascending(identity_start wanted, byte_span &previous, format::entry_walk &walk) {
     constexpr std::size_t block_size = identity_block::size;
     if (walk.left == 0 || previous.size() + walk.entries.left() < block_size)
         return;
-    const wanted_identity held_in_registers = wanted; // a copy that nothing else can change
-    identity_block before(previous.data());
-    std::size_t before_size = previous.size();
-    const unsigned char *last = previous.data();
+    byte_span last = previous;
+    identity_block before(last);
     format::skip_entries_while(walk, block_size, [&](std::uint8_t version, byte_span identity) {
-        const identity_block block(identity.data());
-        // Only bytes up to the previous identity's NUL count; other fields follow it.
-        if (version != format::entry_version || !before.sorts_before_within(before_size, block))
-            return false;
-        if (!is_placed && !held_in_registers.is_clearly_behind(block))
-            return false;
-        if (!ends_exactly(identity))
+        const identity_block block(identity);
+        if (version != format::entry_version || !before.sorts_before(block) ||
+            !wanted.is_clearly_behind(block) || !ends_exactly(identity))
             return false;
         before = block;
-        before_size = identity.size();
-        last = identity.data();
+        last = identity;
         return true;
     });
-    previous = {last, before_size};
+    previous = last;
 }
 
 // Finds the place of an identity in a user or group sub-ACL. False unless the bytes are exactly what compiling a
@@ -75,7 +68,7 @@ bool find_sorted(byte_span subacl, const format::subacl &head, const char *ident
         }
         previous = entry.identity;
         --walk.left;
-        skip_ascending(wanted, is_placed, previous, walk);
+        skip_ascending(is_placed ? identity_start::behind_all() : wanted.start(), previous, walk);
     }
     if (!is_placed)
         place = {subacl.size() - walk.entries.left(), 0};

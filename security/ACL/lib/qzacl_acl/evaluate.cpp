@@ -24,12 +24,12 @@
 #include "qzacl_acl/entry.h"
 #include "qzacl_acl/id_handlers.h"
 #include "qzacl_acl/packed_identity.h"
-#include "qzacl_init.h"
 #include "report.h"
 #include "trace_points.h"
 
 #include <algorithm>
 #include <array>
+#include <cstring>
 
 using namespace qz;
 
@@ -37,14 +37,19 @@ namespace {
 
 constexpr unsigned type_bits = 0x1f;
 
-int check_buffer(const sec_acl_buffer_t &acl) {
-    const byte_span bytes = format::bytes_of(acl);
+int refuse_buffer(byte_span bytes) {
     if (bytes.size() < format::order_offset || bytes[0] != format::buffer_type ||
         bytes[1] != format::buffer_version)
         return report(SEC_S_BAD_ACL, msg::not_an_acl_buffer);
     if (bytes.size() > format::order_offset && bytes[format::order_offset] != format::host_order)
         return report(SEC_S_BAD_ACL, msg::wrong_byte_order);
-    return bytes.size() < format::header_size ? report_corrupt(__LINE__) : SEC_S_OK;
+    return report_corrupt(__LINE__);
+}
+
+inline int check_buffer(byte_span bytes) {
+    const bool is_ours = bytes.size() >= format::header_size &&
+                         std::memcmp(bytes.data(), format::empty_acl, format::count_offset) == 0;
+    return is_ours ? SEC_S_OK : refuse_buffer(bytes);
 }
 
 struct single_request {
@@ -105,21 +110,25 @@ int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler
     return no_match(request, request.identity);
 }
 
-// Skips entries that clearly sort before the wanted identity.
-[[gnu::noinline]] void skip_before(const wanted_identity &wanted, format::entry_walk &walk) {
-    const wanted_identity held_in_registers = wanted; // a copy that nothing else can change
-    format::skip_entries_while(walk, identity_block::size, [&](std::uint8_t, byte_span identity) {
-        return held_in_registers.is_clearly_behind(identity_block(identity.data()));
-    });
+// Skips entries that sort before the wanted identity, with the closer comparison.
+[[gnu::noinline]] format::skipped_entries skip_before(identity_start wanted, byte_reader entries,
+                                                      std::uint32_t left) {
+    return format::skip_entries_while(
+        entries, left, identity_block::size, [&](std::uint8_t, byte_span identity) {
+            return wanted.is_clearly_behind(identity_block(identity)) && format::ends_in_nul(identity);
+        });
 }
 
 // Compares the wanted identity with the entries from the next one on, and leaves the walk before the entry that
-// decides. Without one, the wanted identity sorts after all of them.
-identity_order compare_next(const wanted_identity &wanted, format::entry_walk &walk, format::entry &entry) {
-    for (;;) {
-        skip_before(wanted, walk);
-        if (walk.left == 0)
-            return identity_order::behind;
+// decides. Without one, the wanted identity sorts after all of them. Inline, so that the first loop keeps its
+// variables in registers.
+[[gnu::always_inline]] inline identity_order compare_next(const wanted_identity &wanted,
+                                                          format::entry_walk &walk, format::entry &entry) {
+    const identity_start start = wanted.start();
+    walk.step(format::skip_entries_while(
+        walk.entries, walk.left, identity_block::size,
+        [&](std::uint8_t, byte_span identity) { return start.is_far_behind(identity); }));
+    while (walk.left != 0) {
         byte_reader next = walk.entries;
         if (!format::read(next, entry))
             return identity_order::unknown;
@@ -127,7 +136,9 @@ identity_order compare_next(const wanted_identity &wanted, format::entry_walk &w
         if (order != identity_order::behind)
             return order;
         walk = {next, walk.left - 1};
+        walk.step(skip_before(start, walk.entries, walk.left));
     }
+    return identity_order::behind;
 }
 
 int evaluate_user(const single_request &request, const format::subacl &head, byte_reader entries,
@@ -152,7 +163,8 @@ int evaluate_single(const sec_acl_buffer_t *acl, single_request &request, const 
         return report_bad_parameter(function, 1, 0);
     if (mask == nullptr)
         return report_bad_parameter(function, 5, 0);
-    if (const int result = check_buffer(*acl); result != SEC_S_OK)
+    const byte_span bytes = format::bytes_of(*acl);
+    if (const int result = check_buffer(bytes); result != SEC_S_OK)
         return result;
     const std::uint8_t type = request.type();
     if (!is_single_type(type) && !has_mechanism(type))
@@ -165,11 +177,11 @@ int evaluate_single(const sec_acl_buffer_t *acl, single_request &request, const 
     }
     *mask = 0;
 
-    format::subacl head;
-    byte_reader entries;
-    if (!find_subacl(*acl, type, subacl_mechanism == nullptr ? request.mechanism : subacl_mechanism, head,
-                     entries))
+    format::subacl_walk walk(bytes);
+    if (!sec__find_subacl(walk, type, subacl_mechanism == nullptr ? request.mechanism : subacl_mechanism))
         return no_match(request, "");
+    const format::subacl &head = walk.current();
+    const byte_reader entries = walk.entries();
     if (is_single_type(type))
         return evaluate_single_entry(request, head, entries, *mask);
 
@@ -232,14 +244,14 @@ int evaluate_groups(const sec_acl_buffer_t *acl, std::int32_t count, const sec_g
         return report_bad_parameter(function, 3, 0);
     if (mask == nullptr)
         return report_bad_parameter(function, 4, 0);
-    if (const int result = check_buffer(*acl); result != SEC_S_OK)
+    const byte_span bytes = format::bytes_of(*acl);
+    if (const int result = check_buffer(bytes); result != SEC_S_OK)
         return result;
     *mask = 0;
     if (count == 0)
         return SEC_S_OK;
-    format::subacl head;
-    byte_reader entries;
-    if (!find_subacl(*acl, SEC_ACLE_GROUP, nullptr, head, entries) || count < 0)
+    format::subacl_walk walk(bytes);
+    if (!sec__find_subacl(walk, SEC_ACLE_GROUP, nullptr) || count < 0)
         return no_group();
 
     std::uint32_t granted = 0;
@@ -249,7 +261,8 @@ int evaluate_groups(const sec_acl_buffer_t *acl, std::int32_t count, const sec_g
         if (groups[index].name != nullptr)
             batch.add(groups[index].name);
         if (batch.is_full() || index == count - 1) {
-            if (const int result = batch.evaluate(head, entries, granted, is_found); result != SEC_S_OK)
+            if (const int result = batch.evaluate(walk.current(), walk.entries(), granted, is_found);
+                result != SEC_S_OK)
                 return result;
         }
     }
@@ -266,7 +279,6 @@ int sec__single_acle_perm(const sec_acl_buffer_t *acl, std::uint8_t type, const 
     return run(
         operation::single_acle_perm, std::tie(acl, type, mechanism, identity, mask),
         [&] {
-            pthread_once(&acl__init_once_block, acl__state_init);
             const trace_timer<point::deciding> timer;
             single_request request{type, mechanism, identity};
             const int result = evaluate_single(acl, request, subacl_mechanism, mask);
@@ -281,7 +293,6 @@ int sec__group_acles_perm(const sec_acl_buffer_t *acl, std::int32_t count, const
     return run(
         operation::group_acles_perm, std::tie(acl, count, groups, mask),
         [&] {
-            pthread_once(&acl__init_once_block, acl__state_init);
             const trace_timer<point::deciding_for_groups> timer;
             const int result = evaluate_groups(acl, count, groups, mask);
             timer.stop();

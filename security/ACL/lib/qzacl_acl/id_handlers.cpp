@@ -68,6 +68,7 @@ int sec__register_id_handler(std::uint32_t kind, const char *mechanism, sec_id_c
 
 int sec__get_id_handler(std::uint32_t kind, const char *mechanism, sec_id_compare_fn *handler) {
     const uncancelled until_unlocked;
+    pthread_once(&acl__init_once_block, acl__state_init);
     *handler = nullptr;
     if (const int error = pthread_mutex_lock(&acl__state.lock); error != 0)
         return report_lock_failure(__LINE__, error);

@@ -58,7 +58,7 @@ int append_first_of(const sec_acl_buffer_t &acl, std::uint8_t type, const char *
     const byte_span bytes = format::bytes_of(acl);
     if (is_cut_short(bytes))
         return report_corrupt(__LINE__);
-    const stored_subacl found = find_subacl(acl, type, mechanism);
+    const stored_subacl found = sec__find_subacl(acl, type, mechanism);
     return found.is_there ? append_subacl(bytes.subspan(found.offset), list) : SEC_S_OK;
 }
 

@@ -134,17 +134,21 @@ int sec_acltree_array::add(const acle_view &acle) {
     return add_to_tree(on_duplicate::report, acle, *last_found_);
 }
 
-int sec_acltree_array::add_soon(const acle_view &acle) {
+void sec_acltree_array::expect(const acle_view &acle) const {
     constexpr int for_writing = 1;
+    // Most entries have the key of the previous one.
+    if (last_found_ != nullptr && is_of_key(*last_found_, acle))
+        __builtin_prefetch(last_found_->first_look(acle), for_writing);
+}
+
+int sec_acltree_array::add_soon(const acle_view &acle) {
     int result = SEC_S_OK;
     acle_view &oldest = waiting_[first_waiting_];
     if (waiting_count_ == waiting_max)
         result = add(oldest);
     else
         ++waiting_count_;
-    // Most entries have the key of the previous one.
-    if (last_found_ != nullptr && is_of_key(*last_found_, acle))
-        __builtin_prefetch(last_found_->first_look(acle), for_writing);
+    expect(acle);
     oldest = acle;
     first_waiting_ = (first_waiting_ + 1) % waiting_max;
     return result;
