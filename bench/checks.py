@@ -41,10 +41,13 @@ def add_largest(commands, checker, file, lines):
     commands.add("without -s", checker, "-f", file(lines))
     commands.add("verbose", checker, "-v", "-f", file(lines), stderr=output)
     commands.add("bad", checker, "-c", "-f", file(lines, kind="bad"), stderr=output)
-    # Asked for what nobody has, so that printing is no part of it; the status may say so.
+    # The first two have nothing to print, and their status may say so.
     questioner = checker.with_name("qzacl")
     commands.add("ask", questioner, "ask", "-m", "unix", file(lines), "nobody@nowhere", statuses=(0, 1))
     commands.add("who", questioner, "who", file(lines), "rwcxCqledvsao", statuses=(0, 1))
+    commands.add("show", questioner, "show", file(lines))
+    commands.add("show --json", questioner, "show", "--json", file(lines))
+    commands.add("diff", questioner, "diff", file(lines), file(lines, order="sorted"), statuses=(1,))
 
 
 def measure_short(commands, checker, file, rounds):
@@ -130,5 +133,5 @@ def check_rows(table, commands, sizes):
     good = cpu["without -s"]
     table.ratio(f"{largest:,} with `-v` into a file", cpu["verbose"], "without", good, 3)
     table.ratio(f"{largest:,} bad lines with `-c` into a file", cpu["bad"], "good lines", good, 2.5)
-    for verb in ("ask", "who"):
-        table.ratio(f"`qzacl {verb}`, {largest:,}", cpu.get(verb), "`qzaclfck -f`", good, 1.5)
+    for verb, limit in (("ask", 1.5), ("who", 1.5), ("show", 2), ("show --json", 2.5), ("diff", 4)):
+        table.ratio(f"`qzacl {verb}`, {largest:,}", cpu.get(verb), "`qzaclfck -f`", good, limit)

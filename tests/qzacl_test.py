@@ -143,9 +143,14 @@ class Qzacl(unittest.TestCase):
 
     def test_messages_say_which_of_several_files(self):
         self.write("bad.cacl", b"\x85\x01")
-        for words in "diff a.acl bad.acl", "test bad.acl cases", "lint a.acl bad.acl", "diff bad.cacl bad.acl", "lint none.acl":
-            name = next(word for word in words.split() if word[:3] in ("bad", "non"))
-            self.assertRegex(self.run_words(words)[2].decode(), rf"\Aqzacl: {name}: does not (parse|read)\n3417-")
+        for words, first in [
+                ("diff a.acl bad.acl", "bad.acl: does not parse"),
+                ("diff bad.cacl bad.acl", "bad.cacl: does not read"),
+                ("test bad.acl cases", "bad.acl: does not parse"),
+                ("lint a.acl bad.acl", "bad.acl: does not parse"),
+                ("lint none.acl", "none.acl: does not read")]:
+            messages = self.run_words(words)[2].decode()
+            self.assertTrue(messages.startswith(f"qzacl: {first}\n3417-"), messages)
 
     def test_json_agrees_with_plain(self):
         for line, printed, status in ASKED:

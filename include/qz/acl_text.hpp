@@ -1,5 +1,5 @@
 /*
- * ACLs as texts, and compared: part of <qz/service.hpp>, at whose top the rules stand.
+ * ACLs as texts, and comparing them: part of <qz/service.hpp>, which states the rules.
  */
 #ifndef QZ_ACL_TEXT_HPP
 #define QZ_ACL_TEXT_HPP
@@ -18,7 +18,7 @@ namespace qz {
 
 /* ---- Texts ---- */
 
-/* A text of one's own that grows. Movable; ends with a NUL. */
+/* An owned text that grows. Movable; ends with a NUL. */
 class text {
 public:
     text() noexcept = default;
@@ -26,7 +26,7 @@ public:
     [[nodiscard]] std::string_view view() const noexcept { return {c_str(), size_}; }
     [[nodiscard]] const char *c_str() const noexcept { return bytes_ ? bytes_.get() : ""; }
 
-    /* Whether memory ran out in an append, which then and from there on changed nothing. */
+    /* Whether memory ran out in an append; it and all later ones changed nothing. */
     [[nodiscard]] bool failed() const noexcept { return failed_; }
 
     text &append(std::string_view more) noexcept {
@@ -70,7 +70,7 @@ private:
 
 namespace detail {
 
-/* A code that was found here, for which nothing is recorded. */
+/* A code that these headers return without a recorded error. */
 inline int unrecorded(int code) noexcept {
     cu_set_no_error_1();
     return code;
@@ -80,7 +80,7 @@ constexpr unsigned char fold(char c) noexcept {
     return static_cast<unsigned char>(c >= 'A' && c <= 'Z' ? c + ('a' - 'A') : c);
 }
 
-/* The order of names, as strcmp tells it: A to Z without regard to case, other bytes as they are. */
+/* Compares names as strcmp does, but ignores the case of A to Z. */
 inline int compare_folded(std::string_view a, std::string_view b) noexcept {
     const std::size_t common = std::min(a.size(), b.size());
     for (std::size_t at = 0; at < common; ++at) {
@@ -94,7 +94,7 @@ inline bool same_folded(std::string_view a, std::string_view b) noexcept {
     return a.size() == b.size() && compare_folded(a, b) == 0;
 }
 
-/* Whether a line of an ACL file can hold it as a word. White space is what the reader takes for it. */
+/* Whether a line of an ACL file can hold it as a word. White space is defined as for the reader. */
 inline bool is_word(std::string_view word) noexcept {
     const auto is_space = [](char c) { return std::isspace(static_cast<unsigned char>(c)) != 0; };
     return !word.empty() && word.front() != '#' && std::none_of(word.begin(), word.end(), is_space);
@@ -104,7 +104,7 @@ inline bool is_word(std::string_view word) noexcept {
 
 /* ---- Entries as lines ---- */
 
-/* An entry whose texts somebody else keeps: UTF-8, empty where the type takes none. */
+/* An entry that borrows its texts: UTF-8, empty if the type has none. */
 struct entry_fields {
     std::uint8_t type = 0; /* SEC_ACLE_...; 0: no entry */
     std::uint32_t permissions = 0;
@@ -112,14 +112,14 @@ struct entry_fields {
     std::string_view identity;
 };
 
-/* The letter of a type in ACL files; '?' for what is no type. */
+/* The letter of a type in ACL files; '?' for an unknown type. */
 constexpr char type_letter(std::uint8_t type) noexcept {
     return type <= SEC_ACLE_GROUP ? "?no?u???e???????g"[type] : '?';
 }
 
 /*
- * Appends an entry in the words of a line: single blanks, the mechanism in lower case, the identity as it is
- * stored, the letters in the order of their bits; no line end.
+ * Appends an entry as the words of a line: single blanks, the mechanism in lower case, the identity as stored, the
+ * letters in the order of their bits; no line end.
  *
  *   set   null: acl__default_perm_set
  *
@@ -145,12 +145,12 @@ inline int append_entry(text &line, const entry_fields &entry, const sec_perm_se
 }
 
 /*
- * An identity as sec_create_acle stores that of a user, but for the code set: with the mechanism "unix" or
- * "hba2", in any letter case, an IPv6 address behind the first '@' in its one form. What sec_create_acle
- * would refuse stays as it is.
+ * Converts an identity as sec_create_acle does for a user, except for the code set: with the mechanism "unix" or
+ * "hba2", in any letter case, an IPv6 address after the first '@' gets its canonical form. Identities that
+ * sec_create_acle would reject are not changed.
  *
  *   mechanism, identity   UTF-8; null gives identity
- *   kept                  holds the result where it is not identity itself; failed() when memory ran out
+ *   kept                  holds the result unless it is identity itself; failed() when memory ran out
  */
 inline const char *stored_identity(const char *mechanism, const char *identity, text &kept) noexcept {
     if (mechanism == nullptr || identity == nullptr ||
@@ -235,7 +235,7 @@ inline result<text> to_text(const acl &acl, const sec_perm_set_t *set = nullptr)
  *   lines   the text; may be empty, which gives an ACL without bytes
  *   set     null: acl__default_perm_set
  *
- * Codes: those of sec_read_acl_file for a text; 37, not recorded: the system gave no file in memory.
+ * Codes: those of sec_read_acl_file for a text; 37, not recorded: no file in memory could be created.
  */
 inline result<acl> from_text(std::string_view lines, const sec_perm_set_t *set = nullptr) noexcept {
     const detail::uncancelled until_the_file_is_closed;
@@ -285,9 +285,9 @@ private:
 } // namespace detail
 
 /*
- * Whether two ACLs say the same: the same entries with the same permissions, regardless of letter case and of
- * the order of entries, save that of user-expanded ones of a mechanism, of which the first that matches
- * decides. An ACL without bytes says the same as one without entries.
+ * Whether two ACLs are equivalent: the same entries with the same permissions, ignoring letter case and the order
+ * of entries, except for the user-expanded entries of a mechanism, of which the first match decides. An ACL
+ * without bytes is equivalent to one without entries.
  *
  * Codes: those of sec_list_acl; 6.
  */

@@ -1,5 +1,5 @@
 /*
- * Who asks for access, and what is answered: part of <qz/service.hpp>, at whose top the rules stand.
+ * Requesters and answers: part of <qz/service.hpp>, which states the rules.
  */
 #ifndef QZ_ANSWER_HPP
 #define QZ_ANSWER_HPP
@@ -13,15 +13,15 @@ namespace detail {
 class inquiry;
 }
 
-/* ---- Who asks ---- */
+/* ---- Requesters ---- */
 
-/* Whoever wants something. Keeps the pointers that it is given, to texts in UTF-8. */
+/* The subject of a decision. Stores the given pointers, to texts in UTF-8, without copying. */
 class requester {
 public:
-    /* Who did not authenticate. */
+    /* An unauthenticated requester. */
     [[nodiscard]] static constexpr requester unauthenticated() noexcept { return {}; }
 
-    /* An identity of a mechanism. An IPv6 host of it may be spelled in any way: see stored_identity. */
+    /* An identity of a mechanism. Its IPv6 host may be in any form: see stored_identity. */
     [[nodiscard]] static constexpr requester user(const char *mechanism, const char *identity) noexcept {
         requester made;
         made.is_user_ = true;
@@ -30,7 +30,7 @@ public:
         return made;
     }
 
-    /* The same user as a member of groups, which stand in a row; may be null when count is 0. */
+    /* The same user as a member of an array of groups; may be null when count is 0. */
     [[nodiscard]] constexpr requester in_groups(const sec_group_ref_t *first,
                                                 std::size_t count) const noexcept {
         requester changed = *this;
@@ -63,7 +63,7 @@ private:
     std::size_t group_count_ = 0;
 };
 
-/* ---- What is answered ---- */
+/* ---- Answers ---- */
 
 /*
  * The order in which answers are taken.
@@ -74,7 +74,7 @@ private:
  */
 enum class order : std::uint8_t { closest, sum };
 
-/* Whom an answer is about, and who decided: nobody when there is no entry, sum in the order of that name. */
+/* The party of an answer, and who decided: nobody when there is no entry, sum in the order of that name. */
 enum class who : std::uint8_t { nobody, user, expanded, group, any_other, unauthenticated, sum };
 
 /* "user", "expanded", "group", "any other", "unauthenticated", "sum"; nobody: "". */
@@ -84,26 +84,26 @@ inline std::string_view name_of(who party) noexcept {
     return names[static_cast<std::size_t>(party)];
 }
 
-/* What an ACL says of one party. */
+/* The answer of an ACL about one party. */
 struct party_answer {
     who party = who::nobody;
     bool decides = false;
-    entry_fields entry;     /* as it is stored; its type is 0 where there is none */
-    std::string_view group; /* of a group: its name, as the requester gave it */
+    entry_fields entry;     /* as stored; its type is 0 if there is none */
+    std::string_view group; /* for a group: its name, as the requester gave it */
 
     [[nodiscard]] bool has_entry() const noexcept { return entry.type != 0; }
 };
 
 /*
- * A decision: all answers, which of them decide, and what is granted. Movable. Its texts are good as long as
- * the ACL does not change and the requester's texts live; an answer from a snapshot keeps that itself.
+ * A decision: all answers, which of them decide, and the granted permissions. Movable. Its texts are valid while
+ * the ACL does not change and the requester's texts live; an answer from a snapshot keeps the snapshot.
  */
 class answer {
 public:
     /* Nothing granted, nothing answered. */
     answer() noexcept = default;
 
-    /* The permissions; of those that were wanted, allowed tells whether they are all granted. */
+    /* Permissions; allowed says whether all wanted ones are granted. */
     [[nodiscard]] std::uint32_t granted() const noexcept { return granted_; }
     [[nodiscard]] std::uint32_t wanted() const noexcept { return wanted_; }
     [[nodiscard]] bool allowed() const noexcept { return wanted_ != 0 && (granted_ & wanted_) == wanted_; }
@@ -112,7 +112,7 @@ public:
     [[nodiscard]] who decided_by() const noexcept { return decided_by_; }
 
     /*
-     * The answers, of a user: user, expanded, each group as the requester named them, any other; else:
+     * The answers. For a user: user, expanded, each group in the requester's order, any other; otherwise only
      * unauthenticated.
      */
     [[nodiscard]] const party_answer *begin() const noexcept { return answers_.get(); }
@@ -120,7 +120,7 @@ public:
     [[nodiscard]] std::size_t size() const noexcept { return count_; }
 
     /*
-     * Says why, in lines for people:
+     * Explains the decision in lines for people:
      *
      *   user: no entry
      *   expanded: PLACE: e unix .cluster.example rql (decides)

@@ -1,6 +1,6 @@
 /*
  * Access decisions of services: the order in which answers are taken, and handlers for hosts. Part of
- * <qz/service.hpp>, at whose top the rules stand.
+ * <qz/service.hpp>, which states the rules.
  */
 #ifndef QZ_DECIDE_HPP
 #define QZ_DECIDE_HPP
@@ -13,9 +13,9 @@ namespace qz {
 /* ---- Handlers for user-expanded entries, ready for sec__register_id_handler ---- */
 
 /*
- * An entry stands for a host, or with a dot before it for a domain: the host behind the requester's last '@'
- * equals the entry, or the entry begins with a dot and the host ends with it, without regard to the case of A
- * to Z. An identity without '@' has no host and matches nothing.
+ * An entry is a host, or a domain with a leading dot. It matches if the host after the requester's last '@' equals
+ * it, or if it begins with a dot and the host ends with it, ignoring the case of A to Z. An identity without '@'
+ * has no host and matches nothing.
  */
 inline int domain_handler(const char *requested, const char *entry) noexcept {
     const char *at = std::strrchr(requested, '@');
@@ -28,7 +28,7 @@ inline int domain_handler(const char *requested, const char *entry) noexcept {
     return detail::same_folded(host, end) ? 0 : 1;
 }
 
-/* An entry stands for the one identity that equals it, without regard to the case of A to Z. */
+/* An entry matches the one identity that equals it, ignoring the case of A to Z. */
 inline int exact_handler(const char *requested, const char *entry) noexcept {
     return detail::same_folded(requested, entry) ? 0 : 1;
 }
@@ -43,7 +43,7 @@ public:
     inquiry(const acl &acl, const requester &whom) noexcept
         : acl_(acl), whom_(whom), identity_(stored_identity(whom.mechanism_, whom.identity_, kept_)) {}
 
-    /* Takes the answers in order, and no more of them than it needs. */
+    /* Evaluates the answers in order, and stops when the result is known. */
     [[nodiscard]] decision granted(order taken) const noexcept {
         if (kept_.failed())
             return {unrecorded(SEC_S_NO_MEMORY), 0};
@@ -79,7 +79,7 @@ public:
         return code == SEC_S_OK ? look(*next, who::any_other) : code;
     }
 
-    /* Says which answers decide, and so what is granted. */
+    /* Determines which answers decide, and the granted permissions. */
     static void weigh(answer &made, order taken) noexcept {
         party_answer *const first = made.answers_.get(), *const end = first + made.count_;
         const auto *const closest =
@@ -101,7 +101,7 @@ public:
 private:
     [[nodiscard]] static decision nothing() noexcept { return {SEC_S_BAD_ACLE, 0}; }
 
-    /* An ACL without bytes, that of a file without entries, has no entry for anybody. */
+    /* An ACL without bytes, like that of a file without entries, has no entries. */
     [[nodiscard]] decision single(party asked) const noexcept {
         return acl_.bytes().empty() ? nothing() : acl_.single(asked);
     }
@@ -174,17 +174,16 @@ private:
 } // namespace detail
 
 /*
- * Decides what a requester may do, and tells every answer with its entry. Which user-expanded entry a handler
- * accepted is found by asking it again about one after the other; should it then accept none, the entry has
- * no identity.
+ * Decides what a requester may do, and returns every answer with its entry. To find the user-expanded entry that a
+ * handler accepted, the handler is called again for one entry after the other; if it then accepts none, the entry
+ * has no identity.
  *
- *   acl      may be without bytes, as that of a file without entries: nothing is granted
- *   wanted   permissions, of which answer::allowed tells whether all are granted; 0: nothing is wanted, and
- *            nothing allowed
+ *   acl      may have no bytes, like that of a file without entries: nothing is granted
+ *   wanted   permissions: answer::allowed says whether all are granted; 0: none is wanted, and allowed is false
  *   taken    the order in which answers are taken
  *
- * Codes: those of sec__single_acle_perm and sec__group_acles_perm, but for 43; 6. That there is no entry is
- * an answer. After a failure the answer grants nothing.
+ * Codes: those of sec__single_acle_perm and sec__group_acles_perm, but for 43; 6. No matching entry is
+ * not a failure. After a failure the answer grants nothing.
  */
 inline result<answer> decide(const acl &acl, const requester &whom, std::uint32_t wanted,
                              order taken = order::closest) noexcept {
@@ -198,7 +197,7 @@ inline result<answer> decide(const acl &acl, const requester &whom, std::uint32_
     return {detail::unrecorded(SEC_S_OK), std::move(made)};
 }
 
-/* The same by a snapshot, which the answer keeps. A null one is refused with 42 (3417-109). */
+/* The same for a snapshot, which the answer keeps. A null one fails with 42 (3417-109). */
 inline result<answer> decide(const acl_snapshot &snapshot, const requester &whom, std::uint32_t wanted,
                              order taken = order::closest) noexcept {
     if (!snapshot)
@@ -209,10 +208,10 @@ inline result<answer> decide(const acl_snapshot &snapshot, const requester &whom
 }
 
 /*
- * What decide would grant, and nothing else: asks no more than the order needs, and allocates nothing but for
- * another spelling of an IPv6 host.
+ * The permissions that decide would grant. Evaluates no more answers than the order needs, and allocates only to
+ * convert an IPv6 host.
  *
- * Codes: those of decide, and 43: nobody decides.
+ * Codes: those of decide; 43: no entry decides.
  */
 inline decision granted(const acl &acl, const requester &whom, order taken = order::closest) noexcept {
     return detail::inquiry(acl, whom).granted(taken);

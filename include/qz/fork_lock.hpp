@@ -1,6 +1,6 @@
 /*
- * A lock that a fork leaves free in the child: the part of <qz/service.hpp> behind live_acl. Nothing here is for
- * callers.
+ * A lock that is free in the child of a fork: the part of <qz/service.hpp> that live_acl needs. Nothing here is
+ * for callers.
  */
 #ifndef QZ_FORK_LOCK_HPP
 #define QZ_FORK_LOCK_HPP
@@ -14,7 +14,7 @@
 
 namespace qz::detail {
 
-/* How many forks lie between the first process and this one; counted from the first call on. */
+/* The number of forks that led to this process, from the first call of count_forks. */
 inline std::atomic<std::uint64_t> forks{0};
 
 inline void count_forks() noexcept {
@@ -36,7 +36,7 @@ public:
     fork_lock(const fork_lock &) = delete;
     fork_lock &operator=(const fork_lock &) = delete;
 
-    /* Tells whether it was made anew, so that what it protects may be half changed. */
+    /* Returns whether the mutex is new, so that the protected data may be half changed. */
     bool lock() noexcept {
         const bool is_new = renew();
         mutex_.lock();
@@ -47,7 +47,7 @@ public:
 private:
     [[nodiscard]] static std::uint64_t ready() noexcept { return 2 * forks.load(std::memory_order_relaxed); }
 
-    /* One thread of the child makes the mutex, while its others wait. A fork at that moment repeats this. */
+    /* One thread of the child makes the mutex while the others wait. After another fork this is repeated. */
     bool renew() noexcept {
         const std::uint64_t now = ready();
         for (std::uint64_t seen = state_.load(std::memory_order_acquire); seen != now;) {

@@ -1,5 +1,5 @@
 /*
- * An ACL file that is followed while it changes: part of <qz/service.hpp>, at whose top the rules stand.
+ * An ACL file that is reread when it changes: part of <qz/service.hpp>, which states the rules.
  */
 #ifndef QZ_LIVE_ACL_HPP
 #define QZ_LIVE_ACL_HPP
@@ -53,13 +53,13 @@ private:
     shared *shared_ = nullptr;
 };
 
-/* Says that a file holds the permissions of acl__default_perm_set, whoever reads it. */
+/* States that every program reads the file with the permissions of acl__default_perm_set. */
 struct default_permissions_t {};
 inline constexpr default_permissions_t default_permissions{};
 
 namespace detail {
 
-/* What tells two states of a file apart. */
+/* Distinguishes two states of a file. */
 struct file_stamp {
     dev_t device = 0;
     ino_t number = 0;
@@ -99,18 +99,18 @@ struct file_stamp {
 } // namespace detail
 
 /*
- * An ACL file as it is now: any number of threads take the snapshot and decide by it, while refresh, in one
- * of them or in several, reads the file anew when it has changed.
+ * The current state of an ACL file: any number of threads take the snapshot and decide by it, while one or
+ * several of them call refresh, which rereads the file when it has changed.
  *
- * Forks: the child may go on with the live_acl of its parent, whatever other threads did with it at that moment;
- * its first refresh may then read the file once more. This takes a fork that runs the handlers of
- * pthread_atfork, as fork does and vfork does not.
+ * Forks: the child can use the live_acl of its parent, even if other threads were using it at that moment; its
+ * first refresh may then read the file once more. The fork must run the handlers of pthread_atfork, as fork()
+ * does and vfork() does not.
  */
 class live_acl {
 public:
     /*
-     * Follows a file, which the first refresh reads: always its text. A cache file, whoever compiled it, may
-     * hold bits of another set of permissions, and nothing in it tells.
+     * Follows a file, which the first refresh reads: always its text. A cache file does not record the set of
+     * permissions that compiled it.
      *
      *   path   copied; a relative one is looked up from the working directory at each refresh
      *   set    the permissions of the text, not owned; null: acl__default_perm_set
@@ -118,7 +118,7 @@ public:
     explicit live_acl(const char *path, const sec_perm_set_t *set = nullptr) noexcept
         : live_acl(path, set, SEC_READ_ACL_TEXT) {}
 
-    /* Follows a file whose cache may be read, too, because everybody reads it with the default permissions. */
+    /* Follows a file that every program reads with the default permissions, so that its cache may be read. */
     live_acl(const char *path, default_permissions_t) noexcept
         : live_acl(path, nullptr, SEC_READ_ACL_CONVERT) {}
 
@@ -126,12 +126,12 @@ public:
     live_acl &operator=(const live_acl &) = delete;
 
     /*
-     * Reads the file if its device, number, size or one of its times is another than at the last reading, or
-     * if it had changed so shortly before that a further change might show the same times. What was read
-     * becomes the snapshot unless it is the same bytes. Clears the recorded error.
+     * Reads the file if its device, number, size or one of its times differs from the last reading, or if it
+     * changed so shortly before that reading that a further change might have the same times. The result becomes
+     * the snapshot unless its bytes are the same. Clears the recorded error.
      *
-     * The value tells whether there is a new snapshot. After a failure the last good one stays, the recorded
-     * error says what is wrong, and the next refresh tries again.
+     * The value says whether there is a new snapshot. After a failure the last good one stays, the recorded error
+     * says what is wrong, and the next refresh tries again.
      *
      * Codes: those of sec_read_acl_file; 6.
      * Threads: shared; several at once wait for each other.
@@ -145,13 +145,13 @@ public:
         return outcome;
     }
 
-    /* What was read last; null as long as nothing could be read. Threads: shared. */
+    /* The last good reading; null before the first. Threads: shared. */
     [[nodiscard]] acl_snapshot snapshot() const noexcept {
         const held lock(exchanging_);
         return current_;
     }
 
-    /* The code of the last refresh, by whatever thread; 37 before the first. Threads: shared. */
+    /* The code of the last refresh in any thread; 37 before the first. Threads: shared. */
     [[nodiscard]] int code() const noexcept { return code_.load(std::memory_order_relaxed); }
 
 private:
@@ -181,13 +181,13 @@ private:
         if (lacks_memory_)
             return {SEC_S_NO_MEMORY, false};
         result<bool> outcome = refresh_once();
-        /* A file that is exchanged between the looks that are taken at it is no trouble of the new one. */
+        /* A file that is replaced while it is being read is not a failure of the new file. */
         for (int left = 100; outcome.code() == SEC_S_FILE_ERROR && is_exchanged() && left != 0; --left)
             outcome = refresh_once();
         return outcome;
     }
 
-    /* Both the clock and the stamp before the reading, so that a change during it shows the next time. */
+    /* Takes the time and the stamp before reading, so that the next refresh notices a change during it. */
     result<bool> refresh_once() noexcept {
         timespec now = {};
         clock_gettime(CLOCK_REALTIME_COARSE, &now);
@@ -217,7 +217,7 @@ private:
         return look(now) && !(now == seen_);
     }
 
-    /* The old snapshot is released behind the lock. */
+    /* The old snapshot is released after the lock. */
     bool exchange(acl_snapshot made) noexcept {
         if (!made)
             return false;

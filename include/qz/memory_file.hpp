@@ -23,7 +23,7 @@ public:
     }
     [[nodiscard]] int number() const noexcept { return number_; }
 
-    /* Writes all bytes; false when the system refuses. */
+    /* Writes all bytes; false on failure. */
     [[nodiscard]] bool write_all(std::string_view bytes) const noexcept {
         while (!bytes.empty()) {
             const ssize_t written = write(number_, bytes.data(), bytes.size());
@@ -41,8 +41,8 @@ private:
 };
 
 /*
- * Makes a file in memory, on a descriptor that is none of a standard stream's: what another thread prints must
- * not end up in it. Negative when the system gives none.
+ * Creates a file in memory on a descriptor above those of the standard streams, so that output of other threads
+ * cannot end up in it. Negative on failure.
  */
 inline int make_memory_file() noexcept {
     const int made = memfd_create("acl", MFD_CLOEXEC);
@@ -52,7 +52,7 @@ inline int make_memory_file() noexcept {
     return make_memory_file();
 }
 
-/* Disables the cancellation of the thread for its scope: no operation is a point where it happens. */
+/* Disables cancellation of the thread for its scope: no operation is a cancellation point. */
 class uncancelled {
 public:
     uncancelled() noexcept { pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, &before_); }

@@ -1,6 +1,6 @@
 /*
- * What every service does with an ACL, for C++17 and later, over <qz/acl.hpp>: reading it anew when its file
- * changes, deciding in an agreed order and saying why, and handlers for hosts.
+ * The tasks of every service with an ACL, for C++17 and later, above <qz/acl.hpp>: rereading it when its file
+ * changes, deciding in an agreed order with an explanation, and handlers for hosts.
  *
  *   qz::live_acl acl("/etc/jobs.acl"); // its text: see live_acl
  *   sec__register_id_handler(SEC_ID_HANDLER_EXPANDED, "unix", qz::domain_handler);
@@ -20,9 +20,9 @@
  *   <qz/acl_text.hpp>   to_text, from_text, same, stored_identity, append_entry; text
  *
  * Everything keeps the rules of <qz/acl.hpp> and <qz/acl.h>: codes, recorded errors, owners, threads; neither
- * exceptions nor RTTI are needed, and nothing throws. "Not recorded" stands at a failure that these headers
- * find themselves, as it holds for their 6: the code is all, and no error is recorded then. Const operations
- * and functions are "Threads: shared".
+ * exceptions nor RTTI are needed, and nothing throws. "Not recorded" marks failures that these headers detect
+ * themselves, their code 6 included: they return the code and record no error. Const operations and functions
+ * are "Threads: shared".
  */
 #ifndef QZ_SERVICE_HPP
 #define QZ_SERVICE_HPP

@@ -1,6 +1,6 @@
 /*
- * Finds the entry behind an answer in the bytes of a compiled ACL, in place: the part of <qz/service.hpp>
- * that knows these bytes. Nothing here is for callers.
+ * Finds the entry of an answer in the bytes of a compiled ACL: the part of <qz/service.hpp> that knows their
+ * format. Nothing here is for callers.
  */
 #ifndef QZ_STORED_ENTRY_HPP
 #define QZ_STORED_ENTRY_HPP
@@ -31,7 +31,7 @@ public:
         return true;
     }
 
-    /* A field of so many bytes that holds a string; up to its NUL. */
+    /* A field of the given size that holds a string; returned up to its NUL. */
     [[nodiscard]] bool string(std::size_t size, std::string_view &out) noexcept {
         if (!take(size, out))
             return false;

@@ -2,23 +2,23 @@
 
     import qzacl
 
-    qzacl.register_expanded("unix", qzacl.domain)       # "e unix .cluster.example": everybody of that domain
-    live = qzacl.LiveAcl("/etc/service.acl")            # read anew when the file changes
+    qzacl.register_expanded("unix", qzacl.domain)       # "e unix .cluster.example": every host of that domain
+    live = qzacl.LiveAcl("/etc/service.acl")            # reread when the file changes
     live.refresh()
     alice = qzacl.Requester("unix", "alice@head.cluster.example", ("operators",))
     answer = qzacl.decide(live.snapshot(), alice, qzacl.to_mask("rw"))
     if not answer.allowed:
-        print(answer.explain())                         # each entry that speaks of her, and which one decides
+        print(answer.explain())                         # each entry about her, and which one decides
 
-    with qzacl.Acl.read("service.acl") as acl:          # one's own, to look at and to change
+    with qzacl.Acl.read("service.acl") as acl:          # an ACL to inspect and edit
         for entry in acl:
             print(entry)                                # "u unix alice@head.cluster.example rwxCqle"
         acl.add(qzacl.Entry.create(qzacl.GROUP, qzacl.to_mask("rq"), identity="auditors"))
 
-The libraries are those that the loader finds, or those in the folder that QZ_LIBRARY_DIR names.
+The loader finds the libraries, or QZ_LIBRARY_DIR names their folder.
 
 A failure raises qzacl.Error, with the code, the number and the text of the message; nothing is granted then. Texts are str,
-and UTF-8 in the library: bytes of a file that are none come out as surrogate escapes and go in again as they were. A NUL in
+and UTF-8 in the library: other bytes of a file become surrogate escapes, and are converted back. A NUL in
 a text raises ValueError. Permissions are masks of bits; to_mask and to_letters turn letters into them and back, by the
 library's own permissions or by a PermissionSet of a service.
 

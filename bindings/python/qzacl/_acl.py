@@ -111,17 +111,17 @@ class Acl:
             lib.sec_release_aclelist(byref(found))
 
     def add(self, entry: Entry) -> None:
-        """Adds an entry, or gives the one that is there the new permissions."""
+        """Adds an entry, or gives an existing one the new permissions."""
         self._changing()
         check(lib.sec_add_acle_to_acl(byref(entry.to_c()), byref(self._buffer)))
 
     def add_new(self, entry: Entry) -> None:
-        """Adds an entry; raises Error 43 when it is there already."""
+        """Adds an entry; raises Error 43 for a duplicate."""
         self._changing()
         check(lib.sec_add_acle_to_acl2(byref(entry.to_c()), byref(self._buffer)))
 
     def remove(self, entry: Entry) -> None:
-        """Deletes an entry, whatever its permissions; raises Error 18 when it is not there."""
+        """Deletes an entry, whatever its permissions; raises Error 18 if there is none."""
         self._changing()
         check(lib.sec_del_acle_from_acl(byref(entry.to_c()), byref(self._buffer)))
 
@@ -174,7 +174,7 @@ class Acl:
 
 
 def _memory_file() -> int:
-    """A file in memory, on a descriptor of no standard stream: what is printed meanwhile must not become part of it."""
+    """A file in memory, on a descriptor above those of the standard streams, so that nothing is printed into it."""
     made = os.memfd_create("acl")
     if made > 2:
         return made
@@ -200,8 +200,8 @@ def _line_of(entry: Entry, permissions: PermissionSet | None) -> str:
 
 
 def same(a: Acl, b: Acl) -> bool:
-    """Whether two ACLs say the same, regardless of letter case and of order, save that of the user-expanded entries of a
-    mechanism, of which the first that matches decides."""
+    """Whether two ACLs are equivalent, ignoring letter case and order, except that of the user-expanded entries of a
+    mechanism, of which the first match decides."""
     def said(acl: Acl) -> list[tuple[int, str, str, int]]:
         keys = [(e.type, folded(e.mechanism), folded(e.identity), e.permissions) for e in acl]
         return sorted(keys, key=lambda key: (key[0], key[1], "" if key[0] == EXPANDED else key[2]))

@@ -1,4 +1,4 @@
-"""Access decisions: who asks, the order in which answers are taken, and what is said by which entry."""
+"""Access decisions: requesters, the order of answers, and the entry of each answer."""
 from __future__ import annotations
 
 import enum
@@ -16,9 +16,9 @@ from ._permissions import PermissionSet, mask_of, to_letters
 
 @dataclass(frozen=True)
 class Requester:
-    """Whoever wants something: an identity of a mechanism, in groups; Requester() did not authenticate.
+    """The subject of a decision: an identity of a mechanism, in groups; Requester() is unauthenticated.
 
-    An IPv6 host of the identity may be spelled in any way. With through_handler, user entries are compared by the
+    An IPv6 host of the identity may be in any form. With through_handler, user entries are compared by the
     mechanism's handler of register_user.
     """
 
@@ -47,7 +47,7 @@ class Order(enum.Enum):
 
 
 class Who(enum.Enum):
-    """Whom an answer is about, and who decided; SUM in the order of that name."""
+    """The party of an answer, and who decided; SUM in the order of that name."""
 
     USER = "user"
     EXPANDED = "expanded"
@@ -58,7 +58,7 @@ class Who(enum.Enum):
 
 
 class PartyAnswer(NamedTuple):
-    """What an ACL says of one party."""
+    """The answer of an ACL about one party."""
 
     party: Who
     entry: Entry | None  # as it is stored
@@ -67,9 +67,9 @@ class PartyAnswer(NamedTuple):
 
 
 class Answer(NamedTuple):
-    """A decision: all answers, which of them decide, and what is granted.
+    """A decision: all answers, which of them decide, and the granted permissions.
 
-    The answers are, of a user: user, expanded, each group as the requester named them, any other; else: unauthenticated.
+    The answers for a user are: user, expanded, each group in the requester's order, any other; otherwise unauthenticated.
     """
 
     granted: int

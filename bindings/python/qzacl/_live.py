@@ -1,4 +1,4 @@
-"""An ACL file that is followed while it changes."""
+"""An ACL file that is reread when it changes."""
 from __future__ import annotations
 
 import os
@@ -18,7 +18,7 @@ _COARSE_CLOCK = 5  # CLOCK_REALTIME_COARSE, which the module time does not name
 
 
 class _Stamp(NamedTuple):
-    """What tells two states of a file apart."""
+    """Distinguishes two states of a file."""
 
     device: int
     number: int
@@ -34,8 +34,8 @@ class _Stamp(NamedTuple):
 
 
 class LiveAcl:
-    """An ACL file as it is now: any number of threads decide by the snapshot, while refresh, in one of them or in several,
-    reads the file anew when it has changed. The child of os.fork may go on with it."""
+    """The current state of an ACL file: any number of threads decide by the snapshot, while one or several of them call
+    refresh, which rereads the file when it has changed. The child of os.fork can use it, too."""
 
     def __init__(self, path: str | os.PathLike[str], permissions: PermissionSet | None = None, *,
                  default_permissions: bool = False) -> None:
@@ -70,11 +70,11 @@ class LiveAcl:
 
     @property
     def problem(self) -> Error | None:
-        """What the last refresh, by whatever thread, raised; None after a good one."""
+        """The error of the last refresh in any thread; None after a good one."""
         return self._problem
 
     def snapshot(self) -> Acl:
-        """What was read last, which does not change and is not to be closed. Raises Error as long as nothing could be read."""
+        """The last good reading, which does not change and must not be closed. Raises Error before the first."""
         current, problem = self._current, self._problem
         if current is None:
             raise problem or Error(FILE_ERROR)
@@ -116,7 +116,7 @@ _all: weakref.WeakSet[LiveAcl] = weakref.WeakSet()
 
 
 def _free_locks() -> None:
-    """A thread that refreshed at the fork is none of the child, which would wait for it forever."""
+    """The child lacks the thread that was in a refresh at the fork, and would wait for it forever."""
     for live in _all:
         live._refreshing = threading.Lock()
         live._stamp = None

@@ -38,11 +38,11 @@ private:
     std::size_t line_ = 1;
 };
 
-// Puts entries into their trees. Some wait before, while the memory that their insertion looks at is fetched. Messages
-// are printed in the order of the lines.
+// Inserts entries into their trees, after a delay in which the memory for the insertion is prefetched. Messages are
+// printed in the order of the lines.
 class insertions {
 public:
-    // Messages of a file with a name begin with a line that says it.
+    // A name is printed in a line before the first message.
     insertions(sec_acltree_array &trees, const std::string &name) : trees_(trees), name_(name) {}
 
     bool is_sound() const { return is_sound_; }
@@ -55,7 +55,7 @@ public:
         waiting_[(first_ + count_++) % waiting_max] = entry;
     }
 
-    // Takes a line that holds no entry, whose error is recorded.
+    // Reports a line without an entry, whose error is recorded.
     void refuse(int code) {
         cu_error_t *error = nullptr;
         cu_get_error_1(&error);
@@ -80,7 +80,7 @@ private:
         note(trees_.add(entry));
     }
 
-    // Most entries are of the key that came up last.
+    // Most entries have the key of the newest tree.
     void fetch(const qz::acle_view &entry) const {
         const auto trees = trees_.trees();
         if (!trees.empty() && trees.back()->type() == entry.type &&

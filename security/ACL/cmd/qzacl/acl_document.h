@@ -16,25 +16,25 @@
 
 namespace qzacl {
 
-// Where an entry stands in a text; all zeros in a compiled buffer.
+// The place of an entry in a text; all zeros for a compiled buffer.
 struct text_place {
     std::size_t line = 0;  // from 1, by line feeds, as editors count
-    std::size_t begin = 0; // the byte at which its line begins, and the one behind its line end
+    std::size_t begin = 0; // the first byte of its line, and the one after its line end
     std::size_t end = 0;
 };
 
-// Who looks on while a file is read. The texts of an entry live as long as the document and end in NUL.
+// Callbacks while a file is read. The texts of an entry live as long as the document and end in NUL.
 struct reading {
     std::function<void(const qz::entry_fields &, const text_place &)> entry = {};
     std::function<void(std::string_view)> whole_text = {}; // before its first line is read
-    // An entry that names nobody, by its type and line.
+    // Each entry without an identity: its type and line.
     std::function<void(std::uint8_t, std::size_t)> unnamed = {};
     bool names_file = false; // in a line before the messages, for verbs with several files
 };
 
 class acl_document {
 public:
-    // Reads FILE, or standard input for "-". Whatever a check would say is printed, and all of it; then, or when
+    // Reads FILE, or standard input for "-". Prints all messages that a check would print; then, or when
     // the file cannot be read, told_trouble is thrown. Of a compiled buffer entries are handed out as a text
     // would have them.
     acl_document(const std::string &file, const permission_set &set, const reading &watched = {});

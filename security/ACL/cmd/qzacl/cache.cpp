@@ -25,7 +25,7 @@ struct finding {
     }
 };
 
-// Why services read the text, by the rules of cache_vetting, one by one and in the order in which they are told.
+// Why services read the text: the rules of cache_vetting in the order in which they are reported.
 const char *reason_of(const std::string &file, const struct stat &text) {
     const std::string name = file + qz::cache_extension;
     struct stat cache = {};
@@ -51,7 +51,7 @@ finding examine(const std::string &file, const permission_set &set) {
     struct stat text = {};
     if (stat(file.c_str(), &text) == 0 && S_ISREG(text.st_mode) && text.st_size == 0)
         return {"empty", true};
-    // What services do, and what they read is the answer. Of a file that is not there the library tells.
+    // Reads the file as services do. The library reports a missing file.
     std::uint32_t flags = 0;
     const auto read = qz::acl::read_file(file.c_str(), nullptr, set.get(), SEC_READ_ACL_CONVERT, &flags);
     require(read.code());

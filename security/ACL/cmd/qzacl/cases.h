@@ -8,7 +8,7 @@
 
 namespace qzacl {
 
-// "MECHANISM IDENTITY [+GROUP]... LETTERS yes|no"; "-" for both names is whoever did not authenticate.
+// "MECHANISM IDENTITY [+GROUP]... LETTERS yes|no"; "-" for both names is the unauthenticated party.
 struct test_case {
     std::size_t line = 0; // from 1, by line feeds
     std::string mechanism;

@@ -38,7 +38,7 @@ public:
         one_value(app_.add_option("--wait", line.wait));
     }
 
-    // Gives what is no option; behind "--", nothing is.
+    // Returns the words that are not options, and all words after "--".
     std::vector<std::string> read(command_line &line, const std::vector<std::string> &arguments) {
         refuse_empty_values(arguments);
         try {

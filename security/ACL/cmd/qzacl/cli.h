@@ -14,7 +14,7 @@ namespace qzacl {
 struct command_line {
     const verb *chosen = nullptr; // null: help is wanted, of all verbs
     bool wants_help = false;
-    std::vector<std::string> words; // behind the verb
+    std::vector<std::string> words; // after the verb
 
     bool is_json = false;
     std::optional<std::string> permissions;
@@ -30,7 +30,7 @@ struct command_line {
     unsigned wait = 10;    // seconds for the lock
 };
 
-// Reads the arguments behind the command's name. Throws wrong_use for what cannot be meant.
+// Reads the arguments after the command's name. Throws wrong_use for invalid ones.
 command_line read_command_line(std::span<const verb> verbs, const std::vector<std::string> &arguments);
 
 // What --help prints: of one verb, or of all.

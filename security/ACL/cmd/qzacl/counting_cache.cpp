@@ -83,7 +83,7 @@ outcome compile_once(const std::string &path, const sec_perm_set_t &set) {
 
 bool make_cache_count(const edited_file &file, std::chrono::seconds wait, const permission_set &set) {
     for (;;) {
-        // Other edits may go on meanwhile, of which each waits for its own cache.
+        // Other edits may happen meanwhile; each waits for its own cache.
         while (const long rest = rest_of_second(file.path()))
             std::this_thread::sleep_for(std::chrono::nanoseconds(rest));
         const lock_file lock(file, wait);

@@ -32,7 +32,7 @@ private:
     }
 };
 
-// Tells the differences one by one.
+// Prints the differences.
 class difference_list {
 public:
     difference_list(const call &call, const side &before, const side &after)
@@ -150,10 +150,10 @@ public:
             table_.enter(hash_of(entries.identity(place)), static_cast<std::uint32_t>(place));
     }
 
-    // Fetches what find will look at.
+    // Prefetches the memory that find reads.
     void fetch(const char *identity) const { __builtin_prefetch(table_.first_look(hash_of(identity))); }
 
-    // The place in the entries, or that behind them.
+    // The place in the entries, or their number if there is none.
     std::size_t find(const char *identity) const {
         const std::uint32_t found = table_.find(hash_of(identity), [&](std::uint32_t place) {
             return qz::compare_identities(entries_.identity(place), identity) == 0;
@@ -183,7 +183,7 @@ std::size_t compare_common(const tree_entries &before, const tree_entries &after
     return at;
 }
 
-// Entries of which the first that matches decides, so that their order is a difference.
+// Compares entries of which the first match decides, so that their order is a difference.
 void compare_chains(const tree_entries &before, const tree_entries &after, difference_list &found) {
     constexpr std::size_t fetched_ahead = 16;
     const std::size_t first = compare_common(before, after, found);

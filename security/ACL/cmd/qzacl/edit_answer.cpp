@@ -26,7 +26,7 @@ void say_whether_changed(const call &call, bool has_changed) {
     call.out.object(object);
 }
 
-// The text after the change; what it hides is told.
+// Returns the text after the change; prints a message if it hides a grant.
 std::string text_after(const call &call, const edited_file &file, const text_change &change) {
     const named_text text = {file.path(), file.text()};
     const auto entry = find_entry(text, call.permissions, change.key);

@@ -17,7 +17,7 @@ int answer_edit(const call &call, const edited_file &file, bool has_changed);
 // Makes one change of an entry, or with --check shows it: what set, remove, grant and revoke do. Gives the exit status.
 int change_entry(const call &call, const text_change &change);
 
-// The change that grant or revoke wants: of the letters that the second word names, with the key behind it.
+// The change of grant or revoke: the second word has the letters, and the key follows.
 text_change change_of_letters(const call &call, edit_action action);
 
 } // namespace qzacl

@@ -15,7 +15,7 @@ namespace qzacl {
 
 namespace {
 
-// The first letter of the next line; 'd' when there is none. No byte behind the line is taken, which is an editor's.
+// The first letter of the next line; 'd' at the end of input. Reads no byte after the line: an editor may need them.
 char read_answer() {
     char first = '\0';
     for (;;) {
@@ -59,7 +59,7 @@ bool edit_session::is_right(const std::string &text) const {
     return false;
 }
 
-// Whatever goes wrong here, what was typed is not lost yet.
+// After any failure here the edited text is still there.
 bool edit_session::write(const std::string &text) {
     try {
         const lock_file lock(file_, wait_);

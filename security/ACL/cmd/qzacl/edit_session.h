@@ -1,4 +1,4 @@
-// An editor on an ACL file: nothing that has mistakes takes its place, and nobody else's change is lost.
+// An editor on an ACL file: a text with mistakes never replaces it, and no change of others is lost.
 #ifndef QZACL_EDIT_SESSION_H
 #define QZACL_EDIT_SESSION_H
 

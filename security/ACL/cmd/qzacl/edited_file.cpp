@@ -39,7 +39,7 @@ edited_file::edited_file(const std::string &path) : path_(path) {
 }
 
 void edited_file::read() {
-    // Whoever replaces a file by rename between these two calls does not make them fail.
+    // Tries again if the file is replaced by rename between these two calls.
     constexpr int most_attempts = 50;
     for (int left = most_attempts; left != 0; --left) {
         file_ = qz::descriptor(openat(folder_.get(), leaf_.c_str(), reading));

@@ -12,8 +12,8 @@
 
 namespace qzacl {
 
-// Finds the lines of entries from the trees of a document. Their identities are those of the text, so that their
-// places in it tell the lines: by the line feeds before them, counted for each block of the text.
+// Finds the lines of entries in the trees of a document. The identities are in the text, so the line feeds before
+// them, which are counted for each block of the text, give the lines.
 class entry_lines {
 public:
     // Watches the document being read.
@@ -34,7 +34,7 @@ public:
         return found.line + static_cast<std::size_t>(std::popcount(found.feeds & before));
     }
 
-    // Fetches what line_of will look at for an entry of this identity.
+    // Prefetches the memory that line_of reads for an entry with this identity.
     void fetch(const char *identity) const {
         if (const std::size_t at = place_of(identity) / block_size; at < blocks_.size())
             __builtin_prefetch(&blocks_[at]);
@@ -60,7 +60,7 @@ private:
         }
     }
 
-    // A large number for what is not in the text.
+    // A large number for an identity outside the text.
     std::size_t place_of(const char *identity) const {
         return reinterpret_cast<std::uintptr_t>(identity) - reinterpret_cast<std::uintptr_t>(text_);
     }
@@ -87,8 +87,7 @@ public:
         return {entry.type, entry.perm_mask, entry.mechanism, entry.identity};
     }
 
-    // The same for entries that are taken one after the other. They lie in memory as they stood in the text, so
-    // those that come next are fetched ahead.
+    // The same in a loop over all entries: prefetches the next ones, which are in memory in the order of the text.
     qz::entry_fields in_turn(std::size_t at) const {
         constexpr std::size_t fetched_ahead = 32;
         if (entries_.size() - at > fetched_ahead) {

@@ -1,4 +1,4 @@
-// lint: what the checker lets through and nobody meant.
+// lint: likely mistakes that the checker accepts.
 #include "acl_document.h"
 #include "cli.h"
 #include "entry_words.h"

@@ -23,7 +23,7 @@ lock_file::lock_file(const edited_file &file, std::chrono::seconds wait)
     constexpr std::chrono::milliseconds pause(10);
     const auto last_moment = std::chrono::steady_clock::now() + wait;
     for (;;) {
-        // Who held the lock before may have removed its name since it was opened here: then a new one counts.
+        // The former holder may have removed the file since it was opened here: then a new one is the lock.
         if (open_or_make(file) && flock(file_.get(), LOCK_EX | LOCK_NB) == 0) {
             if (is_named())
                 break;
@@ -55,7 +55,7 @@ bool lock_file::open_or_make(const edited_file &file) {
         throw system_failure("cannot open " + file.path() + ".lock");
     if (!S_ISREG(status.st_mode) || status.st_nlink > 1)
         throw trouble(file.path() + ".lock is no lock: it is no regular file, or has several names");
-    // The owner of the file may then lock it, too, should a kill leave the lock of another user behind.
+    // So that the owner of the file can use the lock if another user's edit is killed.
     if (is_new && (fchown(file_.get(), file.status().st_uid, any_group) != 0 ||
                    fchmod(file_.get(), owner_alone) != 0)) {
         const trouble failure = system_failure("cannot protect " + file.path() + ".lock");

@@ -1,5 +1,5 @@
-// The lock that edits of a file take in turn: FILE.lock beside it. It is held with flock, so that one which a killed
-// edit left behind is no hindrance, and removed while it is held.
+// The lock that edits of a file take in turn: FILE.lock beside it. It is held with flock, so the lock of a killed
+// edit is free, and removed while it is held.
 #ifndef QZACL_LOCK_FILE_H
 #define QZACL_LOCK_FILE_H
 

@@ -37,8 +37,8 @@ constexpr verb verbs[] = {
     {"lint", "FILE...", "what a check lets through and nobody meant", "", 1, any_number, any_number, lint},
 };
 
-// A file that is opened later must not become one of the standard streams. One that was closed stays useless, so
-// that whoever reads or writes it is told.
+// A file that is opened later must not become one of the standard streams. A closed one stays unusable, so that
+// reading or writing it fails.
 void fill_standard_descriptors() {
     for (int fd = open("/dev/null", O_RDWR); fd >= 0; fd = open("/dev/null", O_RDWR)) {
         if (fd > STDERR_FILENO) {

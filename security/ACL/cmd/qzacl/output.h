@@ -14,15 +14,15 @@ using json = nlohmann::ordered_json;
 
 // A text as JSON can hold it: with U+FFFD for each byte that is no UTF-8.
 json json_text(std::string_view bytes);
-// Whether it stands in JSON as it is.
+// Whether JSON needs no escapes for it.
 bool is_plain_in_json(std::string_view bytes);
-// The same text as it stands in a line of JSON, in its quotation marks, appended.
+// Appends the same text as JSON, with its quotation marks.
 void append_json_text(std::string &line, std::string_view bytes);
 
 // A text in which control bytes are shown as \xHH, but for line feeds where they are to stay.
 std::string escaped(std::string_view text, bool keeps_line_feeds);
 
-// So many bytes are written at once.
+// The bytes to collect before they are written.
 inline constexpr std::size_t enough_to_write = 1 << 18;
 
 // Lines that are held back until all of them are known, without ever being moved to a larger place.
@@ -57,8 +57,8 @@ public:
     void lines(const held_lines &held);
     void object(const json &object);
 
-    // Writes what was gathered; called once more at the end. Throws trouble when it cannot be written. When
-    // nobody reads any more, the process ends as others do.
+    // Writes what was gathered; called once more at the end. Throws trouble when it cannot be written. After the reader
+    // of a pipe has closed it, ends the process as SIGPIPE does.
     void flush();
 
 private:

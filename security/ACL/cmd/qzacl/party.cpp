@@ -1,4 +1,4 @@
-// Whoever is asked about, and the handlers.
+// The subject of a question, and the handlers for user-expanded entries.
 #include "party.h"
 
 #include "entry_words.h"

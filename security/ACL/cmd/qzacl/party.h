@@ -1,4 +1,4 @@
-// Whoever is asked about, and the handlers that user-expanded entries are compared with.
+// The subject of a question, and the handlers for user-expanded entries.
 #ifndef QZACL_PARTY_H
 #define QZACL_PARTY_H
 

@@ -1,4 +1,4 @@
-// A copy of a text for an editor, in a folder that nobody else can look into.
+// A copy of a text for an editor, in a folder that no other user can read.
 #ifndef QZACL_PRIVATE_COPY_H
 #define QZACL_PRIVATE_COPY_H
 

@@ -20,7 +20,7 @@ public:
         : call_(call), file_(call.line.words[1]), handlers_(call.line.handlers), acl_(document.take_acl()),
           order_(call.line.takes_sum ? qz::order::sum : qz::order::closest) {}
 
-    // Tries the case that stands in a line.
+    // Checks the case in a line.
     void try_line(std::size_t number, std::string_view line) {
         try {
             const std::vector<std::string> words = words_of(line);

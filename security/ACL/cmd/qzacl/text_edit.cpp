@@ -63,7 +63,7 @@ std::string_view line_end_of(std::string_view text) {
     return text.substr(first, ends_in_crlf(text, first + 1) ? 2 : 1);
 }
 
-// Where reading ends: behind all bytes, or at a NUL where a line would begin. Anywhere else one is a mistake.
+// The end of the text: its last byte, or a NUL at the start of a line. Any other NUL is a mistake.
 std::size_t end_of_lines(std::string_view text) { return std::min(text.find('\0'), text.size()); }
 
 std::string with_line(std::string_view text, const std::string &words) {

@@ -20,7 +20,7 @@ struct named_text {
     std::string_view bytes;
 };
 
-// Reads the whole text as the checker does when it goes on after mistakes. Throws told_trouble when there is one.
+// Reads the whole text as the checker does with -c. Throws told_trouble after a mistake.
 void check_text(const named_text &text, const permission_set &set, const reading &watched = {});
 
 // The entry of a key.

@@ -1,4 +1,4 @@
-// What ends a verb early; main() tells it and ends with the status of trouble.
+// Exceptions that end a verb; main() prints their message and returns the status for trouble.
 #ifndef QZACL_TROUBLE_H
 #define QZACL_TROUBLE_H
 
@@ -10,20 +10,20 @@ namespace qzacl {
 // The exit statuses, as those of grep and diff.
 enum status : int { yes = 0, no = 1, failed = 2 };
 
-// Told as it stands.
+// With the message to print.
 struct trouble : std::runtime_error {
     using std::runtime_error::runtime_error;
 };
 
-// The command line says something that cannot be meant; told with the usage.
+// An invalid command line; printed with a hint to the usage.
 struct wrong_use : trouble {
     using trouble::trouble;
 };
 
-// The library recorded an error, which is told.
+// The library recorded an error, which main() prints.
 struct recorded_trouble : std::exception {};
 
-// All was told already.
+// All messages were printed.
 struct told_trouble : std::exception {};
 
 // Throws when the library's operation failed.
@@ -32,7 +32,7 @@ inline void require(int code) {
         throw recorded_trouble();
 }
 
-// Prints the library's recorded error as qzaclfck does, with an empty line behind it.
+// Prints the library's recorded error as qzaclfck does, followed by an empty line.
 void print_recorded_error();
 
 // Prints a line of this command's own on standard error.
