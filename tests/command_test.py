@@ -21,7 +21,7 @@ from typing import NamedTuple
 
 from command_case import (
     COMMAND, ENTRIES, INHERITED, IS_MUSL, IS_ROOT, NOBODY, ORDINARY, SANITIZED, SOURCE, WRITER, Code, CommandCase,
-    entry, message, posix_acl, run)
+    entry, message, posix_acl, run, unescaped)
 
 A_TEXT = "u abcd xyz wr\n"
 A_LINE = entry("u", "rw", "abcd", "xyz")
@@ -32,10 +32,6 @@ OF_THE_C_LIBRARY = {
     "unknown_option": f"{COMMAND}: " + ("unrecognized option: %s\n" if IS_MUSL else "invalid option -- '%s'\n"),
     "lacks_argument": f"{COMMAND}: option requires an argument" + (": %s\n" if IS_MUSL else " -- '%s'\n"),
 }
-
-
-def unescaped(text):
-    return text.encode("latin-1").decode("unicode_escape")
 
 
 def printed(words):
@@ -49,7 +45,7 @@ def printed(words):
 
 
 class AclText(NamedTuple):
-    """A text, what each of its lines leads to, as a code and what is printed, and its cache where it has no mistakes."""
+    """A text, what each of its lines leads to, as a code and what is printed, and the cache of one without mistakes."""
     text: str
     results: list
     cache: list
