@@ -100,11 +100,16 @@ def steps_of(text):
 
 # ---- Programs and files ----
 
+def environment_with(**more):
+    """What programs are run with, whatever the caller has."""
+    kept = {name: value for name, value in os.environ.items() if name.endswith("SAN_OPTIONS")}
+    return {**kept, "PATH": f"{PLACE.name}/bin:{os.environ['PATH']}", "LC_ALL": "C", **more}
+
+
 def run(arguments, cwd, environment=(), child=None, user=None):
     """Runs the command, and gives its status and what it prints; `child` is called just before."""
     rights = {"user": user, "group": user, "extra_groups": []} if user else {}
-    kept = {name: value for name, value in os.environ.items() if name.endswith("SAN_OPTIONS")}
-    environment = {**kept, "LC_ALL": "C", **dict(environment)}
+    environment = environment_with(**dict(environment))
     command = [COMMAND] + [text.encode("latin-1") for text in arguments]
     done = subprocess.run(command, cwd=cwd, env=environment, preexec_fn=child, stdin=subprocess.DEVNULL,
                           capture_output=True, check=False, timeout=300, **rights)  # in case that it hangs
@@ -114,10 +119,8 @@ def run(arguments, cwd, environment=(), child=None, user=None):
 
 def shown_by_a_shell(command, cwd):
     """What a transcript shows of a command."""
-    kept = {name: value for name, value in os.environ.items() if name.endswith("SAN_OPTIONS")}
-    environment = {**kept, "PATH": f"{PLACE.name}/bin:{os.environ['PATH']}", "LC_ALL": "C", "TMPDIR": cwd}
-    done = subprocess.run(["sh", "-c", command], cwd=cwd, env=environment, stdin=subprocess.DEVNULL,
-                          capture_output=True, check=False, timeout=300)
+    done = subprocess.run(["sh", "-c", command], cwd=cwd, env=environment_with(TMPDIR=cwd), check=False,
+                          stdin=subprocess.DEVNULL, capture_output=True, timeout=300)
     lines = done.stdout.decode("utf-8", "replace").splitlines()
     lines += ["! " + line for line in done.stderr.decode("utf-8", "replace").splitlines() if line]
     lines += [f"[{done.returncode}]"] if done.returncode else []

@@ -8,10 +8,10 @@ import os
 import pathlib
 import pwd
 import random
+import re
 import resource
 import signal
 import socket
-import struct
 import subprocess
 import sys
 import tempfile
@@ -207,12 +207,6 @@ class Output(CommandCase):
                 self.expect(["-vsf", "b"], Code.OK, "" if is_silent else A_LINE, [("b.cacl", A_CACHE)], child=close)
 
 
-def packed_subacl(kind, mask, names):
-    """A sub-ACL of the mechanism "m"."""
-    entries = b"".join(struct.pack("=BIH", 1, mask, len(name) + 1) + name.encode() + b"\0" for name in names)
-    return struct.pack("=IBIB", 12 + len(entries), kind, len(names), 2) + b"m\0" + entries
-
-
 def limited_to(memory):
     """What a process calls to set its own limits."""
     def limit():
@@ -237,10 +231,8 @@ class Memory(CommandCase):
             self.assertTrue(errors == "" if status == 0 else errors.startswith("3417-102"), errors)
         self.assertEqual(set(statuses), {Code.NO_MEMORY, Code.OK})
         self.assertEqual(statuses, sorted(statuses, reverse=True))
-        order = b"\2" if sys.byteorder == "little" else b"\1"
-        head = b"\x85\1" + order + struct.pack("=H", 2)
-        cache = head + packed_subacl(8, 0, names) + packed_subacl(4, 1, sorted_names)
-        self.assertTrue(pathlib.Path(self.dir, "a.cacl").read_bytes() == cache)
+        cache = pathlib.Path(self.dir, "a.cacl").read_text("latin-1")
+        self.assertTrue(re.findall(r"(\d{5})\0", cache) == names + sorted_names)
 
 
 NO_FILE = Code.BAD_FILENAME, message("bad_acl_file_name", "{dir}/a", 0)
