@@ -78,14 +78,14 @@ def unescaped(text):
 
 
 def rows(name):
-    """The rows of a file of cases, whose columns bars divide."""
+    """The rows of a file of cases, with a bar between columns."""
     for line in (SOURCE / "tests" / name).read_text("utf-8").splitlines():
         if line and not line.startswith("#"):
             yield line.split(" | ")
 
 
 def transcripts(name):
-    """Of a file of transcripts, which says itself how they are written: titles, and commands with what they print."""
+    """The cases of a file of transcripts: their titles, and commands with what they print."""
     start, *cases = re.split("(?m)^== ", (SOURCE / "tests" / name).read_text("utf-8"))
     setup = list(steps_of(start))
     for case in cases:
