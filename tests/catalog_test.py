@@ -9,34 +9,14 @@ import shutil
 import subprocess
 import sys
 import unittest
-from typing import NamedTuple
 
-from command_case import BUILD, IDS, IS_ROOT, NOBODY, SANITIZED, SOURCE, TEXTS, Code, CommandCase, entry, message, run
+from command_case import (
+    BUILD, IDS, IS_ROOT, NOBODY, SANITIZED, SOURCE, TEXTS, Code, CommandCase, entry, message, rows, run)
 
 ENGLISH = (BUILD / "share" / "qzseclib.msg").read_text("latin-1")
 GERMAN = (SOURCE / "translations" / "de.msg").read_text("utf-8")
 CHECKER = SOURCE / "tools" / "catalog.py"
 EXAMPLE = SOURCE / "examples" / "mistakes.acl"
-
-
-class Mistake(NamedTuple):
-    """A line in place of a message of the German source, and what is said of it."""
-    number: int
-    line: str
-    said: str
-
-
-MISTAKES = [
-    Mistake(81, '80 "?\\n"', "message 80 stands at line 6 already"),
-    Mistake(82, '82"?\\n"', "a blank and a text must follow the id"),
-    Mistake(83, '83 "%1$s %2$s %3$s\\n"', "message 83 does not have the conversions of the English text"),
-    Mistake(84, '4294967380 "?\\n"', "message 4294967380 is not one of the library's"),
-    Mistake(147, '147 "\\l"', 'an escape sequence other than \\n, \\t, \\\\ and \\"'),
-    Mistake(148, '148 "3417-"?', "text behind the closing quotation mark"),
-    Mistake(149, '149 "\\n', "no closing quotation mark"),
-    Mistake(150, '150 "3417-164 "', "message 150 does not end with a line feed (\\n)"),
-    Mistake(162, '162 "3417-164 \\n"', "message 162 does not begin with its number 3417-176 "),
-]
 
 
 def changed(source, number, line):
@@ -126,18 +106,19 @@ class Catalog(CommandCase):
         path = self.write("de.msg", source.encode())
         command = [sys.executable, "-B", CHECKER, "check", path]
         done = subprocess.run(command, stdout=subprocess.PIPE, text=True, check=False)
-        return done.stdout.replace(path + ":", "").splitlines(), done.returncode
+        return done.stdout.replace(path + ":", "").replace(" \n", "\n").splitlines(), done.returncode
 
     def test_checker(self):
         self.assertEqual(self.complaints(GERMAN), ([], 0))
         self.assertEqual(self.complaints(ENGLISH), ([], 0))
+        mistakes = list(rows("catalog.cases"))
         broken = GERMAN
-        for mistake in MISTAKES:
-            broken = changed(broken, mistake.number, mistake.line)
+        for number, line, _ in mistakes:
+            broken = changed(broken, number, line)
         expected = []
-        for mistake in MISTAKES:
-            lines_before = broken[:broken.index(mistake.line)].count("\n")
-            expected.append(f"{lines_before + 1}: {mistake.said}")
+        for _, line, said in mistakes:
+            lines_before = broken[:broken.index(line)].count("\n")
+            expected.append(f"{lines_before + 1}: {said}")
         lines = broken.count("\n")
         expected += [f"{lines}: message {number} is missing" for number in (81, 84)]
         self.assertEqual(self.complaints(broken), (expected, 1))

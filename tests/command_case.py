@@ -1,6 +1,7 @@
 """What the script tests share: the command as an administrator runs it, its messages, and files with their rights.
 
 A script test is called with the build folder, and then with arguments of unittest."""
+import doctest
 import enum
 import os
 import pathlib
@@ -69,18 +70,61 @@ def entry(letter, permissions, *identity):
     return formatted(forms[len(identity)], "", letter, *identity, permissions)
 
 
+# ---- Cases in files ----
+
+def unescaped(text):
+    """Text of a case, with the bytes that its escapes stand for."""
+    return text.encode("latin-1").decode("unicode_escape")
+
+
+def rows(name):
+    """The rows of a file of cases, with a bar between columns."""
+    for line in (SOURCE / "tests" / name).read_text("utf-8").splitlines():
+        if line and not line.startswith("#"):
+            yield line.split(" | ")
+
+
+def transcripts(name):
+    """The cases of a file of transcripts: their titles, and commands with what they print."""
+    start, *cases = re.split("(?m)^== ", (SOURCE / "tests" / name).read_text("utf-8"))
+    setup = list(steps_of(start))
+    for case in cases:
+        title, _, steps = case.partition("\n")
+        yield title, setup + list(steps_of(steps))
+
+
+def steps_of(text):
+    for command, printed in re.findall(r"(?m)^\$ (.*(?:\n>.*)*)\n((?:(?!\$ ).*\n)*)", text):
+        yield re.sub("\n> ?", "\n", command), printed.rstrip("\n")
+
+
 # ---- Programs and files ----
+
+def environment_with(**more):
+    """What programs are run with, whatever the caller has."""
+    kept = {name: value for name, value in os.environ.items() if name.endswith("SAN_OPTIONS")}
+    return {**kept, "PATH": f"{PLACE.name}/bin:{os.environ['PATH']}", "LC_ALL": "C", **more}
+
 
 def run(arguments, cwd, environment=(), child=None, user=None):
     """Runs the command, and gives its status and what it prints; `child` is called just before."""
     rights = {"user": user, "group": user, "extra_groups": []} if user else {}
-    kept = {name: value for name, value in os.environ.items() if name.endswith("SAN_OPTIONS")}
-    environment = {**kept, "LC_ALL": "C", **dict(environment)}
+    environment = environment_with(**dict(environment))
     command = [COMMAND] + [text.encode("latin-1") for text in arguments]
     done = subprocess.run(command, cwd=cwd, env=environment, preexec_fn=child, stdin=subprocess.DEVNULL,
                           capture_output=True, check=False, timeout=300, **rights)  # in case that it hangs
     printed = b"on standard output: " + done.stdout if done.stdout else done.stderr
     return done.returncode, printed.decode("latin-1")
+
+
+def shown_by_a_shell(command, cwd):
+    """What a transcript shows of a command."""
+    done = subprocess.run(["sh", "-c", command], cwd=cwd, env=environment_with(TMPDIR=cwd), check=False,
+                          stdin=subprocess.DEVNULL, capture_output=True, timeout=300)
+    lines = done.stdout.decode("utf-8", "replace").splitlines()
+    lines += ["! " + line for line in done.stderr.decode("utf-8", "replace").splitlines() if line]
+    lines += [f"[{done.returncode}]"] if done.returncode else []
+    return "\n".join(lines)
 
 
 ENTRIES = "system.posix_acl_access"
@@ -152,3 +196,12 @@ class CommandCase(unittest.TestCase):
             self.assertNotEqual(after.pop(name), before.pop(name, None))
             self.assertEqual(pathlib.Path(self.dir, name).read_bytes(), content)
         self.assertEqual(after, before)
+
+    def expect_transcripts(self, name):
+        for title, steps in transcripts(name):
+            self.fresh()
+            for command, printed in steps:
+                with self.subTest(title, command=command):
+                    shown = shown_by_a_shell(command, self.dir)
+                    if not doctest.OutputChecker().check_output(printed, shown, doctest.ELLIPSIS):
+                        self.assertEqual(shown, printed)

@@ -7,8 +7,6 @@
 #include <clocale>
 #include <dlfcn.h>
 #include <langinfo.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 using namespace support;
 using testing::PrintToString;
@@ -195,7 +193,7 @@ struct conversion {
 
 // A process opens its converters once, so that each conversion has one of its own.
 void expect_conversion(const conversion &row) {
-    if (fork() == 0) {
+    const int status = status_of_child([&] {
         claimed_code_set = row.code_set;
         std::setlocale(LC_ALL, row.locale);
         const std::string too_long = refused(3, address(row.mechanism));
@@ -203,9 +201,7 @@ void expect_conversion(const conversion &row) {
                   row.made.empty() ? too_long : row.made);
         EXPECT_EQ(shown_for(user(row.mechanism, row.identity, 0)), row.displayed);
         std::exit(testing::Test::HasFailure());
-    }
-    int status = -1;
-    EXPECT_GT(wait(&status), 0);
+    });
     EXPECT_EQ(status, 0) << row.mechanism << " in " << row.locale;
 }
 

@@ -12,8 +12,8 @@ import tempfile
 import unittest
 from pathlib import Path
 
-BUILD = Path(sys.argv.pop(1)).resolve()
-SOURCE = Path(__file__).resolve().parent.parent
+from command_case import BUILD, SOURCE, rows
+
 CACHE = dict(re.findall(r"^(\w+):\w+=(.*)$", (BUILD / "CMakeCache.txt").read_text(), re.M))
 SANITIZED = CACHE["QZ_SANITIZE"]
 COMMAND = BUILD / "bin/qzaclfck"
@@ -92,10 +92,7 @@ def facts():
 
 def service_cases():
     """The rows of example_services.cases: an ACL, the size of its cache, who asks, and the answer."""
-    for line in (SOURCE / "tests/example_services.cases").read_text("utf-8").splitlines():
-        if line.startswith("#"):
-            continue
-        text, size, requester, answer = line.split(" | ")
+    for text, size, requester, answer in rows("example_services.cases"):
         if text.startswith("examples/"):
             text = (SOURCE / text).read_text()
         text = text.replace("(nothing)", "").replace(" /", "\n")
@@ -252,16 +249,13 @@ class Completions(unittest.TestCase):
         asked = run("zsh", "-fc", ZSH, SOURCE / "completions" / script)
         return set(re.findall(r"(?m)^(?:\(- \*\)|\*)?(-[\w-]+)\[", asked))
 
-    def expect_usage(self, shell, script):
-        self.assertEqual(self.offered(shell, script, "qzaclfck -"), self.usage)
-        self.assertEqual(self.offered(shell, script, "qzaclfck -c -v -"), self.usage - {"-c", "-v"})
-        self.assertEqual(self.offered(shell, script, "qzaclfck -f mist"), {"mistakes.acl"})
-
-    def test_bash_completes_the_checker(self):
-        self.expect_usage("bash", "qzaclfck.bash")
-
-    def test_fish_completes_the_checker(self):
-        self.expect_usage("fish", "qzaclfck.fish")
+    def test_bash_and_fish_complete_the_checker(self):
+        for shell in "bash", "fish":
+            with self.subTest(shell):
+                script = "qzaclfck." + shell
+                self.assertEqual(self.offered(shell, script, "qzaclfck -"), self.usage)
+                self.assertEqual(self.offered(shell, script, "qzaclfck -c -v -"), self.usage - {"-c", "-v"})
+                self.assertEqual(self.offered(shell, script, "qzaclfck -f mist"), {"mistakes.acl"})
 
     def test_zsh_completes_the_checker(self):
         self.assertEqual(self.offered_by_zsh("_qzaclfck"), self.usage)
@@ -282,4 +276,4 @@ class Completions(unittest.TestCase):
 
 
 if __name__ == "__main__":
-    unittest.main()
+    unittest.main(argv=sys.argv[:1] + sys.argv[2:])

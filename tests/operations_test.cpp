@@ -114,32 +114,17 @@ TEST_F(operations, answer_alike_in_every_thread) {
         });
 }
 
-struct cancelled_use {
-    std::string path;
-    const sec_acl_buffer_t *shared = nullptr;
-    std::string found = {};
-};
-
-void *use_all_when_cancelled(void *given) {
-    auto &use = *static_cast<cancelled_use *>(given);
-    pthread_cancel(pthread_self());
-    const std::string found = use_all(use.path, *use.shared);
-    sec__dump_acl(use.shared);
-    use.found = found;
-    pthread_testcancel(); // the first point at which the thread ends
-    return nullptr;
-}
-
 TEST_F(operations, finish_in_a_thread_that_is_cancelled) {
-    cancelled_use use{written("acl"), &shared.acl};
-    void *ended = nullptr;
+    const std::string path = written("acl");
+    std::string found;
     testing::internal::CaptureStderr();
-    pthread_t thread = {};
-    ASSERT_EQ(pthread_create(&thread, nullptr, use_all_when_cancelled, &use), 0);
-    pthread_join(thread, &ended);
+    run_cancelled([&] {
+        const std::string result = use_all(path, shared.acl);
+        sec__dump_acl(&shared.acl);
+        found = result;
+    });
     EXPECT_NE(testing::internal::GetCapturedStderr(), "");
-    EXPECT_EQ(use.found, expected);
-    EXPECT_EQ(ended, PTHREAD_CANCELED);
+    EXPECT_EQ(found, expected);
 }
 
 TEST_F(operations, answer_once) { EXPECT_EQ(use_all(written("acl"), shared.acl), expected); }

@@ -4,9 +4,7 @@
 #include "support.h"
 
 #include <semaphore>
-#include <sys/wait.h>
 #include <thread>
-#include <unistd.h>
 
 namespace {
 
@@ -48,24 +46,17 @@ extern "C" int __wrap_tr_get_filename_1(char *name) {
 
 namespace {
 
-int status_of(pid_t child) {
-    int status = -1;
-    EXPECT_EQ(waitpid(child, &status, 0), child);
-    return status;
-}
-
 // The configuration is read once, so that each row has a process of its own.
 TEST(registration, asks_for_the_trace_file_when_times_are_traced) {
     const temporary_folder folder;
     for (const auto &[levels, times] : {std::pair("_SEL:Perf=1", 1), {"_SEL:Perf=5", 0}, {"_SEL:API=1", 0}}) {
-        const pid_t child = fork();
-        if (child == 0) {
+        const int status = status_of_child([&, levels = levels, times = times] {
             setenv("QZ_TRACE_LEVELS", levels, 1);
             setenv("QZ_TRACE_FILE", (folder / "trace").c_str(), 1);
             acl__trace_register_component();
             _exit(sizes_asked == times && names_asked == times ? 0 : 1);
-        }
-        EXPECT_EQ(status_of(child), 0) << levels;
+        });
+        EXPECT_EQ(status, 0) << levels;
     }
 }
 
@@ -103,7 +94,9 @@ TEST(fork, leaves_a_child_that_can_use_the_libraries) {
         }
         held.is_forked.release();
         holder.join();
-        EXPECT_EQ(status_of(child), 0);
+        int status = -1;
+        EXPECT_EQ(waitpid(child, &status, 0), child);
+        EXPECT_EQ(status, 0);
         EXPECT_TRUE(use());
     }
 }

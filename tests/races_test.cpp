@@ -1,5 +1,5 @@
-// Files exchanged, edited or removed between any two steps of a reader or a writer: no reader is ever told anything else
-// than the text says.
+// Files exchanged, edited or removed between any two steps of a reader or a writer: no reader is ever told anything
+// else than the text says.
 #include "acl_files.h"
 
 namespace {

@@ -95,7 +95,7 @@ TEST(tree, copies_what_it_cannot_point_to) {
     }
 }
 
-// Compiling sorts the entries and leaves out of their keys what all share; a tree that grows on knows them all the same.
+// Compiling sorts the entries and leaves out of their keys what all share; a tree that grows on knows them all.
 TEST(tree, takes_more_entries_after_it_was_compiled) {
     for (const int count : {3, 40}) {
         sec_acltree_t *root = nullptr;

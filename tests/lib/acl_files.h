@@ -8,7 +8,6 @@
 #include "support.h"
 
 #include <set>
-#include <sys/wait.h>
 
 namespace support {
 
@@ -70,18 +69,6 @@ inline faults_by_place before_step(std::size_t at, const std::function<void()> &
     };
 }
 inline bool is_about_to(const char *call) { return faults::calls.back() == call; }
-
-// How a process ends that does this.
-inline int status_of_child(const std::function<void()> &body) {
-    const pid_t child = fork();
-    if (child == 0) {
-        body();
-        _exit(0);
-    }
-    int status = -1;
-    EXPECT_EQ(waitpid(child, &status, 0), child);
-    return status;
-}
 
 inline const char *user_name() { return getpwuid(geteuid())->pw_name; }
 

@@ -1,4 +1,4 @@
-// What the tests of the ACL library share: errors, files and folders, ACLs written as text, and their bytes.
+// What the tests of the ACL library share: errors, files and folders, processes, ACLs written as text, and their bytes.
 #ifndef QZ_TESTS_SUPPORT_H
 #define QZ_TESTS_SUPPORT_H
 
@@ -12,12 +12,16 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <gtest/gtest.h>
 #include <iterator>
+#include <pthread.h>
 #include <random>
 #include <sstream>
 #include <string>
+#include <sys/wait.h>
 #include <sys/xattr.h>
+#include <unistd.h>
 #include <vector>
 
 namespace support {
@@ -168,6 +172,35 @@ inline bool give_entries(const std::string &path, unsigned user_bits, unsigned m
     const std::string limit = "\x10\0"s + static_cast<char>(mask) + "\0"s + no_id;
     const std::string all = "\2\0\0\0"s + owner + user_1 + group + limit + others;
     return setxattr(path.c_str(), "system.posix_acl_access", all.data(), all.size(), 0) == 0;
+}
+
+// ---- Processes and threads ----
+
+// How a process ends that does this.
+inline int status_of_child(const std::function<void()> &body) {
+    const pid_t child = fork();
+    if (child == 0) {
+        body();
+        _exit(0);
+    }
+    int status = -1;
+    EXPECT_EQ(waitpid(child, &status, 0), child);
+    return status;
+}
+
+// Does this in a thread that is cancelled already, and ends at the first point at which it can.
+inline void run_cancelled(std::function<void()> body) {
+    const auto start = [](void *given) -> void * {
+        pthread_cancel(pthread_self());
+        (*static_cast<std::function<void()> *>(given))();
+        pthread_testcancel();
+        return nullptr;
+    };
+    pthread_t thread = {};
+    void *ended = nullptr;
+    ASSERT_EQ(pthread_create(&thread, nullptr, start, &body), 0);
+    pthread_join(thread, &ended);
+    EXPECT_EQ(ended, PTHREAD_CANCELED);
 }
 
 // ---- Entries ----
