@@ -101,7 +101,7 @@ public:
     }
 
 private:
-    // What trees point into has readable bytes behind it.
+    // Trees may read this many bytes after the text that they point into.
     static constexpr std::size_t readable_behind = 7;
 
     // Whether another line may follow.
@@ -110,7 +110,7 @@ private:
         const line_facts wanted = parse_plainly(text_, at_, static_cast<int>(number));
         const int result = sec__read_acle_from_text(nullptr, &cursor_, &left_, &line_, &parsed_);
         const sec_acle_t acle = qz::record_of(parsed_);
-        const bool is_read = result == 1;
+        const bool is_read = result == qz::line_consumed;
         const bool is_entry = is_read && acle.type != 0;
         EXPECT_EQ(is_read ? no_error : outcome_of(result), wanted.error);
         EXPECT_EQ(is_entry ? text_of(acle) : "", wanted.entry);

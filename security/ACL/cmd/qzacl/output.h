@@ -1,7 +1,8 @@
-// What the verbs answer: lines for people, or JSON, one object a line.
+// The output of the verbs: lines for people, or JSON, one object per line.
 #ifndef QZACL_OUTPUT_H
 #define QZACL_OUTPUT_H
 
+#include <cstdint>
 #include <deque>
 #include <nlohmann/json.hpp>
 #include <string>
@@ -9,18 +10,19 @@
 
 namespace qzacl {
 
-// Keys stay in the order in which they were put in.
+// Keys keep their order of insertion.
 using json = nlohmann::ordered_json;
 
-// A text as JSON can hold it: with U+FFFD for each byte that is no UTF-8.
+// A text as JSON can hold it: with U+FFFD for each byte that is not UTF-8.
 json json_text(std::string_view bytes);
-// Whether JSON needs no escapes for it.
+// True if JSON needs no escapes for the text.
 bool is_plain_in_json(std::string_view bytes);
 // Appends the same text as JSON, with its quotation marks.
 void append_json_text(std::string &line, std::string_view bytes);
 
-// A text in which control bytes are shown as \xHH, but for line feeds where they are to stay.
-std::string escaped(std::string_view text, bool keeps_line_feeds);
+// What becomes of the line feeds in a text whose control bytes are shown as \xHH.
+enum class line_feeds : std::uint8_t { shown, kept };
+std::string escaped(std::string_view text, line_feeds feeds);
 
 // The bytes to collect before they are written.
 inline constexpr std::size_t enough_to_write = 1 << 18;
@@ -40,7 +42,7 @@ private:
     std::deque<std::string> parts_;
 };
 
-// Lines as they are shown on a descriptor: as they are, or on a terminal with control bytes as \xHH.
+// Lines as a descriptor shows them: unchanged or, on a terminal, with control bytes as \xHH.
 std::string shown_on(int fd, std::string_view lines);
 
 // Standard output. On a terminal control bytes are shown as \xHH, so that no identity can move the cursor.
@@ -62,7 +64,7 @@ public:
     void flush();
 
 private:
-    void add(std::string_view text, bool keeps_line_feeds);
+    void add(std::string_view text, line_feeds feeds);
     static void write(std::string_view bytes);
 
     bool is_json_;
