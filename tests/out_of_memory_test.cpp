@@ -35,11 +35,6 @@ struct use {
 };
 constexpr bool tolerated = true;
 
-struct failing_allocation {
-    std::size_t at = 0;  // from 1; 0 fails none
-    bool and_on = false; // also all behind that one
-};
-
 struct allocations : files {
     made_things made;
 
@@ -49,13 +44,15 @@ struct allocations : files {
     }
 
     // Tells how many allocations there were.
-    std::size_t run(const use &row, const failing_allocation &failing) {
-        SCOPED_TRACE(testing::Message() << "allocation " << failing.at << (failing.and_on ? " and on" : ""));
+    std::size_t run(const use &row, const faults::allocations_seen &failing) {
+        SCOPED_TRACE(testing::Message()
+                     << "allocation " << failing.fails_at << (failing.fails_on ? " and on" : ""));
         buffer held(rich);
         const auto live = faults::allocations.live;
         faults::allocations_seen seen;
         const outcome now = watched({}, [&] {
-            faults::allocations = {.fails_at = failing.at, .fails_on = failing.and_on, .live = live};
+            faults::allocations = failing;
+            faults::allocations.live = live;
             const int result = row.call(held.acl);
             seen = faults::allocations;
             faults::allocations = {.live = seen.live};
@@ -63,8 +60,8 @@ struct allocations : files {
         });
         EXPECT_TRUE(now.code == SEC_S_OK || made.is_empty());
         made.release();
-        EXPECT_TRUE(failing.at == 0 || faults::allocations.live == live) << "leaks";
-        if (failing.at == 0 || (row.is_tolerated && now.code == SEC_S_OK)) {
+        EXPECT_TRUE(failing.fails_at == 0 || faults::allocations.live == live) << "leaks";
+        if (failing.fails_at == 0 || (row.is_tolerated && now.code == SEC_S_OK)) {
             EXPECT_EQ(now.code, SEC_S_OK) << now.text;
             return seen.count;
         }
@@ -81,16 +78,16 @@ struct allocations : files {
         const std::size_t count = run(row, {});
         EXPECT_GT(count, 0u);
         for (std::size_t at = 1; at <= count; ++at) {
-            run(row, {.at = at});
-            run(row, {.at = at, .and_on = true});
+            run(row, {.fails_at = at});
+            run(row, {.fails_at = at, .fails_on = true});
         }
     }
 
     // The command prints, for which it sets memory aside, or says that it wrote no cache.
     static void expect_told(const use &row, const outcome &now, std::size_t size,
-                            const failing_allocation &failing) {
+                            const faults::allocations_seen &failing) {
         if (now.id != msg::no_memory.id) {
-            const bool is_skipped = failing.and_on && now.id == msg::cache_skipped_after_errors.id;
+            const bool is_skipped = failing.fails_on && now.id == msg::cache_skipped_after_errors.id;
             EXPECT_TRUE(is_skipped || printed.find("3417-102") != std::string::npos) << now.text;
             return;
         }
@@ -103,7 +100,7 @@ struct allocations : files {
         arguments sizes;
         for (const std::size_t room : {0u, 1u, 16u})
             sizes.push_back(" " + std::to_string(size - room) + " bytes");
-        EXPECT_TRUE(failing.and_on || std::ranges::any_of(sizes, is_told)) << size << " in " << now.text;
+        EXPECT_TRUE(failing.fails_on || std::ranges::any_of(sizes, is_told)) << size << " in " << now.text;
     }
 };
 
