@@ -150,7 +150,7 @@ void try_edits(const std::string &bytes, const model &held, const std::string &n
         }
 }
 
-// Questions whose answers nobody knows.
+// Questions without a known answer: only their codes and bounds are checked.
 void ask(const sec_acl_buffer_t &acl, const std::string &name) {
     sec_aclelist_t list = {};
     for (const int type : types) {

@@ -69,7 +69,7 @@ static void expect_check(const checked_bytes &row) {
 TEST(validate, accepts_what_is_sound) {
     const std::string long_mechanism =
         packed_subacl(SEC_ACLE_EXPANDED, text_field(std::string(254, 'm')), 1, xyz);
-    expect_check({"all types, and bytes behind the end", rich + "behind"});
+    expect_check({"all types, and bytes after the end", rich + "after"});
     expect_check({"a sub-ACL repeated", packed_acl(2, user_xyz + user_xyz)});
     expect_check({"no entries, and entries repeated", acl_bytes("e m:; g: z 4294967295, xyz 3, xyz 3")});
     expect_check({"a long mechanism", acl_of_one(with_number(long_mechanism, 3, 9))});
@@ -84,7 +84,7 @@ TEST(validate, finds_what_is_cut_short_or_of_another_length) {
         {"a length too long", packed_acl(2, with_number(user_xyz, 0, 27, 4) + any_other), corrupted},
         {"an entry cut short", acl_of_one(user_xyz.substr(0, 21)), corrupted},
         {"entries beyond number", acl_of_one(packed_subacl(SEC_ACLE_USER, "m\0"s, ~0u, xyz)), corrupted},
-        // After a faulty entry the walk stands at that entry, where no further sub-ACL starts.
+        // After a faulty entry the walk stays there, where no sub-ACL starts.
         {"a faulty entry before a sub-ACL", packed_acl(2, with_number(any_other, 10, 2) + any_other),
          corrupted},
     };
@@ -267,7 +267,7 @@ TEST(edit, holds_at_most_65535_subacls) {
     EXPECT_TRUE(held.bytes() == full.substr(0, full.size() - 25) + added);
 }
 
-// A handler is shown identities where they stand, and may keep one to add it: the buffer moves while that is done.
+// A handler sees identities in the buffer itself and may keep one to add it. The buffer moves during the addition.
 TEST(edit, adds_an_identity_that_lies_in_the_buffer) {
     buffer held(acl_bytes("u unix: of-a-long-name-that-makes-the-buffer-move 1"));
     sec_acle_t acle = user("unix", "", 2);

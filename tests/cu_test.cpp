@@ -105,7 +105,7 @@ TEST(Fold, AgreesWithTheCLibraryInItsOwnLocale) {
     for (int c = EOF; c < 256; ++c)
         EXPECT_EQ(cu_tolower_posix_1(c), std::tolower(c));
     const auto sign = [](int order) { return (order > 0) - (order < 0); };
-    // Any two bytes at every place of a word and behind it, between others that fold and such as might seem to.
+    // Any two bytes at every place of a word and after it, among others that fold or only seem to.
     for (unsigned at = 0; at < 10; ++at)
         for (unsigned pair = 1; pair < 0x10000; ++pair) {
             char a[] = "aZ@[\x7f\xc1\xff{zBq";

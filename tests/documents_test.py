@@ -198,7 +198,7 @@ class Documents(unittest.TestCase):
         self.assertEqual(self.run_in_shell("compare same other"), (0, "other: + g new r\n"))
 
     def commit(self, staged, present, environment):
-        """The status of a commit of one file while another stands in its place."""
+        """The status of committing a staged file while the working tree has another in its place."""
         stage = f"cd repo && cp ../examples/{staged}.acl 'a b.acl' && git add ."
         change = f"cp ../examples/{present}.acl *"
         commit = "git -c user.name=x -c user.email=x commit -m x"

@@ -42,13 +42,13 @@ SERVICES = (BUILD / "examples/service", BUILD / "examples/service_cpp")
 PYTHON_SERVICE = (sys.executable, "-B", SOURCE / "examples/python/service.py")
 UTF8 = {**os.environ, "LC_ALL": "C.UTF-8"}
 FOR_PYTHON = {**UTF8, "QZ_LIBRARY_DIR": str(BUILD / "lib"), "PYTHONPATH": str(SOURCE / "bindings/python")}
-if "address" in SANITIZED:  # its runtime must come first; what Python never frees is no leak of ours
+if "address" in SANITIZED:  # its runtime must come first; what Python never frees is not our leak
     ASKED = CACHE["CMAKE_CXX_COMPILER"], f"-print-file-name=libclang_rt.asan-{platform.machine()}.so"
     FOR_PYTHON["LD_PRELOAD"] = subprocess.check_output(ASKED, text=True).strip()
     FOR_PYTHON["ASAN_OPTIONS"] = "detect_leaks=0"
 CAN_LOAD = not SANITIZED or os.path.exists(FOR_PYTHON.get("LD_PRELOAD", ""))
 
-# What a shell is asked with: its script of completions, and the line so far.
+# How a shell is asked: its completion script and the line so far are the arguments.
 BASH = """. "$0"
 COMP_WORDS=($1)
 COMP_CWORD=$((${#COMP_WORDS[@]} - 1))
@@ -56,7 +56,7 @@ _PROGRAM
 printf "%s\\n" "${COMPREPLY[@]}"
 """
 FISH = "source $argv[1]; complete -C $argv[2]"
-# At a terminal only it completes: what its script asks of it is shown.
+# It completes only at a terminal, so this prints what its script asks for.
 ZSH = '_arguments() { print -l -- $@ }; . "$0"'
 
 
@@ -146,7 +146,7 @@ class Interface(unittest.TestCase):
             symbols = run("nm", "-D", "--defined-only", BUILD / f"lib/{library}.so")
             self.assertEqual(sorted(re.findall(r" [^A ] (\w+)", symbols)), declared(header), library)
 
-    @unittest.skipIf(SANITIZED, "the sanitizers stand in the place of the hardening")
+    @unittest.skipIf(SANITIZED, "the sanitizers replace the hardening")
     def test_binaries_are_hardened(self):
         of_libraries = ["GNU_RELRO", "FLAGS.*BIND_NOW|FLAGS_1.*NOW", "GNU_STACK.* RW +0x", "__stack_chk_fail"]
         with_checked_calls = [*of_libraries, r" __\w+(?<!stack)_chk@"]
@@ -162,7 +162,7 @@ class Interface(unittest.TestCase):
         if IS_X86_64 and shutil.which("objdump"):
             self.assertIn("endbr64", run("objdump", "-d", "--no-show-raw-insn", BUILD / name))
 
-    @unittest.skipIf(SANITIZED, "the sanitizers stand in the place of the hardening")
+    @unittest.skipIf(SANITIZED, "the sanitizers replace the hardening")
     def test_hardening_that_leaves_no_mark_was_asked_for(self):
         branches = "-fcf-protection=full " if IS_X86_64 else ""
         flags = f"-fstack-clash-protection {branches}-ftrivial-auto-var-init=.*-D_FORTIFY_SOURCE=3"

@@ -11,7 +11,7 @@ int prefix_matches(const char *requested, const char *entry) {
     return std::strncmp(requested, entry, std::strlen(entry));
 }
 
-// The code that an operation recorded, behind which lies one that has nothing to do with the next.
+// The code that an operation recorded. Then records an error that must not affect the next operation.
 std::string end() {
     const int code = recorded_error().code;
     cu_set_error_1(SEC_S_WARNING, 0, "none.cat", 1, 1, "stale");

@@ -274,7 +274,7 @@ class Locks(EditCase):
         self.assertIn(status, (0, -signal.SIGKILL))
         self.assertIn(self.read(), (OLD, OLD + b"n r\n"), (step, time))
         self.assertLessEqual(set(os.listdir(self.dir)), {"a", "a.lock", ".a.qzacl"})
-        # What is left behind hinders nobody, and goes.
+        # The next edit is not hindered by what is left, and removes it.
         self.assertEqual(self.qzacl("grant", "a", "w", "n")[0], 0)
         self.assertEqual(os.listdir(self.dir), ["a"])
         self.assertEqual(os.getxattr(f"{self.dir}/a", "user.origin"), b"x")

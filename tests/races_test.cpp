@@ -1,5 +1,5 @@
-// Files exchanged, edited or removed between any two steps of a reader or a writer: no reader is ever told anything
-// else than the text says.
+// Files exchanged, edited or removed between any two steps of a reader or a writer: no reader ever gets anything but
+// what the text says.
 #include "acl_files.h"
 
 namespace {
@@ -60,7 +60,7 @@ const disturbance disturbances[] = {
     {"a foreign cache", [](auto &path) { write_file(path + ".cacl", rich); }},
 };
 
-// What happens to a file between its vetting and its opening, and how often; what is then told.
+// What happens to a file between its vetting and its opening, and how often; the messages that follow.
 struct replacement {
     const char *name;
     int times;
@@ -141,7 +141,7 @@ TEST_F(races, are_won_before_every_step) {
                     steps = std::max(steps, run(stale, by_command, row, at));
 }
 
-// Nor do those that read their standard input take a part of a file away.
+// Nor does a thread that reads its standard input consume a part of a file.
 TEST_F(files, are_read_whole_while_another_thread_reads_its_input) {
     const auto take_a_part = [](std::size_t) {
         char part[4];
@@ -157,7 +157,7 @@ TEST_F(files, are_read_whole_while_another_thread_reads_its_input) {
     EXPECT_EQ(status, 0);
 }
 
-// Whoever could write the cache, but not the text, gains nothing when the text gives up its entries meanwhile.
+// A user who could write only the cache gains nothing when the text loses its entries in between.
 TEST_F(files, lose_their_entries_while_a_cache_is_vetted) {
     lay_out(rich, 0);
     if (!give_entries(path, 6, 6))

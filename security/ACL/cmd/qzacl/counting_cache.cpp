@@ -22,8 +22,8 @@ namespace {
 
 enum class outcome { counts, does_not_count, failed };
 
-// A cache counts when it is later than its text in whole seconds. Gives what is left of the one in which the text was
-// written, in nanoseconds; 0 when that is over.
+// A cache counts if it is later than its text in whole seconds. Returns the rest of the second in which the text was
+// written, in nanoseconds; 0 if that second is over.
 long rest_of_second(const std::string &path) {
     constexpr long second = 1'000'000'000;
     struct stat text = {};
@@ -49,7 +49,7 @@ int read_trees(acl_text &text, sec_acltree_array &trees) {
     }
 }
 
-// Of a text without entries there is no cache; nor may one that says anything be left that is read.
+// For a text without entries there is no cache to write, but services must not read an older one either.
 bool is_what_services_read(const std::string &path, const sec_perm_set_t &set,
                            const sec_acl_buffer_t &compiled) {
     sec_acl_buffer_t served = {};
