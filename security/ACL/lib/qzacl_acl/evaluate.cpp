@@ -15,8 +15,8 @@
 //   permissions of groups:
 //       each group as one party, without a handler; the masks of all matches are combined
 //
-// An entry that does not fit into the buffer, or an identity without a NUL where the comparison gets to it, is an error.
-// The stored order is not checked: if it is not ascending, it hides entries.
+// An entry that does not fit into the buffer, or an identity without a NUL where the comparison gets to it, is an
+// error. The stored order is not checked: if it is not ascending, it hides entries.
 //
 // The buffer is read in place. Only recording a long identity allocates memory, and the one lock is held only while
 // looking up a handler.
@@ -122,8 +122,8 @@ int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler
 }
 
 // Compares the wanted identity with the entries from the next one on, and leaves the walk before the entry that
-// decides. Without one, the wanted identity sorts after all of them. Inline, so that the first loop keeps its
-// variables in registers.
+// decides. Without one, the wanted identity sorts after all of them. Inline, so that the walk stays in registers of the
+// caller.
 [[gnu::always_inline]] inline identity_order compare_next(const wanted_identity &wanted,
                                                           format::entry_walk &walk, format::entry &entry) {
     const identity_start start = wanted.start();
