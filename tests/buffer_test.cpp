@@ -1,6 +1,6 @@
-// Compiled buffers: made, checked, converted, listed, edited, released and dumped, and what each of these refuses.
-// How every operation takes bytes that were cut short or changed is tested by fuzz/buffer_fuzz.cpp, and what edits
-// do otherwise, also to bytes that no edit makes, by fuzz/edit_fuzz.cpp.
+// Compiled buffers: making, checking, converting, listing, editing, releasing and dumping them, and what each of
+// these refuses. fuzz/buffer_fuzz.cpp tests every operation on bytes that were cut short or changed, and
+// fuzz/edit_fuzz.cpp tests all other edits, also of bytes that no edit makes.
 #include "qzacl_acl/buffer.h"
 #include "qzacl_acl/tree.h"
 #include "qzacl_acl/validate.h"
@@ -139,7 +139,7 @@ TEST(convert, marks_the_order_when_all_was_turned) {
     const std::string twice = with_foreign_number(foreign, 3, 2, 2) + foreign.substr(5);
     const std::pair<std::string, failure> rows[] = {
         {twice, no_error},
-        {with_number(foreign, 9, 99), no_error}, // what is wrong then is not looked for
+        {with_number(foreign, 9, 99), no_error}, // other mistakes are not checked then
         {"\x84\1\1\0\0"s, bad_acl(msg::not_an_acl_buffer)},
         {"\x85\2"s, bad_acl(msg::not_an_acl_buffer)},
         {"\x85\1"s, bad_acl(msg::shorter_than_header, 2)},
@@ -238,7 +238,7 @@ TEST(edit, holds_at_most_65534_bytes_of_identity) {
     const sec_acle_t refused = group(too_long.c_str(), 7);
     const sec_acle_t fitting = group(longest.c_str(), 7);
     const std::string sorted = entry_bytes("a 1") + entry_bytes("b 2");
-    // A buffer that the call makes, which goes with its failure; one changed in place, one rebuilt.
+    // A buffer that the call makes, and frees if it fails; one changed in place; one rebuilt.
     for (const std::string &bytes : {""s, acl_bytes("g: a 1, b 2"), acl_bytes("g: b 2, a 1")}) {
         buffer held(bytes);
         EXPECT_EQ(outcome_of(sec_add_acle_to_acl(&refused, &held.acl)),

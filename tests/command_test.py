@@ -45,7 +45,7 @@ def printed(words):
 
 
 class AclText(NamedTuple):
-    """A text, what each of its lines leads to, as a code and what is printed, and the cache of one without mistakes."""
+    """A text, the code and output of each of its lines, and the cache if it has no mistakes."""
     text: str
     results: list
     cache: list
@@ -75,7 +75,7 @@ CHOICES = [options for count in range(4) for options in itertools.combinations((
 
 
 def started(options, cwd, **how):
-    """The command, which runs beside the test."""
+    """The running command."""
     return subprocess.Popen([COMMAND, options, "-f", "a"], cwd=cwd, env={"LC_ALL": "C"}, **how)
 
 
@@ -208,7 +208,7 @@ class Output(CommandCase):
 
 
 def limited_to(limits, for_large_files=signal.SIG_DFL):
-    """What a process calls to set its own limits, and what the signal of too large a file does."""
+    """A function that sets limits of its process, and the action for the signal of too large a file."""
     def set_limits():
         signal.signal(signal.SIGXFSZ, for_large_files)
         for what, size in limits.items():
@@ -293,7 +293,7 @@ class Caches(CommandCase):
             self.assertEqual((cache.st_uid, cache.st_gid), (text.st_uid, text.st_gid))
 
     def test_a_cache_has_the_entries_of_the_file_and_no_others(self):
-        """Only who can write the file can write the cache, regardless of what new files in the folder inherit."""
+        """Only users who can write the file can write the cache, regardless of what new files in the folder inherit."""
         for entries, inherited in itertools.product((None, posix_acl(group=4)), (None, posix_acl(group=6))):
             with self.subTest(entries=entries, inherited=inherited):
                 self.fresh()

@@ -53,7 +53,7 @@ decision answer_to_groups(const std::string &bytes, const std::vector<const char
 int same_end(const char *wanted, const char *held) {
     if (std::string_view(wanted).ends_with(held))
         return 0;
-    cu_set_error_1(SEC_S_WARNING, 0, "none.cat", 1, 1, "no match"); // which is nobody else's business
+    cu_set_error_1(SEC_S_WARNING, 0, "none.cat", 1, 1, "no match"); // not the error of the decision
     return -1;
 }
 int never(const char *, const char *) { return 1; }

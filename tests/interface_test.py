@@ -61,7 +61,7 @@ ZSH = '_arguments() { print -l -- $@ }; . "$0"'
 
 
 def run(*command, status=0, **options):
-    """Gives what is printed."""
+    """Returns the output."""
     done = subprocess.run([*map(str, command)], capture_output=True, text=True, check=False, **options)
     assert done.returncode == status, f"{command} gave {done.returncode}:\n{done.stdout}{done.stderr}"
     return done.stdout + done.stderr
@@ -76,7 +76,7 @@ def declared(header):
 
 
 def facts():
-    """What must hold of records and values, as conditions in C."""
+    """The facts about records and values, as conditions in C."""
     yield "sizeof acl__default_perm_list == 13 * 84"
     yield "sizeof ((sec_acle_t *)0)->mechanism == 17"
     yield "sizeof ((sec_group_ref_t *)0)->id == 8"
@@ -118,7 +118,7 @@ class Interface(unittest.TestCase):
 
     def compile(self, compiler, *options):
         for path in (SOURCE / "include/qz").glob("*.h*" if "++" in compiler else "*.h"):
-            # What service.hpp is made of is in it.
+            # service.hpp includes the others.
             if "-std=c++20" in options and path.name not in ("acl.hpp", "service.hpp"):
                 continue
             includes = f"#include <qz/{path.name}>\nint unused;\n"
@@ -190,7 +190,7 @@ class Interface(unittest.TestCase):
             self.assertRegex(told, r"^service\.acl: 3417-179 (?s:.*)Orvex Guide\.\n$")
 
     def consume(self, prefix, libraries, folder):
-        """Builds and runs the example with what is installed."""
+        """Builds and runs the example with the installed files."""
         shutil.copytree(SOURCE / "examples", folder, ignore=shutil.ignore_patterns("*.cacl"))
         (folder / "CMakeLists.txt").write_text(CONSUMER)
         packages = os.environ | {"PKG_CONFIG_PATH": f"{libraries}/pkgconfig"}

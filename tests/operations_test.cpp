@@ -59,7 +59,8 @@ std::string decide(const sec_acl_buffer_t &acl) {
     return found.str();
 }
 
-// What one round through the operations came to. Each thread has files and buffers of its own, and shares one.
+// The results of one round through the operations. Each thread has its own files and buffers, except for one shared
+// buffer.
 std::string use_all(const std::string &path, const sec_acl_buffer_t &shared) {
     std::ostringstream found;
     std::uint32_t mask = 0;

@@ -1,12 +1,12 @@
-// Every allocation of every operation failing in turn, once and from then on: what is reported, and what is left. And
-// how few allocations a text takes.
+// Each allocation of each operation fails in turn, once and from then on: what is reported, and what is left. Also,
+// the number of allocations for a text is small.
 #include "acl_files.h"
 
 namespace {
 
 using namespace support;
 
-// What the operations make, each of which leaves nothing when it fails.
+// The results of operations. A failed one leaves nothing.
 struct made_things {
     sec_acl_buffer_t acl = {};
     sec_aclelist_t list = {};
@@ -29,9 +29,9 @@ struct made_things {
 };
 
 struct use {
-    std::string name; // or the functions of which the message names one
+    std::string name; // or the functions that the message may name
     std::function<int(sec_acl_buffer_t &)> call;
-    bool is_tolerated = false; // fails or goes on without
+    bool is_tolerated = false; // may succeed without the memory
 };
 constexpr bool tolerated = true;
 
@@ -43,7 +43,7 @@ struct allocations : files {
         return sec_read_acl_file("acl", user_name(), nullptr, flags, &made.acl, nullptr);
     }
 
-    // Tells how many allocations there were.
+    // Returns the number of allocations.
     std::size_t run(const use &row, const faults::allocations_seen &failing) {
         SCOPED_TRACE(testing::Message()
                      << "allocation " << failing.fails_at << (failing.fails_on ? " and on" : ""));
@@ -74,7 +74,7 @@ struct allocations : files {
 
     void fail_each(const use &row) {
         SCOPED_TRACE(row.name);
-        run(row, {}); // which also makes what then stays
+        run(row, {}); // also makes what stays allocated afterwards
         const std::size_t count = run(row, {});
         EXPECT_GT(count, 0u);
         for (std::size_t at = 1; at <= count; ++at) {
@@ -83,7 +83,7 @@ struct allocations : files {
         }
     }
 
-    // The command prints, for which it sets memory aside, or says that it wrote no cache.
+    // The command prints the failure, from memory that it reserved, or reports that it wrote no cache.
     static void expect_told(const use &row, const outcome &now, std::size_t size,
                             const faults::allocations_seen &failing) {
         if (now.id != msg::no_memory.id) {
@@ -96,7 +96,7 @@ struct allocations : files {
         };
         const bool is_public = row.name.find('_') != std::string::npos;
         EXPECT_TRUE(!is_public || std::ranges::any_of(words(row.name), is_told)) << now.text;
-        // A text is read with room for a NUL, and what is converted is told without the converter's room.
+        // The size in a message may lack the NUL after a text, or the converter's reserve.
         arguments sizes;
         for (const std::size_t room : {0u, 1u, 16u})
             sizes.push_back(" " + std::to_string(size - room) + " bytes");
@@ -120,7 +120,7 @@ TEST_F(allocations, of_buffers_and_edits_fail) {
     fail_each({"list type", [&](acl_buffer &acl) {
                    return sec_list_acl_by_type(&acl, SEC_ACLE_EXPANDED, "krb5", &made.list);
                }});
-    // What is packed is changed in place; the rest is expanded and compiled again.
+    // Packed sub-ACLs are changed in place; the rest is expanded and compiled again.
     fail_each({"sec_add_acle_to_acl", [&](acl_buffer &acl) { return sec_add_acle_to_acl(&large, &acl); }});
     fail_each(
         {"sec_del_acle_from_acl", [&](acl_buffer &acl) { return sec_del_acle_from_acl(&present, &acl); }});
@@ -154,7 +154,7 @@ TEST_F(allocations, of_files_fail) {
     fail_each({"check", check_and_tell, tolerated});
 }
 
-// Insertions wait for lines that come after them; what is told is the first mistake all the same.
+// Insertions wait for later lines; the first mistake is reported all the same.
 TEST_F(files, tell_their_first_mistake) {
     const int duplicate = msg::duplicate_group.id;
     const int bad_type = msg::bad_type_token.id;

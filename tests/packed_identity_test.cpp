@@ -1,4 +1,4 @@
-// The quick proofs about packed identities: where a string ends in its field, and which of two sorts first.
+// The fast comparisons of packed identities: where a string ends in its field, and which of two sorts first.
 #include "qzacl_acl/packed_identity.h"
 #include "support.h"
 
@@ -30,10 +30,10 @@ const support::arguments identities = support::split(
     "\xff\xff,same-start-of-16,same-start-of-16x",
     ',');
 
-// The field of an identity with what may follow it in a buffer.
+// The field of an identity, with bytes that may follow it in a buffer.
 struct field {
-    field(const std::string &identity, char behind)
-        : size(identity.size() + 1), bytes(identity + '\0' + std::string(readable, behind)) {}
+    field(const std::string &identity, char following)
+        : size(identity.size() + 1), bytes(identity + '\0' + std::string(readable, following)) {}
 
     qz::byte_span span() const { return {reinterpret_cast<const unsigned char *>(bytes.data()), size}; }
 
@@ -41,8 +41,9 @@ struct field {
     std::string bytes;
 };
 
-void expect_behind_only_what_sorts_before(const std::string &wanted, const std::string &stored, char behind) {
-    const field held(stored, behind);
+void expect_after_only_what_sorts_before(const std::string &wanted, const std::string &stored,
+                                         char following) {
+    const field held(stored, following);
     const qz::identity_start start(wanted.c_str(), wanted.size());
     const bool sorts_before = qz::fold_compare(stored.c_str(), wanted.c_str()) < 0;
     const bool differs_early =
@@ -54,16 +55,16 @@ void expect_behind_only_what_sorts_before(const std::string &wanted, const std::
     EXPECT_TRUE(sorts_before || !start.is_far_after(held.span())) << stored << " before " << wanted;
 }
 
-TEST(PackedIdentity, SortsBehindOthersWhateverFollowsThem) {
-    for (const char behind : {'\0', '\1', 'a', '\xff'}) {
+TEST(PackedIdentity, SortsAfterOthersWhateverFollowsThem) {
+    for (const char following : {'\0', '\1', 'a', '\xff'}) {
         for (const std::string &wanted : identities) {
             for (const std::string &stored : identities)
-                expect_behind_only_what_sorts_before(wanted, stored, behind);
+                expect_after_only_what_sorts_before(wanted, stored, following);
         }
     }
 }
 
-TEST(PackedIdentity, IsFarBehindWhereNoOtherByteThanLettersAndDigitsDiffers) {
+TEST(PackedIdentity, IsFarAfterWhereOnlyLettersAndDigitsDiffer) {
     const std::pair<std::string, std::string> rows[] = {{"bob", "Alice"},
                                                         {"BOB", "alice"},
                                                         {"user0002@corp.com", "USER0001@corp.com"},
@@ -74,7 +75,7 @@ TEST(PackedIdentity, IsFarBehindWhereNoOtherByteThanLettersAndDigitsDiffers) {
 }
 
 // A field without a NUL says nothing about the bytes that follow it.
-TEST(PackedIdentity, IsNotFarBehindWhatItStartsWith) {
+TEST(PackedIdentity, IsNotFarAfterWhatItStartsWith) {
     const std::string wanted = "abcdefghijklmnopq";
     const qz::identity_start start(wanted.c_str(), wanted.size());
     for (std::size_t size = 0; size <= readable; ++size) {

@@ -1,5 +1,5 @@
-// What concerns the process as a whole: the registration for tracing, and forks. The child of a fork can use each library,
-// even if another thread of its parent held the library's lock.
+// State of the whole process: registration for tracing, and forks. The child of a fork can use each library, even if
+// another thread of its parent held the library's lock.
 #include "qzacl_trace.h"
 #include "support.h"
 
@@ -76,7 +76,7 @@ TEST(fork, leaves_a_child_that_can_use_the_libraries) {
         {"libqzacl", looks_up_a_handler}, {"libqz_cu", fetches_a_text}, {"libqz_tr", registers_for_tracing}};
     for (const auto &[library, use] : uses) {
         SCOPED_TRACE(library);
-        ASSERT_TRUE(use()); // what is done once is done
+        ASSERT_TRUE(use()); // first-time work is done
         stop_with_lock_held held;
         std::thread holder([&held, use = use] {
             stop = &held;

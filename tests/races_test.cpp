@@ -32,7 +32,7 @@ void link_at_what_is_opened(const std::string & /*path*/) {
 }
 void append(const std::string &path) { std::ofstream(path, std::ios::app) << "u unix more@host r\n"; }
 
-// What somebody does to the ACL file or its cache while another works.
+// A change of the ACL file or its cache by someone else during an operation.
 struct disturbance {
     std::string name;
     std::function<void(const std::string &)> act;
@@ -106,7 +106,7 @@ TEST_F(files, are_read_anew_when_they_are_replaced) {
 }
 
 struct races : files {
-    // Disturbs a reader, or the command, and gives the number of its steps.
+    // Disturbs a reader, or the command, and returns the number of its steps.
     std::size_t run(const std::string &stale, bool by_command, const disturbance &row, std::size_t at) const {
         SCOPED_TRACE(testing::Message() << row.name << " before step " << at);
         lay_out(stale);
@@ -119,12 +119,12 @@ struct races : files {
         const bool is_cache_linked =
             row.name == "a link at the name that is opened" && faults::opened == cache;
         EXPECT_TRUE(!by_command || !is_cache_linked || found.id == msg::cannot_open_for_writing.id) << found;
-        // What is read is the text as it was, as it is now, or what somebody put in the place of the cache.
+        // The result is the text as it was, the text as it is now, or the cache that someone put in place.
         const outcome now = read_acl(path, text_only);
         const bool is_known = found == from_text || found == now || found.bytes == rich;
         EXPECT_TRUE(by_command || found.code != SEC_S_OK || is_known) << found;
         EXPECT_TRUE(by_command || !row.is_replacement || found.code == SEC_S_OK) << found;
-        // An old file is told from the text by its number, for as long as the writer looks.
+        // The writer detects an old file by its inode number, as long as it checks.
         const auto closed = std::ranges::find(calls, "close") - calls.begin();
         const bool is_late = row.name.ends_with("old file") && static_cast<long>(at) > closed + 1;
         const bool is_foreign = fs::is_regular_file(cache) && read_file(cache) == rich;

@@ -38,7 +38,7 @@ struct Trace : testing::Test {
         EXPECT_EQ(tr_register_component_1(component, level.data(), table, 4), code);
         return level;
     }
-    // The lines of the file, without what differs from run to run where that has its form.
+    // The lines of the file, without well-formed parts that differ from run to run.
     std::vector<std::string> lines() const {
         const std::regex head(R"(^."time":"\d{4}(-\d\d){2}T\d\d(:\d\d){2}\.\d{9}Z","pid":\d+,"tid":\d+,)");
         std::ifstream in(file);
@@ -111,7 +111,7 @@ TEST_F(Trace, LinesTellTheirTimeAndThread) {
     };
     in_child([&] {
         enlist();
-        tr_record_id_1("C", 1); // must not settle the ids of what its process forks
+        tr_record_id_1("C", 1); // must not fix the ids for children of this process
         in_child([&] { std::thread(record).join(); });
     });
 }
@@ -206,7 +206,7 @@ TEST_F(Trace, FilesOfOthersAreNotWrittenTo) {
         std::ofstream(file) << "before\n";
         fs::permissions(file, fs::perms{0600});
         if (change() != 0)
-            continue; // only root gives files away
+            continue; // only root can change the owner
         in_child([&, is_used = is_used] {
             EXPECT_EQ(enlist(), is_used ? on : off);
             EXPECT_EQ(tr_record_id_1("C", 1), is_used ? TR_OK : TR_NO_FILE);

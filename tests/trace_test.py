@@ -41,7 +41,7 @@ def wanted_items(row):
 
 
 def is_as_wanted(item, wanted):
-    """Whether the bytes of an item are what its row says: see operations.trace."""
+    """Whether the bytes of an item match its row; see operations.trace."""
     if wanted == "any":
         return True
     if wanted == "wide":
@@ -61,7 +61,7 @@ class Trace(CommandCase):
         return {"QZ_TRACE_LEVELS": "_SEL:" + levels, "QZ_TRACE_FILE": self.dir + ".trace"}
 
     def run_test(self, name, cases, levels):
-        """Runs some cases of a test program, and gives the records."""
+        """Runs some cases of a test program, and returns the records."""
         self.fresh()
         program = [BUILD / f"tests/{name}_test", "--gtest_filter=" + cases]
         environment = os.environ | self.traced(levels)

@@ -1,4 +1,5 @@
-// Trees of more entries than the fuzzers' texts have, through the fuzzer of texts; what names a tree; and its limit.
+// Trees with more entries than the fuzzers' texts have, through the fuzzer of texts; the entry that names a tree;
+// limits.
 #include "faults.h"
 #include "fuzz.h"
 #include "qzacl_acl/compile.h"

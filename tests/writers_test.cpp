@@ -100,7 +100,7 @@ TEST_F(files, nobody_may_use_a_new_file_before_it_is_its_owners) {
     EXPECT_EQ(read_acl(path, checked), from_text);
 }
 
-// What is edited while it is read must not be older than its cache.
+// A text that is edited while it is read must not be older than its cache.
 TEST_F(files, caches_are_as_old_as_what_they_are_made_from) {
     fs::file_time_type read_at;
     const auto wait = [&](std::size_t) {

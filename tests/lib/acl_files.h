@@ -51,7 +51,7 @@ inline outcome check(const std::string &path, unsigned options = ACLFCK_OPT_COMP
     return recorded(aclfck__bulk_aclfile(path.c_str(), nullptr, options));
 }
 
-// Runs something watched, and keeps what it prints.
+// Runs something watched, and keeps its output.
 using faults_by_place = std::function<int(std::size_t)>;
 inline std::string printed;
 inline outcome watched(const faults_by_place &fault_of, const std::function<outcome()> &call) {

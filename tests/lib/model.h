@@ -26,7 +26,7 @@ inline auto find(items &all, const std::string &identity) {
 inline bool has_mechanism(int type) { return type == SEC_ACLE_USER || type == SEC_ACLE_EXPANDED; }
 inline bool has_identity(int type) { return type == SEC_ACLE_GROUP || has_mechanism(type); }
 
-// What no edit leaves in a sub-ACL, but bytes from elsewhere may have.
+// Features that no edit leaves in a sub-ACL, but bytes from elsewhere may have.
 enum class oddity : std::uint8_t { none, unknown_version, bytes_after_mechanism, bytes_after_identities };
 
 struct model_subacl {
@@ -145,7 +145,7 @@ struct model {
     }
 };
 
-// What listing a buffer gives, of one type and mechanism or (type 0) all of it.
+// The listed entries of a buffer, of one type and mechanism or (type 0) all.
 inline arguments list_of(const sec_acl_buffer_t &acl, int type = 0, const char *mechanism = nullptr) {
     sec_aclelist_t list = {};
     if (type == 0)

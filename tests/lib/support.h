@@ -71,7 +71,7 @@ struct failure {
 };
 inline const failure no_error;
 
-// The error of this thread, which is cleared.
+// The error of this thread. Clears it.
 inline failure recorded_error() {
     cu_error_t *error = nullptr;
     char *text = nullptr;
@@ -188,7 +188,7 @@ inline int status_of_child(const std::function<void()> &body) {
     return status;
 }
 
-// Does this in a thread that is cancelled already, and ends at the first point at which it can.
+// Runs this in a thread with a pending cancellation, which takes effect at the first cancellation point.
 inline void run_cancelled(std::function<void()> body) {
     const auto start = [](void *given) -> void * {
         pthread_cancel(pthread_self());
@@ -228,7 +228,7 @@ inline std::string text_of(const sec_acle_t &acle) {
     return "?no?u???e???????g"[acle.type] + mechanism + identity + " " + std::to_string(acle.perm_mask);
 }
 
-// The entries of a list, which is released.
+// The entries of a list. Releases it.
 inline arguments taken(sec_aclelist_t &list) {
     arguments entries;
     for (std::int32_t at = 0; at < list.count; ++at)

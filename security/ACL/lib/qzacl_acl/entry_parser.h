@@ -42,9 +42,9 @@ sec_acle_t record_of(const parsed_acle &entry);
 // `*remaining` counts the bytes from the cursor to that NUL, inclusive. A null `set` means the default templates.
 //
 // Returns SEC_S_OK when nothing is left, and line_consumed when it consumed a line; the entry's type is 0 for a line
-// without one. Any other result is a recorded failure: SEC_S_BAD_PERMISSION, SEC_S_FILE_ERROR or SEC_S_BAD_ACL. That line was
-// consumed, too, so the caller may continue. Consuming a line moves the cursor to the next one, or to null after
-// the last, and adds 1 to `*line`.
+// without one. Any other result is a recorded failure: SEC_S_BAD_PERMISSION, SEC_S_FILE_ERROR or SEC_S_BAD_ACL. That
+// line was consumed, too, so the caller may continue. Consuming a line moves the cursor to the next one, or to null
+// after the last, and adds 1 to `*line`.
 int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size_t *remaining,
                              std::uint32_t *line, qz::parsed_acle *entry);
 // The same into a record that borrows its identity.
