@@ -123,19 +123,6 @@ TEST_F(files, nobody_may_use_a_new_file_before_it_is_its_owners) {
     EXPECT_EQ(read_acl(path, checked), from_text);
 }
 
-TEST_F(files, caches_with_other_entries_are_left_alone) {
-    if (!has_entries())
-        GTEST_SKIP() << "the file system has no POSIX ACLs";
-    constexpr unsigned read_only = 4;
-    constexpr unsigned read_write = 6;
-    lay_out(stale_cache);
-    EXPECT_TRUE(give_entries(path, read_only, read_write));
-    EXPECT_TRUE(give_entries(cache, read_write, read_write));
-    EXPECT_EQ(watched({}, [&] { return check(path); }).id, msg::cache_mode_differs.id);
-    EXPECT_EQ(read_acl(path, checked | cached), from_text);
-    EXPECT_EQ(read_file(cache), stale_cache);
-}
-
 // What is edited while it is read must not be older than its cache.
 TEST_F(files, caches_are_as_old_as_what_they_are_made_from) {
     fs::file_time_type read_at;
