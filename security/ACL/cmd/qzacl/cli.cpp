@@ -7,6 +7,7 @@
 
 #include <CLI/CLI.hpp>
 #include <algorithm>
+#include <charconv>
 
 namespace qzacl {
 
@@ -35,7 +36,7 @@ public:
         add_list(app_, "--handler", line.handlers);
         app_.add_flag("--check", line.checks)->disable_flag_override();
         app_.add_flag("-s", line.compiles)->disable_flag_override();
-        one_value(app_.add_option("--wait", line.wait));
+        one_value(app_.add_option("--wait", wait_));
     }
 
     // Returns the words that are not options, and all words after "--".
@@ -49,6 +50,7 @@ public:
         if (order_ != "closest" && order_ != "sum")
             throw wrong_use("--order is closest or sum");
         line.takes_sum = order_ == "sum";
+        line.wait = seconds_of(wait_);
         return words_of(app_.remaining());
     }
 
@@ -73,6 +75,15 @@ private:
         }
     }
 
+    // CLI11 would take no digits at all for 0.
+    static unsigned seconds_of(const std::string &digits) {
+        unsigned seconds = 0;
+        const auto [end, error] = std::from_chars(digits.data(), digits.data() + digits.size(), seconds);
+        if (error != std::errc() || end != digits.data() + digits.size())
+            throw wrong_use("--wait is a number of seconds");
+        return seconds;
+    }
+
     static std::vector<std::string> words_of(std::vector<std::string> left) {
         const auto mark = std::find(left.begin(), left.end(), "--");
         for (auto word = left.begin(); word != mark; ++word) {
@@ -86,6 +97,7 @@ private:
 
     CLI::App app_;
     std::string order_ = "closest";
+    std::string wait_ = "10";
 };
 
 const verb &find_verb(std::span<const verb> verbs, const std::string &name) {
