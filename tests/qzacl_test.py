@@ -74,7 +74,7 @@ REFUSED = [
     "", "nothing a.acl", "who a.acl", "who a.acl r w", "who a.acl ''", "who a.acl z", "show", "show missing.acl",
     "show bad.acl", "who bad.acl r", "ask bad.acl", "lint bad.acl", "diff a.acl bad.acl", "diff - -", "cache -",
     "ask -g ops a.acl", "ask -m a.acl", "ask -m unix -m unix a.acl", "ask --handler= unix=none a.acl x@y", "ask --order most a.acl",
-    "ask --handler unix=all a.acl", "ask --handler unix a.acl", "ask --handler unix=none --handler UNIX=exact a.acl",
+    "ask --handler unix=all a.acl", "ask --handler unix a.acl", "ask --handler =none a.acl x@y", "ask --handler unix=none --handler UNIX=exact a.acl",
     "show --json=false a.acl", "show --unknown a.acl", "show -w r a.acl", "who a.acl -- -r", "ask a.acl x -- -y",
     "show --permissions - -", "show --permissions missing a.acl", "show a.acl.cacl",
 ]
@@ -273,6 +273,10 @@ class Qzacl(unittest.TestCase):
         command = f"{COMMAND} who odd.acl r"
         done = subprocess.run(["script", "-qec", command, "/dev/null"], cwd=self.dir, capture_output=True, check=False)
         self.assertIn(b"g a\xe2\x82\\x01\\x1b[2J r", done.stdout)
+        self.write("odd.acl", b"\x1b[2J\n")
+        done = subprocess.run(["script", "-qec", command, "/dev/null"], cwd=self.dir, capture_output=True, check=False)
+        self.assertIn(b"(\\x1b[2J).", done.stdout)
+        self.assertIn(b"\t'n'/'N'", done.stdout)
 
     def test_output_that_cannot_be_written(self):
         for redirection in (">/dev/full", ">&-"):
@@ -313,6 +317,8 @@ class Qzacl(unittest.TestCase):
             return answer["reads"], answer["reason"], answer["same"], status
 
         self.write("c.acl", b"")
+        self.assertEqual(told(), ("text", "empty", None, 0))
+        self.write("c.acl", b"# no entries\n")
         self.assertEqual(told(), ("text", "empty", None, 0))
         self.write("c.acl", b"o r\n")
         self.assertEqual(told(), ("text", "missing", None, 1))
