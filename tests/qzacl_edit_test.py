@@ -83,6 +83,7 @@ REFUSED = [  # a text, the words of an edit, and what is said
     (OLD, "set -x n", "option"),
     (OLD, "set n r --wait=", "value"),
     (OLD, "set n r --wait -1", "wait"),
+    (OLD, "set n r --wait ", "wait"),
 ]
 
 
@@ -413,6 +414,8 @@ SESSIONS = [  # a text, the editor, the answers, the status, the text behind it,
     (b"bad\n", "sed -i 's/bad/n r/'", "", 0, b"n r\n", "changed\n"),
     (b"bad\n", "true", "", 2, b"bad\n", "3417-179"),
     (OLD, "sed -i s/^/\\\\x85/", "d\n", 2, OLD, "compiled"),
+    (b"\x85\1", "sh -c 'echo o >\"$0\"'", "", 2, b"\x85\1", "a: only texts"),
+    (OLD, "sh -c 'rm \"$0\"; mkfifo \"$0\"'", "", 2, OLD, "no regular file"),
     (OLD, MEANWHILE, "d\n", 2, OLD + b"n x\n", "changed while it was edited"),
     (OLD, "sh -c 'grep -q new \"$0\" || { echo n x >>a; echo g new r >>\"$0\"; }'", "s\ne\n", 0,
      OLD + b"g new r\n", "-n x\n"),
@@ -484,6 +487,8 @@ class Caches(EditCase):
         self.assertEqual(self.qzacl("remove", "a", "n", "-s"), (0, "changed\n"))
         os.utime(f"{self.dir}/a.cacl", (4e9, 4e9))  # later than any text
         self.assertEqual(self.qzacl("remove", "a", "n", "-s")[0], 2)
+        self.write("a", "")
+        self.assertEqual(self.qzacl("remove", "a", "n", "-s"), (0, "unchanged\n"))
 
     def test_cache_that_does_not_count(self):
         self.write("a", OLD)

@@ -10,6 +10,7 @@
 #include <cstdlib>
 #include <fcntl.h>
 #include <filesystem>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -92,8 +93,11 @@ void private_copy::edit() const {
 
 std::string private_copy::text() const {
     const descriptor file(open(path_.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC));
-    if (!file)
+    struct stat status = {};
+    if (!file || fstat(file.get(), &status) != 0)
         throw system_failure("cannot open " + path_);
+    if (!S_ISREG(status.st_mode))
+        throw trouble(path_ + " is no regular file");
     return read_whole(file.get(), path_);
 }
 
