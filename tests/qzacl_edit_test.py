@@ -451,6 +451,18 @@ class Sessions(EditCase):
         self.assertEqual(running.wait(), 2)
         self.assertIn(b"+bad\\x1b[2J", shown)
 
+    def test_a_signal_drops_the_copy(self):
+        for number in (signal.SIGINT, signal.SIGTERM):
+            self.write("a", OLD)
+            environment = {**os.environ, "EDITOR": APPEND + "bad", "TMPDIR": self.dir}
+            running = subprocess.Popen([QZACL, "edit", "a"], cwd=self.dir, env=environment, stdin=subprocess.PIPE,
+                                       stderr=subprocess.PIPE)
+            while b"What now?" not in running.stderr.peek():
+                running.stderr.readline()
+            running.send_signal(number)
+            self.assertIn(b"was not changed", running.communicate()[1])
+            self.assertEqual((running.returncode, self.read(), os.listdir(self.dir)), (2, OLD, ["a"]))
+
     def test_visual_comes_first_and_nobody_else_looks_on(self):
         self.write("a", OLD)
         look = "sh -c 'stat -c %a:%n \"$0\" \"${0%/*}\"; ls *.lock'"

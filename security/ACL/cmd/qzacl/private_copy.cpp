@@ -33,20 +33,24 @@ std::string editor_command() {
 // Interrupts from the terminal are the editor's while it runs.
 class ignored_interrupts {
 public:
-    ignored_interrupts()
-        : interrupt_before_(std::signal(SIGINT, SIG_IGN)), quit_before_(std::signal(SIGQUIT, SIG_IGN)) {}
+    ignored_interrupts() {
+        struct sigaction ignoring = {};
+        ignoring.sa_handler = SIG_IGN;
+        sigaction(SIGINT, &ignoring, &interrupt_before_);
+        sigaction(SIGQUIT, &ignoring, &quit_before_);
+    }
     ignored_interrupts(const ignored_interrupts &) = delete;
     ignored_interrupts &operator=(const ignored_interrupts &) = delete;
     ~ignored_interrupts() { put_back(); }
 
     void put_back() const {
-        std::signal(SIGINT, interrupt_before_);
-        std::signal(SIGQUIT, quit_before_);
+        sigaction(SIGINT, &interrupt_before_, nullptr);
+        sigaction(SIGQUIT, &quit_before_, nullptr);
     }
 
 private:
-    void (*interrupt_before_)(int);
-    void (*quit_before_)(int);
+    struct sigaction interrupt_before_ = {};
+    struct sigaction quit_before_ = {};
 };
 
 } // namespace
