@@ -74,8 +74,9 @@ REFUSED = [
     "", "nothing a.acl", "who a.acl", "who a.acl r w", "who a.acl ''", "who a.acl z", "show", "show missing.acl",
     "show bad.acl", "who bad.acl r", "ask bad.acl", "lint bad.acl", "diff a.acl bad.acl", "diff - -", "cache -",
     "ask -g ops a.acl", "ask -m a.acl", "ask -m unix -m unix a.acl", "ask --handler= unix=none a.acl x@y", "ask --order most a.acl",
-    "ask --handler unix=all a.acl", "ask --handler unix a.acl", "ask --handler =none a.acl x@y", "ask --handler unix=none --handler UNIX=exact a.acl",
-    "show --json=false a.acl", "show --unknown a.acl", "show -w r a.acl", "who a.acl -- -r", "ask a.acl x -- -y",
+    "ask --handler unix=all a.acl", "ask --handler unix a.acl", "ask --handler =none a.acl x@y",
+    "ask --handler unix=none --handler UNIX=exact a.acl", "show --json=false a.acl", "show --json=true a.acl",
+    "ask -h- a.acl", "show --unknown a.acl", "show -w r a.acl", "who a.acl -- -r", "ask a.acl x -- -y",
     "show --permissions - -", "show --permissions missing a.acl", "show a.acl.cacl",
 ]
 
@@ -223,8 +224,9 @@ class Qzacl(unittest.TestCase):
                 self.assertIn(f"group: {name}:1: g {group} r (decides)\n", asked)
 
     def test_an_option_takes_one_value(self):
-        printed = self.run_it("ask", "-g", "none", "a.acl", "bob@x")[0].decode()
-        self.assertIn("group none: no entry\nany other", printed)
+        for value in ("none", "--order=", "-s-", "--"):
+            printed = self.run_it("ask", "-g", value, "a.acl", "bob@x")[0].decode()
+            self.assertIn(f"group {value}: no entry\nany other", printed)
 
     def test_standard_input_and_compiled_files(self):
         compiled = self.compile("a.acl")
