@@ -73,7 +73,8 @@ CASES = b"unix alice@head rw yes # hers\nunix bob@x +ops v yes\n"
 REFUSED = [
     "", "nothing a.acl", "who a.acl", "who a.acl r w", "who a.acl ''", "who a.acl z", "show", "show missing.acl",
     "show bad.acl", "who bad.acl r", "ask bad.acl", "lint bad.acl", "diff a.acl bad.acl", "diff - -", "cache -",
-    "ask -g ops a.acl", "ask -m a.acl", "ask -m unix -m unix a.acl", "ask --handler= unix=none a.acl x@y", "ask --order most a.acl",
+    "ask -g ops a.acl", "ask -m a.acl", "ask -m unix -m unix a.acl", "ask --handler= unix=none a.acl x@y",
+    "ask --order most a.acl",
     "ask --handler unix=all a.acl", "ask --handler unix a.acl", "ask --handler =none a.acl x@y",
     "ask --handler unix=none --handler UNIX=exact a.acl", "show --json=false a.acl", "show --json=true a.acl",
     "ask -h- a.acl", "show --unknown a.acl", "show -w r a.acl", "who a.acl -- -r", "ask a.acl x -- -y",
