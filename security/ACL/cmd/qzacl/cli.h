@@ -27,7 +27,7 @@ struct command_line {
     // Of edits.
     bool checks = false;   // what would change
     bool compiles = false; // so that the cache counts
-    unsigned wait = 10;    // seconds for the lock
+    unsigned wait = 0;     // seconds for the lock
 };
 
 // Reads the arguments after the command's name. Throws wrong_use for invalid ones.

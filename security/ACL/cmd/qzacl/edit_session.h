@@ -3,6 +3,7 @@
 #define QZACL_EDIT_SESSION_H
 
 #include "edited_file.h"
+#include "noted_signals.h"
 #include "permission_set.h"
 #include "private_copy.h"
 
@@ -28,6 +29,7 @@ private:
     const permission_set &set_;
     std::chrono::seconds wait_;
     std::string base_; // the text that a change is made of
+    noted_signals signals_;
     private_copy copy_;
 };
 

@@ -19,8 +19,8 @@ bool is_plain_in_json(std::string_view bytes);
 // Appends the same text as JSON, with its quotation marks.
 void append_json_text(std::string &line, std::string_view bytes);
 
-// A text in which control bytes are shown as \xHH, but for line feeds where they are to stay.
-std::string escaped(std::string_view text, bool keeps_line_feeds);
+// A text in which control bytes are shown as \xHH, but for those that are to stay.
+std::string escaped(std::string_view text, std::string_view kept);
 
 // The bytes to collect before they are written.
 inline constexpr std::size_t enough_to_write = 1 << 18;
@@ -40,8 +40,9 @@ private:
     std::deque<std::string> parts_;
 };
 
-// Lines as they are shown on a descriptor: as they are, or on a terminal with control bytes as \xHH.
-std::string shown_on(int fd, std::string_view lines);
+// Lines as they are shown on a descriptor: as they are, or on a terminal with control bytes as \xHH, but for those that
+// are to stay.
+std::string shown_on(int fd, std::string_view lines, std::string_view kept = "\n");
 
 // Standard output. On a terminal control bytes are shown as \xHH, so that no identity can move the cursor.
 class output {
@@ -62,7 +63,7 @@ public:
     void flush();
 
 private:
-    void add(std::string_view text, bool keeps_line_feeds);
+    void add(std::string_view text, std::string_view kept);
     static void write(std::string_view bytes);
 
     bool is_json_;
