@@ -15,7 +15,8 @@ namespace qzacl {
 
 namespace {
 
-// The first letter of the next line; 'd' at the end of input, and after a signal. Reads no byte after the line: an editor may need them.
+// The first letter of the next line, or 'd' at the end of input and after a signal. Reads no byte after the line, since
+// an editor may need it.
 char read_answer() {
     char first = '\0';
     for (;;) {

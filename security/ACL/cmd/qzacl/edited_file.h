@@ -12,7 +12,9 @@
 namespace qzacl {
 
 // What could not be done, and why by errno.
-trouble system_failure(const std::string &what);
+struct system_failure : trouble {
+    explicit system_failure(const std::string &what);
+};
 
 class edited_file {
 public:
