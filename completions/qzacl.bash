@@ -6,7 +6,7 @@ _qzacl() {
     for ((i = 1; i < COMP_CWORD; i++)); do
         word=${COMP_WORDS[i]}
         case $word in
-        --permissions) ((++i)) ;;
+        --permissions | --handler | --order | --wait | -[gmw]) ((++i)) ;;
         -*) ;;
         *) verb=$word && break ;;
         esac

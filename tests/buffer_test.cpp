@@ -165,6 +165,7 @@ TEST(list, refuses_what_it_cannot_expand) {
          bad_acl(msg::single_acle_repeated)},
         {"a sub-ACL too few", packed_acl(2, any_other), corrupted},
         {"a length that leads nowhere", packed_acl(3, with_number(any_other, 0, 0, 4)), corrupted},
+        {"a header cut short", example.substr(0, 4), corrupted},
         {"another version", "\x85\2\2\0\0"s, bad_acl(msg::not_an_acl_buffer)},
         {"no mechanism", acl_of_one(packed_subacl(SEC_ACLE_USER, "", 1, xyz)), corrupted},
         {"a long mechanism", acl_bytes("u seventeen-bytes-x: x 1"), bad_acl(msg::bad_mechanism_length, 18)},
@@ -180,6 +181,14 @@ TEST(list, refuses_what_it_cannot_expand) {
         // The list is touched once the first bytes are right.
         EXPECT_EQ(list.count, row.error.id == msg::not_an_acl_buffer.id ? 7 : 0);
     }
+}
+
+TEST(list, of_a_type_refuses_a_header_cut_short) {
+    const buffer held(example.substr(0, 4));
+    sec_aclelist_t list = {};
+    for (const char *mechanism : {static_cast<const char *>(nullptr), "unix"})
+        EXPECT_EQ(outcome_of(sec_list_acl_by_type(&held.acl, SEC_ACLE_USER, mechanism, &list)),
+                  bad_acl(msg::buffer_corrupted));
 }
 
 TEST(list, refuses_bad_parameters) {

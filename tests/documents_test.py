@@ -4,6 +4,7 @@ usage: documents_test.py BUILD-FOLDER [unittest arguments]; --write renews the o
 import json
 import os
 import re
+import shlex
 import shutil
 import subprocess
 import sys
@@ -156,7 +157,8 @@ class Documents(unittest.TestCase):
     def test_snippet_shows_a_broken_file(self):
         snippet = re.search(r"```c\n(.*?)```", DOCS[README], re.S)[1].replace("/etc/", "")
         (self.dir / "snippet.c").write_text(PROGRAM % snippet)
-        flags = f"-Wall -Wextra -Werror -I{SOURCE}/include -L{BUILD}/lib -Wl,-rpath,{BUILD}/lib"
+        include, lib = shlex.quote(f"{SOURCE}/include"), shlex.quote(f"{BUILD}/lib")
+        flags = f"-Wall -Wextra -Werror -I{include} -L{lib} -Wl,-rpath,{lib}"
         self.assertEqual(self.run_in_shell(f"cc {flags} snippet.c -o snippet -lqzacl"), (0, ""))
         for text, shown in (r"u unix a@b r\nu unix a@b r\n", "shown\n"), (r"o r\n", ""), ("", ""):
             self.assertEqual(self.run_in_shell(f"printf '{text}' >service.acl; ./snippet"), (0, shown), text)

@@ -263,6 +263,7 @@ class Completions(unittest.TestCase):
     def test_bash_completes_the_companion(self):
         begins_with_s = {verb for verb in self.verbs if verb.startswith("s")}
         self.assertEqual(self.offered("bash", "qzacl.bash", "qzacl s"), begins_with_s)
+        self.assertEqual(self.offered("bash", "qzacl.bash", "qzacl -g ops s"), begins_with_s)
         self.assertEqual(self.offered("bash", "qzacl.bash", "qzacl ask mist"), {"mistakes.acl"})
         for verb, options in self.options_of_verbs.items():
             self.assertEqual(self.offered("bash", "qzacl.bash", f"qzacl --json {verb} -"), options, verb)

@@ -167,6 +167,18 @@ class Edits(EditCase):
                 self.write("a", before)
                 self.expect_refused(said, *words)
 
+    def test_a_signal_drops_the_copy(self):
+        for number in (signal.SIGINT, signal.SIGTERM):
+            self.write("a", OLD)
+            environment = environment_with(EDITOR="sed -i s/^g/bad/", TMPDIR=self.dir)
+            running = subprocess.Popen([QZACL, "edit", "a"], cwd=self.dir, env=environment, stdin=subprocess.PIPE,
+                                       stderr=subprocess.PIPE)
+            while b"What now?" not in running.stderr.peek():
+                running.stderr.readline()
+            running.send_signal(number)
+            self.assertIn(b"was not changed", running.communicate()[1])
+            self.assertEqual((running.returncode, self.read(), os.listdir(self.dir)), (2, OLD, ["a"]))
+
     @unittest.skipIf(SANITIZED, "Python cannot load the library")
     def test_any_text_and_change(self):
         """Every byte is kept but those of one line, and the result says what the library's edit of the ACL gives."""

@@ -45,6 +45,7 @@ const disturbance disturbances[] = {
     {"exchanged by an equally old file", [](auto &path) { put(other_text, path, 100); }, by_another},
     {"edited", [](auto &path) { write_file(path, other_text); }},
     {"edited like an old file", [](auto &path) { write_file(path, other_text, 50); }},
+    {"edited like an equally old file", [](auto &path) { write_file(path, other_text, 100); }},
     {"grown", append},
     {"emptied", [](auto &path) { write_file(path, ""); }},
     {"removed", [](auto &path) { fs::remove(path); }},
@@ -157,20 +158,51 @@ TEST_F(files, are_read_whole_while_another_thread_reads_its_input) {
     EXPECT_EQ(status, 0);
 }
 
-// A user who could write only the cache gains nothing when the text loses its entries in between.
-TEST_F(files, lose_their_entries_while_a_cache_is_vetted) {
-    lay_out(rich, 0);
-    if (!give_entries(path, 6, 6))
-        GTEST_SKIP() << "the file system has no POSIX ACLs";
-    fs::permissions(cache, fs::perms(0664));
-    const auto lose = [&](std::size_t) {
-        if (is_about_to("getxattr")) {
-            removexattr(path.c_str(), "system.posix_acl_access");
-            fs::permissions(path, fs::perms(0644));
-        }
-        return faults::no_fault;
+void lose_entries(const std::string &path) {
+    removexattr(path.c_str(), "system.posix_acl_access");
+    fs::permissions(path, fs::perms(0644));
+}
+void give_away(const std::string &path) {
+    constexpr uid_t nobody = 65534;
+    EXPECT_TRUE(chown(path.c_str(), nobody, 0) == 0 || geteuid() != 0);
+}
+void put_with_entries(const std::string &path) {
+    constexpr int newer_than_the_cache = -50;
+    put(other_text, path, newer_than_the_cache, 0664);
+    give_entries(path, 6, 6);
+}
+
+// A user who could write only the cache gains nothing when the text changes while their entries are compared.
+TEST_F(files, change_while_the_entries_of_a_cache_are_compared) {
+    constexpr bool with_entries = true;
+    constexpr bool without = false;
+    put(other_text, path, 50);
+    const outcome other = read_acl(path, text_only);
+    outcome from_cache = from_text;
+    from_cache.bytes = rich;
+    const outcome given_away = geteuid() == 0 ? from_text : from_cache; // by root alone
+    const std::tuple<const char *, bool, bool, void (*)(const std::string &), outcome> rows[] = {
+        {"the text loses its entries", with_entries, without, lose_entries, from_text},
+        {"the text is given away", with_entries, with_entries, give_away, given_away},
+        {"another text has the entries of the cache", without, with_entries, put_with_entries, other},
     };
-    EXPECT_EQ(watched(lose, [&] { return read_acl(path, checked); }), from_text);
+    if (!has_entries())
+        GTEST_SKIP() << "the file system has no POSIX ACLs";
+    for (const auto &[what, of_text, of_cache, change, wanted] : rows) {
+        SCOPED_TRACE(what);
+        lay_out(rich, 0);
+        fs::permissions(path, fs::perms(0664));
+        fs::permissions(cache, fs::perms(0664));
+        EXPECT_TRUE(of_text == without || give_entries(path, 6, 6));
+        EXPECT_TRUE(of_cache == without || give_entries(cache, 6, 6));
+        bool is_changed = false;
+        const auto change_once = [&, act = change](std::size_t) {
+            if (is_about_to("getxattr") && !std::exchange(is_changed, true))
+                act(path);
+            return faults::no_fault;
+        };
+        EXPECT_EQ(watched(change_once, [&] { return read_acl(path, checked); }), wanted);
+    }
 }
 
 } // namespace

@@ -75,6 +75,17 @@ TEST_F(Trace, LinesAreExact) {
     EXPECT_THAT(lines(), testing::ElementsAre(first, second));
 }
 
+TEST_F(Trace, LinesComeFromAThreadThatIsCancelled) {
+    in_child([&] {
+        std::thread([&] {
+            pthread_cancel(pthread_self());
+            EXPECT_EQ(enlist(), on);
+            EXPECT_EQ(tr_record_id_1("C", 1), TR_OK);
+        }).join();
+    });
+    EXPECT_EQ(lines().size(), 1u);
+}
+
 TEST_F(Trace, LinesComeUntilTheFileIsLost) {
     in_child([&] {
         enlist();

@@ -81,6 +81,29 @@ TEST_F(files, have_no_descriptor_of_a_standard_stream) {
     }
 }
 
+// Another thread that held the numbers of the streams, too, gives them back before a file is opened.
+TEST_F(files, keep_nothing_that_was_printed_while_they_had_the_number_of_a_stream) {
+    const std::string longer_than_the_cache(1000, 'x');
+    bool is_printed = false;
+    const auto give_back_and_print = [&](std::size_t) {
+        const bool is_opening = is_about_to("open") && faults::opened != "/";
+        const bool is_closing = is_about_to("close");
+        for (const int stream : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
+            if (is_opening)
+                close(stream);
+            if (is_closing)
+                is_printed |= write(stream, longer_than_the_cache.data(), longer_than_the_cache.size()) > 0;
+        }
+        return faults::no_fault;
+    };
+    const int status = status_of_child([&] {
+        faults::watched(give_back_and_print, [&] { return check(path); });
+        _exit(is_printed ? 0 : 1);
+    });
+    EXPECT_EQ(status, 0);
+    EXPECT_EQ(read_file(cache), from_text.bytes);
+}
+
 TEST_F(files, nobody_may_use_a_new_file_before_it_is_its_owners) {
     constexpr uid_t owner = 65534;
     if (geteuid() != 0 || !has_entries())

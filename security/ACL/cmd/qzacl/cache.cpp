@@ -57,8 +57,11 @@ finding examine(const std::string &file, const permission_set &set) {
     std::uint32_t flags = 0;
     const auto read = acl::read_file(file.c_str(), nullptr, set.get(), SEC_READ_ACL_CONVERT, &flags);
     require(read.code());
-    if ((flags & SEC_READ_ACL_TEXT) != 0)
+    if ((flags & SEC_READ_ACL_TEXT) != 0) {
+        if (read->bytes().empty()) // nothing is compiled from a text without entries
+            return {"empty", true};
         return {reason_of(file, text)};
+    }
     finding made;
     const auto compiled = acl::read_file(file.c_str(), nullptr, set.get(), SEC_READ_ACL_TEXT);
     if (!compiled) {

@@ -7,6 +7,7 @@
 
 #include <CLI/CLI.hpp>
 #include <algorithm>
+#include <charconv>
 
 namespace qzacl {
 
@@ -35,12 +36,12 @@ public:
         add_list(app_, "--handler", line.handlers);
         app_.add_flag("--check", line.checks)->disable_flag_override();
         app_.add_flag("-s", line.compiles)->disable_flag_override();
-        one_value(app_.add_option("--wait", line.wait));
+        one_value(app_.add_option("--wait", wait_));
     }
 
     // Returns the words that are not options, and all words after "--".
     std::vector<std::string> read(command_line &line, const std::vector<std::string> &arguments) {
-        refuse_empty_values(arguments);
+        refuse_odd_forms(arguments);
         try {
             app_.parse(std::vector<std::string>(arguments.rbegin(), arguments.rend()));
         } catch (const CLI::Error &error) {
@@ -49,6 +50,7 @@ public:
         if (order_ != "closest" && order_ != "sum")
             throw wrong_use("--order is closest or sum");
         line.takes_sum = order_ == "sum";
+        line.wait = seconds_of(wait_);
         return words_of(app_.remaining());
     }
 
@@ -62,15 +64,56 @@ public:
     }
 
 private:
-    // CLI11 would take the next word as the value of "--order=".
-    void refuse_empty_values(const std::vector<std::string> &arguments) const {
+    // CLI11 would take the next word as the value of "--order=", "--json=true" as "--json", and "-s-" as "-s --".
+    void refuse_odd_forms(const std::vector<std::string> &arguments) const {
+        bool is_value = false;
         for (const std::string &argument : arguments) {
-            if (argument == "--")
+            if (is_value)
+                is_value = false;
+            else if (argument == "--")
                 return;
-            if (argument.size() > 3 && argument.back() == '=' &&
-                app_.get_option_no_throw(argument.substr(0, argument.size() - 1)) != nullptr)
-                throw wrong_use(argument + " needs a value");
+            else if (argument.compare(0, 2, "--") == 0)
+                is_value = wants_value(argument);
+            else if (argument[0] == '-')
+                is_value = letters_want_value(argument);
         }
+    }
+
+    static bool takes_value(const CLI::Option *option) {
+        return option != nullptr && option->get_items_expected_max() != 0;
+    }
+
+    // Whether the next argument is the value of "--name".
+    bool wants_value(const std::string &argument) const {
+        const std::size_t equals = argument.find('=');
+        const CLI::Option *option = app_.get_option_no_throw(argument.substr(0, equals));
+        if (equals == std::string::npos || option == nullptr)
+            return takes_value(option);
+        if (!takes_value(option))
+            throw wrong_use(option->get_name() + " takes no value");
+        if (equals + 1 == argument.size())
+            throw wrong_use(argument + " needs a value");
+        return false;
+    }
+
+    // The same of the last letter of "-abc".
+    bool letters_want_value(const std::string &argument) const {
+        for (std::size_t at = 1; at < argument.size(); ++at) {
+            if (argument[at] == '-')
+                throw wrong_use("there is no option " + argument);
+            if (takes_value(app_.get_option_no_throw(std::string("-") + argument[at])))
+                return at + 1 == argument.size();
+        }
+        return false;
+    }
+
+    // CLI11 would take no digits at all for 0.
+    static unsigned seconds_of(const std::string &digits) {
+        unsigned seconds = 0;
+        const auto [end, error] = std::from_chars(digits.data(), digits.data() + digits.size(), seconds);
+        if (error != std::errc() || end != digits.data() + digits.size())
+            throw wrong_use("--wait is a number of seconds");
+        return seconds;
     }
 
     static std::vector<std::string> words_of(std::vector<std::string> left) {
@@ -86,6 +129,7 @@ private:
 
     CLI::App app_;
     std::string order_ = "closest";
+    std::string wait_ = "10";
 };
 
 const verb &find_verb(std::span<const verb> verbs, const std::string &name) {

@@ -27,7 +27,7 @@ struct command_line {
     // For edits.
     bool checks = false;   // --check: only show what would change
     bool compiles = false; // -s: also compile
-    unsigned wait = 10;    // seconds for the lock
+    unsigned wait = 0;     // seconds for the lock
 };
 
 // Reads the arguments after the command's name. Throws wrong_use for invalid ones.

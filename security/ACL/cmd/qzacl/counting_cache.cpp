@@ -49,7 +49,7 @@ int read_trees(acl_text &text, sec_acltree_array &trees) {
     }
 }
 
-// For a text without entries there is no cache to write, but services must not read an older one either.
+// For a text without entries there is no cache, and services must not read anything else.
 bool is_what_services_read(const std::string &path, const sec_perm_set_t &set,
                            const sec_acl_buffer_t &compiled) {
     sec_acl_buffer_t served = {};
@@ -58,7 +58,7 @@ bool is_what_services_read(const std::string &path, const sec_perm_set_t &set,
     const owned<void> owner(served.data);
     const bool is_text = (flags & SEC_READ_ACL_TEXT) != 0;
     if (result != SEC_S_OK || compiled.length == 0)
-        return result == SEC_S_OK && is_text;
+        return result == SEC_S_OK && served.length == 0;
     return !is_text && served.length == compiled.length &&
            std::memcmp(served.data, compiled.data, static_cast<std::size_t>(compiled.length)) == 0;
 }

@@ -15,10 +15,13 @@ namespace qzacl {
 
 namespace {
 
-// The first letter of the next line; 'd' at the end of input. Reads no byte after the line: an editor may need them.
+// The first letter of the next line, or 'd' at the end of input and after a signal. Reads no byte after the line, since
+// an editor may need it.
 char read_answer() {
     char first = '\0';
     for (;;) {
+        if (noted_signals::any())
+            return 'd';
         char c = '\0';
         const ssize_t count = read(STDIN_FILENO, &c, 1);
         if (count < 0 && errno == EINTR)
@@ -41,7 +44,7 @@ bool edit_session::run() {
     for (;;) {
         copy_.edit();
         const std::string text = copy_.text();
-        if (is_right(text) && (text == base_ || write(text)))
+        if (!noted_signals::any() && is_right(text) && (text == base_ || write(text)))
             return text != base_;
         if (!asks_to_go_on(text))
             throw trouble(file_.path() + " was not changed");

@@ -3,6 +3,7 @@
 #define QZACL_EDIT_SESSION_H
 
 #include "edited_file.h"
+#include "noted_signals.h"
 #include "permission_set.h"
 #include "private_copy.h"
 
@@ -27,6 +28,7 @@ private:
     const permission_set &set_;
     std::chrono::seconds wait_;
     std::string base_; // the text that the editor started from
+    noted_signals signals_;
     private_copy copy_;
 };
 

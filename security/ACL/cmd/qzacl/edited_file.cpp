@@ -26,7 +26,7 @@ bool same_time(const timespec &one, const timespec &other) {
 
 } // namespace
 
-trouble system_failure(const std::string &what) { return trouble(what + ": " + strerror(errno)); }
+system_failure::system_failure(const std::string &what) : trouble(what + ": " + strerror(errno)) {}
 
 edited_file::edited_file(const std::string &path) : path_(path) {
     const owned<char> real(realpath(path.c_str(), nullptr));

@@ -12,7 +12,9 @@
 namespace qzacl {
 
 // An action that failed, with the reason from errno.
-trouble system_failure(const std::string &what);
+struct system_failure : trouble {
+    explicit system_failure(const std::string &what);
+};
 
 class edited_file {
 public:

@@ -65,10 +65,11 @@ void find_stored_form(entry_key &key) {
     cu_set_no_error_1();
     if (key.is_refused || identity == made->identity)
         return;
-    // The part before the host is kept as given.
+    // The part before the host stays as the caller wrote it.
     const std::size_t at = identity.find('@');
     const std::size_t host = at == std::string::npos ? 0 : at + 1;
-    key.stored.replace(host, std::string::npos, std::string_view(made->identity).substr(host));
+    key.stored.resize(host);
+    key.stored += std::string_view(made->identity).substr(host);
 }
 
 } // namespace

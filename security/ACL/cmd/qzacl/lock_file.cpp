@@ -60,9 +60,10 @@ bool lock_file::open_or_make(const edited_file &file) {
     // So that the owner of the file can use the lock if another user's edit is killed.
     if (is_new && (fchown(file_.get(), file.status().st_uid, any_group) != 0 ||
                    fchmod(file_.get(), owner_alone) != 0)) {
-        const trouble failure = system_failure("cannot protect " + file.path() + ".lock");
+        const int error = errno;
         unlinkat(folder_, name_.c_str(), 0);
-        throw failure;
+        errno = error;
+        throw system_failure("cannot protect " + file.path() + ".lock");
     }
     return true;
 }

@@ -29,12 +29,12 @@ bool is_control(std::string_view text, std::size_t at) {
 
 } // namespace
 
-std::string escaped(std::string_view text, line_feeds feeds) {
+std::string escaped(std::string_view text, std::string_view kept) {
     constexpr char digits[] = "0123456789abcdef";
     std::string shown;
     for (std::size_t at = 0; at < text.size(); ++at) {
         const auto byte = static_cast<unsigned char>(text[at]);
-        if (!is_control(text, at) || (byte == '\n' && feeds == line_feeds::kept)) {
+        if (!is_control(text, at) || kept.find(text[at]) != std::string_view::npos) {
             shown += text[at];
             continue;
         }
@@ -47,8 +47,8 @@ std::string escaped(std::string_view text, line_feeds feeds) {
     return shown;
 }
 
-std::string shown_on(int fd, std::string_view lines) {
-    return isatty(fd) == 0 ? std::string(lines) : escaped(lines, line_feeds::kept);
+std::string shown_on(int fd, std::string_view lines, std::string_view kept) {
+    return isatty(fd) == 0 ? std::string(lines) : escaped(lines, kept);
 }
 
 json json_text(std::string_view bytes) { return valid_utf8(bytes); }
@@ -70,15 +70,15 @@ void append_json_text(std::string &line, std::string_view bytes) {
 
 output::output(bool is_json) : is_json_(is_json), is_terminal_(isatty(STDOUT_FILENO) != 0) {}
 
-void output::add(std::string_view text, line_feeds feeds) {
+void output::add(std::string_view text, std::string_view kept) {
     if (is_terminal_)
-        gathered_ += escaped(text, feeds);
+        gathered_ += escaped(text, kept);
     else
         gathered_ += text;
 }
 
 void output::line(std::string_view text) {
-    add(text, line_feeds::shown);
+    add(text, "");
     gathered_ += '\n';
     if (gathered_.size() >= enough_to_write)
         flush();
@@ -89,7 +89,7 @@ void output::lines(std::string_view text) {
         flush();
         return write(text);
     }
-    add(text, line_feeds::kept);
+    add(text, "\n");
     if (gathered_.size() >= enough_to_write)
         flush();
 }

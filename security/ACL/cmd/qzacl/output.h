@@ -2,7 +2,6 @@
 #ifndef QZACL_OUTPUT_H
 #define QZACL_OUTPUT_H
 
-#include <cstdint>
 #include <deque>
 #include <nlohmann/json.hpp>
 #include <string>
@@ -20,9 +19,8 @@ bool is_plain_in_json(std::string_view bytes);
 // Appends the same text as JSON, with its quotation marks.
 void append_json_text(std::string &line, std::string_view bytes);
 
-// What becomes of the line feeds in a text whose control bytes are shown as \xHH.
-enum class line_feeds : std::uint8_t { shown, kept };
-std::string escaped(std::string_view text, line_feeds feeds);
+// The text with its control bytes as \xHH, except those in `kept`.
+std::string escaped(std::string_view text, std::string_view kept);
 
 // The bytes to collect before they are written.
 inline constexpr std::size_t enough_to_write = 1 << 18;
@@ -42,8 +40,8 @@ private:
     std::deque<std::string> parts_;
 };
 
-// Lines as a descriptor shows them: unchanged or, on a terminal, with control bytes as \xHH.
-std::string shown_on(int fd, std::string_view lines);
+// Lines as a descriptor shows them: unchanged or, on a terminal, with control bytes as \xHH except those in `kept`.
+std::string shown_on(int fd, std::string_view lines, std::string_view kept = "\n");
 
 // Standard output. On a terminal control bytes are shown as \xHH, so that no identity can move the cursor.
 class output {
@@ -64,7 +62,7 @@ public:
     void flush();
 
 private:
-    void add(std::string_view text, line_feeds feeds);
+    void add(std::string_view text, std::string_view kept);
     static void write(std::string_view bytes);
 
     bool is_json_;

@@ -27,7 +27,7 @@ handlers::handlers(const std::vector<std::string> &words) {
         const std::size_t equals = word.find('=');
         const std::string mechanism = folded(word.substr(0, equals));
         const sec_id_compare_fn handler =
-            handler_named(equals == std::string::npos ? "" : word.substr(equals + 1));
+            handler_named(mechanism.empty() || equals == std::string::npos ? "" : word.substr(equals + 1));
         if (!named_.emplace(mechanism, handler).second)
             throw wrong_use("--handler is given twice for " + mechanism);
     }

@@ -10,6 +10,7 @@
 #include <cstdlib>
 #include <fcntl.h>
 #include <filesystem>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -32,20 +33,24 @@ std::string editor_command() {
 // Interrupts from the terminal are the editor's while it runs.
 class ignored_interrupts {
 public:
-    ignored_interrupts()
-        : interrupt_before_(std::signal(SIGINT, SIG_IGN)), quit_before_(std::signal(SIGQUIT, SIG_IGN)) {}
+    ignored_interrupts() {
+        struct sigaction ignoring = {};
+        ignoring.sa_handler = SIG_IGN;
+        sigaction(SIGINT, &ignoring, &interrupt_before_);
+        sigaction(SIGQUIT, &ignoring, &quit_before_);
+    }
     ignored_interrupts(const ignored_interrupts &) = delete;
     ignored_interrupts &operator=(const ignored_interrupts &) = delete;
     ~ignored_interrupts() { put_back(); }
 
     void put_back() const {
-        std::signal(SIGINT, interrupt_before_);
-        std::signal(SIGQUIT, quit_before_);
+        sigaction(SIGINT, &interrupt_before_, nullptr);
+        sigaction(SIGQUIT, &quit_before_, nullptr);
     }
 
 private:
-    void (*interrupt_before_)(int);
-    void (*quit_before_)(int);
+    struct sigaction interrupt_before_ = {};
+    struct sigaction quit_before_ = {};
 };
 
 } // namespace
@@ -92,8 +97,11 @@ void private_copy::edit() const {
 
 std::string private_copy::text() const {
     const descriptor file(open(path_.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC));
-    if (!file)
+    struct stat status = {};
+    if (!file || fstat(file.get(), &status) != 0)
         throw system_failure("cannot open " + path_);
+    if (!S_ISREG(status.st_mode))
+        throw trouble(path_ + " is no regular file");
     return read_whole(file.get(), path_);
 }
 

@@ -99,10 +99,14 @@ std::string changed_bytes(std::string_view text, const permission_set &set, cons
 
 } // namespace
 
-void check_text(const named_text &text, const permission_set &set, const reading &watched) {
+void require_text(const named_text &text) {
     constexpr char first_of_compiled = '\x85';
     if (text.bytes.substr(0, 1) == std::string_view(&first_of_compiled, 1))
         throw trouble(text.name + ": only texts can be edited, and this is a compiled ACL");
+}
+
+void check_text(const named_text &text, const permission_set &set, const reading &watched) {
+    require_text(text);
     const acl_document document(text.name, text.bytes, set, watched);
 }
 

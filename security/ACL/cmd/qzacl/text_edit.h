@@ -20,6 +20,9 @@ struct named_text {
     std::string_view bytes;
 };
 
+// Throws trouble for a compiled ACL.
+void require_text(const named_text &text);
+
 // Reads the whole text as the checker does with -c. Throws told_trouble after a mistake.
 void check_text(const named_text &text, const permission_set &set, const reading &watched = {});
 

@@ -6,6 +6,7 @@
 
 #include <cerrno>
 #include <cstring>
+#include <sys/stat.h>
 #include <unistd.h>
 
 using namespace qz;
@@ -38,6 +39,10 @@ std::string read_whole(const std::string &name) {
 std::string read_whole(int fd, const std::string &name) {
     std::string bytes;
     constexpr std::size_t step = 1 << 18;
+    // A file that memory cannot hold fails before it has filled it.
+    struct stat status = {};
+    if (fstat(fd, &status) == 0 && S_ISREG(status.st_mode))
+        bytes.reserve(static_cast<std::size_t>(status.st_size) + step);
     for (;;) {
         const std::size_t before = bytes.size();
         bytes.resize(before + step);
