@@ -22,16 +22,20 @@ namespace {
 
 enum class outcome { counts, does_not_count, failed };
 
-// A cache counts if it is later than its text in whole seconds. Returns the rest of the second in which the text was
-// written, in nanoseconds; 0 if that second is over.
-long rest_of_second(const std::string &path) {
-    constexpr long second = 1'000'000'000;
+// A cache counts if it is later than its text in whole seconds. Returns the time until the end of the second in which
+// the text was written; 0 if it is over. The kernel may have stamped the text from a finer clock, ahead of the coarse
+// one that stamps the cache, so that second may not even have begun. A text from further in the future is not waited
+// for.
+std::chrono::nanoseconds rest_of_second(const std::string &path) {
+    using std::chrono::seconds;
     struct stat text = {};
     timespec now = {};
-    if (stat(path.c_str(), &text) != 0 || clock_gettime(CLOCK_REALTIME_COARSE, &now) != 0 ||
-        text.st_mtim.tv_sec != now.tv_sec)
-        return 0;
-    return second - now.tv_nsec;
+    if (stat(path.c_str(), &text) != 0 || clock_gettime(CLOCK_REALTIME_COARSE, &now) != 0)
+        return {};
+    const seconds ahead(text.st_mtim.tv_sec - now.tv_sec);
+    if (ahead < seconds(0) || ahead > seconds(1))
+        return {};
+    return ahead + seconds(1) - std::chrono::nanoseconds(now.tv_nsec);
 }
 
 int read_trees(acl_text &text, sec_acltree_array &trees) {
@@ -84,12 +88,13 @@ outcome compile_once(const std::string &path, const sec_perm_set_t &set) {
 } // namespace
 
 bool make_cache_count(const edited_file &file, std::chrono::seconds wait, const permission_set &set) {
+    constexpr std::chrono::nanoseconds over(0);
     for (;;) {
         // Other edits may happen meanwhile; each waits for its own cache.
-        while (const long rest = rest_of_second(file.path()))
-            std::this_thread::sleep_for(std::chrono::nanoseconds(rest));
+        for (auto rest = rest_of_second(file.path()); rest != over; rest = rest_of_second(file.path()))
+            std::this_thread::sleep_for(rest);
         const lock_file lock(file, wait);
-        if (rest_of_second(file.path()) != 0)
+        if (rest_of_second(file.path()) != over)
             continue;
         const outcome found = compile_once(file.path(), *set.get());
         if (found == outcome::failed)
