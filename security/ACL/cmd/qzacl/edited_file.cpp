@@ -20,10 +20,6 @@ namespace {
 
 constexpr int reading = O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
 
-bool same_time(const timespec &one, const timespec &other) {
-    return one.tv_sec == other.tv_sec && one.tv_nsec == other.tv_nsec;
-}
-
 } // namespace
 
 system_failure::system_failure(const std::string &what) : trouble(what + ": " + strerror(errno)) {}
@@ -62,8 +58,7 @@ void edited_file::read() {
 bool edited_file::is_as_read() const {
     struct stat now = {};
     return fstatat(folder_.get(), leaf_.c_str(), &now, AT_SYMLINK_NOFOLLOW) == 0 && same_file(now, status_) &&
-           now.st_size == status_.st_size && same_time(now.st_mtim, status_.st_mtim) &&
-           same_time(now.st_ctim, status_.st_ctim);
+           now.st_size == status_.st_size && has_same_times(now, status_);
 }
 
 } // namespace qzacl

@@ -30,16 +30,6 @@ bool is_unchanged(const char *path, const struct stat &examined) {
     return same_file(now, examined) && has_same_owner(now, examined) && now.st_mode == examined.st_mode;
 }
 
-bool is_same_time(const timespec &one, const timespec &other) {
-    return one.tv_sec == other.tv_sec && one.tv_nsec == other.tv_nsec;
-}
-
-// True when the file has not been written in between. Copying with the time can keep the modification time, but nobody
-// can set the change time.
-bool has_same_times(const struct stat &one, const struct stat &other) {
-    return is_same_time(one.st_mtim, other.st_mtim) && is_same_time(one.st_ctim, other.st_ctim);
-}
-
 // True when the text is the one that was read, or is so new that a cache of what was read will not be used. Copying
 // another file over it keeps the inode.
 bool is_text_of(const struct stat &status, const text_origin &origin) {

@@ -5,6 +5,7 @@
 #include "base/owned.h"
 
 #include <cstddef>
+#include <ctime>
 #include <span>
 #include <sys/stat.h>
 
@@ -13,6 +14,16 @@ namespace qz {
 // True when both describe the same file, even under different names.
 inline bool same_file(const struct stat &one, const struct stat &other) {
     return one.st_dev == other.st_dev && one.st_ino == other.st_ino;
+}
+
+inline bool same_time(const timespec &one, const timespec &other) {
+    return one.tv_sec == other.tv_sec && one.tv_nsec == other.tv_nsec;
+}
+
+// True when a file has not been written in between. Copying with the time can keep the modification time, but nobody
+// can set the change time.
+inline bool has_same_times(const struct stat &one, const struct stat &other) {
+    return same_time(one.st_mtim, other.st_mtim) && same_time(one.st_ctim, other.st_ctim);
 }
 
 // Opens a vetted file, so that exchanging it in between gains nothing: the descriptor must show the same regular file
