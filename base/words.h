@@ -23,13 +23,6 @@ inline std::uint64_t load8(const void *at) {
     return word;
 }
 
-// Four bytes from any address, in host order.
-inline std::uint32_t load4(const void *at) {
-    std::uint32_t word;
-    std::memcpy(&word, at, sizeof word);
-    return word;
-}
-
 // A loaded word as a number whose lowest byte is the first in memory.
 constexpr std::uint64_t first_byte_lowest(std::uint64_t loaded) {
     return std::endian::native == std::endian::little ? loaded : __builtin_bswap64(loaded);
@@ -41,7 +34,7 @@ constexpr std::uint64_t first_byte_highest(std::uint64_t loaded) {
 }
 
 // The bits after the first `count` bytes of a number whose first byte is the highest; none for eight bytes.
-constexpr std::uint64_t bits_behind(std::size_t count) {
+constexpr std::uint64_t bits_after(std::size_t count) {
     return count < word_size ? UINT64_MAX >> (8 * count) : 0;
 }
 

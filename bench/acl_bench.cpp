@@ -64,7 +64,7 @@ void bench_phases(benchmark::State &state, const std::string &text) {
         stopwatch watch;
         watch.lap();
         for (qz::parsed_acle entry;
-             sec__read_acle_from_text(nullptr, &cursor, &remaining, &line, &entry) == 1;)
+             sec__read_acle_from_text(nullptr, &cursor, &remaining, &line, &entry) == qz::line_consumed;)
             entries.push_back(entry);
         parsing += watch.lap();
 

@@ -20,7 +20,7 @@ int same_name(const char *wanted, const char *held) { return folded(wanted).comp
     sec__register_id_handler(SEC_ID_HANDLER_USER, "names", same_name),
 };
 
-// Reads bytes that passed the check, and turns those of a copy to what a host of the other byte order writes.
+// Reads bytes that passed the check, and turns those of a copy into what a host of the other byte order writes.
 class reader {
 public:
     explicit reader(const std::string &bytes) : turned(bytes), bytes_(bytes) {}
@@ -90,7 +90,7 @@ bool succeeded(int result) {
     return result == SEC_S_OK;
 }
 
-// The mask of a decision, which is 0 when it fails.
+// The mask of a decision; 0 if it fails.
 std::uint32_t decided(const sec_acl_buffer_t &acl, int type, const char *mechanism, const char *stored_as,
                       const std::string &name) {
     std::uint32_t mask = 0;
@@ -131,7 +131,7 @@ void expect_decisions(const sec_acl_buffer_t &acl, const model_subacl &held, con
     EXPECT_EQ(held.type == SEC_ACLE_GROUP ? decided(acl, groups) : granted, granted);
 }
 
-// What edits make of the bytes: where these are what the model writes, what they make of the model.
+// Edits either change nothing and fail or, if the model writes these bytes, change both alike.
 void try_edits(const std::string &bytes, const model &held, const std::string &name) {
     const std::pair<int, const char *> keys[] = {{SEC_ACLE_USER, "UNIX"},        {SEC_ACLE_USER, "m"},
                                                  {SEC_ACLE_EXPANDED, "krb5"},    {SEC_ACLE_GROUP, ""},
@@ -150,7 +150,7 @@ void try_edits(const std::string &bytes, const model &held, const std::string &n
         }
 }
 
-// Questions whose answers nobody knows.
+// Questions without a known answer: only their codes and bounds are checked.
 void ask(const sec_acl_buffer_t &acl, const std::string &name) {
     sec_aclelist_t list = {};
     for (const int type : types) {
@@ -178,7 +178,7 @@ void dump_unseen(const sec_acl_buffer_t &acl) {
     cu_set_no_error_1();
 }
 
-// What the check accepted lists, decides and turns as the second reading says.
+// Accepted bytes list, decide and convert as the second reader says.
 void expect_sound(const sec_acl_buffer_t &acl, const std::string &bytes, const std::string &name) {
     reader second(bytes);
     const model held = second.read();
@@ -245,7 +245,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
     if (name.empty())
         name = "bob@host.example";
     use_everywhere(bytes, name);
-    // What another host wrote is used again in this one's order.
+    // The bytes of another host are used again in this one's order.
     buffer here(bytes);
     if (succeeded(sec_convert_acl_to_host(without_check, &here.acl)) && here.bytes() != bytes)
         use_everywhere(here.bytes(), name);

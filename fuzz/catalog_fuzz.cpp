@@ -29,7 +29,7 @@ std::vector<std::string> sorted(const std::string &text) {
     return all;
 }
 
-// A conversion carried out by the C library, which may not be asked to fill strings and characters with zeros.
+// A conversion by the C library, which must not be asked to pad strings and characters with zeros.
 std::string shown(const std::smatch &piece, const auto &argument) {
     const std::string kind = piece[4];
     const bool takes_zeros = kind != "s" && kind != "c";
@@ -42,11 +42,9 @@ std::string shown(const std::smatch &piece, const auto &argument) {
 // Which arguments a text takes, and whether as strings: each by the first conversion that takes it.
 std::map<int, bool> strings_in(const std::string &text) {
     std::map<int, bool> is_string;
-    for (const std::smatch &each : pieces(text)) {
-        const bool is_conversion = each[1].matched;
-        if (is_conversion)
+    for (const std::smatch &each : pieces(text))
+        if (each[1].matched)
             is_string.try_emplace(place_of(each), each[4] == "s");
-    }
     return is_string;
 }
 
@@ -72,7 +70,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
     EXPECT_EQ(given.count, is_string.empty() ? 0 : is_string.rbegin()->first + 1);
     for (int i = 0; i < most_arguments; ++i) {
         EXPECT_EQ(given.is_string(static_cast<unsigned>(i)), is_string[i]);
-        // What is not given holds a number, so that it would be a wild address.
+        // A missing argument holds a number, which would be a wild address.
         given.values[i].number = i % 2 == 0 ? -1234567 - i : 'a' + i;
         if (is_string[i])
             given.values[i].text = i % 2 == 0 ? "" : "text";

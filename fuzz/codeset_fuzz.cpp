@@ -22,7 +22,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
         wanted = fuzz::recoded(target, "UTF-32LE", *wanted);
     if (codeset < 2 && as_is)
         wanted = bytes;
-    // Such bytes begin what is beyond 16 bits.
+    // Such bytes begin the characters beyond 16 bits.
     const auto is_far = [](char c) { return static_cast<unsigned char>(c) >= 0xf0; };
     if (wanted && bmp_only && std::ranges::any_of(from_utf8 ? bytes : *wanted, is_far))
         wanted.reset();

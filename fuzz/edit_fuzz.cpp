@@ -85,7 +85,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
         const int of = type(from);
         const char *const by = mechanism(from);
         const char *const name = identity(from);
-        // What a type has no use for must not matter.
+        // Fields that a type does not use must not matter.
         const bool lacks_mechanism = !has_identity(of) && step % 2 == 0;
         const bool lacks_identity = !has_identity(of) && step % 3 == 0;
         const sec_acle_t acle =

@@ -13,7 +13,7 @@ namespace {
 using namespace fuzz;
 using namespace support;
 
-// What a line is: nothing, an entry as text_of() shows it, or a failure.
+// The content of a line: nothing, an entry as text_of() shows it, or a failure.
 struct line_facts {
     std::string entry = {};
     failure error = no_error;
@@ -32,7 +32,7 @@ std::optional<std::uint32_t> mask_of(const std::string &letters) {
     return mask;
 }
 
-// The second parser, of a line that is neither too long nor empty; `is_cut` by a NUL.
+// The second parser, for a line that is neither too long nor empty. `is_cut` means by a NUL.
 line_facts parse_tokens(const arguments &tokens, int line, bool is_cut) {
     const std::string type = folded(tokens[0]);
     if (type.size() != 1 || "noueg"s.find(type) == std::string::npos)
@@ -85,12 +85,12 @@ public:
         : text_(text), is_borrowed_(text.size() % 3 != 0),
           copy_(text_field(text) + std::string(is_borrowed_ ? readable_behind : 0, 'x')) {}
 
-    // The model, which in the end is as the bytes are.
+    // Returns the model, whose bytes are the compiled ones.
     model compile(buffer &out) {
         while (at_ < text_.size() && text_[at_] != '\0' && read_line())
             ;
         EXPECT_EQ(sec__read_acle_from_text(nullptr, &cursor_, &left_, &line_, &parsed_), 0);
-        // The trees, in the order in which their keys appeared, are compiled the last first.
+        // The tree of the latest key is compiled first.
         std::ranges::reverse(plain_.subacls);
         // Where memory for it fails, sorting takes another way.
         const auto compiles = [&] { return sec__acltrees_to_acl(trees_.trees(), &out.acl); };
@@ -101,7 +101,7 @@ public:
     }
 
 private:
-    // What trees point into has readable bytes behind it.
+    // Trees may read this many bytes after the text that they point into.
     static constexpr std::size_t readable_behind = 7;
 
     // Whether another line may follow.
@@ -110,7 +110,7 @@ private:
         const line_facts wanted = parse_plainly(text_, at_, static_cast<int>(number));
         const int result = sec__read_acle_from_text(nullptr, &cursor_, &left_, &line_, &parsed_);
         const sec_acle_t acle = qz::record_of(parsed_);
-        const bool is_read = result == 1;
+        const bool is_read = result == qz::line_consumed;
         const bool is_entry = is_read && acle.type != 0;
         EXPECT_EQ(is_read ? no_error : outcome_of(result), wanted.error);
         EXPECT_EQ(is_entry ? text_of(acle) : "", wanted.entry);

@@ -1,11 +1,10 @@
-// The bounds of what reads and writes bytes: a step that does not fit takes nothing, and a proven offset that is wrong
+// The bounds of the readers and the writer: a step that does not fit takes nothing, and a proven offset that is wrong
 // ends the process instead of going unnoticed.
 #include "bytes.h"
 
 #include <gtest/gtest.h>
 
 #include <array>
-#include <vector>
 
 namespace {
 

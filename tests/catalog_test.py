@@ -75,7 +75,7 @@ class Catalog(CommandCase):
 
     @unittest.skipIf(SANITIZED or not IS_ROOT, "only root can make a program privileged, and the sanitizers mind it")
     def test_privileged_programs(self):
-        """Who runs one with more rights than his own chooses neither its texts nor a file for it to trace into."""
+        """A user who runs one with more rights chooses neither its texts nor its trace file."""
         self.compile(ENGLISH.replace("3417-", "Trick-"))
         os.chmod(self.dir, 0o777)
         self.assertEqual(self.shown_by_program(owner=0, mode=0o755), ("no: Trick-", True))

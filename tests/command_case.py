@@ -18,15 +18,15 @@ BUILD = pathlib.Path(sys.argv[1]).resolve()
 SANITIZED = "QZ_SANITIZE:STRING=\n" not in (BUILD / "CMakeCache.txt").read_text()
 IS_ROOT = os.geteuid() == 0
 NOBODY = 65534
-ORDINARY = NOBODY - 1 if IS_ROOT else None  # whom root takes to be without its rights
-WRITER = NOBODY - 2  # a user whom an entry lets write
+ORDINARY = NOBODY - 1 if IS_ROOT else None  # the user that root becomes to lack its rights
+WRITER = NOBODY - 2  # a user whom a POSIX ACL permits to write
 
 # A copy of the command and its libraries that any user can reach, wherever the build folder lies.
 PLACE = tempfile.TemporaryDirectory()
 os.chmod(PLACE.name, 0o755)
 for part in ("bin", "lib"):
     shutil.copytree(BUILD / part, f"{PLACE.name}/{part}", symlinks=True)
-subprocess.run(["chmod", "-R", "a+rX", PLACE.name], check=True)  # as the mask of who built may not allow
+subprocess.run(["chmod", "-R", "a+rX", PLACE.name], check=True)  # the mask of the build may not allow it
 COMMAND = PLACE.name + "/bin/qzaclfck"
 # The C library musl has texts of its own, and knows no locales but "C" and such in UTF-8.
 IS_MUSL = b"/ld-musl-" in pathlib.Path(COMMAND).read_bytes()
@@ -44,7 +44,7 @@ TABLE = (SOURCE / "security/msg/qzseclib_msg.h").read_text("latin-1")  # so that
 
 
 def meant(literals):
-    """The text that literals of C stand for."""
+    """The text of C string literals."""
     text = re.sub(r'"\s*"', "", literals.strip())[1:-1]
     return re.sub(r"\\(.)", lambda escape: {"n": "\n", "t": "\t"}.get(escape[1], escape[1]), text)
 
@@ -60,7 +60,7 @@ def formatted(name, *values):
 
 
 def message(name, *values):
-    """A message as the command prints it: with an empty line behind it."""
+    """A message as the command prints it: followed by an empty line."""
     return formatted(name, *values) + "\n"
 
 
@@ -101,7 +101,7 @@ def steps_of(text):
 # ---- Programs and files ----
 
 def environment_with(**more):
-    """What programs are run with, whatever the caller has."""
+    """The environment of programs, independent of the caller's."""
     kept = {name: value for name, value in os.environ.items() if name.endswith("SAN_OPTIONS")}
     return {**kept, "PATH": f"{PLACE.name}/bin:{os.environ['PATH']}", "LC_ALL": "C", **more}
 
@@ -118,7 +118,7 @@ def run(arguments, cwd, environment=(), child=None, user=None):
 
 
 def shown_by_a_shell(command, cwd):
-    """What a transcript shows of a command."""
+    """The output of a command as a transcript shows it."""
     done = subprocess.run(["sh", "-c", command], cwd=cwd, env=environment_with(TMPDIR=cwd), check=False,
                           stdin=subprocess.DEVNULL, capture_output=True, timeout=300)
     lines = done.stdout.decode("utf-8", "replace").splitlines()
@@ -141,7 +141,7 @@ def posix_acl(group):
 
 
 def snapshot(directory):
-    """What tells of changes to anything in a directory, by name."""
+    """The state of everything in a directory, by name, to detect changes."""
     found = {}
     for item in os.scandir(directory):
         info = item.stat(follow_symlinks=False)

@@ -27,7 +27,7 @@ A_TEXT = "u abcd xyz wr\n"
 A_LINE = entry("u", "rw", "abcd", "xyz")
 A_CACHE = bytes.fromhex("8501020100 1a000000 04 01000000 05 6162636400 01 03000000 0400 78797a00")
 NO_CACHE = message("cache_skipped_after_errors")
-# What the C library says of options, which has no number.
+# Messages about options, which the C library prints without a number.
 OF_THE_C_LIBRARY = {
     "unknown_option": f"{COMMAND}: " + ("unrecognized option: %s\n" if IS_MUSL else "invalid option -- '%s'\n"),
     "lacks_argument": f"{COMMAND}: option requires an argument" + (": %s\n" if IS_MUSL else " -- '%s'\n"),
@@ -35,7 +35,7 @@ OF_THE_C_LIBRARY = {
 
 
 def printed(words):
-    """What the last words of a row of command.cases stand for."""
+    """The output that the last words of a row of command.cases describe."""
     name, *values = map(unescaped, words.split())
     if name == "shows":
         return entry(*("" if value == "none" else value for value in values))
@@ -45,7 +45,7 @@ def printed(words):
 
 
 class AclText(NamedTuple):
-    """A text, what each of its lines leads to, as a code and what is printed, and the cache of one without mistakes."""
+    """A text, the code and output of each of its lines, and the cache if it has no mistakes."""
     text: str
     results: list
     cache: list
@@ -75,7 +75,7 @@ CHOICES = [options for count in range(4) for options in itertools.combinations((
 
 
 def started(options, cwd, **how):
-    """The command, which runs beside the test."""
+    """The running command."""
     return subprocess.Popen([COMMAND, options, "-f", "a"], cwd=cwd, env={"LC_ALL": "C"}, **how)
 
 
@@ -83,7 +83,7 @@ class Output(CommandCase):
     def test_options(self):
         self.write("a", "n r\n")
         for arguments, status, errors in OPTIONS:
-            # The C library then looks for no options behind operands.
+            # With it, the C library looks for no options after operands.
             for strict in ({}, {"POSIXLY_CORRECT": "1"}):
                 with self.subTest(arguments, **strict):
                     self.expect(arguments.split(" "), status, errors, environment=strict)
@@ -127,7 +127,7 @@ class Output(CommandCase):
 
     @unittest.skipIf(IS_MUSL, "the C library knows no such locales")
     def test_a_locale_says_what_ends_a_word(self):
-        """More white space than usual ends a word, but does not stand between two."""
+        """White space that only the locale has ends a word, but may not precede one."""
         rules = pathlib.Path("/usr/share/i18n/locales/i18n_ctype").read_text("utf-8")
         rules = rules.replace("\nspace /", "\nspace /\n<U00A0>;/")
         pathlib.Path(self.root, "blanks").write_text(rules, "utf-8")
@@ -174,7 +174,7 @@ class Output(CommandCase):
                 self.assertEqual(self.printed_until(number, signal.SIG_IGN), (0, whole, whole))
 
     def printed_until(self, number, action):
-        """The status, what stands in the pipe when a signal comes early, and what would without it."""
+        """The status, what the pipe holds when a signal comes early, and what it would hold without one."""
         count = 5000
         self.write("a", "x\n" * count)
         set_action = lambda: signal.signal(number, action)
@@ -207,12 +207,13 @@ class Output(CommandCase):
                 self.expect(["-vsf", "b"], Code.OK, "" if is_silent else A_LINE, [("b.cacl", A_CACHE)], child=close)
 
 
-def limited_to(memory):
-    """What a process calls to set its own limits."""
-    def limit():
-        resource.setrlimit(resource.RLIMIT_STACK, (256 << 10, 256 << 10))
-        resource.setrlimit(resource.RLIMIT_AS, (memory, memory))
-    return limit
+def limited_to(limits, for_large_files=signal.SIG_DFL):
+    """A function that sets limits of its process, and the action for the signal of too large a file."""
+    def set_limits():
+        signal.signal(signal.SIGXFSZ, for_large_files)
+        for what, size in limits.items():
+            resource.setrlimit(what, (size, size))
+    return set_limits
 
 
 class Memory(CommandCase):
@@ -223,10 +224,11 @@ class Memory(CommandCase):
         self.write("a", "".join(f"u m {name} r\ne m {name}\n" for name in names))
         statuses = []
         for megabytes in range(4, 64, 2):
-            status, errors = run(["-cs", "-f", "a"], self.dir, child=limited_to(megabytes << 20))
+            limits = {resource.RLIMIT_STACK: 256 << 10, resource.RLIMIT_AS: megabytes << 20}
+            status, errors = run(["-cs", "-f", "a"], self.dir, child=limited_to(limits))
             self.assertEqual(os.path.exists(self.dir + "/a.cacl"), status == 0)
             if status < 0 or "error while loading" in errors:
-                continue  # not even the C library found its place
+                continue  # too little even to load the C library
             statuses.append(status)
             self.assertTrue(errors == "" if status == 0 else errors.startswith("3417-102"), errors)
         self.assertEqual(set(statuses), {Code.NO_MEMORY, Code.OK})
@@ -238,7 +240,7 @@ class Memory(CommandCase):
 NO_FILE = Code.BAD_FILENAME, message("bad_acl_file_name", "{dir}/a", 0)
 OTHER_MODE = Code.FILE_ERROR, message("cache_mode_differs", "{dir}/a")
 NO_WRITING = Code.FILE_ERROR, message("cannot_open_for_writing", "{dir}/a.cacl")
-IN_THE_WAY = [  # what the owner does before, and what "-s" then comes to
+IN_THE_WAY = [  # what the owner does first, and the result of "-s" then
     ("rm a; mkdir a", NO_FILE),
     ("rm a; mkfifo a", NO_FILE),
     ("ln -sf /dev/zero a", NO_FILE),
@@ -262,14 +264,6 @@ def entries_of(path):
     with contextlib.suppress(OSError):
         return os.getxattr(path, ENTRIES)
     return None
-
-
-def limited_to_file_size(size, action):
-    """What a process calls to set the limit, and what the signal of going beyond does."""
-    def limit():
-        signal.signal(signal.SIGXFSZ, action)
-        resource.setrlimit(resource.RLIMIT_FSIZE, (size, size))
-    return limit
 
 
 class Caches(CommandCase):
@@ -299,7 +293,7 @@ class Caches(CommandCase):
             self.assertEqual((cache.st_uid, cache.st_gid), (text.st_uid, text.st_gid))
 
     def test_a_cache_has_the_entries_of_the_file_and_no_others(self):
-        """Nobody can write the cache who cannot write the file, whatever new files in the folder inherit."""
+        """Only users who can write the file can write the cache, regardless of what new files in the folder inherit."""
         for entries, inherited in itertools.product((None, posix_acl(group=4)), (None, posix_acl(group=6))):
             with self.subTest(entries=entries, inherited=inherited):
                 self.fresh()
@@ -331,8 +325,8 @@ class Caches(CommandCase):
         short = Code.FILE_ERROR, message("short_write", 7, size, 0)
         nothing = Code.FILE_ERROR, message("short_write", -1, size, errno.EFBIG)
         for _ in ("without a cache", "with one"):
-            self.expect_refusal(short, child=limited_to_file_size(7, signal.SIG_IGN))
-            self.expect_refusal(nothing, child=limited_to_file_size(0, signal.SIG_DFL))
+            self.expect_refusal(short, child=limited_to({resource.RLIMIT_FSIZE: 7}, signal.SIG_IGN))
+            self.expect_refusal(nothing, child=limited_to({resource.RLIMIT_FSIZE: 0}))
             self.write("a.cacl", "old")
 
     def test_the_longest_path_leaves_room_for_the_suffix(self):

@@ -1,5 +1,5 @@
-// The platform utility library: errors and their texts, catalogs that are not there, letter case, clock, and what
-// threads share. What texts and code sets convert to is left to the fuzzers.
+// The platform utility library: errors and their texts, missing catalogs, letter case, the clock, and shared handles.
+// The fuzzers test the formatting of texts and the conversion of code sets.
 #include "base/posix_fold.h"
 #include "faults.h"
 #include "qz/cu.h"
@@ -58,7 +58,8 @@ TEST(Error, IsOfItsThreadAndKeptByAHandle) {
     EXPECT_EQ(current_text(), "");
 }
 
-// Far above and around what needs no allocation, with every remainder by 16. The thread ends with a block in use.
+// Around and far above the size that needs no allocation, with every remainder by 16. The thread ends with a block in
+// use.
 TEST(Error, LongArguments) {
     std::thread([] {
         for (const size_t first : {999990u, 500u})
@@ -105,7 +106,7 @@ TEST(Fold, AgreesWithTheCLibraryInItsOwnLocale) {
     for (int c = EOF; c < 256; ++c)
         EXPECT_EQ(cu_tolower_posix_1(c), std::tolower(c));
     const auto sign = [](int order) { return (order > 0) - (order < 0); };
-    // Any two bytes at every place of a word and behind it, between others that fold and such as might seem to.
+    // Any two bytes at every place of a word and after it, among others that fold or only seem to.
     for (unsigned at = 0; at < 10; ++at)
         for (unsigned pair = 1; pair < 0x10000; ++pair) {
             char a[] = "aZ@[\x7f\xc1\xff{zBq";

@@ -11,7 +11,7 @@ import unittest
 from pathlib import Path
 
 SOURCE = Path(__file__).resolve().parent.parent
-# What every Debian has, and what the build needs besides.
+# Programs on every Debian, and those that the build needs as well.
 ESSENTIAL = "bash cat cut dirname env mktemp readlink realpath rm sed stty tee xargs".split()
 BUILD_TOOLS = "g++ cmake ninja python3".split()
 NAMED = [  # a verb, and packages that a bare machine lacks for it
@@ -34,7 +34,7 @@ class Dev(unittest.TestCase):
         (self.dir / name).chmod(0o755)
 
     def dev(self, *arguments, path=SOURCE / "dev", **more):
-        """Runs it where no other programs are; gives the status, and what is printed on either stream."""
+        """Runs it where there are no other programs; returns the status and the output of each stream."""
         environment = {"PATH": str(self.dir), "TERM": "xterm", **more.pop("env", {})}
         done = subprocess.run([path, *arguments], env=environment, stdout=subprocess.PIPE, check=False,
                               **{"cwd": self.dir, "stderr": subprocess.PIPE, **more})

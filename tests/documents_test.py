@@ -63,7 +63,7 @@ class Documents(unittest.TestCase):
             (self.dir / name).chmod(0o755)
 
     def run_in_shell(self, command, folder=".", **more):
-        """Gives the status, and what is printed on either stream."""
+        """Returns the status, and the output of both streams."""
         here = str(self.dir)
         path = f"{BUILD}/bin:{BUILD}/examples:{here}:{os.environ['PATH']}"
         environment = {"PATH": path, "LC_ALL": "C", "HOME": here, "LOCPATH": here, **more}
@@ -72,7 +72,7 @@ class Documents(unittest.TestCase):
         return done.returncode, done.stdout.replace(str(self.dir), "/etc")
 
     def real_output(self, found, page):
-        """A command and what it really prints, which is compared with what the page shows."""
+        """A command and its real output, which is compared with the page."""
         command = found[2]
         for written, meant in WRITTEN.items():
             command = command.replace(written, meant)
@@ -200,7 +200,7 @@ class Documents(unittest.TestCase):
         self.assertEqual(self.run_in_shell("compare same other"), (0, "other: + g new r\n"))
 
     def commit(self, staged, present, environment):
-        """The status of a commit of one file while another stands in its place."""
+        """The status of committing a staged file while the working tree has another in its place."""
         stage = f"cd repo && cp ../examples/{staged}.acl 'a b.acl' && git add ."
         change = f"cp ../examples/{present}.acl *"
         commit = "git -c user.name=x -c user.email=x commit -m x"
@@ -259,7 +259,7 @@ class Documents(unittest.TestCase):
 
     @unittest.skipUnless(shutil.which("mandoc"), "there is no mandoc")
     def test_manual_is_sound(self):
-        # Without matters of style, such as blanks at the end of what was printed.
+        # Without matters of style, such as trailing blanks in output.
         checked = self.run_in_shell("mandoc -T lint -W warning $(grep -L '^[.]so ' man*/*)", BUILD / "share/man")
         self.assertEqual(checked, (0, ""))
 

@@ -19,7 +19,7 @@ extern "C" char *nl_langinfo(nl_item item) noexcept {
     return item == CODESET && claimed_code_set != nullptr ? const_cast<char *>(claimed_code_set) : real(item);
 }
 
-// What the conversion of code sets answers; 0: what it really does.
+// The claimed result of converting code sets; 0: the real one.
 static int claimed_result = 0;
 
 extern "C" int cu_iconv_str_1(cu_iconv_t handle, std::uint32_t options, const char *in,
@@ -46,7 +46,7 @@ const sec_perm_template_t own_templates[] = {
     {highest_bit, 'r', "", ""}, {1, '\xe9', "", ""}, {1, 'x', "", ""}, {2, 'r', "", ""}};
 const sec_perm_set_t own_letters = {4, own_templates};
 
-// After an error, what was found before it is there.
+// After an error, the bits or letters before it are there.
 TEST(permissions, turn_letters_into_bits) {
     const std::tuple<const char *, const sec_perm_set_t *, std::uint32_t, const char *> rows[] = {
         {nullptr, nullptr, 0, ""},
@@ -81,7 +81,7 @@ TEST(permissions, turn_bits_into_letters) {
     EXPECT_EQ(outcome_of(sec_translate_bitmask(1, nullptr, nullptr)), bad_parameter("sec_translate_mask", 3));
 }
 
-// What an entry made of these parameters holds, or the error.
+// The contents of an entry made from these parameters, or the error.
 std::string made_of(std::uint8_t type, const char *mechanism, const char *identity) {
     auto *made = reinterpret_cast<sec_acle_t *>(0x10);
     const failure error = outcome_of(sec_create_acle(type, highest_bit, mechanism, identity, &made));

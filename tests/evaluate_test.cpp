@@ -53,7 +53,7 @@ decision answer_to_groups(const std::string &bytes, const std::vector<const char
 int same_end(const char *wanted, const char *held) {
     if (std::string_view(wanted).ends_with(held))
         return 0;
-    cu_set_error_1(SEC_S_WARNING, 0, "none.cat", 1, 1, "no match"); // which is nobody else's business
+    cu_set_error_1(SEC_S_WARNING, 0, "none.cat", 1, 1, "no match"); // not the error of the decision
     return -1;
 }
 int never(const char *, const char *) { return 1; }
@@ -72,7 +72,7 @@ TEST(evaluate, decides_by_exactly_one_entry) {
         {"the handler sorts it before the second", {by_handler, "exact", "C"}, nothing},
         {"the requester's handler", {by_handler, "exact", "alice", "unix"}, nothing},
         {"no handler of the other kind", {by_handler, "krb5", "a", "exact"}, 8},
-        {"whatever the sign for the first", {SEC_ACLE_EXPANDED, "krb5", "hx"}, 64},
+        {"the handler sorts it before the first, which ends nothing", {SEC_ACLE_EXPANDED, "krb5", "hx"}, 64},
         {"entries, but no handler", {SEC_ACLE_EXPANDED, "unix", "alice"}, nothing},
     };
     for (const auto &[what, asked, mask] : rows) {
@@ -153,7 +153,7 @@ TEST(evaluate, refuses_bytes_that_are_no_acl_of_this_host) {
               bad_acl(msg::not_an_acl_buffer));
 }
 
-// A table that cannot be locked leaves no error behind a decision that was made without it.
+// If the table cannot be locked, the decision is made without it and leaves no error of that.
 TEST(evaluate, goes_on_when_handlers_cannot_be_looked_up) {
     const pthread_mutex_t kept = std::exchange(acl__state.lock, PTHREAD_ERRORCHECK_MUTEX_INITIALIZER_NP);
     pthread_mutex_lock(&acl__state.lock);

@@ -42,13 +42,13 @@ SERVICES = (BUILD / "examples/service", BUILD / "examples/service_cpp")
 PYTHON_SERVICE = (sys.executable, "-B", SOURCE / "examples/python/service.py")
 UTF8 = {**os.environ, "LC_ALL": "C.UTF-8"}
 FOR_PYTHON = {**UTF8, "QZ_LIBRARY_DIR": str(BUILD / "lib"), "PYTHONPATH": str(SOURCE / "bindings/python")}
-if "address" in SANITIZED:  # its runtime must come first; what Python never frees is no leak of ours
+if "address" in SANITIZED:  # its runtime must come first; what Python never frees is not our leak
     ASKED = CACHE["CMAKE_CXX_COMPILER"], f"-print-file-name=libclang_rt.asan-{platform.machine()}.so"
     FOR_PYTHON["LD_PRELOAD"] = subprocess.check_output(ASKED, text=True).strip()
     FOR_PYTHON["ASAN_OPTIONS"] = "detect_leaks=0"
 CAN_LOAD = not SANITIZED or os.path.exists(FOR_PYTHON.get("LD_PRELOAD", ""))
 
-# What a shell is asked with: its script of completions, and the line so far.
+# How a shell is asked: its completion script and the line so far are the arguments.
 BASH = """. "$0"
 COMP_WORDS=($1)
 COMP_CWORD=$((${#COMP_WORDS[@]} - 1))
@@ -56,12 +56,12 @@ _PROGRAM
 printf "%s\\n" "${COMPREPLY[@]}"
 """
 FISH = "source $argv[1]; complete -C $argv[2]"
-# At a terminal only it completes: what its script asks of it is shown.
+# It completes only at a terminal, so this prints what its script asks for.
 ZSH = '_arguments() { print -l -- $@ }; . "$0"'
 
 
 def run(*command, status=0, **options):
-    """Gives what is printed."""
+    """Returns the output."""
     done = subprocess.run([*map(str, command)], capture_output=True, text=True, check=False, **options)
     assert done.returncode == status, f"{command} gave {done.returncode}:\n{done.stdout}{done.stderr}"
     return done.stdout + done.stderr
@@ -76,7 +76,7 @@ def declared(header):
 
 
 def facts():
-    """What must hold of records and values, as conditions in C."""
+    """The facts about records and values, as conditions in C."""
     yield "sizeof acl__default_perm_list == 13 * 84"
     yield "sizeof ((sec_acle_t *)0)->mechanism == 17"
     yield "sizeof ((sec_group_ref_t *)0)->id == 8"
@@ -118,7 +118,7 @@ class Interface(unittest.TestCase):
 
     def compile(self, compiler, *options):
         for path in (SOURCE / "include/qz").glob("*.h*" if "++" in compiler else "*.h"):
-            # What service.hpp is made of is in it.
+            # service.hpp includes the others.
             if "-std=c++20" in options and path.name not in ("acl.hpp", "service.hpp"):
                 continue
             includes = f"#include <qz/{path.name}>\nint unused;\n"
@@ -146,7 +146,7 @@ class Interface(unittest.TestCase):
             symbols = run("nm", "-D", "--defined-only", BUILD / f"lib/{library}.so")
             self.assertEqual(sorted(re.findall(r" [^A ] (\w+)", symbols)), declared(header), library)
 
-    @unittest.skipIf(SANITIZED, "the sanitizers stand in the place of the hardening")
+    @unittest.skipIf(SANITIZED, "the sanitizers replace the hardening")
     def test_binaries_are_hardened(self):
         of_libraries = ["GNU_RELRO", "FLAGS.*BIND_NOW|FLAGS_1.*NOW", "GNU_STACK.* RW +0x", "__stack_chk_fail"]
         with_checked_calls = [*of_libraries, r" __\w+(?<!stack)_chk@"]
@@ -162,7 +162,7 @@ class Interface(unittest.TestCase):
         if IS_X86_64 and shutil.which("objdump"):
             self.assertIn("endbr64", run("objdump", "-d", "--no-show-raw-insn", BUILD / name))
 
-    @unittest.skipIf(SANITIZED, "the sanitizers stand in the place of the hardening")
+    @unittest.skipIf(SANITIZED, "the sanitizers replace the hardening")
     def test_hardening_that_leaves_no_mark_was_asked_for(self):
         branches = "-fcf-protection=full " if IS_X86_64 else ""
         flags = f"-fstack-clash-protection {branches}-ftrivial-auto-var-init=.*-D_FORTIFY_SOURCE=3"
@@ -190,7 +190,7 @@ class Interface(unittest.TestCase):
             self.assertRegex(told, r"^service\.acl: 3417-179 (?s:.*)Orvex Guide\.\n$")
 
     def consume(self, prefix, libraries, folder):
-        """Builds and runs the example with what is installed."""
+        """Builds and runs the example with the installed files."""
         shutil.copytree(SOURCE / "examples", folder, ignore=shutil.ignore_patterns("*.cacl"))
         (folder / "CMakeLists.txt").write_text(CONSUMER)
         packages = os.environ | {"PKG_CONFIG_PATH": f"{libraries}/pkgconfig"}

@@ -11,7 +11,7 @@ int prefix_matches(const char *requested, const char *entry) {
     return std::strncmp(requested, entry, std::strlen(entry));
 }
 
-// The code that an operation recorded, behind which lies one that has nothing to do with the next.
+// The code that an operation recorded. Then records an error that must not affect the next operation.
 std::string end() {
     const int code = recorded_error().code;
     cu_set_error_1(SEC_S_WARNING, 0, "none.cat", 1, 1, "stale");
@@ -59,7 +59,8 @@ std::string decide(const sec_acl_buffer_t &acl) {
     return found.str();
 }
 
-// What one round through the operations came to. Each thread has files and buffers of its own, and shares one.
+// The results of one round through the operations. Each thread has its own files and buffers, except for one shared
+// buffer.
 std::string use_all(const std::string &path, const sec_acl_buffer_t &shared) {
     std::ostringstream found;
     std::uint32_t mask = 0;

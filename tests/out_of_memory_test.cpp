@@ -1,12 +1,12 @@
-// Every allocation of every operation failing in turn, once and from then on: what is reported, and what is left. And
-// how few allocations a text takes.
+// Each allocation of each operation fails in turn, once and from then on: what is reported, and what is left. Also,
+// the number of allocations for a text is small.
 #include "acl_files.h"
 
 namespace {
 
 using namespace support;
 
-// What the operations make, each of which leaves nothing when it fails.
+// The results of operations. A failed one leaves nothing.
 struct made_things {
     sec_acl_buffer_t acl = {};
     sec_aclelist_t list = {};
@@ -29,16 +29,11 @@ struct made_things {
 };
 
 struct use {
-    std::string name; // or the functions of which the message names one
+    std::string name; // or the functions that the message may name
     std::function<int(sec_acl_buffer_t &)> call;
-    bool is_tolerated = false; // fails or goes on without
+    bool is_tolerated = false; // may succeed without the memory
 };
 constexpr bool tolerated = true;
-
-struct failing_allocation {
-    std::size_t at = 0;  // from 1; 0 fails none
-    bool and_on = false; // also all behind that one
-};
 
 struct allocations : files {
     made_things made;
@@ -48,14 +43,16 @@ struct allocations : files {
         return sec_read_acl_file("acl", user_name(), nullptr, flags, &made.acl, nullptr);
     }
 
-    // Tells how many allocations there were.
-    std::size_t run(const use &row, const failing_allocation &failing) {
-        SCOPED_TRACE(testing::Message() << "allocation " << failing.at << (failing.and_on ? " and on" : ""));
+    // Returns the number of allocations.
+    std::size_t run(const use &row, const faults::allocations_seen &failing) {
+        SCOPED_TRACE(testing::Message()
+                     << "allocation " << failing.fails_at << (failing.fails_on ? " and on" : ""));
         buffer held(rich);
         const auto live = faults::allocations.live;
         faults::allocations_seen seen;
         const outcome now = watched({}, [&] {
-            faults::allocations = {.fails_at = failing.at, .fails_on = failing.and_on, .live = live};
+            faults::allocations = failing;
+            faults::allocations.live = live;
             const int result = row.call(held.acl);
             seen = faults::allocations;
             faults::allocations = {.live = seen.live};
@@ -63,8 +60,8 @@ struct allocations : files {
         });
         EXPECT_TRUE(now.code == SEC_S_OK || made.is_empty());
         made.release();
-        EXPECT_TRUE(failing.at == 0 || faults::allocations.live == live) << "leaks";
-        if (failing.at == 0 || (row.is_tolerated && now.code == SEC_S_OK)) {
+        EXPECT_TRUE(failing.fails_at == 0 || faults::allocations.live == live) << "leaks";
+        if (failing.fails_at == 0 || (row.is_tolerated && now.code == SEC_S_OK)) {
             EXPECT_EQ(now.code, SEC_S_OK) << now.text;
             return seen.count;
         }
@@ -77,20 +74,20 @@ struct allocations : files {
 
     void fail_each(const use &row) {
         SCOPED_TRACE(row.name);
-        run(row, {}); // which also makes what then stays
+        run(row, {}); // also makes what stays allocated afterwards
         const std::size_t count = run(row, {});
         EXPECT_GT(count, 0u);
         for (std::size_t at = 1; at <= count; ++at) {
-            run(row, {.at = at});
-            run(row, {.at = at, .and_on = true});
+            run(row, {.fails_at = at});
+            run(row, {.fails_at = at, .fails_on = true});
         }
     }
 
-    // The command prints, for which it sets memory aside, or says that it wrote no cache.
+    // The command prints the failure, from memory that it reserved, or reports that it wrote no cache.
     static void expect_told(const use &row, const outcome &now, std::size_t size,
-                            const failing_allocation &failing) {
+                            const faults::allocations_seen &failing) {
         if (now.id != msg::no_memory.id) {
-            const bool is_skipped = failing.and_on && now.id == msg::cache_skipped_after_errors.id;
+            const bool is_skipped = failing.fails_on && now.id == msg::cache_skipped_after_errors.id;
             EXPECT_TRUE(is_skipped || printed.find("3417-102") != std::string::npos) << now.text;
             return;
         }
@@ -99,11 +96,11 @@ struct allocations : files {
         };
         const bool is_public = row.name.find('_') != std::string::npos;
         EXPECT_TRUE(!is_public || std::ranges::any_of(words(row.name), is_told)) << now.text;
-        // A text is read with room for a NUL, and what is converted is told without the converter's room.
+        // The size in a message may lack the NUL after a text, or the converter's reserve.
         arguments sizes;
         for (const std::size_t room : {0u, 1u, 16u})
             sizes.push_back(" " + std::to_string(size - room) + " bytes");
-        EXPECT_TRUE(failing.and_on || std::ranges::any_of(sizes, is_told)) << size << " in " << now.text;
+        EXPECT_TRUE(failing.fails_on || std::ranges::any_of(sizes, is_told)) << size << " in " << now.text;
     }
 };
 
@@ -123,7 +120,7 @@ TEST_F(allocations, of_buffers_and_edits_fail) {
     fail_each({"list type", [&](acl_buffer &acl) {
                    return sec_list_acl_by_type(&acl, SEC_ACLE_EXPANDED, "krb5", &made.list);
                }});
-    // What is packed is changed in place; the rest is expanded and compiled again.
+    // Packed sub-ACLs are changed in place; the rest is expanded and compiled again.
     fail_each({"sec_add_acle_to_acl", [&](acl_buffer &acl) { return sec_add_acle_to_acl(&large, &acl); }});
     fail_each(
         {"sec_del_acle_from_acl", [&](acl_buffer &acl) { return sec_del_acle_from_acl(&present, &acl); }});
@@ -157,7 +154,7 @@ TEST_F(allocations, of_files_fail) {
     fail_each({"check", check_and_tell, tolerated});
 }
 
-// Insertions wait for lines that come after them; what is told is the first mistake all the same.
+// Insertions wait for later lines; the first mistake is reported all the same.
 TEST_F(files, tell_their_first_mistake) {
     const int duplicate = msg::duplicate_group.id;
     const int bad_type = msg::bad_type_token.id;

@@ -1,10 +1,6 @@
-// The quick proofs about packed identities: where a string ends in its field, and which of two sorts first.
+// The fast comparisons of packed identities: where a string ends in its field, and which of two sorts first.
 #include "qzacl_acl/packed_identity.h"
-
-#include <gtest/gtest.h>
-
-#include <string>
-#include <utility>
+#include "support.h"
 
 namespace {
 
@@ -27,31 +23,17 @@ TEST(PackedIdentity, EndsExactlyWhereItsFirstNulIsTheLastByte) {
     }
 }
 
-// Around the limits of words and blocks, with bytes that folding changes, leaves alone, or that are higher than letters.
-const std::string identities[] = {"",
-                                  "A",
-                                  "a_",
-                                  "a`",
-                                  "AB",
-                                  "abcdef",
-                                  "abcdefg",
-                                  "abcdefg_",
-                                  "abcdefg`",
-                                  "abcdefgH",
-                                  "abcdefghi",
-                                  "user_000@",
-                                  "USER_001",
-                                  "user_0010",
-                                  "z",
-                                  "[",
-                                  "\xff\xff",
-                                  "same-start-of-16",
-                                  "same-start-of-16x"};
+// Around the limits of words and blocks, with bytes that folding changes or leaves alone, or that are higher than
+// letters. The first is empty.
+const support::arguments identities = support::split(
+    ",A,a_,a`,AB,abcdef,abcdefg,abcdefg_,abcdefg`,abcdefgH,abcdefghi,user_000@,USER_001,user_0010,z,[,"
+    "\xff\xff,same-start-of-16,same-start-of-16x",
+    ',');
 
-// The field of an identity with what may follow it in a buffer.
+// The field of an identity, with bytes that may follow it in a buffer.
 struct field {
-    field(const std::string &identity, char behind)
-        : size(identity.size() + 1), bytes(identity + '\0' + std::string(readable, behind)) {}
+    field(const std::string &identity, char following)
+        : size(identity.size() + 1), bytes(identity + '\0' + std::string(readable, following)) {}
 
     qz::byte_span span() const { return {reinterpret_cast<const unsigned char *>(bytes.data()), size}; }
 
@@ -59,47 +41,46 @@ struct field {
     std::string bytes;
 };
 
-void expect_behind_only_what_sorts_before(const std::string &wanted, const std::string &stored, char behind) {
-    const field held(stored, behind);
+void expect_after_only_what_sorts_before(const std::string &wanted, const std::string &stored,
+                                         char following) {
+    const field held(stored, following);
     const qz::identity_start start(wanted.c_str(), wanted.size());
     const bool sorts_before = qz::fold_compare(stored.c_str(), wanted.c_str()) < 0;
     const bool differs_early =
         qz::fold_compare(stored.substr(0, readable).c_str(), wanted.substr(0, readable).c_str()) != 0;
     const qz::identity_block block(held.span());
-    EXPECT_EQ(start.is_clearly_behind(block), sorts_before && differs_early)
-        << stored << " before " << wanted;
+    EXPECT_EQ(start.is_clearly_after(block), sorts_before && differs_early) << stored << " before " << wanted;
     EXPECT_EQ(block.sorts_before(qz::identity_block(field(wanted, 'a').span())),
               sorts_before && differs_early);
-    EXPECT_TRUE(sorts_before || !start.is_far_behind(held.span())) << stored << " before " << wanted;
+    EXPECT_TRUE(sorts_before || !start.is_far_after(held.span())) << stored << " before " << wanted;
 }
 
-TEST(PackedIdentity, SortsBehindOthersWhateverFollowsThem) {
-    for (const char behind : {'\0', '\1', 'a', '\xff'}) {
+TEST(PackedIdentity, SortsAfterOthersWhateverFollowsThem) {
+    for (const char following : {'\0', '\1', 'a', '\xff'}) {
         for (const std::string &wanted : identities) {
             for (const std::string &stored : identities)
-                expect_behind_only_what_sorts_before(wanted, stored, behind);
+                expect_after_only_what_sorts_before(wanted, stored, following);
         }
     }
 }
 
-TEST(PackedIdentity, IsFarBehindWhereNoOtherByteThanLettersAndDigitsDiffers) {
+TEST(PackedIdentity, IsFarAfterWhereOnlyLettersAndDigitsDiffer) {
     const std::pair<std::string, std::string> rows[] = {{"bob", "Alice"},
                                                         {"BOB", "alice"},
                                                         {"user0002@corp.com", "USER0001@corp.com"},
                                                         {"abcdefghijklmnZ", "ABCDEFGHIJKLMNA"}};
     for (const auto &[wanted, stored] : rows)
-        EXPECT_TRUE(
-            qz::identity_start(wanted.c_str(), wanted.size()).is_far_behind(field(stored, 'x').span()))
+        EXPECT_TRUE(qz::identity_start(wanted.c_str(), wanted.size()).is_far_after(field(stored, 'x').span()))
             << stored << " before " << wanted;
 }
 
-// A field that no NUL ends says nothing of what would follow it, whatever bytes do.
-TEST(PackedIdentity, IsNotFarBehindWhatItStartsWith) {
+// A field without a NUL says nothing about the bytes that follow it.
+TEST(PackedIdentity, IsNotFarAfterWhatItStartsWith) {
     const std::string wanted = "abcdefghijklmnopq";
     const qz::identity_start start(wanted.c_str(), wanted.size());
     for (std::size_t size = 0; size <= readable; ++size) {
         const field held(wanted.substr(0, size), '\0');
-        EXPECT_FALSE(start.is_far_behind(held.span().first(size))) << size;
+        EXPECT_FALSE(start.is_far_after(held.span().first(size))) << size;
     }
 }
 

@@ -1,12 +1,10 @@
-// What concerns the process as a whole: the registration for tracing, and forks. Whatever another thread holds of a
-// library when a process forks, the child can use the library.
+// State of the whole process: registration for tracing, and forks. The child of a fork can use each library, even if
+// another thread of its parent held the library's lock.
 #include "qzacl_trace.h"
 #include "support.h"
 
 #include <semaphore>
 #include <thread>
-
-namespace {
 
 using namespace support;
 
@@ -19,12 +17,10 @@ struct stop_with_lock_held {
     std::binary_semaphore is_holding{0};
     std::binary_semaphore is_forked{0};
 };
-thread_local stop_with_lock_held *stop = nullptr;
+static thread_local stop_with_lock_held *stop = nullptr;
 
-int sizes_asked = 0;
-int names_asked = 0;
-
-} // namespace
+static int sizes_asked = 0;
+static int names_asked = 0;
 
 // The linker leads the libraries' calls here.
 extern "C" int __real_pthread_mutex_unlock(pthread_mutex_t *mutex);
@@ -80,7 +76,7 @@ TEST(fork, leaves_a_child_that_can_use_the_libraries) {
         {"libqzacl", looks_up_a_handler}, {"libqz_cu", fetches_a_text}, {"libqz_tr", registers_for_tracing}};
     for (const auto &[library, use] : uses) {
         SCOPED_TRACE(library);
-        ASSERT_TRUE(use()); // what is done once is done
+        ASSERT_TRUE(use()); // first-time work is done
         stop_with_lock_held held;
         std::thread holder([&held, use = use] {
             stop = &held;
@@ -89,7 +85,7 @@ TEST(fork, leaves_a_child_that_can_use_the_libraries) {
         held.is_holding.acquire();
         const pid_t child = fork();
         if (child == 0) {
-            alarm(10); // ends a child that waits for the holder, whom it does not have
+            alarm(10); // ends a child that waits for a holder that it does not have
             _exit(use() ? 0 : 1);
         }
         held.is_forked.release();

@@ -31,7 +31,7 @@ OLD = b"# staff\nu unix alice@h r # boss\ng ops rw\n"
 
 
 def edits(outcome):
-    """Of edits.cases the texts, the words of the edits, and what the outcome then is."""
+    """The texts, the words of the edits and their results in edits.cases, by outcome."""
     for text, words, result in rows("edits.cases"):
         kind, _, rest = result.partition(": ")
         if kind == outcome:
@@ -95,7 +95,7 @@ def differ_in_letters(old, new):
 
 
 def changed_acl(text, verb, letters, key):
-    """What the library makes of the ACL when it is edited there."""
+    """The ACL after the same edit by the library."""
     acl = qzacl.Acl.from_text(text)
     kind = {"n": 1, "o": 2, "u": 4, "e": 8, "g": 16}[key[0].lower()]
     mechanism = key[1].lower() if len(key) == 3 else ""
@@ -114,7 +114,7 @@ def changed_acl(text, verb, letters, key):
 
 class EditCase(CommandCase):
     def qzacl(self, *words, tracer=(), **how):
-        """Gives the status and what was printed, on both streams together."""
+        """Returns the status and the output of both streams together."""
         command = [*tracer, QZACL, *[word.encode("latin-1") for word in words]]
         done = subprocess.run(command, cwd=self.dir, env=environment_with(), stdin=subprocess.DEVNULL, timeout=300,
                               stdout=subprocess.PIPE, stderr=subprocess.STDOUT, check=False, **how)
@@ -286,7 +286,7 @@ class Locks(EditCase):
         self.assertIn(status, (0, -signal.SIGKILL))
         self.assertIn(self.read(), (OLD, OLD + b"n r\n"), (step, time))
         self.assertLessEqual(set(os.listdir(self.dir)), {"a", "a.lock", ".a.qzacl"})
-        # What is left behind hinders nobody, and goes.
+        # The next edit is not hindered by what is left, and removes it.
         self.assertEqual(self.qzacl("grant", "a", "w", "n")[0], 0)
         self.assertEqual(os.listdir(self.dir), ["a"])
         self.assertEqual(os.getxattr(f"{self.dir}/a", "user.origin"), b"x")

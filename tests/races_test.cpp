@@ -1,5 +1,5 @@
-// Files exchanged, edited or removed between any two steps of a reader or a writer: no reader is ever told anything
-// else than the text says.
+// Files exchanged, edited or removed between any two steps of a reader or a writer: no reader ever gets anything but
+// what the text says.
 #include "acl_files.h"
 
 namespace {
@@ -32,7 +32,7 @@ void link_at_what_is_opened(const std::string & /*path*/) {
 }
 void append(const std::string &path) { std::ofstream(path, std::ios::app) << "u unix more@host r\n"; }
 
-// What somebody does to the ACL file or its cache while another works.
+// A change of the ACL file or its cache by someone else during an operation.
 struct disturbance {
     std::string name;
     std::function<void(const std::string &)> act;
@@ -61,7 +61,7 @@ const disturbance disturbances[] = {
     {"a foreign cache", [](auto &path) { write_file(path + ".cacl", rich); }},
 };
 
-// What happens to a file between its vetting and its opening, and how often; what is then told.
+// What happens to a file between its vetting and its opening, and how often; the messages that follow.
 struct replacement {
     const char *name;
     int times;
@@ -107,7 +107,7 @@ TEST_F(files, are_read_anew_when_they_are_replaced) {
 }
 
 struct races : files {
-    // Disturbs a reader, or the command, and gives the number of its steps.
+    // Disturbs a reader, or the command, and returns the number of its steps.
     std::size_t run(const std::string &stale, bool by_command, const disturbance &row, std::size_t at) const {
         SCOPED_TRACE(testing::Message() << row.name << " before step " << at);
         lay_out(stale);
@@ -120,12 +120,12 @@ struct races : files {
         const bool is_cache_linked =
             row.name == "a link at the name that is opened" && faults::opened == cache;
         EXPECT_TRUE(!by_command || !is_cache_linked || found.id == msg::cannot_open_for_writing.id) << found;
-        // What is read is the text as it was, as it is now, or what somebody put in the place of the cache.
+        // The result is the text as it was, the text as it is now, or the cache that someone put in place.
         const outcome now = read_acl(path, text_only);
         const bool is_known = found == from_text || found == now || found.bytes == rich;
         EXPECT_TRUE(by_command || found.code != SEC_S_OK || is_known) << found;
         EXPECT_TRUE(by_command || !row.is_replacement || found.code == SEC_S_OK) << found;
-        // An old file is told from the text by its number, for as long as the writer looks.
+        // The writer detects an old file by its inode number, as long as it checks.
         const auto closed = std::ranges::find(calls, "close") - calls.begin();
         const bool is_late = row.name.ends_with("old file") && static_cast<long>(at) > closed + 1;
         const bool is_foreign = fs::is_regular_file(cache) && read_file(cache) == rich;
@@ -142,7 +142,7 @@ TEST_F(races, are_won_before_every_step) {
                     steps = std::max(steps, run(stale, by_command, row, at));
 }
 
-// Nor do those that read their standard input take a part of a file away.
+// Nor does a thread that reads its standard input consume a part of a file.
 TEST_F(files, are_read_whole_while_another_thread_reads_its_input) {
     const auto take_a_part = [](std::size_t) {
         char part[4];
@@ -172,7 +172,7 @@ void put_with_entries(const std::string &path) {
     give_entries(path, 6, 6);
 }
 
-// Whoever could write the cache, but not the text, gains nothing when the text changes while their entries are compared.
+// A user who could write only the cache gains nothing when the text changes while their entries are compared.
 TEST_F(files, change_while_the_entries_of_a_cache_are_compared) {
     constexpr bool with_entries = true;
     constexpr bool without = false;

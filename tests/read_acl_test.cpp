@@ -20,7 +20,7 @@ struct read_acl_file : testing::Test {
     static reading failed(const failure &error, unsigned flags) { return {"", flags, error}; }
     static reading read(const std::string &name, unsigned flags, const char *user = nullptr) {
         buffer held;
-        held.acl = {7, &held}; // overwritten whatever comes
+        held.acl = {7, &held}; // always overwritten
         const int result = sec_read_acl_file(name.c_str(), user, nullptr, flags, &held.acl, &flags);
         EXPECT_EQ(held.acl.data == nullptr, held.acl.length == 0);
         return {held.bytes(), flags, outcome_of(result)};
@@ -139,7 +139,7 @@ TEST_F(read_acl_file, knows_times_after_2038) {
     EXPECT_EQ(read(path, 0), given(from_text, text));
 }
 
-// A file of 4 GiB is none without bytes, and one of a byte less does not go into a block of none.
+// A file of 4 GiB does not count as empty, and one of a byte less does not get a block without bytes.
 TEST_F(read_acl_file, larger_than_memory_can_be_does_not_fit) {
     if (sizeof(size_t) > 4)
         GTEST_SKIP() << "any file may fit";
@@ -192,7 +192,7 @@ TEST_F(read_acl_file, of_a_user_must_be_that_users_alone) {
     EXPECT_EQ(read("acl", 0, name), given("", 0));
 }
 
-// The path that a name stands for, behind the user's id where there is a user; or the failure.
+// The path of a name, after the user's id if there is a user; or the failure.
 failure path_of(const std::string &name, const char *user = nullptr) {
     qz::path_buffer path;
     std::uint32_t uid = 0;
@@ -202,7 +202,7 @@ failure path_of(const std::string &name, const char *user = nullptr) {
 }
 failure found(const std::string &path) { return {SEC_S_OK, 0, path}; }
 
-TEST(file_name, stands_as_it_is_or_behind_the_working_directory) {
+TEST(file_name, is_absolute_or_in_the_working_directory) {
     const temporary_folder folder;
     const std::string x4094(4094, 'x');
     const std::string x4095(4095, 'x');
@@ -231,7 +231,7 @@ TEST(file_name, lies_in_the_home_directory_of_a_user) {
     const auto unusable = [](const char *name) {
         return error_of(SEC_S_BAD_PARAMETER, msg::path_with_user_name, name, "alice");
     };
-    // The name; what the database answers, and as whose home; the path or the failure.
+    // The name; the answer of the user database; the home directory; the path or the failure.
     const std::tuple<const char *, std::pair<int, const char *>, std::string, failure> rows[] = {
         {"..", {0, "alice"}, "/h/", found("4242 /h/..")},
         {"12345", {0, "alice"}, h4090, found("4242 " + h4090 + "/12345")},

@@ -218,7 +218,7 @@ TEST(service, texts_are_read_in_a_thread_that_is_cancelled) {
     EXPECT_EQ(entry_count, acl_of(service_text).list()->size());
 }
 
-// What other threads of a service without standard streams print does not become part of a text.
+// In a service without standard streams, output of other threads does not become part of a text.
 TEST(service, texts_are_in_no_file_of_a_standard_stream) {
     const int status = status_of_child([] {
         for (const int stream : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO})
@@ -238,7 +238,7 @@ TEST(service, no_text_holds_what_no_line_can) {
         {longest, 1, SEC_S_OK},        {longest + "n", 1, SEC_S_BAD_ACLE},
         {longest + "nn", 0, SEC_S_OK}, {"a", 0x80000000, SEC_S_BAD_PERMISSION},
     };
-    // Bytes from elsewhere may hold what cannot be added.
+    // Bytes from elsewhere may hold entries that cannot be added.
     const auto code_of_text = [](const std::string &subacl) {
         const std::string bytes = acl_of_one(subacl);
         return qz::to_text(*qz::acl::from_bytes(bytes.data(), bytes.size())).code();
@@ -251,7 +251,7 @@ TEST(service, no_text_holds_what_no_line_can) {
         const std::string field = text_field(mechanism);
         EXPECT_EQ(code_of_text(packed_subacl(SEC_ACLE_USER, field, 1, entry_bytes("al 1"))), SEC_S_BAD_ACLE);
     }
-    // A set of a service's own, whose letters do not tell all bits apart.
+    // A service's own set with the same letter for two bits.
     const sec_perm_template_t shared[] = {{1, 'a', "", ""}, {2, 'a', "", ""}};
     const sec_perm_set_t set = {2, shared};
     EXPECT_EQ(qz::to_text(acl_of("o w\n"), &set).code(), SEC_S_BAD_ACLE);

@@ -1,4 +1,4 @@
-// Every system call failing in turn with several errors: what each failure leads to, and what is left.
+// Each system call fails in turn with several errors: what each failure leads to, and what is left.
 #include "acl_files.h"
 
 #include <regex>
@@ -7,7 +7,7 @@ namespace {
 
 using namespace support;
 
-// What a failing call leads to, by the name of the message.
+// The result of a failing call, with the name of its message.
 struct told {
     int id;
     int code;
@@ -39,7 +39,7 @@ const told &result_of(const outcome &now) {
     return found == std::end(results) ? results[0] : *found;
 }
 
-// Where nothing can be written, what was begun is cleaned up.
+// On a full disk, a partial file is cleaned up.
 enum class disk : std::uint8_t { has_room, is_full };
 // Whether the text and the cache have the entries of a POSIX ACL.
 enum class posix_acl : std::uint8_t { none, of_both };
@@ -79,7 +79,7 @@ struct system_calls : files {
         EXPECT_TRUE(std::regex_search(now.text, number)) << now.text;
     }
 
-    // What the failure of one call leads to, which the error makes no difference to.
+    // The result of one failing call, which must not depend on the error.
     std::string result_of_call(const way &row, std::size_t at, const std::string &call,
                                bool is_clean_up) const {
         const bool is_transfer = call == "read" || call == "write";

@@ -1,4 +1,4 @@
-// The trace facility. A process reads its configuration once, so whatever needs one runs in a child.
+// The trace facility. A process reads its configuration once, so tests that need one run in a child.
 #include "qz/tr.h"
 
 #include <fcntl.h>
@@ -38,7 +38,7 @@ struct Trace : testing::Test {
         EXPECT_EQ(tr_register_component_1(component, level.data(), table, 4), code);
         return level;
     }
-    // The lines of the file, without what differs from run to run where that has its form.
+    // The lines of the file, without well-formed parts that differ from run to run.
     std::vector<std::string> lines() const {
         const std::regex head(R"(^."time":"\d{4}(-\d\d){2}T\d\d(:\d\d){2}\.\d{9}Z","pid":\d+,"tid":\d+,)");
         std::ifstream in(file);
@@ -96,7 +96,7 @@ TEST_F(Trace, LinesComeUntilTheFileIsLost) {
         limit.rlim_cur = RLIM_INFINITY;
         EXPECT_EQ(setrlimit(RLIMIT_FSIZE, &limit), 0);
         EXPECT_EQ(tr_record_id_1("C", 3), TR_OK);
-        closefrom(3); // as a daemon does, whose next file then takes the number
+        closefrom(3); // as a daemon does; its next file gets the number
         const std::string next = file + "2";
         EXPECT_EQ(open(next.c_str(), O_WRONLY | O_CREAT, 0600), 3);
         EXPECT_EQ(tr_record_id_1("C", 4), TR_NO_FILE);
@@ -118,11 +118,11 @@ TEST_F(Trace, LinesTellTheirTimeAndThread) {
         EXPECT_THAT(line, testing::HasSubstr(",\"pid\":" + ids + ","));
         strptime(line.c_str(), "{\"time\":\"%Y-%m-%dT%H:%M:%S.", &parts);
         EXPECT_LE(before, timegm(&parts));
-        EXPECT_LE(timegm(&parts), time(nullptr) + 1); // whose clock is coarse
+        EXPECT_LE(timegm(&parts), time(nullptr) + 1); // the clock of time() is coarse
     };
     in_child([&] {
         enlist();
-        tr_record_id_1("C", 1); // must not settle the ids of what its process forks
+        tr_record_id_1("C", 1); // must not fix the ids for children of this process
         in_child([&] { std::thread(record).join(); });
     });
 }
@@ -163,7 +163,7 @@ TEST_F(Trace, OnlyRegularFilesAreWrittenTo) {
     const std::string too_long = folder + std::string(TR_FILENAME_SIZE, '/') + "t";
     ASSERT_EQ(symlink("target", link.c_str()), 0);
     ASSERT_EQ(mkfifo(fifo.c_str(), 0600), 0);
-    const int reader = open(fifo.c_str(), O_RDWR); // without whom it could not be opened
+    const int reader = open(fifo.c_str(), O_RDWR); // without a reader it could not be opened
     for (const std::string &name : {link, fifo, folder, "/dev/null"s, ""s}) {
         SCOPED_TRACE(file = name);
         in_child([&] {
@@ -205,7 +205,8 @@ TEST_F(Trace, TheFileTellsItsNameAndSize) {
 TEST_F(Trace, FilesOfOthersAreNotWrittenTo) {
     const std::tuple<const char *, bool, std::function<int()>> rows[] = {
         {"readable", true, [&] { return chmod(file.c_str(), 0644); }},
-        {"writable by its group, or by whom an ACL names", false, [&] { return chmod(file.c_str(), 0620); }},
+        {"writable by its group, or by a user in a POSIX ACL", false,
+         [&] { return chmod(file.c_str(), 0620); }},
         {"writable by others", false, [&] { return chmod(file.c_str(), 0602); }},
         {"with a second name", false, [&] { return link(file.c_str(), (file + "2").c_str()); }},
         {"of somebody else", false, [&] { return chown(file.c_str(), 1, 1); }},
@@ -216,7 +217,7 @@ TEST_F(Trace, FilesOfOthersAreNotWrittenTo) {
         std::ofstream(file) << "before\n";
         fs::permissions(file, fs::perms{0600});
         if (change() != 0)
-            continue; // only root gives files away
+            continue; // only root can change the owner
         in_child([&, is_used = is_used] {
             EXPECT_EQ(enlist(), is_used ? on : off);
             EXPECT_EQ(tr_record_id_1("C", 1), is_used ? TR_OK : TR_NO_FILE);

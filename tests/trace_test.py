@@ -21,7 +21,7 @@ for line in LINES:
     elif line and not line.startswith("#"):
         rows.append(line)
 
-# Whether trees let go of their entries one by one is not seen from outside.
+# Whether trees release their entries one by one is not visible from outside.
 RELEASES_OF_ENTRIES = (45, 47, 48)
 CREATES_ENTRY = 40
 CREATED_ENTRY = 43
@@ -35,13 +35,13 @@ def number_of(row):
 
 
 def wanted_items(row):
-    """Of each item of a row the last word, which says what it holds."""
+    """The last word of each item of a row, which says what the item holds."""
     _, _, items = row.partition(": ")
     return [item.split()[-1] for item in items.split(", ")] if items else []
 
 
 def is_as_wanted(item, wanted):
-    """Whether the bytes of an item are what its row says: see operations.trace."""
+    """Whether the bytes of an item match its row; see operations.trace."""
     if wanted == "any":
         return True
     if wanted == "wide":
@@ -61,7 +61,7 @@ class Trace(CommandCase):
         return {"QZ_TRACE_LEVELS": "_SEL:" + levels, "QZ_TRACE_FILE": self.dir + ".trace"}
 
     def run_test(self, name, cases, levels):
-        """Runs some cases of a test program, and gives the records."""
+        """Runs some cases of a test program, and returns the records."""
         self.fresh()
         program = [BUILD / f"tests/{name}_test", "--gtest_filter=" + cases]
         environment = os.environ | self.traced(levels)
@@ -97,13 +97,13 @@ class Trace(CommandCase):
         self.assertEqual("".join(released), "cifpwtm" + "dcba" + "abcd" + "cbda" + "tfm")
 
     def test_replaced_entries(self):
-        """A mechanism that fills its array is told without what stands behind it."""
+        """A mechanism that fills its array is recorded without the bytes after it."""
         records = self.run_test("tree", "*leaves_up", "Info=1")
         mechanisms = [bytes_of(record["items"][1]) for record in records]
         self.assertEqual(mechanisms, [b"sixteen-bytes-xxx"] * 5)
 
     def test_entries_that_nobody_gets(self):
-        """They are not told to be released."""
+        """Their release is not recorded."""
         records = self.run_test("entry", "*DeathTest.*", "API=1")
         shown = (CREATES_ENTRY, CREATED_ENTRY, RELEASES_ENTRY)
         numbers = [record["id"] for record in records if record["id"] in shown]
@@ -111,7 +111,7 @@ class Trace(CommandCase):
         self.assertNotIn((CREATES_ENTRY, RELEASES_ENTRY), itertools.pairwise(numbers))
 
     def test_other_tests_pass_with_everything_traced(self):
-        """Whatever is handed to an operation, null pointers included, can be told."""
+        """All arguments of operations can be recorded, null pointers included."""
         for name in "buffer", "entry", "evaluate", "read_acl":
             self.run_test(name, "*", "API=8,Errors=8,Info=8,Perf=2")
 

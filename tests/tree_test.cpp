@@ -1,4 +1,5 @@
-// Trees of more entries than the fuzzers' texts have, through the fuzzer of texts; what names a tree; and its limit.
+// Trees with more entries than the fuzzers' texts have, through the fuzzer of texts; the entry that names a tree;
+// limits.
 #include "faults.h"
 #include "fuzz.h"
 #include "qzacl_acl/compile.h"
@@ -17,7 +18,7 @@ TEST(tree, holds_what_a_text_says) {
         const auto below = [&](std::size_t limit) { return random() % limit; };
         std::string text;
         for (auto count = 1 + below(round % 20 == 7 ? 500 : 60); count != 0; --count) {
-            // Of few letters, of all bytes, and behind a long prefix that they share.
+            // Of few letters, of all bytes, and after a long shared prefix.
             std::string name(round % 5 == 2 ? round % 60 : 0, 'z');
             for (auto left = 1 + below(round % 5 == 1 ? 150 : 6); left != 0; --left)
                 name +=
@@ -29,8 +30,8 @@ TEST(tree, holds_what_a_text_says) {
     }
 }
 
-// The mechanism is spelled as in the entry that stands topmost in the binary search tree of the insertions, or in the
-// chain of expanded ones.
+// The mechanism is spelled as in the topmost entry of the binary search tree that insertion builds, or of the chain
+// of expanded entries.
 TEST(tree, is_named_by_its_topmost_entry) {
     const auto acle_of = [](int type, const char *name) {
         std::string mechanism = "unix";
@@ -67,7 +68,7 @@ TEST(tree, is_named_by_its_topmost_entry) {
     }
 }
 
-// A tree points into the text that it is told of, as far as its places reach, and copies what stands elsewhere.
+// A tree points into its text, as far as its places reach, and copies everything else.
 TEST(tree, copies_what_it_cannot_point_to) {
     const std::string line = "u unix alice r\n";
     const std::string alice = acl_bytes("u unix: alice 1");
@@ -82,7 +83,7 @@ TEST(tree, copies_what_it_cannot_point_to) {
         std::size_t left = whole;
         std::uint32_t number = 1;
         qz::parsed_acle parsed;
-        ASSERT_EQ(sec__read_acle_from_text(nullptr, &cursor, &left, &number, &parsed), 1);
+        ASSERT_EQ(sec__read_acle_from_text(nullptr, &cursor, &left, &number, &parsed), qz::line_consumed);
         sec_acltree_array trees({text, told});
         EXPECT_EQ(trees.add(qz::view_of(parsed)), SEC_S_OK);
         std::ranges::fill(parsed.mechanism, 'x');
@@ -95,7 +96,8 @@ TEST(tree, copies_what_it_cannot_point_to) {
     }
 }
 
-// Compiling sorts the entries and leaves out of their keys what all share; a tree that grows on knows them all.
+// Compiling sorts the entries and drops the common prefix from their keys; a tree that then grows still finds them
+// all.
 TEST(tree, takes_more_entries_after_it_was_compiled) {
     for (const int count : {3, 40}) {
         sec_acltree_t *root = nullptr;
@@ -123,7 +125,7 @@ TEST(tree, takes_more_entries_after_it_was_compiled) {
     }
 }
 
-// Whose order trace_test reads, and the mechanism that the last entry replaces.
+// trace_test reads the order of the releases, and the mechanism recorded for the replaced entry.
 TEST(tree, is_released_from_its_leaves_up) {
     const char mechanism[] = "sixteen-bytes-xx";
     const std::pair<int, std::string> rows[] = {
@@ -161,7 +163,7 @@ TEST(tree, asks_for_no_less_memory_than_it_means) {
     }
 }
 
-// Where a few entries stand before a long comment, their tree leaves the memory to others.
+// The tree of a few entries before a long comment takes little memory.
 TEST(tree, takes_no_memory_for_a_comment) {
     constexpr std::size_t line_size = 4;
     std::string text;

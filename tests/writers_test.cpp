@@ -1,5 +1,5 @@
-// Writers of caches that are killed or ended by a signal at each step, or have others beside them: what they leave, and
-// that no reader is ever told anything else than the text says.
+// Writers of caches that are killed or ended by a signal at each step, or disturbed by others: what they leave, and
+// that no reader ever gets anything but what the text says.
 #include "acl_files.h"
 
 #include <csignal>
@@ -123,7 +123,7 @@ TEST_F(files, nobody_may_use_a_new_file_before_it_is_its_owners) {
     EXPECT_EQ(read_acl(path, checked), from_text);
 }
 
-// What is edited while it is read must not be older than its cache.
+// A text that is edited while it is read must not be older than its cache.
 TEST_F(files, caches_are_as_old_as_what_they_are_made_from) {
     fs::file_time_type read_at;
     const auto wait = [&](std::size_t) {
@@ -137,7 +137,7 @@ TEST_F(files, caches_are_as_old_as_what_they_are_made_from) {
     EXPECT_LE(fs::last_write_time(cache), read_at);
 }
 
-// When the disk is full and another file stands at the temporary name meanwhile, that is not removed.
+// When the disk is full and another file has taken the temporary name, that file is not removed.
 TEST_F(files, temporary_names_are_taken) {
     const auto take = [&](std::size_t) {
         if (!is_about_to("write"))

@@ -1,5 +1,5 @@
-// What the tests of files share: an ACL file and its cache in a folder of their own, reads and checks of them whose
-// system calls are watched, and processes that end in the middle.
+// What the tests of files share: an ACL file and its cache in a folder of their own, and reads and checks of them
+// with watched system calls.
 #ifndef QZ_TESTS_ACL_FILES_H
 #define QZ_TESTS_ACL_FILES_H
 
@@ -45,13 +45,13 @@ inline outcome read_acl(const std::string &path, unsigned flags, const char *use
     const int code = sec_read_acl_file(path.c_str(), user, nullptr, flags, &held.acl, nullptr);
     return recorded(code, held.bytes());
 }
-// The command's check, as a rule with a cache written.
+// The command's check, by default with a cache written.
 constexpr unsigned no_options = 0;
 inline outcome check(const std::string &path, unsigned options = ACLFCK_OPT_COMPILE) {
     return recorded(aclfck__bulk_aclfile(path.c_str(), nullptr, options));
 }
 
-// Runs something watched, and keeps what it prints.
+// Runs something watched, and keeps its output.
 using faults_by_place = std::function<int(std::size_t)>;
 inline std::string printed;
 inline outcome watched(const faults_by_place &fault_of, const std::function<outcome()> &call) {

@@ -1,5 +1,5 @@
-// Stands between the code under test and the system: counts allocations and system calls, and lets tests fail, cut
-// short or precede each. The linker leads the calls of the layers and of the tests here (see CMakeLists.txt).
+// Intercepts allocations and system calls: counts them, and lets tests fail them, cut them short, or act before them.
+// The linker redirects the calls of the layers and the tests to this file (see CMakeLists.txt).
 #ifndef QZ_TESTS_FAULTS_H
 #define QZ_TESTS_FAULTS_H
 
@@ -22,29 +22,29 @@ namespace faults {
 struct allocations_seen {
     std::size_t count = 0;
     std::size_t fails_at = 0; // from 1; 0 fails none
-    bool fails_on = false;    // also all behind that one
+    bool fails_on = false;    // and all later ones, too
     std::ptrdiff_t live = 0;
     std::size_t refused = 0; // bytes that the last one to fail asked for
 };
 inline thread_local allocations_seen allocations; // of this thread
 
-// What a call is to do: nothing special, fall short of what was asked for, or fail with an errno value.
+// What a call does: nothing special, transfer less than requested, or fail with an errno value.
 constexpr int no_fault = 0;
 constexpr int short_transfer = -1;
 
 inline bool is_watching = false;
 inline std::vector<std::string> calls;
-inline std::string opened;                       // the name that was last opened or is about to be
-inline std::function<int(std::size_t)> fault_of; // told the place in `calls` of the one about to be made
+inline std::string opened;                       // the name in the latest call of open
+inline std::function<int(std::size_t)> fault_of; // by the place in `calls` of the next call
 
-// What the user database answers instead: a result, and the user's name; without a name there is no such user.
+// The answer of the user database instead: a result, and the user's name; null if there is no such user.
 inline std::optional<std::pair<int, const char *>> answer;
 inline std::string home; // of every user
 
 inline int next(const char *name) {
     if (!is_watching)
         return no_fault;
-    is_watching = false; // what the test itself calls now is not looked at
+    is_watching = false; // calls of the test itself do not count
     calls.emplace_back(name);
     const int fault = fault_of ? fault_of(calls.size() - 1) : no_fault;
     is_watching = true;
@@ -64,7 +64,7 @@ auto watched(const std::function<int(std::size_t)> &fault, const Call &call) {
     return result;
 }
 
-// Lets each allocation of a step fail in turn until it gets what it wants: what failed for memory left all as it was.
+// Fails each allocation of a step in turn until the step succeeds: a failed attempt must change nothing.
 template <class Step>
 int patiently(Step step) {
     for (std::size_t failing = 1;; ++failing) {
@@ -95,12 +95,12 @@ inline void *counted(void *made) {
 
 } // namespace faults
 
-// Of the names that a call has for the linker, with large files and late times or without, a C library may lack some;
-// the code under test uses one of them.
+// The linker knows a call under several names, for large files and late times. A C library may lack some; the code
+// under test uses one of them.
 #define QZ_WRAPPED(result, name, parameters)                                                                 \
     [[gnu::weak]] result __real_##name parameters;                                                           \
     [[gnu::used]] inline result __wrap_##name parameters
-// A call that fails with -1, and one that may also fall short of what was asked for.
+// A call that fails with -1, and one that may also transfer less than requested.
 #define QZ_WRAPPED_AS(called, name, parameters, arguments)                                                   \
     QZ_WRAPPED(int, name, parameters) { return faults::next(called) > 0 ? -1 : __real_##name arguments; }
 #define QZ_WRAPPED_CALL(name, parameters, arguments) QZ_WRAPPED_AS(#name, name, parameters, arguments)
@@ -108,7 +108,7 @@ inline void *counted(void *made) {
     QZ_WRAPPED_AS(#name, name, parameters, arguments)                                                        \
     QZ_WRAPPED_AS(#name, name##64, parameters, arguments)                                                    \
     QZ_WRAPPED_AS(#name, __##name##64_time64, parameters, arguments)
-// Opening, and what a fortified call without a mode becomes.
+// Opening, and its fortified form without a mode.
 #define QZ_WRAPPED_OPEN(name, fortified)                                                                     \
     QZ_WRAPPED(int, name, (const char *path, int flags, mode_t mode)) {                                      \
         if (faults::is_watching)                                                                             \
@@ -167,12 +167,12 @@ QZ_WRAPPED(ssize_t, fgetxattr, (int fd, const char *name, void *value, size_t si
     return faults::next("fgetxattr") > 0 ? -1 : __real_fgetxattr(fd, name, value, size);
 }
 QZ_WRAPPED_TRANSFER(read, void *)
-// What a fortified call becomes.
+// The fortified form of read().
 [[gnu::used]] inline ssize_t __wrap___read_chk(int fd, void *bytes, size_t size, size_t /*room*/) {
     return __wrap_read(fd, bytes, size);
 }
 QZ_WRAPPED_TRANSFER(write, const void *)
-QZ_WRAPPED(int, close, (int fd)) { // which closes even as it fails
+QZ_WRAPPED(int, close, (int fd)) { // closes even if it fails
     const bool fails = faults::next("close") > 0;
     const int result = __real_close(fd);
     return fails ? -1 : result;

@@ -26,7 +26,7 @@ inline auto find(items &all, const std::string &identity) {
 inline bool has_mechanism(int type) { return type == SEC_ACLE_USER || type == SEC_ACLE_EXPANDED; }
 inline bool has_identity(int type) { return type == SEC_ACLE_GROUP || has_mechanism(type); }
 
-// What no edit leaves in a sub-ACL, but bytes from elsewhere may have.
+// Features that no edit leaves in a sub-ACL, but bytes from elsewhere may have.
 enum class oddity : std::uint8_t { none, unknown_version, bytes_after_mechanism, bytes_after_identities };
 
 struct model_subacl {
@@ -85,7 +85,7 @@ struct model {
         return std::ranges::find_if(subacls, is_of_key);
     }
 
-    // Those of a type and, where it is given, a mechanism; type 0 stands for all.
+    // Those of a type and, if given, a mechanism; type 0 means all.
     arguments entries(int type, const char *mechanism) const {
         arguments all;
         for (const model_subacl &each : subacls) {
@@ -116,12 +116,12 @@ struct model {
         if (old != held.end() && how == sec_add_acle_to_acl2)
             return duplicate(acle.type, mechanism, identity);
         if (at == subacls.end()) {
-            // A walk that follows the lengths must find it behind the entries of the last one.
+            // A walk that follows the lengths must find it after the entries of the last one.
             if (!subacls.empty() && subacls.back().wrong_length)
                 return bad_acl(msg::buffer_corrupted);
             at = subacls.insert(at, {acle.type, ""});
         } else if (at->wrong_length) {
-            // What the length names goes, and what it does not stays out of force.
+            // The bytes within the length go; the rest stays out of force.
             behind = (at->bytes() + behind).substr(*at->wrong_length);
         }
         const std::string spelled = held.empty() ? mechanism : at->mechanism;
@@ -145,7 +145,7 @@ struct model {
     }
 };
 
-// What listing a buffer gives, of one type and mechanism or (type 0) all of it.
+// The listed entries of a buffer, of one type and mechanism or (type 0) all.
 inline arguments list_of(const sec_acl_buffer_t &acl, int type = 0, const char *mechanism = nullptr) {
     sec_aclelist_t list = {};
     if (type == 0)

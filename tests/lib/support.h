@@ -30,7 +30,7 @@ using namespace std::literals;
 namespace msg = qz::msg;
 using arguments = std::vector<std::string>;
 
-// What operations are asked for by a number.
+// Arguments that are numbers.
 enum check_choice : int { without_check, with_check };
 inline constexpr int by_handler = SEC_ACLE_USER | SEC_ACLE_USE_ID_HANDLER;
 
@@ -71,7 +71,7 @@ struct failure {
 };
 inline const failure no_error;
 
-// The error of this thread, which is cleared.
+// The error of this thread. Clears it.
 inline failure recorded_error() {
     cu_error_t *error = nullptr;
     char *text = nullptr;
@@ -84,11 +84,11 @@ inline failure recorded_error() {
     return found;
 }
 
-// The place that a located message ends with, and what stands for the number of its line.
+// The place at the end of a located message, and what replaces its line number.
 inline const std::string source = "security/ACL/lib/qzacl_acl";
 inline const std::string some_line = "LINE";
 
-// The error that an operation recorded, whose code must be its result.
+// The error that an operation recorded. Its code must be the result.
 inline failure outcome_of(int result) {
     failure found = recorded_error();
     EXPECT_EQ(result, found.code);
@@ -99,7 +99,7 @@ inline failure outcome_of(int result) {
     return found;
 }
 
-// The error that a message is recorded as, whose arguments are given as they are shown.
+// The error with a message, from its arguments as they are shown.
 inline failure error_with(int code, int id, const arguments &args) {
     failure made{code, id, std::string(msg::default_text(id))};
     for (std::size_t at = 0; (at = made.text.find('$', at)) != std::string::npos;) {
@@ -176,7 +176,7 @@ inline bool give_entries(const std::string &path, unsigned user_bits, unsigned m
 
 // ---- Processes and threads ----
 
-// How a process ends that does this.
+// The status of a process that does this.
 inline int status_of_child(const std::function<void()> &body) {
     const pid_t child = fork();
     if (child == 0) {
@@ -188,7 +188,7 @@ inline int status_of_child(const std::function<void()> &body) {
     return status;
 }
 
-// Does this in a thread that is cancelled already, and ends at the first point at which it can.
+// Runs this in a thread with a pending cancellation, which takes effect at the first cancellation point.
 inline void run_cancelled(std::function<void()> body) {
     const auto start = [](void *given) -> void * {
         pthread_cancel(pthread_self());
@@ -228,7 +228,7 @@ inline std::string text_of(const sec_acle_t &acle) {
     return "?no?u???e???????g"[acle.type] + mechanism + identity + " " + std::to_string(acle.perm_mask);
 }
 
-// The entries of a list, which is released.
+// The entries of a list. Releases it.
 inline arguments taken(sec_aclelist_t &list) {
     arguments entries;
     for (std::int32_t at = 0; at < list.count; ++at)
@@ -253,7 +253,7 @@ struct buffer {
     sec_acl_buffer_t acl = {};
 };
 
-// Its parts. Numbers stand as this host has them; strings are given with their NUL.
+// Its parts. Numbers are in host order; strings are given with their NUL.
 inline constexpr bool is_low_byte_first = std::endian::native == std::endian::little;
 inline constexpr char this_order = is_low_byte_first ? 2 : 1;
 inline constexpr char other_order = is_low_byte_first ? 1 : 2;

@@ -1,13 +1,16 @@
-"""Tests of the package qzacl on the real library: the cases that the other languages run, too, decisions against the questions
-of the C interface, and what is Python's own: texts, exceptions, owners, handlers.
+"""Tests of the package qzacl on the real library: the cases that the other languages run, too, decisions against the
+questions of the C interface, and what is Python's own: texts, exceptions, owners, handlers.
 
 Run by CTest, or with QZ_LIBRARY_DIR set by python3 -m pytest in bindings/python."""
+import functools
 import gc
+import operator
 import os
 import random
 import signal
 import threading
 import time
+from concurrent.futures import ThreadPoolExecutor
 from pathlib import Path
 
 import pytest
@@ -54,10 +57,7 @@ def by_hand(acl, whom, order):
     if order is Order.CLOSEST:
         who, mask = next(iter(found.items()))
         return mask, who
-    total = 0
-    for mask in found.values():
-        total |= mask
-    return total, Who.SUM
+    return functools.reduce(operator.or_, found.values()), Who.SUM
 
 
 def random_entry(pick):
@@ -108,7 +108,8 @@ def test_identities_are_asked_in_their_stored_form():
 
 def test_handlers_know_hosts():
     matching = [("a@h.x", "h.x"), ("a@H.X", "h.x"), ("a@h.x", ".x"), ("a@.x", ".x"), ("a@b@h.x", "h.x")]
-    others = [("a@h.x", "x"), ("a@hx", ".x"), ("h.x", "h.x"), ("a@b@h.x", "b@h.x"), ("a@", ""), ("a@h.x", ""), ("a@x", ".h.x")]
+    others = [("a@h.x", "x"), ("a@hx", ".x"), ("h.x", "h.x"), ("a@b@h.x", "b@h.x"), ("a@", ""), ("a@h.x", "")]
+    others += [("a@x", ".h.x")]
     assert [row for row in matching if not qzacl.domain(*row)] == []
     assert [row for row in others if qzacl.domain(*row)] == []
     assert qzacl.exact("A@h", "a@H")
@@ -238,31 +239,25 @@ def test_a_live_acl_reads_foreign_caches_only_when_told(tmp_path):
 
 
 def test_a_live_acl_is_shared_by_threads(tmp_path):
-    path, following, failures, done = tmp_path / "live.acl", tmp_path / "next.acl", [], threading.Event()
+    path, following, done = tmp_path / "live.acl", tmp_path / "next.acl", threading.Event()
     path.write_text("o r\n")
     live = qzacl.LiveAcl(path)
     live.refresh()
 
     def ask():
         while not done.is_set():
-            try:
-                live.refresh()
-                if qzacl.decide(live.snapshot(), Requester("unix", "a@h")).granted not in (1, 2):
-                    failures.append("neither the one nor the other")
-            except qzacl.Error as problem:
-                failures.append(problem)
+            live.refresh()
+            assert qzacl.decide(live.snapshot(), Requester("unix", "a@h")).granted in (1, 2)
 
-    threads = [threading.Thread(target=ask) for _ in range(3)]
-    for thread in threads:
-        thread.start()
-    for text in ["o w\n", "o r\n"] * 10:
-        following.write_text(text)
-        following.rename(path)
-        gc.collect()  # snapshots that nobody holds go
-    done.set()
-    for thread in threads:
-        thread.join()
-    assert failures == []
+    with ThreadPoolExecutor() as threads:
+        asking = [threads.submit(ask) for _ in range(3)]
+        for text in ["o w\n", "o r\n"] * 10:
+            following.write_text(text)
+            following.rename(path)
+            gc.collect()  # snapshots that nobody holds go
+        done.set()
+    for each in asking:
+        each.result()  # raises what was raised there
     live.refresh()
     assert live.snapshot().any_other() == 1
 

@@ -119,7 +119,7 @@ private:
 };
 
 // The place of a field whose offset a reader found or the format fixes. An offset out of bounds is a bug: the process
-// aborts, because otherwise it would decide by bytes that nobody wrote.
+// is stopped, because otherwise it would decide by bytes that nobody wrote.
 template <class Field, class Byte>
 Byte *proven_place(std::span<Byte> bytes, std::size_t offset) {
     byte_cursor<Byte> cursor(bytes);

@@ -34,29 +34,28 @@ struct reading {
 
 class acl_document {
 public:
-    // Reads FILE, or standard input for "-". Prints all messages that a check would print; then, or when
-    // the file cannot be read, told_trouble is thrown. Of a compiled buffer entries are handed out as a text
-    // would have them.
+    // Reads FILE, or standard input for "-". Prints the messages of a check. Throws told_trouble if there were any,
+    // or if the file cannot be read. The entries of a compiled buffer are handed out as those of a text would be.
     acl_document(const std::string &file, const permission_set &set, const reading &watched = {});
 
-    // The same of bytes that are at hand; `file` is their name in answers.
+    // The same for bytes in memory; `file` is their name in answers.
     acl_document(const std::string &file, std::string_view bytes, const permission_set &set,
                  const reading &watched = {});
 
     const std::string &file() const { return file_; }
     bool is_compiled() const { return !compiled_.bytes().empty(); }
 
-    // "FILE:LINE", or the file alone where the line is not known.
+    // "FILE:LINE", or the file alone if the line is unknown.
     std::string place(std::size_t line) const;
 
-    // The entries in the trees that they compile from. Throws when those of a buffer make none.
+    // The trees that the entries compile from. Throws if those of a buffer cannot be made.
     std::span<sec_acltree_t *const> trees();
 
-    // What services ask: the buffer itself, or the compiled text; without bytes where there are no entries.
-    // Throws recorded_trouble.
+    // What services evaluate: the buffer itself, or the compiled text; empty if there are no entries. Throws
+    // recorded_trouble.
     qz::acl take_acl();
 
-    // Throws recorded_trouble when the text has more than a buffer can hold.
+    // Throws recorded_trouble if the text has more than a buffer can hold.
     void require_compilable() const;
 
 private:
@@ -77,7 +76,7 @@ private:
 // Calls `each` with every entry of a sound buffer, sub-ACLs from last to first.
 void for_each_stored(const qz::acl &acl, const std::function<void(const qz::entry_fields &)> &each);
 
-// Appends "FILE:LINE", or the file alone where the line is 0.
+// Appends "FILE:LINE", or the file alone if the line is 0.
 void append_place(std::string &text, const std::string &file, std::size_t line);
 
 } // namespace qzacl

@@ -42,7 +42,7 @@ public:
         return acl(buffer);
     }
 
-    // 0 where it is not known.
+    // 0 if it is unknown.
     std::size_t line_of(const entry_fields &entry) const {
         for (const found_entry &each : found_) {
             if (each.entry.type == entry.type && detail::same_folded(each.entry.identity, entry.identity))
@@ -80,7 +80,7 @@ private:
     std::vector<found_entry> found_;
 };
 
-// A file, and who may be in it.
+// A file, and the entries that may answer.
 struct question {
     const acl_document &document;
     const candidates &found;

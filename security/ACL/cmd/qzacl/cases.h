@@ -1,4 +1,4 @@
-// A file of cases: what an ACL is to grant, and what not.
+// A file of cases: what an ACL must grant, and what it must not.
 #ifndef QZACL_CASES_H
 #define QZACL_CASES_H
 
@@ -20,10 +20,10 @@ struct test_case {
     bool is_user() const { return mechanism != "-" || identity != "-"; }
 };
 
-// Reads the words of a line, which has some. Throws trouble.
+// Reads a case from the words of a line that is not empty. Throws trouble.
 test_case case_of(const std::vector<std::string> &words);
 
-// The words of a line of an ACL file, and so of a file of cases, without a comment.
+// The words of a line of an ACL file or a file of cases, without its comment.
 std::vector<std::string> words_of(std::string_view line);
 
 } // namespace qzacl

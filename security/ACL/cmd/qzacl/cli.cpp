@@ -1,5 +1,5 @@
-// The command line. CLI11 reads the options alone; words are taken from what it leaves over, because for its own
-// ones it gives "++", words in brackets and names of subcommands a meaning.
+// The command line. CLI11 parses only the options. Words are taken from what it leaves over, because among its own it
+// gives a special meaning to "++", to words in brackets and to the names of subcommands.
 #include "cli.h"
 
 #include "trouble.h"
@@ -64,7 +64,7 @@ public:
     }
 
 private:
-    // CLI11 would take the next word for the value of "--order=", "--json=true" for "--json", and "-s-" for "-s --".
+    // CLI11 would take the next word as the value of "--order=", "--json=true" as "--json", and "-s-" as "-s --".
     void refuse_odd_forms(const std::vector<std::string> &arguments) const {
         bool is_value = false;
         for (const std::string &argument : arguments) {

@@ -12,7 +12,7 @@
 namespace qzacl {
 
 struct command_line {
-    const verb *chosen = nullptr; // null: help is wanted, of all verbs
+    const verb *chosen = nullptr; // null: help for all verbs is wanted
     bool wants_help = false;
     std::vector<std::string> words; // after the verb
 
@@ -24,16 +24,16 @@ struct command_line {
     bool takes_sum = false;
     std::vector<std::string> handlers; // MECH=domain|exact|none
 
-    // Of edits.
-    bool checks = false;   // what would change
-    bool compiles = false; // so that the cache counts
+    // For edits.
+    bool checks = false;   // --check: only show what would change
+    bool compiles = false; // -s: also compile
     unsigned wait = 0;     // seconds for the lock
 };
 
 // Reads the arguments after the command's name. Throws wrong_use for invalid ones.
 command_line read_command_line(std::span<const verb> verbs, const std::vector<std::string> &arguments);
 
-// What --help prints: of one verb, or of all.
+// The output of --help, for one verb or for all.
 std::string help_of(std::span<const verb> verbs, const verb *chosen);
 
 } // namespace qzacl

@@ -22,7 +22,7 @@ namespace {
 
 enum class outcome { counts, does_not_count, failed };
 
-// A cache counts when it is later than its text in whole seconds. Returns how long the second in which the text was
+// A cache counts if it is later than its text in whole seconds. Returns how long the second in which the text was
 // written will last, or 0 when it is over. The kernel may have stamped the text from a finer clock, which is ahead of
 // the coarse one that stamps the cache, so that second may not even have begun. A text from a later future is not
 // waited for.
@@ -53,7 +53,7 @@ int read_trees(acl_text &text, sec_acltree_array &trees) {
     }
 }
 
-// Of a text without entries there is no cache, nor may services read anything else.
+// For a text without entries there is no cache, and services must not read anything else.
 bool is_what_services_read(const std::string &path, const sec_perm_set_t &set,
                            const sec_acl_buffer_t &compiled) {
     sec_acl_buffer_t served = {};

@@ -140,7 +140,7 @@ void compare_sorted(const tree_entries &before, const tree_entries &after, diffe
         found.add(after[b]);
 }
 
-// Finds entries by identity, from a place on.
+// Finds entries by identity, starting at a place.
 class identity_index {
 public:
     identity_index(const tree_entries &entries, std::size_t first) : entries_(entries) {
@@ -170,7 +170,7 @@ private:
     identity_table table_;
 };
 
-// Compares what both chains begin with. Returns how many entries that is.
+// Compares the common start of both chains. Returns its number of entries.
 std::size_t compare_common(const tree_entries &before, const tree_entries &after, difference_list &found) {
     std::size_t at = 0;
     for (; at < std::min(before.size(), after.size()); ++at) {
@@ -183,7 +183,7 @@ std::size_t compare_common(const tree_entries &before, const tree_entries &after
     return at;
 }
 
-// Compares entries of which the first match decides, so that their order is a difference.
+// Compares entries whose first match decides, so another order is a difference.
 void compare_chains(const tree_entries &before, const tree_entries &after, difference_list &found) {
     constexpr std::size_t fetched_ahead = 16;
     const std::size_t first = compare_common(before, after, found);

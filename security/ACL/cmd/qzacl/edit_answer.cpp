@@ -1,4 +1,4 @@
-// What all edits end with, and what those of one entry share.
+// The end of every edit, and the common part of edits of one entry.
 #include "edit_answer.h"
 
 #include "cli.h"

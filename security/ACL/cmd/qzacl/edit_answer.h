@@ -1,4 +1,4 @@
-// What all edits end with: the answer, and with -s the cache.
+// The end of every edit: the answer and, with -s, the cache.
 #ifndef QZACL_EDIT_ANSWER_H
 #define QZACL_EDIT_ANSWER_H
 
@@ -8,13 +8,14 @@
 
 namespace qzacl {
 
-// The file that the first word names, read. Throws trouble.
+// Reads the file named by the first word. Throws trouble.
 edited_file file_to_edit(const call &call);
 
-// Says whether the file changed, and compiles it where that is wanted. Gives the exit status.
+// Prints whether the file changed, and compiles it if requested. Returns the exit status.
 int answer_edit(const call &call, const edited_file &file, bool has_changed);
 
-// Makes one change of an entry, or with --check shows it: what set, remove, grant and revoke do. Gives the exit status.
+// Makes one change of an entry or, with --check, shows it: the work of set, remove, grant and revoke. Returns the
+// exit status.
 int change_entry(const call &call, const text_change &change);
 
 // The change of grant or revoke: the second word has the letters, and the key follows.

@@ -16,8 +16,7 @@ class edit_session {
 public:
     edit_session(edited_file &file, const permission_set &set, std::chrono::seconds wait); // throws trouble
 
-    // Runs the editor until what it left is written, or is given up, which throws trouble. False when the text
-    // is as it was.
+    // Runs the editor until its text is written; throws trouble if the user gives up. False if the text is unchanged.
     bool run();
 
 private:
@@ -28,7 +27,7 @@ private:
     edited_file &file_;
     const permission_set &set_;
     std::chrono::seconds wait_;
-    std::string base_; // the text that a change is made of
+    std::string base_; // the text that the editor started from
     noted_signals signals_;
     private_copy copy_;
 };

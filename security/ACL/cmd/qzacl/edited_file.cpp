@@ -1,4 +1,4 @@
-// The file that an edit is about, found and read.
+// The file to edit.
 #include "edited_file.h"
 
 #include "qzacl_utils/file_bytes.h"

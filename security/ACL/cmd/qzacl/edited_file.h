@@ -1,5 +1,5 @@
-// The file that an edit is about: found once, with the folder that holds it, and asked through descriptors from then
-// on. Its functions throw trouble.
+// The file to edit: found once, together with its folder, and accessed through descriptors from then on. Its
+// functions throw trouble.
 #ifndef QZACL_EDITED_FILE_H
 #define QZACL_EDITED_FILE_H
 
@@ -11,7 +11,7 @@
 
 namespace qzacl {
 
-// What could not be done, and why by errno.
+// An action that failed, with the reason from errno.
 struct system_failure : trouble {
     explicit system_failure(const std::string &what);
 };
@@ -21,17 +21,18 @@ public:
     // Follows links to the real file, and opens the folder that holds it.
     explicit edited_file(const std::string &path);
 
-    // Reads the file anew. It is a regular one with a single name: a change of another name's file would split them.
+    // Reads the file again. It must be a regular file with a single name: replacing one of several names would split
+    // them.
     void read();
 
-    const std::string &path() const { return path_; } // as it was given
+    const std::string &path() const { return path_; } // as given
     const std::string &leaf() const { return leaf_; } // its name in the folder
     int folder() const { return folder_.get(); }
     int fd() const { return file_.get(); }
     const struct stat &status() const { return status_; }
     const std::string &text() const { return text_; }
 
-    // Whether the name still leads to the file that was read, and nothing was done to it since.
+    // True if the name still leads to the file that was read, and that file has not changed since.
     bool is_as_read() const;
 
 private:

@@ -1,4 +1,4 @@
-// Whom an entry is about, from the words of a command line.
+// The key of an entry, from the words of a command line.
 #include "entry_key.h"
 
 #include "base/posix_fold.h"
@@ -32,7 +32,7 @@ std::uint8_t type_of(std::string_view word) {
     return 0;
 }
 
-// True when the line that a word is put into gives it back as one word.
+// True if the parser reads the word back as one word.
 bool is_word(const std::string &word) {
     std::string line = word;
     line_words tokens(line.data(), line.data() + line.size());
@@ -45,8 +45,8 @@ struct release_acle {
     void operator()(sec_acle_t *acle) const { sec_release_acle(acle); }
 };
 
-// Bytes beyond ASCII decide nothing of what is refused or of how a host is stored, but the library would take them
-// to be in the code set of the locale. So an 'x' stands for each while it looks at a text.
+// Bytes beyond ASCII affect neither what is refused nor how a host is stored, but the library would read them in the
+// code set of the locale. So each is replaced by an 'x' while the library examines a text.
 std::string plain(std::string text) {
     std::replace_if(
         text.begin(), text.end(), [](char c) { return static_cast<unsigned char>(c) > 0x7f; }, 'x');

@@ -22,7 +22,7 @@ public:
                 .unnamed = [this](std::uint8_t type, std::size_t line) { unnamed_[type] = line; }};
     }
 
-    // Takes an entry of the document. 0 where its line is not known.
+    // The line of an entry of the document; 0 if it is unknown.
     std::size_t line_of(const qz::entry_fields &entry) const {
         if (entry.identity.empty())
             return unnamed_[entry.type];

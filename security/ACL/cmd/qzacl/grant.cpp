@@ -1,4 +1,4 @@
-// grant: letters more for an entry, which is added where it is not there.
+// grant: adds letters to an entry, which is added if there is none.
 #include "edit_answer.h"
 
 namespace qzacl {

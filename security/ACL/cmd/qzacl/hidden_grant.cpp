@@ -9,7 +9,8 @@ namespace qzacl {
 
 namespace {
 
-// What services accept for an expanded entry: the host itself, or with a leading dot each host of the domain.
+// The hosts that services accept for an expanded entry: the host itself or, with a leading dot, every host of the
+// domain.
 bool is_host_of(std::string_view identity, std::string_view entry) {
     const std::size_t at = identity.rfind('@');
     if (at == std::string_view::npos)

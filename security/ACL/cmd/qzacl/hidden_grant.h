@@ -1,4 +1,4 @@
-// What a new entry hides: the permissions that its party was granted by others until then.
+// What a new entry hides: the permissions that other entries granted its party until then.
 #ifndef QZACL_HIDDEN_GRANT_H
 #define QZACL_HIDDEN_GRANT_H
 
@@ -9,9 +9,9 @@
 
 namespace qzacl {
 
-// What a grant that adds an entry hides of what others granted its party until now, for people; empty for nothing. An
-// entry of its own takes the place of their answers: of a user that of the first expanded entry for the host, of any
-// that of any other. Which groups a party is in is not known here.
+// Describes the permissions that a party loses when grant adds an entry for it, because the new entry hides others;
+// empty if there are none. A user's own entry hides the first expanded entry for the host, and every new entry hides
+// that of any other. The groups of a party are not known here.
 std::string hidden_by(const named_text &text, const permission_set &set, const text_change &change);
 
 } // namespace qzacl

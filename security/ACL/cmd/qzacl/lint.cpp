@@ -21,12 +21,12 @@ struct warning {
     const char *name;
     std::string text;
     std::size_t line;
-    entry_fields entry; // of type 0 where it is about no entry
+    entry_fields entry; // of type 0 if it is about no entry
 };
 
 bool names_hosts(std::string_view mechanism) { return mechanism == "unix" || mechanism == "hba2"; }
 
-// An address in the one form that identities are compared in; empty for what is no address of IPv6.
+// An IPv6 address in the form in which identities are compared; empty for anything else.
 std::string one_form_of(const std::string &host) {
     in6_addr address = {};
     char formatted[INET6_ADDRSTRLEN] = "";
@@ -46,7 +46,7 @@ public:
                 .names_file = true};
     }
 
-    // By line; what is about the whole file comes first in its line.
+    // By line; within a line, warnings about the whole file come first.
     std::vector<warning> take_warnings() {
         std::stable_sort(found_.begin(), found_.end(),
                          [](const warning &a, const warning &b) { return a.line < b.line; });
@@ -98,7 +98,7 @@ private:
         for (std::size_t dot = identity.find('.', 1); dot != std::string::npos && !former.empty();
              dot = identity.find('.', dot + 1)) {
             const std::string domain = identity.substr(dot);
-            if (former.count(domain) != 0) {
+            if (former.contains(domain)) {
                 warn("hidden", "is never reached: " + domain + " above accepts the same");
                 break;
             }
@@ -142,7 +142,7 @@ void tell(const warning &found, const acl_document &document, const call &call) 
     call.out.object(object);
 }
 
-// Gives the status of one file.
+// Returns the status of one file.
 int lint_file(const std::string &file, const call &call) {
     linter looking;
     const acl_document document(file, call.permissions, looking.watched());

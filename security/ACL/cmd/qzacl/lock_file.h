@@ -14,7 +14,7 @@ namespace qzacl {
 
 class lock_file {
 public:
-    // Takes the lock of a file that was read. Throws trouble when it cannot be had, or not in time.
+    // Takes the lock of a file that was read. Throws trouble if that fails or takes too long.
     lock_file(const edited_file &file, std::chrono::seconds wait);
     lock_file(const lock_file &) = delete;
     lock_file &operator=(const lock_file &) = delete;
@@ -27,7 +27,7 @@ private:
     int folder_;
     std::string name_;
     qz::descriptor file_;
-    // While the lock is held, signals that would end the command wait: nothing is left half done or lying about.
+    // While the lock is held, signals that would end the command are blocked, so that nothing is left half done.
     sigset_t signals_before_ = {};
 };
 

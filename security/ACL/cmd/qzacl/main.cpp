@@ -69,12 +69,12 @@ int run(const command_line &line) {
     return status;
 }
 
-// Tells what was thrown.
+// Prints the message of the current exception.
 void tell() {
     try {
         throw;
     } catch (const told_trouble &) {
-        // Nothing is left to say.
+        // Its messages were printed.
     } catch (const recorded_trouble &) {
         print_recorded_error();
     } catch (const wrong_use &found) {

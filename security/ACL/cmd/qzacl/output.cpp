@@ -1,4 +1,4 @@
-// What the verbs answer.
+// The output of the verbs.
 #include "output.h"
 
 #include "trouble.h"

@@ -1,4 +1,4 @@
-// What the verbs answer: lines for people, or JSON, one object a line.
+// The output of the verbs: lines for people, or JSON, one object per line.
 #ifndef QZACL_OUTPUT_H
 #define QZACL_OUTPUT_H
 
@@ -9,17 +9,17 @@
 
 namespace qzacl {
 
-// Keys stay in the order in which they were put in.
+// Keys keep their order of insertion.
 using json = nlohmann::ordered_json;
 
-// A text as JSON can hold it: with U+FFFD for each byte that is no UTF-8.
+// A text as JSON can hold it: with U+FFFD for each byte that is not UTF-8.
 json json_text(std::string_view bytes);
-// Whether JSON needs no escapes for it.
+// True if JSON needs no escapes for the text.
 bool is_plain_in_json(std::string_view bytes);
 // Appends the same text as JSON, with its quotation marks.
 void append_json_text(std::string &line, std::string_view bytes);
 
-// A text in which control bytes are shown as \xHH, but for those that are to stay.
+// The text with its control bytes as \xHH, except those in `kept`.
 std::string escaped(std::string_view text, std::string_view kept);
 
 // The bytes to collect before they are written.
@@ -40,8 +40,7 @@ private:
     std::deque<std::string> parts_;
 };
 
-// Lines as they are shown on a descriptor: as they are, or on a terminal with control bytes as \xHH, but for those that
-// are to stay.
+// Lines as a descriptor shows them: unchanged or, on a terminal, with control bytes as \xHH except those in `kept`.
 std::string shown_on(int fd, std::string_view lines, std::string_view kept = "\n");
 
 // Standard output. On a terminal control bytes are shown as \xHH, so that no identity can move the cursor.

@@ -26,10 +26,10 @@ private:
     std::map<std::string, sec_id_compare_fn> named_;
 };
 
-// A requester that keeps its texts: the mechanism in lower case, the identity in its stored form.
+// A requester that owns its texts: the mechanism in lower case, the identity in its stored form.
 class party {
 public:
-    // Who did not authenticate.
+    // An unauthenticated party.
     party() = default;
 
     party(const std::string &mechanism, const std::string &identity, std::vector<std::string> groups);
@@ -41,7 +41,7 @@ public:
     const std::string &identity() const { return identity_; }
     const std::vector<std::string> &groups() const { return groups_; }
 
-    // Good as long as the party.
+    // Valid as long as the party.
     qz::requester requester() const;
 
 private:

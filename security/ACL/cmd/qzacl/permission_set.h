@@ -30,8 +30,8 @@ public:
     // The mask of at least one letter. Throws wrong_use for none, recorded_trouble for an unknown one.
     std::uint32_t mask_of(const std::string &letters) const;
 
-    // The letters of a mask in the order of their bits, good until the next call. Throws recorded_trouble for
-    // a bit without letter.
+    // The letters of a mask in the order of their bits, valid until the next call. Throws recorded_trouble for a bit
+    // without a letter.
     std::string_view letters_of(std::uint32_t mask) const;
 
 private:

@@ -7,7 +7,7 @@
 
 namespace qzacl {
 
-// A folder below $TMPDIR, else /tmp, which goes with all that an editor left there.
+// A folder below $TMPDIR or else /tmp. It is removed with everything that an editor left in it.
 class private_folder {
 public:
     private_folder();

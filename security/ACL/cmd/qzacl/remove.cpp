@@ -1,4 +1,4 @@
-// remove: the line of an entry goes.
+// remove: deletes the line of an entry.
 #include "cli.h"
 #include "edit_answer.h"
 

@@ -19,7 +19,8 @@ namespace qzacl {
 
 namespace {
 
-// The new file under its name beside the old one, which it loses at the end of the scope unless it moved on.
+// The new file, under a temporary name beside the old one. It is removed at the end of the scope unless it was
+// renamed.
 class new_file {
 public:
     // The lock is held, so that a file of this name is what a killed edit left.
@@ -53,8 +54,8 @@ private:
     bool has_moved_ = false;
 };
 
-// An attribute's value or, by the same rule, the names of all: asked for their size, and again should they grow
-// meanwhile. Nothing where there is none, and on a file system without any.
+// The value of an attribute, or the names of all: first their size is queried, and again if they grow in between.
+// Empty if there is none, or if the file system has no attributes.
 template <class Query>
 std::optional<std::string> read_attribute(const Query &query) {
     for (;;) {
@@ -76,7 +77,7 @@ std::optional<std::string> attribute_of(int fd, const char *name) {
     return read_attribute([=](char *out, std::size_t size) { return fgetxattr(fd, name, out, size); });
 }
 
-// What the new file has already, as the system's own labels, need not be given to it, which not everybody may.
+// Attributes that the new file already has, such as labels of the system, are not set: not every user may.
 void copy_attributes(int from, int to) {
     const auto names =
         read_attribute([=](char *out, std::size_t size) { return flistxattr(from, out, size); });
@@ -91,7 +92,7 @@ void copy_attributes(int from, int to) {
     }
 }
 
-// The mode comes last, since giving a file away clears bits of it.
+// The mode comes last, because a change of the owner clears bits of it.
 void protect_like(const edited_file &file, int fd) {
     posix_acl entries;
     const struct stat &status = file.status();
@@ -109,7 +110,7 @@ void protect_like(const edited_file &file, int fd) {
 
 void replace_file(const edited_file &file, std::string_view bytes) {
     new_file made(file);
-    // What it inherits from its folder, the file that it replaces may not have.
+    // The replaced file may lack what the new one inherits from the folder.
     if (!remove_posix_acl(made.fd()))
         throw system_failure("cannot protect the new file");
     if (!write_all(made.fd(), bytes))

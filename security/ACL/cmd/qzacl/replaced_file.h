@@ -8,9 +8,9 @@
 
 namespace qzacl {
 
-// Replaces a file that was read, under its lock. The new one has the owner, group, mode, access control entries and
-// extended attributes of the old one before it gets its name, and is on disk then. Throws trouble; the old file
-// is there then, unless only the folder could not be synced.
+// Replaces a file that was read, under its lock. Before the new one gets its name, it has the owner, group, mode,
+// access control entries and extended attributes of the old one, and is on disk. Throws trouble; the old file is then
+// still in place, unless only the sync of the folder failed.
 void replace_file(const edited_file &file, std::string_view bytes);
 
 } // namespace qzacl

@@ -1,4 +1,4 @@
-// revoke: letters less for an entry.
+// revoke: takes letters from an entry.
 #include "edit_answer.h"
 
 namespace qzacl {

@@ -1,4 +1,4 @@
-// set: an entry gets the letters that are named, and is added where it is not there.
+// set: gives an entry exactly the named letters, and adds it if there is none.
 #include "cli.h"
 #include "edit_answer.h"
 

@@ -12,7 +12,7 @@ namespace qzacl {
 
 namespace {
 
-// Whether lines lead back to the entries that they show. Those of a text do.
+// True if the parser reads the same entries from the lines. Those of a text qualify.
 class line_checker {
 public:
     explicit line_checker(const permission_set &set) : set_(set) {}

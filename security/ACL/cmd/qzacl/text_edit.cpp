@@ -29,7 +29,7 @@ std::uint32_t permissions_after(const text_change &change, std::uint32_t before)
     }
 }
 
-// An editor takes these two bytes for one line end, the parser for a line's and that of a blank one.
+// To an editor these two bytes are one line end; to the parser they end a line and a blank one.
 bool ends_in_crlf(std::string_view text, std::size_t end) {
     return end != 0 && end < text.size() && text[end - 1] == '\r' && text[end] == '\n';
 }
@@ -135,7 +135,7 @@ std::string changed_text(const named_text &text, const permission_set &set, cons
     if (changed == text.bytes)
         return changed;
     const auto after = find_entry({text.name, changed}, set, change.key);
-    // The letters of a set may begin a comment.
+    // A set may use '#' as a letter, which begins a comment.
     const std::uint32_t wanted = permissions_after(change, entry ? entry->permissions : 0);
     if (change.action != edit_action::remove && (!after || after->permissions != wanted))
         throw trouble(text.name + ": no line can hold these letters");

@@ -1,5 +1,5 @@
-// Changes one entry in the text of an ACL file: its line changes, and every other byte stays as it is. Where lines
-// and words are is for the checker's own parser to say.
+// Changes one entry in the text of an ACL file: its line changes, and every other byte stays as it is. The checker's
+// own parser finds the lines and words.
 #ifndef QZACL_TEXT_EDIT_H
 #define QZACL_TEXT_EDIT_H
 
@@ -14,7 +14,7 @@
 
 namespace qzacl {
 
-// A text that is edited, and its name for people.
+// A text to edit, and its name in messages.
 struct named_text {
     const std::string &name;
     std::string_view bytes;
@@ -47,8 +47,8 @@ struct text_change {
 // Whether a change of a text without the entry would add one.
 bool adds_entry(const text_change &change);
 
-// The text after a change, checked; the same bytes when nothing changes. `entry` is what find_entry found. Throws
-// trouble where no line can hold the entry.
+// The text after a change, checked; the same bytes if nothing changes. `entry` is the result of find_entry. Throws
+// trouble if no line can hold the entry.
 std::string changed_text(const named_text &text, const permission_set &set, const text_change &change,
                          const std::optional<found_entry> &entry);
 

@@ -7,8 +7,7 @@
 
 namespace qzacl {
 
-// All that differs is one piece, from the first line that does to the last, with up to three lines around it. Nothing
-// for equal texts.
+// One hunk, from the first line that differs to the last, with up to three lines of context. Empty for equal texts.
 std::string unified_diff(std::string_view before, std::string_view after, const std::string &name);
 
 } // namespace qzacl

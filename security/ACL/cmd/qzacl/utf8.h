@@ -7,8 +7,8 @@
 
 namespace qzacl {
 
-// The bytes of the character that the text begins with; 0 when it begins with none, or is empty. Overlong forms,
-// surrogates and what lies beyond U+10FFFF are no characters.
+// The length of the character at the start of the text; 0 if there is none. Overlong forms, surrogates and values
+// above U+10FFFF are not characters.
 std::size_t character_size(std::string_view text);
 
 bool is_utf8(std::string_view text);

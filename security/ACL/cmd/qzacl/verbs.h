@@ -23,11 +23,11 @@ struct verb {
     std::string_view name;
     std::string_view usage; // its words and options
     std::string_view purpose;
-    std::string_view options; // that it takes beside --json and --permissions, single blanks between
+    std::string_view options; // besides --json and --permissions, separated by single blanks
     std::size_t least_words;
     std::size_t most_words;
-    std::size_t files;            // of its first words how many may be "-"
-    int (*run)(const call &call); // gives the exit status
+    std::size_t files;            // how many of its first words may be "-"
+    int (*run)(const call &call); // returns the exit status
 };
 
 inline constexpr std::size_t any_number = static_cast<std::size_t>(-1);

@@ -89,7 +89,6 @@ int acl_text::open(const vetted_file &file, const acl_file_use &use) {
 }
 
 acl_line acl_text::next(parsed_acle &entry) {
-    constexpr int line_consumed = 1;
     result_ = sec__read_acle_from_text(set_, &cursor_, &remaining_, &line_, &entry);
     if (result_ == SEC_S_OK)
         return acl_line::end;

@@ -253,9 +253,9 @@ public:
     const subacl &current() const { return current_; }
     // From the first entry of the current sub-ACL to the end of the buffer.
     byte_reader entries() const {
-        byte_reader behind_header = next_;
-        behind_header.skip(subacl_header_size + current_.mechanism_length);
-        return behind_header;
+        byte_reader first = next_;
+        first.skip(subacl_header_size + current_.mechanism_length);
+        return first;
     }
     // The bytes that the current sub-ACL may use: up to the next sub-ACL or, for the last one, to the end of the
     // buffer. So even if forged sub-ACLs overlap, walking over all entries takes time linear in the bytes.
@@ -275,9 +275,9 @@ private:
 // if a sub-ACL reaches beyond the end of the buffer, or if the length of the last one does not lead to the end of
 // its entries, because a walk would look for the new one elsewhere.
 inline bool find_end(byte_span buffer, std::size_t &offset) {
-    byte_reader behind(buffer);
+    byte_reader rest(buffer);
     header head;
-    if (!read(behind, head))
+    if (!read(rest, head))
         return false;
     subacl_walk walk(buffer);
     for (unsigned left = head.subacl_count; left != 0; --left) {
@@ -285,13 +285,13 @@ inline bool find_end(byte_span buffer, std::size_t &offset) {
             return false;
     }
     if (head.subacl_count != 0) {
-        behind = byte_reader(walk.bytes());
+        rest = byte_reader(walk.bytes());
         subacl last;
-        if (!read(behind, last) || !skip_entries(behind, last.entry_count) ||
-            walk.bytes().size() - behind.left() != last.length)
+        if (!read(rest, last) || !skip_entries(rest, last.entry_count) ||
+            walk.bytes().size() - rest.left() != last.length)
             return false;
     }
-    offset = buffer.size() - behind.left();
+    offset = buffer.size() - rest.left();
     return true;
 }
 

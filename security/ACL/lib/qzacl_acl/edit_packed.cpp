@@ -31,7 +31,7 @@ bool has_sorted_form(const format::subacl &head) {
     format::skip_entries_while(walk, block_size, [&](std::uint8_t version, byte_span identity) {
         const identity_block block(identity);
         if (version != format::entry_version || !before.sorts_before(block) ||
-            !wanted.is_clearly_behind(block) || !ends_exactly(identity))
+            !wanted.is_clearly_after(block) || !ends_exactly(identity))
             return false;
         before = block;
         last = identity;
@@ -60,15 +60,15 @@ bool find_sorted(byte_span subacl, const format::subacl &head, const char *ident
         if (!previous.empty() &&
             fold_compare(format::string_in(previous), format::string_in(entry.identity)) >= 0)
             return false;
-        const identity_order order = is_placed ? identity_order::behind : wanted.compare(entry.identity);
-        if (order != identity_order::behind) {
+        const identity_order order = is_placed ? identity_order::after : wanted.compare(entry.identity);
+        if (order != identity_order::after) {
             is_placed = true;
             place = {offset,
                      order == identity_order::same ? format::entry_fixed_size + entry.identity.size() : 0};
         }
         previous = entry.identity;
         --walk.left;
-        skip_ascending(is_placed ? identity_start::behind_all() : wanted.start(), previous, walk);
+        skip_ascending(is_placed ? identity_start::after_all() : wanted.start(), previous, walk);
     }
     if (!is_placed)
         place = {subacl.size() - walk.entries.left(), 0};

@@ -168,7 +168,6 @@ sec_acle_t record_of(const parsed_acle &entry) {
 
 int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size_t *remaining,
                              std::uint32_t *line, parsed_acle *entry) {
-    constexpr int line_consumed = 1;
     *entry = {};
     char *begin = *cursor;
     if (begin == nullptr || *begin == '\0')

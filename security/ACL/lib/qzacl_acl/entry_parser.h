@@ -15,6 +15,9 @@ namespace qz {
 // The longest accepted line, including its line end.
 inline constexpr std::size_t line_length_max = 1096;
 
+// The result for a line that was read without an error.
+inline constexpr int line_consumed = 1;
+
 // The entry of one line. Its mechanism and identity point into the text; a NUL, which the lengths do not count, follows
 // each. A type without one has a null span.
 struct parsed_acle {
@@ -38,10 +41,10 @@ sec_acle_t record_of(const parsed_acle &entry);
 // Reads the line at `*cursor` into `*entry`, which then points into the text. The text is writable and ends in a NUL;
 // `*remaining` counts the bytes from the cursor to that NUL, inclusive. A null `set` means the default templates.
 //
-// Returns 0 when nothing is left, and 1 when it consumed a line; the entry's type is 0 for a line without one. Any
-// other result is a recorded failure: SEC_S_BAD_PERMISSION, SEC_S_FILE_ERROR or SEC_S_BAD_ACL. That line was
-// consumed, too, so the caller may continue. Consuming a line moves the cursor to the next one, or to null after
-// the last, and adds 1 to `*line`.
+// Returns SEC_S_OK when nothing is left, and line_consumed when it consumed a line; the entry's type is 0 for a line
+// without one. Any other result is a recorded failure: SEC_S_BAD_PERMISSION, SEC_S_FILE_ERROR or SEC_S_BAD_ACL. That
+// line was consumed, too, so the caller may continue. Consuming a line moves the cursor to the next one, or to null
+// after the last, and adds 1 to `*line`.
 int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size_t *remaining,
                              std::uint32_t *line, qz::parsed_acle *entry);
 // The same into a record that borrows its identity.

@@ -15,7 +15,8 @@
 //   permissions of groups:
 //       each group as one party, without a handler; the masks of all matches are combined
 //
-// The stored order is not checked: if it is not ascending, it hides entries.
+// An entry that does not fit into the buffer, or an identity without a NUL where the comparison gets to it, is an
+// error. The stored order is not checked: if it is not ascending, it hides entries.
 //
 // The buffer is read in place. Only recording a long identity allocates memory, and the one lock is held only while
 // looking up a handler.
@@ -89,8 +90,9 @@ sec_id_compare_fn find_handler(std::uint32_t kind, const char *mechanism) {
 }
 
 // Calls a handler for each entry. An error that it records for an entry that does not match is cleared.
-int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler, bool is_sorted,
-                        const format::subacl &head, byte_reader entries, std::uint32_t &mask) {
+int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler, const format::subacl &head,
+                        byte_reader entries, std::uint32_t &mask) {
+    const bool is_sorted = request.type() == SEC_ACLE_USER;
     for (std::uint32_t left = head.entry_count; left != 0; --left) {
         format::entry entry;
         if (!format::read(entries, entry))
@@ -115,30 +117,30 @@ int evaluate_by_handler(const single_request &request, sec_id_compare_fn handler
                                                       std::uint32_t left) {
     return format::skip_entries_while(
         entries, left, identity_block::size, [&](std::uint8_t, byte_span identity) {
-            return wanted.is_clearly_behind(identity_block(identity)) && format::ends_in_nul(identity);
+            return wanted.is_clearly_after(identity_block(identity)) && format::ends_in_nul(identity);
         });
 }
 
 // Compares the wanted identity with the entries from the next one on, and leaves the walk before the entry that
-// decides. Without one, the wanted identity sorts after all of them. Inline, so that the first loop keeps its
-// variables in registers.
+// decides. Without one, the wanted identity sorts after all of them. Inline, so that the walk stays in registers of the
+// caller.
 [[gnu::always_inline]] inline identity_order compare_next(const wanted_identity &wanted,
                                                           format::entry_walk &walk, format::entry &entry) {
     const identity_start start = wanted.start();
     walk.step(format::skip_entries_while(
         walk.entries, walk.left, identity_block::size,
-        [&](std::uint8_t, byte_span identity) { return start.is_far_behind(identity); }));
+        [&](std::uint8_t, byte_span identity) { return start.is_far_after(identity); }));
     while (walk.left != 0) {
         byte_reader next = walk.entries;
         if (!format::read(next, entry))
             return identity_order::unknown;
         const identity_order order = wanted.compare(entry.identity);
-        if (order != identity_order::behind)
+        if (order != identity_order::after)
             return order;
         walk = {next, walk.left - 1};
         walk.step(skip_before(start, walk.entries, walk.left));
     }
-    return identity_order::behind;
+    return identity_order::after;
 }
 
 int evaluate_user(const single_request &request, const format::subacl &head, byte_reader entries,
@@ -190,13 +192,13 @@ int evaluate_single(const sec_acl_buffer_t *acl, single_request &request, const 
         handler = find_handler(SEC_ID_HANDLER_EXPANDED, request.mechanism);
         if (handler == nullptr)
             return no_match(request, request.identity);
-        return evaluate_by_handler(request, handler, false, head, entries, *mask);
+        return evaluate_by_handler(request, handler, head, entries, *mask);
     }
     request.walked = static_cast<std::int32_t>(head.entry_count);
     if (request.uses_handler())
         handler = find_handler(SEC_ID_HANDLER_USER, request.mechanism);
     return handler == nullptr ? evaluate_user(request, head, entries, *mask)
-                              : evaluate_by_handler(request, handler, true, head, entries, *mask);
+                              : evaluate_by_handler(request, handler, head, entries, *mask);
 }
 
 // Evaluates some of the requester's groups with one pass over the entries.

@@ -55,7 +55,7 @@ private:
 
 private:
     static std::uint64_t folded(const unsigned char *bytes, std::size_t count) {
-        return fold8(first_byte_highest(load8(bytes))) & ~bits_behind(count);
+        return fold8(first_byte_highest(load8(bytes))) & ~bits_after(count);
     }
 #endif
 
@@ -105,7 +105,7 @@ inline bool ends_exactly(byte_span field) {
 enum class identity_order : std::uint8_t {
     before,
     same,
-    behind,
+    after,
     unknown, // the stored field has no NUL
 };
 
@@ -116,26 +116,27 @@ public:
     identity_start(const char *text, std::size_t length)
         : first_(fold8(first_word(text, length))), second_(fold8(second_word(text, length))) {}
 
-    // Sorts after every identity.
-    static identity_start behind_all() { return identity_start(UINT64_MAX, UINT64_MAX); }
+    // Sorts after every identity that does not start with sixteen bytes of 0xff.
+    static identity_start after_all() { return {UINT64_MAX, UINT64_MAX}; }
 
     // True for most entries that sort before the wanted identity, and for no others. Two words of `stored`, an
     // entry's identity, must be readable even if it is shorter.
     //
     // Instead of folding letters, this sets the case bit in every byte, which makes no byte less than its folded
-    // form. Bytes after a short identity count as the highest. So an identity that is less even then sorts before.
-    bool is_far_behind(byte_span stored) const {
+    // form. Bytes after a short identity count as 0xff. So an identity that is less even then sorts before.
+    bool is_far_after(byte_span stored) const {
         constexpr std::uint64_t case_bits = in_each_byte('a' - 'A');
         const std::uint64_t first =
-            first_byte_highest(load8(stored.data()) | case_bits) | bits_behind(stored.size());
+            first_byte_highest(load8(stored.data()) | case_bits) | bits_after(stored.size());
         if (first < first_) [[likely]]
             return true;
         return first == first_ && stored.size() >= 2 * word_size &&
                first_byte_highest(load8(stored.data() + word_size) | case_bits) < second_;
     }
 
-    // The same for more entries, at a higher cost. The field must end in NUL.
-    bool is_clearly_behind(const identity_block &stored) const {
+    // The same for more entries, at a higher cost. Holds only for a field that ends in NUL: without one, a stored
+    // identity that the wanted one starts with counts as well.
+    bool is_clearly_after(const identity_block &stored) const {
         const std::uint64_t first = stored.first();
         if (first < first_) [[likely]]
             return true;
@@ -181,7 +182,7 @@ public:
         const std::size_t shared = std::min(stored.size(), length_ + 1);
         const int order = fold_compare(text_, reinterpret_cast<const char *>(stored.data()), shared);
         if (order != 0)
-            return order < 0 ? identity_order::before : identity_order::behind;
+            return order < 0 ? identity_order::before : identity_order::after;
         return shared > length_ ? identity_order::same : identity_order::unknown;
     }
 

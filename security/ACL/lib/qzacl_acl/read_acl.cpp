@@ -29,7 +29,8 @@ int convert_and_check(sec_acl_buffer_t &acl) {
     const byte_span bytes = format::bytes_of(acl);
     const bool is_foreign =
         bytes.size() > format::order_offset && bytes[format::order_offset] != format::host_order;
-    if (const int result = sec_convert_acl_to_host(1, &acl); result != SEC_S_OK || !is_foreign)
+    constexpr int with_check = 1;
+    if (const int result = sec_convert_acl_to_host(with_check, &acl); result != SEC_S_OK || !is_foreign)
         return result;
     return sec__check_acl_buffer(&acl);
 }
