@@ -26,6 +26,7 @@ from command_case import (
 A_TEXT = "u abcd xyz wr\n"
 A_LINE = entry("u", "rw", "abcd", "xyz")
 A_CACHE = bytes.fromhex("8501020100 1a000000 04 01000000 05 6162636400 01 03000000 0400 78797a00")
+A_NEW_CACHE = [("a.cacl", A_CACHE)]
 NO_CACHE = message("cache_skipped_after_errors")
 # Messages about options, which the C library prints without a number.
 OF_THE_C_LIBRARY = {
@@ -267,11 +268,8 @@ def entries_of(path):
 
 
 class Caches(CommandCase):
-    def expect_cache(self, **how):
-        self.expect(["-s", "-f", "a"], Code.OK, "", [("a.cacl", A_CACHE)], **how)
-
-    def expect_refusal(self, result, **how):
-        self.expect(["-s", "-f", "a"], *result, **how)
+    def expect_compiled(self, code=Code.OK, errors="", makes=(), **how):
+        self.expect(["-s", "-f", "a"], code, errors, makes, **how)
 
     def test_what_stands_in_the_way(self):
         for does, result in IN_THE_WAY:
@@ -281,13 +279,13 @@ class Caches(CommandCase):
                 self.write("of_root", A_TEXT)
                 self.write("a", A_TEXT, owner=ORDINARY)
                 subprocess.run(does, shell=True, cwd=self.dir, user=ORDINARY, group=ORDINARY, check=True)
-                self.expect_refusal(result, user=ORDINARY)
+                self.expect_compiled(*result, user=ORDINARY)
 
     def test_a_cache_is_protected_like_the_file(self):
         for mode in (0o640, 0o400, 0o1666, 0o2755, 0o4711):
             self.fresh()
             path = self.write("a", A_TEXT, mode, ORDINARY)
-            self.expect_cache(child=lambda: os.umask(0o077))
+            self.expect_compiled(makes=A_NEW_CACHE, child=lambda: os.umask(0o077))
             text, cache = os.stat(path), os.stat(path + ".cacl")
             self.assertEqual(cache.st_mode, text.st_mode)
             self.assertEqual((cache.st_uid, cache.st_gid), (text.st_uid, text.st_gid))
@@ -302,7 +300,7 @@ class Caches(CommandCase):
                     self.set_entries(path, entries)
                 if inherited:
                     self.set_entries(self.dir, inherited, INHERITED)
-                self.expect_cache()
+                self.expect_compiled(makes=A_NEW_CACHE)
                 self.assertEqual(entries_of(path + ".cacl"), entries_of(path))
                 self.assertEqual(os.stat(path + ".cacl").st_mode, os.stat(path).st_mode)
                 if IS_ROOT:
@@ -313,11 +311,11 @@ class Caches(CommandCase):
         path = self.write("a", A_TEXT, 0o664)
         self.write("a.cacl", "old", 0o664)
         self.set_entries(path, posix_acl(group=4))
-        self.expect_refusal(OTHER_MODE)
+        self.expect_compiled(*OTHER_MODE)
         self.set_entries(path + ".cacl", posix_acl(group=6))
-        self.expect_refusal(OTHER_MODE)
+        self.expect_compiled(*OTHER_MODE)
         self.set_entries(path + ".cacl", posix_acl(group=4))
-        self.expect_cache()
+        self.expect_compiled(makes=A_NEW_CACHE)
 
     def test_a_full_disk_leaves_the_cache_that_was_there(self):
         self.write("a", A_TEXT)
@@ -325,8 +323,8 @@ class Caches(CommandCase):
         short = Code.FILE_ERROR, message("short_write", 7, size, 0)
         nothing = Code.FILE_ERROR, message("short_write", -1, size, errno.EFBIG)
         for _ in ("without a cache", "with one"):
-            self.expect_refusal(short, child=limited_to({resource.RLIMIT_FSIZE: 7}, signal.SIG_IGN))
-            self.expect_refusal(nothing, child=limited_to({resource.RLIMIT_FSIZE: 0}))
+            self.expect_compiled(*short, child=limited_to({resource.RLIMIT_FSIZE: 7}, signal.SIG_IGN))
+            self.expect_compiled(*nothing, child=limited_to({resource.RLIMIT_FSIZE: 0}))
             self.write("a.cacl", "old")
 
     def test_the_longest_path_leaves_room_for_the_suffix(self):

@@ -257,9 +257,6 @@ class Completions(unittest.TestCase):
                 self.assertEqual(self.offered(shell, script, "qzaclfck -c -v -"), self.usage - {"-c", "-v"})
                 self.assertEqual(self.offered(shell, script, "qzaclfck -f mist"), {"mistakes.acl"})
 
-    def test_zsh_completes_the_checker(self):
-        self.assertEqual(self.offered_by_zsh("_qzaclfck"), self.usage)
-
     def test_bash_completes_the_companion(self):
         begins_with_s = {verb for verb in self.verbs if verb.startswith("s")}
         self.assertEqual(self.offered("bash", "qzacl.bash", "qzacl s"), begins_with_s)
@@ -272,7 +269,8 @@ class Completions(unittest.TestCase):
         self.assertIn("ask", self.verbs)
         self.assertEqual(self.offered("fish", "qzacl.fish", "qzacl "), self.verbs)
 
-    def test_zsh_completes_the_companion(self):
+    def test_zsh_completes_both(self):
+        self.assertEqual(self.offered_by_zsh("_qzaclfck"), self.usage)
         self.assertEqual(self.offered_by_zsh("_qzacl"), {"-h"}.union(*self.options_of_verbs.values()))
 
 

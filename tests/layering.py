@@ -1,5 +1,5 @@
-"""Checks that includes point down only in the picture of the house, which is read in CONTRIBUTING.md. Headers that are
-above in another folder are out of reach anyway, by cmake/layers.cmake, but for a path with "../" in it.
+"""Checks that includes only point down in the picture of the source layout in CONTRIBUTING.md. Headers above in another
+folder are out of reach anyway, because of cmake/layers.cmake, except by a path with "../" in it.
 
 usage: layering.py [ROOT]   prints each offending line and exits with 1 when there is one
 """
@@ -18,16 +18,8 @@ LIBRARY = "security/ACL/lib/"
 COMPANION = "security/ACL/cmd/qzacl/"
 SEARCHED = (LIBRARY, "security/", "platform/", "include/", "")
 INCLUDE = re.compile(r'\s*#\s*include\s*[<"]([^">]+)[">]')
-
-
-def sources():
-    for folder in ("security", "platform", "base", "include"):
-        for path in (ROOT / folder).rglob("*.*"):
-            if path.suffix in (".c", ".cpp", ".h", ".hpp"):
-                yield path.relative_to(ROOT).as_posix()
-
-
-FILES = set(sources())
+FILES = {path.relative_to(ROOT).as_posix() for folder in ("security", "platform", "base", "include")
+         for path in (ROOT / folder).rglob("*.*") if path.suffix in (".c", ".cpp", ".h", ".hpp")}
 
 
 def rank_of(path):

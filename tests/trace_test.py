@@ -12,10 +12,9 @@ import unittest
 
 from command_case import BUILD, IS_ROOT, SOURCE, Code, CommandCase, message
 
-LINES = (SOURCE / "tests/operations.trace").read_text("utf-8").splitlines()
 # The rows of records that are expected, by the setting of the levels.
 EXPECTED = {}
-for line in LINES:
+for line in (SOURCE / "tests/operations.trace").read_text("utf-8").splitlines():
     if line.startswith("["):
         rows = EXPECTED.setdefault(line.strip("[]"), [])
     elif line and not line.startswith("#"):

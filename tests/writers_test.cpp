@@ -55,10 +55,11 @@ TEST_F(files, writers_that_are_ended_by_a_signal_leave_nothing) {
             ++at;
 }
 
+constexpr int streams[] = {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO};
+const std::string longer_than_the_cache(1000, 'x');
+
 // The threads of a service without standard streams print all the same.
 TEST_F(files, have_no_descriptor_of_a_standard_stream) {
-    constexpr std::array streams = {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO};
-    const std::string longer_than_the_cache(1000, 'x');
     bool is_taken = false;
     const auto print = [&](std::size_t) {
         for (const int stream : streams)
@@ -81,14 +82,13 @@ TEST_F(files, have_no_descriptor_of_a_standard_stream) {
     }
 }
 
-// Another thread that held the numbers of the streams, too, gives them back before a file is opened.
+// Another thread that also held the numbers of the streams releases them before a file is opened.
 TEST_F(files, keep_nothing_that_was_printed_while_they_had_the_number_of_a_stream) {
-    const std::string longer_than_the_cache(1000, 'x');
     bool is_printed = false;
     const auto give_back_and_print = [&](std::size_t) {
         const bool is_opening = is_about_to("open") && faults::opened != "/";
         const bool is_closing = is_about_to("close");
-        for (const int stream : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
+        for (const int stream : streams) {
             if (is_opening)
                 close(stream);
             if (is_closing)
