@@ -1,6 +1,6 @@
-// Compiled buffers: making, checking, converting, listing, editing, releasing and dumping them, and what each of
-// these refuses. fuzz/buffer_fuzz.cpp tests every operation on bytes that were cut short or changed, and
-// fuzz/edit_fuzz.cpp tests all other edits, also of bytes that no edit makes.
+// Compiled buffers: made, checked, converted, listed, edited, released and dumped, and what each of these refuses.
+// How every operation takes bytes that were cut short or changed is tested by fuzz/buffer_fuzz.cpp, and what edits
+// do otherwise, also to bytes that no edit makes, by fuzz/edit_fuzz.cpp.
 #include "qzacl_acl/buffer.h"
 #include "qzacl_acl/tree.h"
 #include "qzacl_acl/validate.h"
@@ -69,7 +69,7 @@ static void expect_check(const checked_bytes &row) {
 TEST(validate, accepts_what_is_sound) {
     const std::string long_mechanism =
         packed_subacl(SEC_ACLE_EXPANDED, text_field(std::string(254, 'm')), 1, xyz);
-    expect_check({"all types, and bytes after the end", rich + "after"});
+    expect_check({"all types, and bytes behind the end", rich + "behind"});
     expect_check({"a sub-ACL repeated", packed_acl(2, user_xyz + user_xyz)});
     expect_check({"no entries, and entries repeated", acl_bytes("e m:; g: z 4294967295, xyz 3, xyz 3")});
     expect_check({"a long mechanism", acl_of_one(with_number(long_mechanism, 3, 9))});
@@ -84,7 +84,7 @@ TEST(validate, finds_what_is_cut_short_or_of_another_length) {
         {"a length too long", packed_acl(2, with_number(user_xyz, 0, 27, 4) + any_other), corrupted},
         {"an entry cut short", acl_of_one(user_xyz.substr(0, 21)), corrupted},
         {"entries beyond number", acl_of_one(packed_subacl(SEC_ACLE_USER, "m\0"s, ~0u, xyz)), corrupted},
-        // After a faulty entry the walk stays there, where no sub-ACL starts.
+        // After a faulty entry the walk stands at that entry, where no further sub-ACL starts.
         {"a faulty entry before a sub-ACL", packed_acl(2, with_number(any_other, 10, 2) + any_other),
          corrupted},
     };
@@ -139,7 +139,7 @@ TEST(convert, marks_the_order_when_all_was_turned) {
     const std::string twice = with_foreign_number(foreign, 3, 2, 2) + foreign.substr(5);
     const std::pair<std::string, failure> rows[] = {
         {twice, no_error},
-        {with_number(foreign, 9, 99), no_error}, // other mistakes are not checked then
+        {with_number(foreign, 9, 99), no_error}, // what is wrong then is not looked for
         {"\x84\1\1\0\0"s, bad_acl(msg::not_an_acl_buffer)},
         {"\x85\2"s, bad_acl(msg::not_an_acl_buffer)},
         {"\x85\1"s, bad_acl(msg::shorter_than_header, 2)},
@@ -243,7 +243,7 @@ TEST(edit, holds_at_most_65534_bytes_of_identity) {
     const sec_acle_t refused = group(too_long.c_str(), 7);
     const sec_acle_t fitting = group(longest.c_str(), 7);
     const std::string sorted = entry_bytes("a 1") + entry_bytes("b 2");
-    // A buffer that the call makes, and frees if it fails; one changed in place; one rebuilt.
+    // A buffer that the call makes, which goes with its failure; one changed in place, one rebuilt.
     for (const std::string &bytes : {""s, acl_bytes("g: a 1, b 2"), acl_bytes("g: b 2, a 1")}) {
         buffer held(bytes);
         EXPECT_EQ(outcome_of(sec_add_acle_to_acl(&refused, &held.acl)),
@@ -272,7 +272,7 @@ TEST(edit, holds_at_most_65535_subacls) {
     EXPECT_TRUE(held.bytes() == full.substr(0, full.size() - 25) + added);
 }
 
-// A handler sees identities in the buffer itself and may keep one to add it. The buffer moves during the addition.
+// A handler is shown identities where they stand, and may keep one to add it: the buffer moves while that is done.
 TEST(edit, adds_an_identity_that_lies_in_the_buffer) {
     buffer held(acl_bytes("u unix: of-a-long-name-that-makes-the-buffer-move 1"));
     sec_acle_t acle = user("unix", "", 2);

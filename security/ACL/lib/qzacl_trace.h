@@ -79,7 +79,7 @@ struct trace_point {
     static constexpr bool takes = traced::fit<traced::list<Items...>, traced::list<Args...>>;
 
     template <class... Args>
-    static void record(const Args &...args) {
+    void record(const Args &...args) const {
         qz::record(Id, Items{args}...);
     }
 };
@@ -93,7 +93,7 @@ bool traces(Point) {
 template <class Point, class... Args>
 requires(Point::template takes<Args...>) void trace(Point point, const Args &...args) {
     if (traces(point)) [[unlikely]]
-        Point::record(args...);
+        point.record(args...);
 }
 
 // ---- Timings ----

@@ -22,10 +22,10 @@ namespace {
 
 enum class outcome { counts, does_not_count, failed };
 
-// A cache counts if it is later than its text in whole seconds. Returns the time until the end of the second in which
-// the text was written; 0 if it is over. The kernel may have stamped the text from a finer clock, ahead of the coarse
-// one that stamps the cache, so that second may not even have begun. A text from further in the future is not waited
-// for.
+// A cache counts if it is later than its text in whole seconds. Returns how long the second in which the text was
+// written will last, or 0 when it is over. The kernel may have stamped the text from a finer clock, which is ahead of
+// the coarse one that stamps the cache, so that second may not even have begun. A text from a later future is not
+// waited for.
 std::chrono::nanoseconds rest_of_second(const std::string &path) {
     using std::chrono::seconds;
     struct stat text = {};

@@ -98,7 +98,7 @@ private:
         for (std::size_t dot = identity.find('.', 1); dot != std::string::npos && !former.empty();
              dot = identity.find('.', dot + 1)) {
             const std::string domain = identity.substr(dot);
-            if (former.count(domain) != 0) {
+            if (former.contains(domain)) {
                 warn("hidden", "is never reached: " + domain + " above accepts the same");
                 break;
             }

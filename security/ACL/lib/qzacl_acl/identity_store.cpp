@@ -65,7 +65,8 @@ shortage identity_store::grow(std::uint64_t units) {
     const std::uint64_t size = std::max({units, std::uint64_t{size_} * 2, first_units});
     // On a 32-bit machine the size may exceed the address space.
     constexpr std::size_t most_bytes = std::numeric_limits<std::ptrdiff_t>::max();
-    const bool fits = size <= last_place && size <= most_bytes / own_unit;
+    constexpr std::uint64_t most_units = std::min<std::uint64_t>(last_place, most_bytes / own_unit);
+    const bool fits = size <= most_units;
     const std::size_t bytes = fits ? static_cast<std::size_t>(size) * own_unit : most_bytes;
     void *grown = fits ? std::realloc(base_, bytes) : nullptr;
     if (grown == nullptr)

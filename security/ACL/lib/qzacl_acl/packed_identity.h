@@ -117,7 +117,7 @@ public:
         : first_(fold8(first_word(text, length))), second_(fold8(second_word(text, length))) {}
 
     // Sorts after every identity that does not start with sixteen bytes of 0xff.
-    static identity_start after_all() { return identity_start(UINT64_MAX, UINT64_MAX); }
+    static identity_start after_all() { return {UINT64_MAX, UINT64_MAX}; }
 
     // True for most entries that sort before the wanted identity, and for no others. Two words of `stored`, an
     // entry's identity, must be readable even if it is shorter.
