@@ -15,15 +15,15 @@
             print(entry)                                # "u unix alice@head.cluster.example rwxCqle"
         acl.add(qzacl.Entry.create(qzacl.GROUP, qzacl.to_mask("rq"), identity="auditors"))
 
-The loader finds the libraries, or QZ_LIBRARY_DIR names their folder.
+The loader finds the libraries, unless QZ_LIBRARY_DIR names their folder.
 
-A failure raises qzacl.Error, with the code, the number and the text of the message; nothing is granted then. Texts are str,
-and UTF-8 in the library: other bytes of a file become surrogate escapes, and are converted back. A NUL in
-a text raises ValueError. Permissions are masks of bits; to_mask and to_letters turn letters into them and back, by the
-library's own permissions or by a PermissionSet of a service.
+A failure raises qzacl.Error with the code, number and text of the message, and grants nothing. Texts are str here and
+UTF-8 in the library. Other bytes of a file become surrogate escapes and are converted back. A NUL in a text raises
+ValueError. Permissions are bit masks. to_mask and to_letters convert letters to masks and back, by the library's own
+permissions or by the PermissionSet of a service.
 
-Any number of threads may ask one Acl at a time; while one edits or closes it, no other may use it. Handlers are called in
-the thread that asks.
+Any number of threads may query an Acl at the same time. While one edits or closes it, no other may use it. Handlers are
+called in the thread that queries.
 """
 from ._acl import Acl, same
 from ._decide import Answer, Order, PartyAnswer, Requester, Who, decide, granted, stored_identity
@@ -34,7 +34,8 @@ from ._live import LiveAcl
 from ._permissions import Permission, PermissionSet, to_letters, to_mask
 
 __all__ = [
-    "ANY_OTHER", "Acl", "Answer", "EXPANDED", "Entry", "Error", "GROUP", "LiveAcl", "Order", "PartyAnswer", "Permission",
+    "ANY_OTHER", "Acl", "Answer", "EXPANDED", "Entry", "Error", "GROUP", "LiveAcl", "Order", "PartyAnswer",
+    "Permission",
     "PermissionSet", "Requester", "UNAUTHENTICATED", "USER", "Who", "decide", "domain", "exact", "granted",
     "register_expanded", "register_user", "same", "stored_identity", "to_letters", "to_mask",
 ]

@@ -21,7 +21,7 @@ _SPACES = " \t\n\v\f\r"
 
 
 class Acl:
-    """An ACL, empty or from a file, a text or bytes. Released by close, at the end of a with block, or with the object."""
+    """An ACL, empty or from a file, a text or bytes. close, the end of a with block, or its last use releases it."""
 
     def __init__(self) -> None:
         self._buffer = Buffer()
@@ -36,9 +36,9 @@ class Acl:
              cache: bool = False, write_cache: bool = False) -> Acl:
         """Reads a file, or with a user a bare file name in that user's home directory.
 
-        cache allows for the compiled cache file, whose bytes are checked; write_cache also writes a missing or stale one.
-        Leave them out unless everybody reads the file with the library's own permissions: nothing in a cache file tells by
-        which set it was compiled, and with another one its bits mean something else.
+        cache permits reading the compiled cache file, whose bytes are checked. write_cache also writes a missing or
+        stale one. Use neither unless every program reads the file with the library's own permissions: a cache file does
+        not record the set that compiled it, and with another set its bits mean something else.
         """
         acl, name = cls(), os.fsencode(path)
         if b"\0" in name:
@@ -75,7 +75,7 @@ class Acl:
         return ctypes.string_at(self._buffer.data, self._buffer.length) if self._buffer.length else b""
 
     def to_text(self, permissions: PermissionSet | None = None) -> str:
-        """The text of an ACL file that compiles to the same bytes. Raises Error 43 for an entry that no line can hold."""
+        """Returns a text that compiles to the same bytes. Raises Error 43 for an entry that no line can hold."""
         subacls = [list(entries) for _, entries in itertools.groupby(self, lambda e: (e.type, folded(e.mechanism)))]
         return "".join(_line_of(entry, permissions) for entries in reversed(subacls) for entry in entries)
 
@@ -87,7 +87,8 @@ class Acl:
     def __enter__(self) -> Acl:
         return self
 
-    def __exit__(self, kind: type[BaseException] | None, value: BaseException | None, trace: TracebackType | None) -> None:
+    def __exit__(self, kind: type[BaseException] | None, value: BaseException | None,
+                 trace: TracebackType | None) -> None:
         self.close()
 
     # ---- Listing and editing ----

@@ -69,7 +69,8 @@ class PartyAnswer(NamedTuple):
 class Answer(NamedTuple):
     """A decision: all answers, which of them decide, and the granted permissions.
 
-    The answers for a user are: user, expanded, each group in the requester's order, any other; otherwise unauthenticated.
+    A user gets the answers user, expanded, each group in the requester's order, and any other. An unauthenticated
+    requester gets the answer unauthenticated alone.
     """
 
     granted: int
@@ -82,10 +83,12 @@ class Answer(NamedTuple):
         """Whether something was wanted and all of it is granted."""
         return self.wanted != 0 and self.granted & self.wanted == self.wanted
 
-    def explain(self, place: Callable[[PartyAnswer], str] = lambda said: "", permissions: PermissionSet | None = None) -> str:
-        """Says why, a line for each answer and then what is granted: "expanded: FILE:3: e unix .x rql (decides)".
+    def explain(self, place: Callable[[PartyAnswer], str] = lambda said: "",
+                permissions: PermissionSet | None = None) -> str:
+        """Explains the answer, one line per party and then the granted letters.
 
-        place tells where an entry stands, "FILE:3" for example, or nothing.
+        A line looks like "expanded: FILE:3: e unix .x rql (decides)". place returns where an entry is, such as
+        "FILE:3", or an empty string.
         """
         lines = []
         for said in self.answers:
@@ -103,8 +106,9 @@ class Answer(NamedTuple):
 
 
 def stored_identity(mechanism: str, identity: str) -> str:
-    """An identity as Entry.create stores that of a user: with "unix" and "hba2" an IPv6 address behind the first "@" in its
-    one form. What Entry.create would refuse stays as it is."""
+    """An identity as Entry.create stores it for a user: "unix" and "hba2" have IPv6 hosts in canonical form.
+
+    The host follows the first "@". Identities that Entry.create refuses are returned unchanged."""
     user, at, host = identity.partition("@")
     if not at or folded(mechanism) not in ("unix", "hba2"):
         return identity
@@ -117,7 +121,7 @@ def stored_identity(mechanism: str, identity: str) -> str:
 
 
 def granted(acl: Acl, whom: Requester, order: Order = Order.CLOSEST) -> int:
-    """What decide would grant, and nothing else: asks no more than the order needs."""
+    """Returns what decide would grant, and queries no more than the order needs."""
     if whom.mechanism is None or whom.identity is None:
         return acl.unauthenticated() or 0
     mechanism, identity = whom.mechanism, stored_identity(whom.mechanism, whom.identity)
@@ -134,11 +138,11 @@ def granted(acl: Acl, whom: Requester, order: Order = Order.CLOSEST) -> int:
 
 
 def decide(acl: Acl, whom: Requester, wanted: int = 0, order: Order = Order.CLOSEST) -> Answer:
-    """Decides what a requester may do, and tells every answer with its entry; wanted is a mask, 0: nothing is wanted.
+    """Decides what a requester may do, and returns every answer with its entry. wanted is a mask, 0 for nothing.
 
-    Lists the sub-ACLs that speak of the requester when it asks an Acl for the first time after a change. Which user-expanded
-    entry a handler accepted is found by asking it again about one after the other; should it then accept none, the entry has
-    no identity.
+    The first call after a change of the Acl lists the sub-ACLs that concern the requester. To find the user-expanded
+    entry that a handler accepted, the handler is called again for one entry after the other. If it then accepts none,
+    the entry has no identity.
     """
     answers = _all_answers(acl, whom)
     deciding = next((said.party for said in answers if said.entry is not None), None)
@@ -165,7 +169,10 @@ def _all_answers(acl: Acl, whom: Requester) -> list[PartyAnswer]:
         return of.expanded(mechanism, identity)
 
     named = [(group, acl.groups([group])) for group in whom.groups]
-    own = _accepted(acl, USER, mechanism, user) if whom.through_handler else _named(acl, USER, mechanism, identity, user(acl))
+    if whom.through_handler:
+        own = _accepted(acl, USER, mechanism, user)
+    else:
+        own = _named(acl, USER, mechanism, identity, user(acl))
     return [PartyAnswer(Who.USER, own, False, ""),
             PartyAnswer(Who.EXPANDED, _accepted(acl, EXPANDED, mechanism, expanded), False, ""),
             *(PartyAnswer(Who.GROUP, _named(acl, GROUP, "", group, mask), False, group) for group, mask in named),

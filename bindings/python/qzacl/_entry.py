@@ -13,7 +13,7 @@ TYPE_LETTERS = {UNAUTHENTICATED: "n", ANY_OTHER: "o", USER: "u", EXPANDED: "e", 
 
 
 class Entry(NamedTuple):
-    """An entry: whom it means, and the permissions as a mask. str() gives it as a line of an ACL file has it."""
+    """An entry: its type, mechanism and identity, and its permissions as a mask. str() returns its line of a file."""
 
     type: int  # UNAUTHENTICATED, ANY_OTHER, USER, EXPANDED or GROUP
     permissions: int
@@ -48,7 +48,8 @@ class Entry(NamedTuple):
 
     def line(self, permissions: PermissionSet | None = None) -> str:
         """The words of a line: single blanks, mechanism in lower case, letters in the order of their bits."""
-        words = (TYPE_LETTERS[self.type], folded(self.mechanism), self.identity, to_letters(self.permissions, permissions))
+        letters = to_letters(self.permissions, permissions)
+        words = (TYPE_LETTERS[self.type], folded(self.mechanism), self.identity, letters)
         return " ".join(word for word in words if word)
 
     def __str__(self) -> str:

@@ -12,10 +12,10 @@ _kept: list[Any] = []  # registered for the life of the process, so these are ne
 
 
 def register_expanded(mechanism: str, matches: Callable[[str, str], bool]) -> None:
-    """Gives user-expanded entries of the mechanism their meaning: matches(requested, entry) tells whom they stand for.
+    """Defines what user-expanded entries of the mechanism match: matches(requested, entry) returns whether they do.
 
-    Without a handler they match nobody. Of several for one mechanism the first stays in force. Where it raises, the entry
-    does not match, and the exception is shown by sys.excepthook.
+    Without a handler they match nobody. If a mechanism has several handlers, the first one counts. If it raises, the
+    entry does not match, and sys.excepthook shows the exception.
     """
     _register(HANDLER_EXPANDED, mechanism, lambda requested, entry: 0 if matches(requested, entry) else 1)
 
@@ -42,13 +42,14 @@ def _register(kind: int, mechanism: str, compare: Callable[[str, str], int]) -> 
 
 
 def domain(requested: str, entry: str) -> bool:
-    """For register_expanded: the host behind the last "@" equals the entry, or the entry begins with a dot and the host ends
-    with it, without regard to the case of A to Z. An identity without "@" has no host and matches nothing."""
+    """For register_expanded: the host equals the entry, or the entry begins with a dot and the host ends with it.
+
+    The host follows the last "@"; an identity without one matches nothing. The case of A to Z does not matter."""
     _, at, host = folded(requested).rpartition("@")
     end = folded(entry)
     return bool(at and host) and (host == end or end.startswith(".") and host.endswith(end))
 
 
 def exact(requested: str, entry: str) -> bool:
-    """For register_expanded: the entry stands for the one identity that equals it but for the case of A to Z."""
+    """For register_expanded: the identity equals the entry, except for the case of A to Z."""
     return folded(requested) == folded(entry)

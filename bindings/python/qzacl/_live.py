@@ -39,9 +39,10 @@ class LiveAcl:
 
     def __init__(self, path: str | os.PathLike[str], permissions: PermissionSet | None = None, *,
                  default_permissions: bool = False) -> None:
-        """Follows a file, which the first refresh reads: always its text, unless default_permissions says that everybody reads
-        it with the library's own permissions. Then its cache file may be read as well, in which nothing tells by which set
-        it was compiled."""
+        """Follows a file, which the first refresh reads.
+
+        It reads the text, never a cache file, which does not record the set that compiled it. default_permissions
+        states that every program reads the file with the library's own permissions; then its cache may be read, too."""
         if default_permissions and permissions is not None:
             raise ValueError("a set of one's own is not the default one")
         self._path, self._permissions, self._cache = os.fspath(path), permissions, default_permissions
@@ -53,11 +54,13 @@ class LiveAcl:
         _all.add(self)
 
     def refresh(self) -> bool:
-        """Reads the file if its device, number, size or one of its times is another than at the last reading, or if it had
-        changed so shortly before that a further change might show the same times. Tells whether there is a new snapshot,
-        which is not so where the bytes are the same.
+        """Reads the file if it has changed, and returns whether there is a new snapshot.
 
-        Raises Error when the file cannot be read. The last good snapshot stays, and the next refresh tries again.
+        A changed file differs in its device, number, size or times from the last reading. It is also read again if it
+        changed so shortly before that reading that a further change might have the same times. Equal bytes make no new
+        snapshot.
+
+        Raises Error if the file cannot be read. The last good snapshot stays, and the next refresh tries again.
         """
         with self._refreshing:
             try:

@@ -21,8 +21,8 @@ class Permission(NamedTuple):
 class PermissionSet:
     """The permissions of a service that has its own. Of those that share a bit or a letter, the first is used.
 
-    Does not change, so any number of threads may use it. ACLs keep no set: hand it to every operation that reads or writes
-    letters. A cache file of an ACL tells nothing of the set that it was compiled with: see Acl.read.
+    A set never changes, so any number of threads may use it. ACLs do not keep it: pass it to every operation that
+    reads or writes letters. A cache file does not record the set that compiled it: see Acl.read.
     """
 
     def __init__(self, permissions: Iterable[Permission | tuple[int, str] | tuple[int, str, str, str]]) -> None:
