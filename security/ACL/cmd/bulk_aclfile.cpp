@@ -23,19 +23,11 @@ namespace {
 // Released when an error cannot be printed for lack of memory.
 owned<void> spare_memory;
 
-constexpr acl_file_use by_command = {
-    .not_found = {SEC_S_BAD_FILENAME, msg::bad_acl_file_name},
-    .not_private = {SEC_S_BAD_PERMISSION, msg::acl_file_not_private},
-    .cannot_open = {SEC_S_FILE_ERROR, msg::cannot_open_acl_file},
-    .takes_empty_of_anybody = false,
-    .is_traced = false,
-};
-
 // Finds and vets the file, and opens its text.
 int aclfck__get_aclfile(const char *aclfname, const char *username, vetted_file &file, acl_text &text) {
     return text.open_again_while_replaced([&] {
-        const int result = vet_acl_file(aclfname, username, by_command, file);
-        return result != SEC_S_OK ? result : text.open(file, by_command);
+        const int result = vet_acl_file(aclfname, username, by_commands, file);
+        return result != SEC_S_OK ? result : text.open(file, by_commands);
     });
 }
 

@@ -15,14 +15,6 @@ namespace qzacl {
 
 namespace {
 
-constexpr acl_file_use by_companion = {
-    .not_found = {SEC_S_BAD_FILENAME, msg::bad_acl_file_name},
-    .not_private = {SEC_S_BAD_PERMISSION, msg::acl_file_not_private},
-    .cannot_open = {SEC_S_FILE_ERROR, msg::cannot_open_acl_file},
-    .takes_empty_of_anybody = false,
-    .is_traced = false,
-};
-
 [[noreturn]] void fail(const std::string &name) { throw trouble(name + ": " + std::strerror(errno)); }
 
 } // namespace
@@ -57,8 +49,8 @@ std::string read_whole(int fd, const std::string &name) {
 
 int read_acl_text(const std::string &path, vetted_file &file, acl_text &text) {
     return text.open_again_while_replaced([&] {
-        const int found = vet_acl_file(path.c_str(), nullptr, by_companion, file);
-        return found != SEC_S_OK ? found : text.open(file, by_companion);
+        const int found = vet_acl_file(path.c_str(), nullptr, by_commands, file);
+        return found != SEC_S_OK ? found : text.open(file, by_commands);
     });
 }
 

@@ -26,6 +26,15 @@ struct acl_file_use {
     bool is_traced;              // opening and its timings
 };
 
+// The use of the commands.
+inline constexpr acl_file_use by_commands = {
+    .not_found = {SEC_S_BAD_FILENAME, msg::bad_acl_file_name},
+    .not_private = {SEC_S_BAD_PERMISSION, msg::acl_file_not_private},
+    .cannot_open = {SEC_S_FILE_ERROR, msg::cannot_open_acl_file},
+    .takes_empty_of_anybody = false,
+    .is_traced = false,
+};
+
 // Finds and examines the file. It must be a regular file and, with a user name, owned by that user and writable by no
 // one else. Returns SEC_S_OK, a code of sec__get_aclfname, or one of the use.
 int vet_acl_file(const char *aclfname, const char *username, const acl_file_use &use, vetted_file &file);
