@@ -7,38 +7,6 @@ namespace {
 
 using namespace support;
 
-// The result of a failing call, with the name of its message.
-struct told {
-    int id;
-    int code;
-    const char *name;
-    bool shows_error; // of the system, or 0 when the file is another
-};
-constexpr bool shows_errno = true;
-constexpr bool shows_none = false;
-const told results[] = {
-    {0, SEC_S_OK, "ok", shows_none},
-    {msg::unknown_user.id, SEC_S_UNKNOWN_USER, "unknown_user", shows_none},
-    {msg::working_directory_unknown.id, SEC_S_BAD_FILENAME, "working_directory_unknown", shows_errno},
-    {msg::bad_acl_file_name.id, SEC_S_BAD_FILENAME, "bad_acl_file_name", shows_errno},
-    {msg::cannot_open_acl_file.id, SEC_S_FILE_ERROR, "cannot_open_acl_file", shows_errno},
-    {msg::bad_file_name.id, SEC_S_FILE_ERROR, "bad_file_name", shows_errno},
-    {msg::cannot_open_file.id, SEC_S_FILE_ERROR, "cannot_open_file", shows_errno},
-    {msg::short_read.id, SEC_S_FILE_ERROR, "short_read", shows_errno},
-    {msg::cannot_open_for_writing.id, SEC_S_FILE_ERROR, "cannot_open_for_writing", shows_none},
-    {msg::cache_mode_differs.id, SEC_S_FILE_ERROR, "cache_mode_differs", shows_none},
-    {msg::short_write.id, SEC_S_FILE_ERROR, "short_write", shows_errno},
-    {msg::cannot_set_owner.id, SEC_S_FILE_ERROR, "cannot_set_owner", shows_none},
-    {msg::cannot_set_mode.id, SEC_S_FILE_ERROR, "cannot_set_mode", shows_none},
-    {msg::cannot_rename_cache.id, SEC_S_FILE_ERROR, "cannot_rename_cache", shows_none},
-};
-const told &result_of(const outcome &now) {
-    const auto found = std::ranges::find(results, std::pair(now.id, now.code),
-                                         [](const told &each) { return std::pair(each.id, each.code); });
-    EXPECT_NE(found, std::end(results)) << now;
-    return found == std::end(results) ? results[0] : *found;
-}
-
 // On a full disk, a partial file is cleaned up.
 enum class disk : std::uint8_t { has_room, is_full };
 // Whether the text and the cache have the entries of a POSIX ACL.
@@ -52,13 +20,22 @@ struct way { // to pass through the system, with a section of system_calls.resul
     posix_acl entries = posix_acl::none;
 };
 
-std::string section(const std::string &name) {
-    const std::string all = read_file(QZ_TESTS "/system_calls.results");
-    const std::string head = "[" + name + "]\n";
-    const std::size_t found = all.find(head);
-    EXPECT_NE(found, std::string::npos) << name;
+std::string text_between(const std::string &text, const std::string &head, const std::string &end) {
+    const std::size_t found = text.find(head);
+    EXPECT_NE(found, std::string::npos) << head;
     const std::size_t start = found + head.size();
-    return all.substr(start, all.find("\n\n", start) + 1 - start);
+    return text.substr(start, text.find(end, start) - start);
+}
+const std::string results = read_file(QZ_TESTS "/system_calls.results");
+
+// The name of the message, by its number, the code, and whether it shows the error.
+std::string name_of(const outcome &now, int error) {
+    if (now.code == SEC_S_OK && now.id == 0)
+        return "ok";
+    const std::regex number(" " + std::to_string(error) + "\\b");
+    const std::string shown = std::regex_search(now.text, number) ? ", shows errno" : "";
+    const std::string code = ", code " + std::to_string(now.code);
+    return text_between(results, now.text.substr(0, 8) + code + shown + ": ", "\n");
 }
 
 struct system_calls : files {
@@ -89,10 +66,7 @@ struct system_calls : files {
             SCOPED_TRACE(testing::Message() << call << " fails with " << fault);
             const std::size_t descriptors = names_in("/proc/self/fd").size();
             const outcome now = run(row, at, fault);
-            told_names.insert(result_of(now).name);
-            const int error = is_clean_up || is_close ? ENOSPC : std::max(fault, 0);
-            const std::regex number("\\b" + std::to_string(error) + "\\b");
-            EXPECT_TRUE(!result_of(now).shows_error || std::regex_search(now.text, number)) << now.text;
+            told_names.insert(name_of(now, is_clean_up || is_close ? ENOSPC : std::max(fault, 0)));
             EXPECT_EQ(names_in("/proc/self/fd").size(), descriptors);
             const bool is_read = now.code == SEC_S_OK;
             EXPECT_TRUE(!is_read || now.bytes.empty() || now.bytes == from_text.bytes);
@@ -115,7 +89,7 @@ struct system_calls : files {
             const bool is_clean_up = row.room == disk::is_full && static_cast<long>(at) > written;
             found += calls[at] + ": " + result_of_call(row, at, calls[at], is_clean_up) + "\n";
         }
-        EXPECT_EQ(found, section(row.name));
+        EXPECT_EQ(found, text_between(results, "[" + row.name + "]\n", "\n\n") + "\n");
     }
 };
 
