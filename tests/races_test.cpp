@@ -142,22 +142,6 @@ TEST_F(races, are_won_before_every_step) {
                     steps = std::max(steps, run(stale, by_command, row, at));
 }
 
-// Nor does a thread that reads its standard input consume a part of a file.
-TEST_F(files, are_read_whole_while_another_thread_reads_its_input) {
-    const auto take_a_part = [](std::size_t) {
-        char part[4];
-        [[maybe_unused]] const ssize_t taken = read(STDIN_FILENO, part, sizeof part);
-        return faults::no_fault;
-    };
-    const int status = status_of_child([&] {
-        close(STDIN_FILENO);
-        const outcome found = faults::watched(take_a_part, [this] { return read_acl(path, text_only); });
-        if (found != from_text)
-            _exit(1);
-    });
-    EXPECT_EQ(status, 0);
-}
-
 void lose_entries(const std::string &path) {
     removexattr(path.c_str(), "system.posix_acl_access");
     fs::permissions(path, fs::perms(0644));

@@ -58,13 +58,15 @@ TEST_F(files, writers_that_are_ended_by_a_signal_leave_nothing) {
 constexpr int streams[] = {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO};
 const std::string longer_than_the_cache(1000, 'x');
 
-// The threads of a service without standard streams print all the same.
+// The threads of a service without standard streams print and read all the same.
 TEST_F(files, have_no_descriptor_of_a_standard_stream) {
     bool is_taken = false;
-    const auto print = [&](std::size_t) {
+    const auto print_and_read = [&](std::size_t) {
         for (const int stream : streams)
             is_taken |= write(stream, longer_than_the_cache.data(), longer_than_the_cache.size()) >= 0 ||
                         errno != EBADF;
+        char part[4];
+        [[maybe_unused]] const ssize_t part_size = read(STDIN_FILENO, part, sizeof part);
         return faults::no_fault;
     };
     for (const std::string &stale : both_caches) {
@@ -72,7 +74,7 @@ TEST_F(files, have_no_descriptor_of_a_standard_stream) {
         const int status = status_of_child([&] {
             for (const int stream : streams)
                 close(stream);
-            faults::watched(print, [&] { return check(path); });
+            faults::watched(print_and_read, [&] { return check(path); });
             if (is_taken)
                 _exit(1);
         });
