@@ -99,9 +99,16 @@ inline failure outcome_of(int result) {
     return found;
 }
 
-// The error with a message, from its arguments as they are shown.
-inline failure error_with(int code, int id, const arguments &args) {
-    failure made{code, id, std::string(msg::default_text(id))};
+inline std::string shown(const std::string &text) { return text; }
+inline std::string shown(int number) { return std::to_string(number); }
+
+// The error with a message and its arguments; of a located message the last two are left out.
+template <int Id, class... Args>
+failure error_of(int code, const msg::message<Id, Args...> & /*message*/, const auto &...given) {
+    arguments args = {shown(given)...};
+    if (sizeof...(given) + 2 == sizeof...(Args))
+        args.insert(args.end(), {source, some_line});
+    failure made{code, Id, std::string(msg::default_text(Id))};
     for (std::size_t at = 0; (at = made.text.find('$', at)) != std::string::npos;) {
         const std::string &arg = args.at(static_cast<std::size_t>(made.text[at - 1] - '1'));
         at -= 2;
@@ -109,18 +116,6 @@ inline failure error_with(int code, int id, const arguments &args) {
         at += arg.size();
     }
     return made;
-}
-
-inline std::string shown(const std::string &text) { return text; }
-inline std::string shown(int number) { return std::to_string(number); }
-
-// The same with a message's name; of a located message the last two arguments are left out.
-template <int Id, class... Args>
-failure error_of(int code, const msg::message<Id, Args...> & /*message*/, const auto &...given) {
-    arguments args = {shown(given)...};
-    if (sizeof...(given) + 2 == sizeof...(Args))
-        args.insert(args.end(), {source, some_line});
-    return error_with(code, Id, args);
 }
 inline failure bad_acl(const auto &message, const auto &...given) {
     return error_of(SEC_S_BAD_ACL, message, given...);
