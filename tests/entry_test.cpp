@@ -98,12 +98,8 @@ std::string refused(int position, const std::string &value) {
     return PrintToString(bad_parameter("sec_create_acle", position, value));
 }
 
-struct parameters {
-    std::uint8_t type;
-    const char *mechanism;
-    const char *identity;
-    std::string made; // or the error
-};
+// The type, the mechanism and the identity; what is made of them, or the error.
+using parameters = std::tuple<std::uint8_t, const char *, const char *, std::string>;
 
 TEST(entries, are_made_with_addresses_in_their_short_form) {
     const parameters rows[] = {

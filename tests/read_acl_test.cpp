@@ -36,15 +36,8 @@ TEST_F(read_acl_file, reads_the_cache_when_it_is_current) {
     const std::string cut = example.substr(0, 30);
     std::string unsound = foreign;
     unsound[20] = 9; // the version of its entry
-    struct row {
-        const char *what;
-        std::string cached; // nothing: there is no cache
-        int age;
-        unsigned in;
-        unsigned out;
-        std::string bytes;
-    };
-    const row rows[] = {
+    // The bytes of the cache, or nothing without one; its age; the flags in and out; the bytes that are read.
+    const std::tuple<const char *, std::string, int, unsigned, unsigned, std::string> rows[] = {
         {"no cache", "", 0, convert | others, text | others, from_text},
         {"a current one", example, current, convert | cache | others, convert | others, example},
         {"the text is asked for", example, current, text | cache, text, from_text},
@@ -94,14 +87,8 @@ TEST_F(read_acl_file, reads_the_cache_when_its_entries_are_those_of_the_text) {
     constexpr unsigned read_write = 6;
     constexpr bool believed = true;
     constexpr bool not_believed = false;
-    struct row {
-        const char *what;
-        unsigned of_text;
-        unsigned of_cache;
-        unsigned mode;
-        bool is_believed;
-    };
-    const row rows[] = {
+    // The entry of the text, that of the cache, and the mode of both.
+    const std::tuple<const char *, unsigned, unsigned, unsigned, bool> rows[] = {
         {"neither has entries", none, none, 0664, believed},
         {"both have the same", read_write, read_write, 0664, believed},
         {"the group may write the cache", read_write, none, 0664, not_believed},

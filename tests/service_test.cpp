@@ -283,13 +283,8 @@ TEST_F(live_acl, keeps_the_last_good_one) {
 }
 
 TEST_F(live_acl, trusts_times_that_are_behind) {
-    struct row {
-        const char *what;
-        timespec changed;
-        timespec now;    // before the file was read
-        bool is_settled; // so that the time of a later change must differ
-    };
-    const row rows[] = {
+    // When the file changed, when it was read, and whether the time of a later change must differ.
+    const std::tuple<const char *, timespec, timespec, bool> rows[] = {
         {"within a tick of the clock", {100, 5'000'000}, {100, 24'000'000}, false},
         {"after it", {100, 5'000'000}, {100, 26'000'000}, true},
         {"in the next second", {100, 990'000'000}, {101, 9'000'000}, false},
