@@ -10,52 +10,63 @@ namespace {
 constexpr std::size_t longest = 300;
 constexpr int most_arguments = 9;
 
-// A text cut into conversions, doubled percent signs, and single bytes.
-std::vector<std::smatch> pieces(const std::string &text) {
-    static const std::regex piece("%([1-9])\\$(0?)([1-9]\\d{0,2})?([sduxc])|%%|[^]");
-    return {std::sregex_iterator(text.begin(), text.end(), piece), std::sregex_iterator()};
-}
+// A part of a text: a conversion, a doubled percent sign or a single byte.
+struct piece {
+    std::string bytes;
+    int place = most_arguments; // of the argument of a conversion, from 0
+    bool is_string = false;
+    std::string form = {}; // of the conversion, for the C library
+};
 
-// Of the argument of a conversion, from 0.
-int place_of(const std::smatch &conversion) { return *conversion[1].first - '1'; }
+std::vector<piece> pieces_of(const std::string &text) {
+    static const std::regex any("%([1-9])\\$(0?)([1-9]\\d{0,2})?([sduxc])|%%|[^]");
+    std::vector<piece> all;
+    for (std::sregex_iterator at(text.begin(), text.end(), any); at != std::sregex_iterator(); ++at) {
+        piece &made = all.emplace_back(piece{at->str()});
+        if (made.bytes.size() < 3)
+            continue;
+        const std::string kind = at->str(4);
+        // The C library must not be asked to pad strings and characters with zeros.
+        const std::string zeros = kind == "s" || kind == "c" ? "" : at->str(2);
+        made.place = made.bytes[1] - '1';
+        made.is_string = kind == "s";
+        made.form = "%" + zeros + at->str(3) + kind;
+    }
+    return all;
+}
 
 // The conversions in order, with the percent signs that belong to nothing before them.
 std::vector<std::string> sorted(const std::string &text) {
     std::vector<std::string> all;
-    for (const std::smatch &each : pieces(text))
-        if (each[1].matched || each.str() == "%")
-            all.push_back(each.str());
+    for (const piece &each : pieces_of(text))
+        if (each.place < most_arguments || each.bytes == "%")
+            all.push_back(each.bytes);
     std::ranges::sort(all);
     return all;
-}
-
-// A conversion by the C library, which must not be asked to pad strings and characters with zeros.
-std::string shown(const std::smatch &piece, const auto &argument) {
-    const std::string kind = piece[4];
-    const bool takes_zeros = kind != "s" && kind != "c";
-    const std::string form = "%" + (takes_zeros ? piece[2].str() : "") + piece[3].str() + kind;
-    char text[1100];
-    const int length = std::snprintf(text, sizeof text, form.c_str(), argument);
-    return {text, static_cast<std::size_t>(length)};
 }
 
 // Which arguments a text takes, and whether as strings: each by the first conversion that takes it.
 std::map<int, bool> strings_in(const std::string &text) {
     std::map<int, bool> is_string;
-    for (const std::smatch &each : pieces(text))
-        if (each[1].matched)
-            is_string.try_emplace(place_of(each), each[4] == "s");
+    for (const piece &each : pieces_of(text))
+        if (each.place < most_arguments)
+            is_string.try_emplace(each.place, each.is_string);
     return is_string;
 }
 
-// The output for a conversion, a percent sign or a byte.
-std::string expanded(const std::smatch &piece, const qz::cu::arguments &given,
-                     std::map<int, bool> &is_string) {
-    const int at = piece[1].matched ? place_of(piece) : most_arguments;
-    const bool takes_string = piece[4] == "s";
-    if (at >= given.count || takes_string != is_string[at])
-        return piece.str() == "%%" ? "%" : piece.str();
-    return takes_string ? shown(piece, given.values[at].text) : shown(piece, given.values[at].number);
+std::string shown(const piece &conversion, auto argument) {
+    char text[1100];
+    const int length = std::snprintf(text, sizeof text, conversion.form.c_str(), argument);
+    return {text, static_cast<std::size_t>(length)};
+}
+
+// The output for a piece. Conversions of a missing argument, or one of the other kind, stay.
+std::string expanded(const piece &part, const qz::cu::arguments &given) {
+    const auto at = static_cast<unsigned>(part.place);
+    if (at >= given.count || part.is_string != given.is_string(at))
+        return part.bytes == "%%" ? "%" : part.bytes;
+    const auto &value = given.values[at];
+    return part.is_string ? shown(part, value.text) : shown(part, value.number);
 }
 
 } // namespace
@@ -63,17 +74,17 @@ std::string expanded(const std::smatch &piece, const qz::cu::arguments &given,
 int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
     std::string_view from = fuzz::input(data, size);
     const std::string by_default = fuzz::line(from).substr(0, longest).c_str();
-    const std::string offered(std::string(from, 0, longest).c_str());
+    const std::string offered = std::string(from, 0, longest).c_str();
     std::map<int, bool> is_string = strings_in(by_default);
     qz::cu::arguments given = {};
     qz::cu::find_arguments(by_default.c_str(), given);
     EXPECT_EQ(given.count, is_string.empty() ? 0 : is_string.rbegin()->first + 1);
-    for (int i = 0; i < most_arguments; ++i) {
-        EXPECT_EQ(given.is_string(static_cast<unsigned>(i)), is_string[i]);
+    for (int at = 0; at < most_arguments; ++at) {
+        EXPECT_EQ(given.is_string(static_cast<unsigned>(at)), is_string[at]);
         // A missing argument holds a number, which would be a wild address.
-        given.values[i].number = i % 2 == 0 ? -1234567 - i : 'a' + i;
-        if (is_string[i])
-            given.values[i].text = i % 2 == 0 ? "" : "text";
+        given.values[at].number = at % 2 == 0 ? -1234567 - at : 'a' + at;
+        if (is_string[at])
+            given.values[at].text = at % 2 == 0 ? "" : "text";
     }
     const std::vector<std::string> taken = sorted(offered);
     const bool is_sound = taken.size() <= 32 && (taken.empty() || taken[0] != "%");
@@ -81,8 +92,8 @@ int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
     EXPECT_EQ(qz::cu::has_conversions_of(offered.c_str(), by_default.c_str()), is_usable);
     for (const std::string &text : {by_default, offered}) {
         std::string wanted;
-        for (const std::smatch &each : pieces(text))
-            wanted += expanded(each, given, is_string);
+        for (const piece &each : pieces_of(text))
+            wanted += expanded(each, given);
         std::vector<char> made(qz::cu::format_text(text.c_str(), given, nullptr, 0));
         EXPECT_EQ(qz::cu::format_text(text.c_str(), given, made.data(), made.size()), made.size());
         EXPECT_EQ(std::string(made.begin(), made.end()), wanted + '\0');
