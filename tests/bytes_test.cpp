@@ -28,6 +28,7 @@ TEST(Bytes, WhatDoesNotFitMakesTheWriterFail) {
     four_bytes memory = {};
     qz::byte_writer writer(memory);
     writer.field(std::uint16_t{0xffff});
+    EXPECT_FALSE(writer.is_full());
     writer.field(std::uint32_t{0xffffffff});
     EXPECT_EQ(memory, (four_bytes{0xff, 0xff, 0, 0}));
     writer.field(std::uint16_t{0xffff});
