@@ -39,6 +39,9 @@ std::string name_of(const outcome &now, int error) {
 }
 
 struct system_calls : files {
+    const std::function<outcome()> read_cache = [this] { return read_acl(path, checked); };
+    const std::function<outcome()> write_cache = [this] { return check(path); };
+
     outcome run(const way &row, std::size_t at, int fault) const {
         lay_out(row.cache_bytes, row.cache_bytes == stale_cache ? 200 : 0);
         if (row.entries == posix_acl::of_both)
@@ -96,7 +99,6 @@ struct system_calls : files {
 TEST_F(system_calls, of_readers_fail) {
     const auto read_text = [] { return read_acl("acl", text_only); };
     const auto read_text_of_user = [] { return read_acl("acl", text_only, user_name()); };
-    const auto read_cache = [this] { return read_acl(path, checked); };
     const auto renew_cache = [this] { return read_acl(path, checked | cached); };
     expect_results({"a text by a relative name is read", no_cache, read_text});
     expect_results({"a text of a user is read", no_cache, read_text_of_user});
@@ -105,7 +107,6 @@ TEST_F(system_calls, of_readers_fail) {
 }
 
 TEST_F(system_calls, of_writers_fail) {
-    const auto write_cache = [this] { return check(path); };
     expect_results({"the first cache is written", no_cache, write_cache});
     expect_results({"the next cache is written", stale_cache, write_cache});
     expect_results({"there is no room for the first cache", no_cache, write_cache, disk::is_full});
@@ -115,8 +116,6 @@ TEST_F(system_calls, of_writers_fail) {
 TEST_F(system_calls, of_files_with_entries_fail) {
     if (!has_entries())
         GTEST_SKIP() << "the file system has no POSIX ACLs";
-    const auto read_cache = [this] { return read_acl(path, checked); };
-    const auto write_cache = [this] { return check(path); };
     expect_results(
         {"a cache with entries is read", from_text.bytes, read_cache, disk::has_room, posix_acl::of_both});
     expect_results({"the first cache with entries is written", no_cache, write_cache, disk::has_room,

@@ -19,9 +19,6 @@ constexpr int types[] = {SEC_ACLE_UNAUTHENTICATED, SEC_ACLE_ANYOTHER, SEC_ACLE_U
 using items = std::vector<std::pair<std::string, std::uint32_t>>;
 
 inline const auto key = [](const auto &each) { return folded(each.first); };
-inline auto find(items &all, const std::string &identity) {
-    return std::ranges::find(all, folded(identity), key);
-}
 
 inline bool has_mechanism(int type) { return type == SEC_ACLE_USER || type == SEC_ACLE_EXPANDED; }
 inline bool has_identity(int type) { return type == SEC_ACLE_GROUP || has_mechanism(type); }
@@ -108,7 +105,7 @@ struct model {
         const bool deletes = how == sec_del_acle_from_acl;
         auto at = subacls.begin() + (find(acle.type, mechanism) - subacls.begin());
         items held = at == subacls.end() ? items() : at->expanded();
-        const auto old = support::find(held, identity);
+        const auto old = std::ranges::find(held, folded(identity), key);
         if (deletes && old == held.end()) {
             const int code = at != subacls.end() && held.empty() ? SEC_S_BAD_ACLE : SEC_S_ACLE_NOT_FOUND;
             return error_of(code, msg::acle_not_found, acle.type, mechanism, identity);
