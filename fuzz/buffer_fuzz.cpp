@@ -21,9 +21,10 @@ int same_name(const char *wanted, const char *held) { return folded(wanted).comp
 };
 
 // Reads bytes that passed the check, and turns those of a copy into what a host of the other byte order writes.
-class reader {
-public:
-    explicit reader(const std::string &bytes) : turned(bytes), bytes_(bytes) {}
+struct reader {
+    const std::string &bytes;
+    std::string turned = bytes;
+    std::size_t at = 3;
 
     model read() {
         model made;
@@ -32,10 +33,6 @@ public:
             made.subacls.push_back(subacl());
         return made;
     }
-
-    std::string turned;
-
-private:
     model_subacl subacl() {
         number(4);
         model_subacl made{static_cast<int>(number(1)), ""};
@@ -49,24 +46,21 @@ private:
         return made;
     }
     std::size_t number(std::size_t width) {
-        std::string field = bytes_.substr(at_, width);
+        std::string field = bytes.substr(at, width);
         if (is_low_byte_first)
             std::ranges::reverse(field);
         std::size_t value = 0;
         for (const char byte : field)
             value = value << 8 | static_cast<unsigned char>(byte);
-        std::reverse(&turned[at_], &turned[at_] + width);
-        at_ += width;
+        std::reverse(&turned[at], &turned[at] + width);
+        at += width;
         return value;
     }
     // Its NUL is counted.
     std::string text(std::size_t length) {
-        at_ += length;
-        return length == 0 ? "" : bytes_.substr(at_ - length, length - 1);
+        at += length;
+        return length == 0 ? "" : bytes.substr(at - length, length - 1);
     }
-
-    const std::string &bytes_;
-    std::size_t at_ = 3;
 };
 
 // The mask of the first entry that does not sort before the name, where it is the same, else 0.
@@ -180,7 +174,7 @@ void dump_unseen(const sec_acl_buffer_t &acl) {
 
 // Accepted bytes list, decide and convert as the second reader says.
 void expect_sound(const sec_acl_buffer_t &acl, const std::string &bytes, const std::string &name) {
-    reader second(bytes);
+    reader second{bytes};
     const model held = second.read();
     try_edits(bytes, held, name);
     sec_aclelist_t list = {};
