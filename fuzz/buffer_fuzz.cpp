@@ -95,9 +95,7 @@ std::uint32_t decided(const sec_acl_buffer_t &acl, int type, const char *mechani
     return mask;
 }
 std::uint32_t decided(const sec_acl_buffer_t &acl, const std::vector<const char *> &names) {
-    std::vector<sec_group_ref_t> groups;
-    for (const char *name : names)
-        groups.push_back({0, name});
+    const auto groups = group_references(names);
     const auto count = static_cast<int>(groups.size());
     std::uint32_t mask = 0;
     const bool is_decided = succeeded(sec__group_acles_perm(&acl, count, groups.data(), &mask));

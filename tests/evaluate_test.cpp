@@ -41,9 +41,7 @@ decision answer(const std::string &bytes, const question &asked) {
 
 decision answer_to_groups(const std::string &bytes, const std::vector<const char *> &names) {
     const buffer held(bytes);
-    std::vector<sec_group_ref_t> groups;
-    for (const char *name : names)
-        groups.push_back({0, name});
+    const auto groups = group_references(names);
     std::uint32_t mask = untouched;
     const auto count = static_cast<std::int32_t>(groups.size());
     const int result = sec__group_acles_perm(&held.acl, count, groups.data(), &mask);

@@ -31,14 +31,6 @@ qz::acl acl_of(const std::string &lines) {
     return std::move(*read);
 }
 
-// Borrows the names.
-std::vector<sec_group_ref_t> references(const arguments &names) {
-    std::vector<sec_group_ref_t> made;
-    for (const std::string &name : names)
-        made.push_back({0, name.c_str()});
-    return made;
-}
-
 // ---- Decisions ----
 
 // What the single questions answer, combined by hand: the mask and who decided.
@@ -75,11 +67,11 @@ std::string any_of(const std::string &text) {
 }
 std::string any_mechanism() { return any_of("unix hba2 krb5 none"); }
 std::string any_user() { return any_of("al Al bob") + any_of("@h.x @H.x @k.y @x h.x"); }
-arguments any_groups() {
-    arguments made(below(4));
-    for (std::string &each : made)
-        each = any_of("ops OPS audit staff");
-    return made;
+std::vector<sec_group_ref_t> any_groups() {
+    std::vector<const char *> names(below(4));
+    for (const char *&each : names)
+        each = std::array{"ops", "OPS", "audit", "staff"}[below(4)];
+    return group_references(names);
 }
 std::string any_identity(int type) {
     if (type == SEC_ACLE_GROUP)
@@ -104,8 +96,7 @@ TEST(service, decides_as_the_single_questions_do) {
         const qz::acl acl = any_acl();
         const std::string mechanism = any_mechanism();
         const std::string identity = any_user();
-        const arguments names = any_groups();
-        const auto groups = references(names);
+        const auto groups = any_groups();
         const requester whom = requester::user(mechanism.c_str(), identity.c_str()).in_groups(groups);
         for (const order taken : {order::closest, order::sum}) {
             const auto [mask, by] = by_hand(acl, mechanism, identity, groups, taken);
@@ -120,8 +111,7 @@ TEST(service, decides_as_the_single_questions_do) {
 
 TEST(service, stays_within_bytes_that_are_no_acl) {
     random_numbers.seed(7);
-    const arguments names = words("ops audit");
-    const auto groups = references(names);
+    const auto groups = group_references({"ops", "audit"});
     for (int round = 0; round < 3000; ++round) {
         std::string bytes(any_acl().bytes());
         for (auto left = below(4); left != 0; --left)

@@ -216,6 +216,14 @@ inline sec_acle_t group(const char *identity, std::uint32_t mask) {
     return entry(SEC_ACLE_GROUP, "", identity, mask);
 }
 
+// The groups of a requester. They borrow their names, which may be null.
+inline std::vector<sec_group_ref_t> group_references(const std::vector<const char *> &names) {
+    std::vector<sec_group_ref_t> made;
+    for (const char *name : names)
+        made.push_back({0, name});
+    return made;
+}
+
 // The letter of its type, its mechanism and identity where it has them, and its mask.
 inline std::string text_of(const sec_acle_t &acle) {
     const std::string mechanism = acle.mechanism[0] == '\0' ? "" : " "s + acle.mechanism;
