@@ -154,8 +154,6 @@ TEST(convert, marks_the_order_when_all_was_turned) {
 TEST(list, refuses_what_it_cannot_expand) {
     const failure corrupted = bad_acl(msg::buffer_corrupted);
     const checked_bytes rows[] = {
-        {"two for any other", packed_acl(2, any_other + subacl_bytes("n: 1, 1")),
-         bad_acl(msg::single_acle_repeated)},
         {"a sub-ACL too few", packed_acl(2, any_other), corrupted},
         {"a length that leads nowhere", packed_acl(3, with_number(any_other, 0, 0, 4)), corrupted},
         {"a header cut short", example.substr(0, 4), corrupted},
