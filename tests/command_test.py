@@ -23,7 +23,6 @@ from command_case import (
     entry, message, posix_acl, run)
 
 A_TEXT = "u abcd xyz wr\n"
-A_LINE = entry("u", "rw", "abcd", "xyz")
 A_CACHE = bytes.fromhex("8501020100 1a000000 04 01000000 05 6162636400 01 03000000 0400 78797a00")
 A_NEW_CACHE = [("a.cacl", A_CACHE)]
 NO_CACHE = message("cache_skipped_after_errors")
@@ -37,14 +36,6 @@ def started(options, cwd, **how):
 class Output(CommandCase):
     def test_transcripts(self):
         self.expect_transcripts("command.cases")
-
-    def test_a_locale_says_in_which_code_set_identities_are_shown(self):
-        self.write("a", "u m \xc3\xa9 r\ng \xff\nn r\n")
-        failed = message("conversion_failed").removesuffix("\n")
-        shown = entry("u", "r", "m", "\xc3\xa9")
-        arguments = ["-v", "-f", "a"]
-        self.expect(arguments, Code.OK, failed + failed + entry("n", "r"), environment={"LC_ALL": "C"})
-        self.expect(arguments, Code.OK, shown + failed + entry("n", "r"), environment={"LC_ALL": "C.UTF-8"})
 
     def test_a_locale_says_nothing_about_letters(self):
         same_user = "u UNIX I@Host r\nu unix i@hoSt w\n"
@@ -126,17 +117,6 @@ class Output(CommandCase):
                 child.terminate()
                 time.sleep(0.01)
             self.assertEqual(child.returncode, -signal.SIGTERM)
-
-    def test_closed_standard_descriptors(self):
-        self.write("mistake", "x\n" + A_TEXT)
-        self.write("b", A_TEXT)
-        mistake = message("bad_type_token", 1, "x") + NO_CACHE
-        for closed in ((0,), (1,), (2,), (0, 1), (0, 2), (1, 2), (0, 1, 2)):
-            is_silent = 2 in closed
-            close = lambda: list(map(os.close, closed))
-            with self.subTest(closed=closed):
-                self.expect(["-csf", "mistake"], Code.OK, "" if is_silent else mistake, child=close)
-                self.expect(["-vsf", "b"], Code.OK, "" if is_silent else A_LINE, [("b.cacl", A_CACHE)], child=close)
 
 
 def limited_to(limits, for_large_files=signal.SIG_DFL):
