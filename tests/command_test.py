@@ -17,62 +17,15 @@ import sys
 import tempfile
 import time
 import unittest
-from typing import NamedTuple
 
 from command_case import (
-    COMMAND, ENTRIES, INHERITED, IS_MUSL, IS_ROOT, NOBODY, ORDINARY, SANITIZED, SOURCE, WRITER, Code, CommandCase,
-    entry, message, posix_acl, run, unescaped)
+    COMMAND, ENTRIES, INHERITED, IS_MUSL, IS_ROOT, NOBODY, ORDINARY, SANITIZED, WRITER, Code, CommandCase,
+    entry, message, posix_acl, run)
 
 A_TEXT = "u abcd xyz wr\n"
-A_LINE = entry("u", "rw", "abcd", "xyz")
 A_CACHE = bytes.fromhex("8501020100 1a000000 04 01000000 05 6162636400 01 03000000 0400 78797a00")
 A_NEW_CACHE = [("a.cacl", A_CACHE)]
 NO_CACHE = message("cache_skipped_after_errors")
-# Messages about options, which the C library prints without a number.
-OF_THE_C_LIBRARY = {
-    "unknown_option": f"{COMMAND}: " + ("unrecognized option: %s\n" if IS_MUSL else "invalid option -- '%s'\n"),
-    "lacks_argument": f"{COMMAND}: option requires an argument" + (": %s\n" if IS_MUSL else " -- '%s'\n"),
-}
-
-
-def printed(words):
-    """The output that the last words of a row of command.cases describe."""
-    name, *values = map(unescaped, words.split())
-    if name == "shows":
-        return entry(*("" if value == "none" else value for value in values))
-    if name in OF_THE_C_LIBRARY:
-        return OF_THE_C_LIBRARY[name] % values[0]
-    return message(name, *(int(value) if value.isdigit() else value for value in values))
-
-
-class AclText(NamedTuple):
-    """A text, the code and output of each of its lines, and the cache if it has no mistakes."""
-    text: str
-    results: list
-    cache: list
-
-
-def read_cases():
-    """The rows for options, and the texts."""
-    options, texts = [], []
-    for row in (SOURCE / "tests/command.cases").read_text("utf-8").splitlines():
-        if not row or row.startswith("#"):
-            continue
-        kind, _, rest = row.partition(": ")
-        if kind == "text":
-            texts.append(AclText(unescaped(rest.strip('"')), [], []))
-        elif kind == "cache":
-            texts[-1].cache.append(bytes.fromhex(rest))
-        elif kind.startswith("options"):
-            code, *told = rest.split(", ")
-            options.append((unescaped(kind).partition(" ")[2], Code[code], "".join(map(printed, told))))
-        else:
-            texts[-1].results.append((Code[kind], printed(rest)))
-    return options, texts
-
-
-OPTIONS, ACL_TEXTS = read_cases()
-CHOICES = [options for count in range(4) for options in itertools.combinations(("-c", "-v", "-s"), count)]
 
 
 def started(options, cwd, **how):
@@ -81,39 +34,8 @@ def started(options, cwd, **how):
 
 
 class Output(CommandCase):
-    def test_options(self):
-        self.write("a", "n r\n")
-        for arguments, status, errors in OPTIONS:
-            # With it, the C library looks for no options after operands.
-            for strict in ({}, {"POSIXLY_CORRECT": "1"}):
-                with self.subTest(arguments, **strict):
-                    self.expect(arguments.split(" "), status, errors, environment=strict)
-
-    def test_lines(self):
-        for each, options in itertools.product(ACL_TEXTS, CHOICES):
-            with self.subTest(each.text[:60], options=options):
-                self.expect_check(each, options)
-
-    def expect_check(self, each, options):
-        codes = [code for code, _ in each.results]
-        failure = next(filter(None, codes), Code.OK)
-        goes_on = "-c" in options or not failure
-        results = each.results if goes_on else each.results[:codes.index(failure) + 1]
-        told = [text for code, text in results if code or "-v" in options]
-        if failure and "-s" in options:
-            told.append(NO_CACHE)
-        makes = [("a.cacl", cache) for cache in each.cache if "-s" in options]
-        self.fresh()
-        self.write("a", each.text)
-        self.expect([*options, "-f", "a"], Code.OK if goes_on else failure, "".join(told), makes)
-
-    def test_a_locale_says_in_which_code_set_identities_are_shown(self):
-        self.write("a", "u m \xc3\xa9 r\ng \xff\nn r\n")
-        failed = message("conversion_failed").removesuffix("\n")
-        shown = entry("u", "r", "m", "\xc3\xa9")
-        arguments = ["-v", "-f", "a"]
-        self.expect(arguments, Code.OK, failed + failed + entry("n", "r"), environment={"LC_ALL": "C"})
-        self.expect(arguments, Code.OK, shown + failed + entry("n", "r"), environment={"LC_ALL": "C.UTF-8"})
+    def test_transcripts(self):
+        self.expect_transcripts("command.cases")
 
     def test_a_locale_says_nothing_about_letters(self):
         same_user = "u UNIX I@Host r\nu unix i@hoSt w\n"
@@ -195,17 +117,6 @@ class Output(CommandCase):
                 child.terminate()
                 time.sleep(0.01)
             self.assertEqual(child.returncode, -signal.SIGTERM)
-
-    def test_closed_standard_descriptors(self):
-        self.write("mistake", "x\n" + A_TEXT)
-        self.write("b", A_TEXT)
-        mistake = message("bad_type_token", 1, "x") + NO_CACHE
-        for closed in ((0,), (1,), (2,), (0, 1), (0, 2), (1, 2), (0, 1, 2)):
-            is_silent = 2 in closed
-            close = lambda: list(map(os.close, closed))
-            with self.subTest(closed=closed):
-                self.expect(["-csf", "mistake"], Code.OK, "" if is_silent else mistake, child=close)
-                self.expect(["-vsf", "b"], Code.OK, "" if is_silent else A_LINE, [("b.cacl", A_CACHE)], child=close)
 
 
 def limited_to(limits, for_large_files=signal.SIG_DFL):
