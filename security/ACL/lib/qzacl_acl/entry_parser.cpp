@@ -26,30 +26,40 @@ namespace {
 
 constexpr bool is_line_end(char c) { return c == '\n' || c == '\f' || c == '\r'; }
 
-// The first byte at or after `at` that satisfies `ends`; there must be one before `limit`. `may_end` tests eight
-// bytes at a time and sets the high bits of candidates, the first byte being the lowest. After the first true
-// candidate it may set too many bits, but it never misses one.
-template <class MayEnd, class Ends>
-char *find_end(char *at, const char *limit, const MayEnd &may_end, const Ends &ends) {
-    for (; limit - at >= static_cast<std::ptrdiff_t>(word_size); at += word_size) {
-        for (auto some = may_end(first_byte_lowest(load8(at))); some != 0; some &= some - 1) {
-            char *const found = at + std::countr_zero(some) / 8;
-            if (ends(*found))
-                return found;
-        }
-    }
-    while (!ends(*at))
-        ++at;
-    return at;
-}
+// Steps through the bytes of a text that are no plain signs: blanks, control characters, and bytes above ASCII.
+class sign_scan {
+public:
+    // The bytes from `begin` up to `limit` end in a NUL.
+    sign_scan(char *begin, const char *limit) : block_(begin), limit_(limit) { load(); }
 
-// The first line end or NUL.
-char *find_line_end(char *at, const char *limit) {
-    const auto is_low = [](std::uint64_t word) { // below 14
-        return (word - in_each_byte(14)) & ~word & in_each_byte(0x80);
-    };
-    return find_end(at, limit, is_low, [](char c) { return c == '\0' || is_line_end(c); });
-}
+    // The next such byte. The caller stops at the last NUL.
+    char *next_other() {
+        while (others_ == 0) {
+            block_ += word_size;
+            load();
+        }
+        char *const found = block_ + std::countr_zero(others_) / 8;
+        others_ &= others_ - 1;
+        return found;
+    }
+
+private:
+    void load() {
+        std::uint64_t word = 0;
+        if (limit_ - block_ >= static_cast<std::ptrdiff_t>(word_size)) [[likely]]
+            word = first_byte_lowest(load8(block_));
+        else
+            for (const char *at = limit_; at != block_;)
+                word = word << 8 | static_cast<unsigned char>(*--at);
+        // The high bit of each byte that is not above the blank, or above 127. No sum carries into the next byte.
+        const std::uint64_t above_blank = (word & in_each_byte(0x7f)) + in_each_byte(0x7f - ' ');
+        others_ = (~above_blank | word) & in_each_byte(0x80);
+    }
+
+    char *block_;
+    const char *limit_;
+    std::uint64_t others_ = 0;
+};
 
 std::uint8_t type_of_letter(char letter) {
     switch (letter) {
@@ -73,38 +83,69 @@ std::uint8_t type_of_letter(char letter) {
     }
 }
 
-// Cuts the tokens out of one line of a text, ending each with a NUL in place.
+// Cuts the tokens out of one line of a text, ending each with a NUL in place, and finds the end of the line.
 class line_tokens {
 public:
-    line_tokens(char *begin, char *end, const char *limit) : at_(begin), end_(end), limit_(limit) {}
+    // The bytes from `begin` up to `limit` end in a NUL.
+    line_tokens(char *begin, const char *limit) : at_(begin), others_(begin, limit) {}
 
     // False when only blanks or a comment are left.
     bool next(line_word &out) {
-        if (!find_word(at_, end_))
-            return false;
-        out.text = at_;
-        at_ = find_token_end();
-        out.length = static_cast<std::size_t>(at_ - out.text);
-        *at_ = '\0';
-        // A token that ends at the line end is the last one.
-        if (at_ != end_)
+        while (end_ == nullptr) {
+            char *const stop = next_separator();
+            if (ends_line(*stop))
+                end_at(stop);
+            if (stop != at_) {
+                if (*at_ == '#')
+                    return false;
+                out = {at_, static_cast<std::size_t>(stop - at_)};
+                *stop = '\0';
+                at_ = stop + 1;
+                return true;
+            }
+            if (end_ == nullptr && !is_blank(*stop)) {
+                out = {at_, 0};
+                at_ = stop + 1;
+                *stop = '\0';
+                return true;
+            }
             ++at_;
-        return true;
+        }
+        return false;
     }
 
+    // The end of the line, and whether it is a NUL.
+    char *end() {
+        while (end_ == nullptr) {
+            char *const other = others_.next_other();
+            if (ends_line(*other))
+                end_at(other);
+        }
+        return end_;
+    }
+    bool ends_at_nul() const { return ends_at_nul_; }
+
 private:
+    static constexpr bool ends_line(char c) { return c == '\0' || is_line_end(c); }
+
+    void end_at(char *stop) {
+        end_ = stop;
+        ends_at_nul_ = *stop == '\0';
+    }
+
     // White space, a line end, or a NUL.
-    char *find_token_end() const {
-        const auto is_no_sign = [](std::uint64_t word) { // blanks, control characters and non-ASCII bytes
-            return ((word - in_each_byte(' ' + 1)) | word) & in_each_byte(0x80);
-        };
-        return find_end(at_, limit_, is_no_sign,
-                        [this](char c) { return c == '\0' || is_line_end(c) || is_space_(c); });
+    char *next_separator() {
+        for (;;) {
+            char *const other = others_.next_other();
+            if (*other == ' ' || ends_line(*other) || is_space_(*other))
+                return other;
+        }
     }
 
     char *at_;
-    char *end_;
-    const char *limit_;
+    char *end_ = nullptr;
+    bool ends_at_nul_ = false;
+    sign_scan others_;
     space_class is_space_;
 };
 
@@ -114,7 +155,7 @@ void fold_in_place(const line_word &word) {
 }
 
 // Fills the entry from the tokens of a line. Without any, its type stays 0.
-int parse_line(line_tokens tokens, const sec_perm_set_t &set, int line, parsed_acle &entry) {
+int parse_line(line_tokens &tokens, const sec_perm_set_t &set, int line, parsed_acle &entry) {
     line_word type;
     if (!tokens.next(type))
         return SEC_S_OK;
@@ -173,27 +214,22 @@ int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size
     if (begin == nullptr || *begin == '\0')
         return SEC_S_OK;
 
-    const char *limit = begin + *remaining;
-    char *end = find_line_end(begin, limit);
-    const bool ends_at_nul = *end == '\0';
-    const std::size_t length = static_cast<std::size_t>(end - begin) + 1;
     const auto shown_line = static_cast<int>(*line);
-
-    int result = SEC_S_OK;
+    line_tokens tokens(begin, begin + *remaining);
+    int result = parse_line(tokens, set == nullptr ? acl__default_perm_set : *set, shown_line, *entry);
+    char *const end = tokens.end();
+    const std::size_t length = static_cast<std::size_t>(end - begin) + 1;
     if (length > line_length_max) {
+        *entry = {};
         trace(point::line_too_long, *line, length);
         result = report(SEC_S_FILE_ERROR, msg::line_too_long, shown_line);
-    } else {
-        result = parse_line(line_tokens(begin, end, limit), set == nullptr ? acl__default_perm_set : *set,
-                            shown_line, *entry);
+    } else if (result == SEC_S_OK && tokens.ends_at_nul() && *remaining != length) {
         // A NUL before the end of the text would hide what follows.
-        if (result == SEC_S_OK && ends_at_nul && *remaining != length) {
-            *cursor = nullptr;
-            ++*line;
-            return report(SEC_S_BAD_ACL, msg::line_corrupted, shown_line);
-        }
+        *cursor = nullptr;
+        ++*line;
+        return report(SEC_S_BAD_ACL, msg::line_corrupted, shown_line);
     }
-    *cursor = ends_at_nul ? nullptr : end + 1;
+    *cursor = tokens.ends_at_nul() ? nullptr : end + 1;
     *remaining -= length;
     ++*line;
     return result == SEC_S_OK ? line_consumed : result;
