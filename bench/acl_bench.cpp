@@ -71,7 +71,7 @@ void bench_phases(benchmark::State &state, const std::string &text) {
         std::optional<sec_acltree_array> trees(std::in_place, std::span(consumed.data(), size));
         int result = SEC_S_OK;
         for (const qz::parsed_acle &entry : entries)
-            result |= trees->add_soon(qz::view_of(entry));
+            result |= trees->append(qz::view_of(entry));
         result = trees->settle(result);
         inserting += watch.lap();
 

@@ -78,6 +78,9 @@ line_facts parse_plainly(const std::string &text, std::size_t at, int line) {
     return facts;
 }
 
+// Trees may read this many bytes after the text that they point into.
+constexpr std::size_t readable_behind = 7;
+
 // A text beside the model, line by line.
 class text_reader {
 public:
@@ -92,17 +95,18 @@ public:
         EXPECT_EQ(sec__read_acle_from_text(nullptr, &cursor_, &left_, &line_, &parsed_), 0);
         // The tree of the latest key is compiled first.
         std::ranges::reverse(plain_.subacls);
-        // Where memory for it fails, sorting takes another way.
-        const auto compiles = [&] { return sec__acltrees_to_acl(trees_.trees(), &out.acl); };
-        const bool is_patient = text_.size() % 2 == 0;
-        EXPECT_EQ(is_patient ? faults::patiently(compiles) : compiles(), SEC_S_OK);
+        EXPECT_EQ(faults::patiently([&] { return sec__acltrees_to_acl(trees_.trees(), &out.acl); }),
+                  SEC_S_OK);
         EXPECT_EQ(out.bytes(), plain_.bytes());
         return plain_;
     }
+    failure first_failure() const { return first_failure_; }
 
 private:
-    // Trees may read this many bytes after the text that they point into.
-    static constexpr std::size_t readable_behind = 7;
+    void note(const failure &error) {
+        if (first_failure_ == no_error)
+            first_failure_ = error;
+    }
 
     // Whether another line may follow.
     bool read_line() {
@@ -115,9 +119,12 @@ private:
         EXPECT_EQ(is_read ? no_error : outcome_of(result), wanted.error);
         EXPECT_EQ(is_entry ? text_of(acle) : "", wanted.entry);
         EXPECT_EQ(line_, number + 1);
+        note(wanted.error);
         if (is_entry) {
             const int added = faults::patiently([&] { return trees_.add(qz::view_of(parsed_)); });
-            EXPECT_EQ(outcome_of(added), plain_.edit(sec_add_acle_to_acl2, acle));
+            const failure duplicate = plain_.edit(sec_add_acle_to_acl2, acle);
+            EXPECT_EQ(outcome_of(added), duplicate);
+            note(duplicate);
         }
         at_ += wanted.length;
         const bool is_last = at_ > text_.size() || text_[at_ - 1] == '\0';
@@ -134,10 +141,39 @@ private:
     std::size_t left_ = text_.size() + 1;
     std::size_t at_ = 0;
     std::uint32_t line_ = 1;
+    failure first_failure_ = no_error;
     model plain_;
     sec_acltree_array trees_{is_borrowed_ ? std::span(start_, left_) : std::span<char>()};
     qz::parsed_acle parsed_;
 };
+
+// Reads the text up to its first failure, finding duplicates late. Compiles it if there is none.
+failure read_at_once(const std::string &text, buffer &out) {
+    const buffer copy(text_field(text) + std::string(readable_behind, 'x'));
+    char *cursor = static_cast<char *>(copy.acl.data);
+    std::size_t left = text.size() + 1;
+    std::uint32_t line = 1;
+    sec_acltree_array trees(std::span(cursor, left));
+    qz::parsed_acle parsed;
+    qz::acle_view last;
+    int result = qz::line_consumed;
+    while (result == qz::line_consumed) {
+        result = sec__read_acle_from_text(nullptr, &cursor, &left, &line, &parsed);
+        if (result != qz::line_consumed || parsed.type == 0)
+            continue;
+        last = qz::view_of(parsed);
+        if (const int appended = trees.append(last); appended != SEC_S_OK)
+            return outcome_of(appended);
+    }
+    // Without memory for a copy, expanded entries are sorted another way.
+    const auto settles = [&] { return trees.settle(result); };
+    const bool is_patient = text.size() % 2 == 0;
+    if (const failure first = outcome_of(is_patient ? faults::patiently(settles) : settles());
+        first != no_error)
+        return first;
+    EXPECT_TRUE(trees.trees().empty() || outcome_of(trees.add(last)) != no_error);
+    return outcome_of(sec__acltrees_to_acl(trees.trees(), &out.acl));
+}
 
 } // namespace
 
@@ -148,5 +184,9 @@ int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
     const model plain = reader.compile(held);
     EXPECT_EQ(outcome_of(sec_convert_acl_to_host(with_check, &held.acl)), no_error);
     EXPECT_EQ(list_of(held.acl), plain.entries(0, nullptr));
+
+    buffer at_once;
+    EXPECT_EQ(read_at_once(text, at_once), reader.first_failure());
+    EXPECT_EQ(at_once.bytes(), reader.first_failure() == no_error ? plain.bytes() : "");
     return 0;
 }

@@ -95,6 +95,13 @@ class Trace(CommandCase):
         released = [record["items"][4]["text"] for record in records if record["id"] == RELEASES_TOLD_ENTRY]
         self.assertEqual("".join(released), "cifpwtm" + "dcba" + "abcd" + "cbda" + "tfm")
 
+    def test_trees_of_a_text_with_a_duplicate(self):
+        """They hold the entries before it."""
+        errors = message("duplicate_group", "g", "B") + message("cache_skipped_after_errors")
+        self.check("-s", "g c\ng b\ng B\ng a\n", Code.BAD_ACLE, errors)
+        released = [record["items"][4]["text"] for record in self.records() if record["id"] == RELEASES_TOLD_ENTRY]
+        self.assertEqual(released, ["b", "c"])
+
     def test_replaced_entries(self):
         """A mechanism that fills its array is recorded without the bytes after it."""
         records = self.run_test("tree", "*leaves_up", "Info=1")

@@ -124,7 +124,7 @@ int read_entries(acl_text &text, unsigned flags, sec_acltree_array &trees, bool 
                 const sec_acle_t shown = record_of(entry);
                 sec__dump_acle(&shown, nullptr, "");
             }
-            result = may_wait ? trees.add_soon(acle) : trees.add(acle);
+            result = may_wait ? trees.append(acle) : trees.add(acle);
             may_go_on = goes_on && result == SEC_S_BAD_ACLE;
         } else {
             result = trees.settle(line == acl_line::bad ? text.failure() : SEC_S_OK);

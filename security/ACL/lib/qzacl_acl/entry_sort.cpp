@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <array>
 #include <bit>
+#include <numeric>
 
 namespace qz {
 namespace {
@@ -16,7 +17,8 @@ struct sorts_before {
     bool operator()(const small_entry &a, const small_entry &b) const {
         if (a.key != b.key)
             return a.key < b.key;
-        return compare_identities(identities.identity(a.place), identities.identity(b.place)) < 0;
+        const int order = compare_identities(identities.identity(a.place), identities.identity(b.place));
+        return order != 0 ? order < 0 : a.place < b.place;
     }
 };
 
@@ -26,12 +28,12 @@ std::size_t common_prefix(std::span<const small_entry> entries, const identity_s
     std::uint64_t difference = 0;
     for (const small_entry &entry : entries)
         difference |= entry.key ^ first.key;
-    // If one identity fits in its key, the prefix ends there.
-    std::size_t prefix = static_cast<std::size_t>(std::countl_zero(difference)) / 8;
-    if (difference != 0 || ends_within(first.key))
-        return prefix;
+    if (difference != 0)
+        return static_cast<std::size_t>(std::countl_zero(difference)) / 8;
+    if (ends_within(first.key))
+        return 0; // all are equal
     const char *const text = identities.identity(first.place);
-    prefix = identity_length(text);
+    std::size_t prefix = identity_length(text);
     for (const small_entry &entry : entries.subspan(1)) {
         const char *const other = identities.identity(entry.place);
         std::size_t same = identity_word_size;
@@ -44,50 +46,51 @@ std::size_t common_prefix(std::span<const small_entry> entries, const identity_s
     return prefix;
 }
 
-// Up to this many entries, a comparison sort is faster than a radix sort.
-constexpr std::size_t comparison_sort_max = 48;
+// A byte of the key, the highest being number 0.
+struct digit_of_key {
+    unsigned number;
 
-// Sorts by one byte of the key after the other, the highest first, moving the entries between two arrays. The recursion
-// is at most as deep as a key has bytes.
-class radix_sort {
-public:
-    explicit radix_sort(const identity_store &identities) : before_{identities} {}
+    std::size_t operator()(const small_entry &entry) const { return (entry.key >> (56 - 8 * number)) & 0xff; }
+};
 
-    // The result is in `to` if `ends_in_to`, else in `from`.
-    void sort(std::span<small_entry> from, std::span<small_entry> to, unsigned shift, bool ends_in_to) {
-        if (from.size() <= comparison_sort_max || shift >= 64) {
-            std::sort(from.begin(), from.end(), before_);
-            if (ends_in_to)
-                std::copy(from.begin(), from.end(), to.begin());
-            return;
-        }
-        const auto digit = [shift](const small_entry &entry) {
-            return static_cast<std::size_t>((entry.key >> (56 - shift)) & 0xff);
-        };
-        std::array<std::uint32_t, 257> starts{};
-        for (const small_entry &entry : from)
-            ++starts[digit(entry) + 1];
-        if (starts[digit(from.front()) + 1] == from.size()) {
-            sort(from, to, shift + 8, ends_in_to);
-            return;
-        }
-        for (std::size_t value = 1; value < starts.size(); ++value)
-            starts[value] += starts[value - 1];
-        std::array<std::uint32_t, 256> ends{};
-        std::copy_n(starts.begin(), ends.size(), ends.begin());
-        for (const small_entry &entry : from)
-            to[ends[digit(entry)]++] = entry;
-        for (std::size_t value = 0; value < ends.size(); ++value) {
-            const std::size_t size = ends[value] - starts[value];
-            if (size != 0)
-                sort(to.subspan(starts[value], size), from.subspan(starts[value], size), shift + 8,
-                     !ends_in_to);
+using digit_counts = std::array<std::uint32_t, 256>;
+
+// Orders entries by a digit of which `sizes` has the counts, by moving them in place.
+void order_by_digit(std::span<small_entry> entries, const digit_of_key &digit, const digit_counts &sizes) {
+    digit_counts next; // the place of the next entry with the digit
+    std::exclusive_scan(sizes.begin(), sizes.end(), next.begin(), std::uint32_t{0});
+    std::uint32_t end = 0;
+    for (std::size_t value = 0; value < sizes.size(); ++value) {
+        end += sizes[value];
+        while (next[value] != end) {
+            small_entry moved = entries[next[value]];
+            for (std::size_t its = digit(moved); its != value; its = digit(moved))
+                std::swap(moved, entries[next[its]++]);
+            entries[next[value]++] = moved;
         }
     }
+}
 
-private:
-    sorts_before before_;
-};
+// Sorts by one digit after the other. The recursion is at most as deep as a key has bytes.
+void radix_sort(std::span<small_entry> entries, digit_of_key digit, const sorts_before &before) {
+    // Up to this many entries, a comparison sort is faster.
+    constexpr std::size_t few = 48;
+    if (entries.size() <= few || digit.number == sizeof(small_entry::key)) {
+        std::sort(entries.begin(), entries.end(), before);
+        return;
+    }
+    digit_counts sizes{};
+    for (const small_entry &entry : entries)
+        ++sizes[digit(entry)];
+    if (sizes[digit(entries.front())] != entries.size())
+        order_by_digit(entries, digit, sizes);
+    std::size_t start = 0;
+    for (const std::uint32_t size : sizes) {
+        if (size > 1)
+            radix_sort(entries.subspan(start, size), {digit.number + 1}, before);
+        start += size;
+    }
+}
 
 } // namespace
 
@@ -99,16 +102,21 @@ std::size_t sort_by_identity(std::span<small_entry> entries, const identity_stor
         for (small_entry &entry : entries)
             entry.key = ordered_word(identities.identity(entry.place) + prefix);
     }
-    constexpr unsigned first_byte = 0;
-    constexpr bool ends_in_scratch = false;
-    owned<small_entry[]> scratch;
-    if (entries.size() > comparison_sort_max)
-        scratch = allocate<small_entry>(entries.size());
-    if (scratch == nullptr)
-        std::sort(entries.begin(), entries.end(), sorts_before{identities});
-    else
-        radix_sort(identities).sort(entries, {scratch.get(), entries.size()}, first_byte, ends_in_scratch);
+    radix_sort(entries, {.number = 0}, {identities});
     return prefix;
+}
+
+std::optional<small_entry> first_duplicate(std::span<const small_entry> sorted,
+                                           const identity_store &identities) {
+    const small_entry *first = nullptr;
+    for (std::size_t index = 1; index < sorted.size(); ++index) {
+        const small_entry &one = sorted[index - 1];
+        const small_entry &next = sorted[index];
+        if (one.key == next.key && (first == nullptr || next.place < first->place) &&
+            compare_identities(identities.identity(one.place), identities.identity(next.place)) == 0)
+            first = &next;
+    }
+    return first == nullptr ? std::nullopt : std::optional(*first);
 }
 
 } // namespace qz

@@ -5,6 +5,7 @@
 #include "qzacl_acl/identity_store.h"
 
 #include <cstdint>
+#include <optional>
 #include <span>
 
 namespace qz {
@@ -18,10 +19,14 @@ struct small_entry {
 };
 static_assert(sizeof(small_entry) == 16);
 
-// Sorts entries with distinct identities in ascending order. Takes O(n log n) comparisons for any order of input and a
-// bounded stack depth. Without memory for a second array it is slower. Returns the length of the prefix common to all
-// identities; the keys then hold the bytes after it.
+// Sorts entries by identity, and those with equal ones by place. Takes O(n log n) comparisons for any order of input
+// and a bounded stack depth, and no memory. Returns the length of the prefix common to all identities; the keys then hold
+// the bytes after it.
 std::size_t sort_by_identity(std::span<small_entry> entries, const identity_store &identities);
+
+// Of sorted entries, the one with the lowest place that repeats the identity of an earlier one.
+std::optional<small_entry> first_duplicate(std::span<const small_entry> sorted,
+                                           const identity_store &identities);
 
 } // namespace qz
 

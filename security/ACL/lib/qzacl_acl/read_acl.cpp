@@ -100,7 +100,7 @@ int acl_file_reader::parse_lines(sec_acltree_array &trees) {
             point::line_read.record(text_.line(), entry.type, acle.mechanism, acle.identity, entry.perm_mask);
         if (line == acl_line::none)
             continue;
-        if (const int added = may_wait ? trees.add_soon(acle) : trees.add(acle); added != SEC_S_OK)
+        if (const int added = may_wait ? trees.append(acle) : trees.add(acle); added != SEC_S_OK)
             return added;
     }
 }

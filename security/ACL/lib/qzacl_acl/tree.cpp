@@ -69,7 +69,7 @@ small_entry *sec_acltree::find_equal(const candidate &wanted, std::uint64_t hash
     return number == identity_table::none ? nullptr : &entries[number];
 }
 
-sec_acltree::insertion sec_acltree::insert(const acle_view &acle) {
+sec_acltree::insertion sec_acltree::insert(const acle_view &acle, duplicates handled) {
     const std::uint32_t count = entries_.count();
     if (is_single_type(type_) && count != 0)
         return {outcome::duplicate, &entries_.all().front(), {}};
@@ -87,7 +87,9 @@ sec_acltree::insertion sec_acltree::insert(const acle_view &acle) {
     const candidate wanted = {identity, ordered_word(identity)};
     if (is_ascending_ && count != 0)
         is_ascending_ = sorts_last(wanted);
-    if (!is_ascending_) {
+    if (handled == duplicates::are_found_later) {
+        table_.release(); // it lacks this entry
+    } else if (!is_ascending_) {
         if (count >= few && table_.room() <= count) {
             if (const shortage lacking = fill_table(place))
                 return {outcome::no_memory, nullptr, lacking};
@@ -106,6 +108,29 @@ sec_acltree::insertion sec_acltree::insert(const acle_view &acle) {
                               .is_deleted = 0,
                               .perm_mask = acle.perm_mask}),
             {}};
+}
+
+std::optional<small_entry> sec_acltree::first_duplicate() {
+    if (is_ascending_)
+        return std::nullopt;
+    if (type_ != SEC_ACLE_EXPANDED) {
+        put_in_order();
+        return qz::first_duplicate(entries_.all(), identities_);
+    }
+    // Expanded entries keep the order of insertion.
+    const std::span<small_entry> entries = entries_.all();
+    const owned<small_entry[]> copy = allocate<small_entry>(entries.size());
+    const std::span<small_entry> sorted = copy == nullptr ? entries : std::span(copy.get(), entries.size());
+    if (copy != nullptr)
+        std::copy(entries.begin(), entries.end(), sorted.begin());
+    const bool drops_prefix = sort_by_identity(sorted, identities_) != 0;
+    const std::optional<small_entry> found = qz::first_duplicate(sorted, identities_);
+    if (copy == nullptr) {
+        has_whole_keys_ = !drops_prefix;
+        std::sort(entries.begin(), entries.end(),
+                  [](const small_entry &a, const small_entry &b) { return a.place < b.place; });
+    }
+    return found;
 }
 
 void sec_acltree::count_entry(std::size_t identity_length, int held) {
@@ -190,8 +215,9 @@ void sec_acltree::trace_release() {
 
 namespace qz {
 
-int add_to_tree(on_duplicate handling, const acle_view &acle, sec_acltree &tree) {
-    const sec_acltree::insertion done = tree.insert(acle);
+int add_to_tree(on_duplicate handling, const acle_view &acle, sec_acltree &tree,
+                sec_acltree::duplicates duplicates) {
+    const sec_acltree::insertion done = tree.insert(acle, duplicates);
     switch (done.result) {
     case sec_acltree::outcome::inserted:
         break;

@@ -17,6 +17,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <memory>
+#include <optional>
 #include <span>
 
 // A tree. A null pointer is an empty one. Not thread-safe.
@@ -39,8 +40,13 @@ public:
     // The mechanism of the key, as the first entry inserted spells it.
     std::string_view mechanism() const { return identities_.first_mechanism(); }
 
-    // A duplicate changes nothing.
-    insertion insert(const qz::acle_view &acle);
+    // An entry whose identity is already there is either refused, or inserted and found by first_duplicate().
+    enum class duplicates : std::uint8_t { are_refused, are_found_later };
+
+    // A refused duplicate changes nothing. To find duplicates later, the identities must be in the text.
+    insertion insert(const qz::acle_view &acle, duplicates handled = duplicates::are_refused);
+    // The first entry inserted that repeats the identity of an earlier one.
+    std::optional<qz::small_entry> first_duplicate();
     // The memory that inserting an entry of the text reads first, or null if unknown.
     const void *first_look(const qz::acle_view &acle) const {
         const char *const text = acle.identity.data();
@@ -93,7 +99,7 @@ private:
     std::uint32_t held_count_ = 0;
     std::uint32_t overlong_count_ = 0;
     mutable bool has_whole_keys_ = true; // false once sorting has dropped a common prefix from the keys
-    // True while every entry sorts after its predecessor. As long as it is, the table is unused.
+    // True while every entry sorts after its predecessor. As long as it is, no two are equal, and the table is unused.
     mutable bool is_ascending_ = true;
     std::uint8_t type_;
 };
@@ -112,7 +118,8 @@ void sec__free_acltree(sec_acltree_t *root);
 namespace qz {
 
 // The same for an existing tree.
-int add_to_tree(on_duplicate handling, const acle_view &acle, sec_acltree &tree);
+int add_to_tree(on_duplicate handling, const acle_view &acle, sec_acltree &tree,
+                sec_acltree::duplicates duplicates = sec_acltree::duplicates::are_refused);
 
 struct free_acltree {
     void operator()(sec_acltree_t *root) const { sec__free_acltree(root); }

@@ -14,23 +14,32 @@ using namespace qz;
 
 namespace {
 
-bool equals_folded(std::string_view one, std::string_view other) {
-    return std::equal(one.begin(), one.end(), other.begin(), other.end(), [](char a, char b) {
-        return fold(static_cast<unsigned char>(a)) == fold(static_cast<unsigned char>(b));
-    });
+// The mechanism of an entry in the text as two words with NULs after it. The parser has folded it, and two words are
+// readable there, so that this takes no call.
+void load_words(std::string_view mechanism, std::uint64_t (&words)[2]) {
+    words[0] = first_byte_highest(load8(mechanism.data())) & ~bits_after(mechanism.size());
+    if (mechanism.size() > word_size)
+        words[1] = first_byte_highest(load8(mechanism.data() + word_size)) &
+                   ~bits_after(mechanism.size() - word_size);
 }
 
-std::uint32_t hash_of_key(const acle_view &acle, const identity_hash_key &key) {
-    char mechanism[mechanism_max] = {};
-    if (has_mechanism(acle.type))
-        std::memcpy(mechanism, acle.mechanism.data(), acle.mechanism.size());
-    std::uint64_t state = hash_word(key.second, acle.type, key);
-    state = hash_word(state, fold8(load8(mechanism)), key);
-    state = hash_word(state, fold8(load8(mechanism + sizeof(std::uint64_t))), key);
-    return static_cast<std::uint32_t>(hash_word(state, key.second, key) >> 32);
+// The same for any other mechanism.
+void fold_words(std::string_view mechanism, std::uint64_t (&words)[2]) {
+    char padded[mechanism_max] = {};
+    std::memcpy(padded, mechanism.data(), mechanism.size());
+    words[0] = fold8(load8(padded));
+    words[1] = fold8(load8(padded + word_size));
 }
 
 } // namespace
+
+// Finding duplicates by sorting needs places that ascend in order of insertion over all trees. When releases are traced,
+// the trees must not hold entries after the first bad one.
+sec_acltree_array::sec_acltree_array(std::span<char> text)
+    : text_(text),
+      handled_(text.empty() || text.size() > identity_store::last_place || traces(trace_category::api)
+                   ? sec_acltree_t::duplicates::are_refused
+                   : sec_acltree_t::duplicates::are_found_later) {}
 
 sec_acltree_array::~sec_acltree_array() {
     const bool is_traced = traces(trace_category::api);
@@ -42,25 +51,32 @@ sec_acltree_array::~sec_acltree_array() {
     }
 }
 
-bool sec_acltree_array::is_of_key(const sec_acltree_t &tree, const acle_view &acle) const {
-    if (tree.type() != acle.type)
-        return false;
-    if (!has_mechanism(acle.type))
-        return true;
-    // The parser has folded the mechanisms of a text.
-    return text_.empty() ? equals_folded(tree.mechanism(), acle.mechanism)
-                         : tree.mechanism() == acle.mechanism;
+sec_acltree_array::tree_key sec_acltree_array::key_of(std::uint8_t type, std::string_view mechanism) const {
+    tree_key key = {.mechanism = {}, .type = type};
+    if (has_mechanism(type))
+        text_.empty() ? fold_words(mechanism, key.mechanism) : load_words(mechanism, key.mechanism);
+    return key;
 }
 
-sec_acltree_t *sec_acltree_array::find_tree(const acle_view &acle, std::uint32_t hash) {
+std::uint32_t sec_acltree_array::hash_of(const tree_key &key) const {
+    std::uint64_t state = hash_word(hash_key_.second, key.type, hash_key_);
+    state = hash_word(state, key.mechanism[0], hash_key_);
+    state = hash_word(state, key.mechanism[1], hash_key_);
+    return static_cast<std::uint32_t>(hash_word(state, hash_key_.second, hash_key_) >> 32);
+}
+
+sec_acltree_t *sec_acltree_array::find_tree(const tree_key &key, std::uint32_t hash) const {
     if (index_ == nullptr)
         return nullptr;
     for (std::uint32_t at = hash;; ++at) {
         const slot held = index_[at & (index_size_ - 1)];
         if (held.number == 0)
             return nullptr;
-        if (held.hash == hash && is_of_key(*trees_[held.number - 1], acle))
-            return trees_[held.number - 1];
+        if (held.hash != hash)
+            continue;
+        sec_acltree_t *const tree = trees_[held.number - 1];
+        if (key_of(tree->type(), tree->mechanism()) == key)
+            return tree;
     }
 }
 
@@ -94,7 +110,7 @@ shortage sec_acltree_array::make_room_for_tree() {
     return {};
 }
 
-int sec_acltree_array::append_tree(const acle_view &acle, std::uint32_t hash) {
+int sec_acltree_array::append_tree(const acle_view &acle, const tree_key &key, std::uint32_t hash) {
     if (const shortage lacking = make_room_for_tree())
         return report_no_memory("sec__add_acle_to_trees", lacking);
     if (const shortage lacking = memory_.make_room(sizeof(sec_acltree_t)))
@@ -108,6 +124,7 @@ int sec_acltree_array::append_tree(const acle_view &acle, std::uint32_t hash) {
     trees_[count_++] = tree;
     enter_in_index({hash, count_});
     last_found_ = tree;
+    last_key_ = key;
     return SEC_S_OK;
 }
 
@@ -122,46 +139,50 @@ bool sec_acltree_array::may_borrow(const acle_view &acle) const {
 }
 
 int sec_acltree_array::add(const acle_view &acle) {
+    return add(acle, sec_acltree_t::duplicates::are_refused);
+}
+
+int sec_acltree_array::add(const acle_view &acle, sec_acltree_t::duplicates handled) {
     if (!may_borrow(acle))
         return report(SEC_S_INTERNAL, msg::internal_failure, acl_source, __LINE__, SEC_S_INTERNAL);
-    if (last_found_ == nullptr || !is_of_key(*last_found_, acle)) {
-        const std::uint32_t hash = hash_of_key(acle, hash_key_);
-        sec_acltree_t *found = find_tree(acle, hash);
+    const tree_key key = key_of(acle.type, acle.mechanism);
+    if (last_found_ == nullptr || key != last_key_) {
+        const std::uint32_t hash = hash_of(key);
+        sec_acltree_t *found = find_tree(key, hash);
         if (found == nullptr)
-            return append_tree(acle, hash);
+            return append_tree(acle, key, hash);
         last_found_ = found;
+        last_key_ = key;
     }
-    return add_to_tree(on_duplicate::report, acle, *last_found_);
+    return add_to_tree(on_duplicate::report, acle, *last_found_, handled);
 }
 
 void sec_acltree_array::expect(const acle_view &acle) const {
     constexpr int for_writing = 1;
     // Most entries have the key of the previous one.
-    if (last_found_ != nullptr && is_of_key(*last_found_, acle))
+    if (last_found_ != nullptr && key_of(acle.type, acle.mechanism) == last_key_)
         __builtin_prefetch(last_found_->first_look(acle), for_writing);
 }
 
-int sec_acltree_array::add_soon(const acle_view &acle) {
-    int result = SEC_S_OK;
-    acle_view &oldest = waiting_[first_waiting_];
-    if (waiting_count_ == waiting_max)
-        result = add(oldest);
-    else
-        ++waiting_count_;
-    expect(acle);
-    oldest = acle;
-    first_waiting_ = (first_waiting_ + 1) % waiting_max;
-    return result;
+int sec_acltree_array::append(const acle_view &acle) {
+    may_hold_duplicates_ = handled_ == sec_acltree_t::duplicates::are_found_later;
+    const int result = add(acle, handled_);
+    return result == SEC_S_OK ? SEC_S_OK : settle(result);
 }
 
 int sec_acltree_array::settle(int result) {
-    const std::uint32_t count = std::exchange(waiting_count_, 0);
-    for (std::uint32_t left = count; left != 0; --left) {
-        const int added = add(waiting_[(first_waiting_ + waiting_max - left) % waiting_max]);
-        if (added != SEC_S_OK)
-            return added;
+    if (!may_hold_duplicates_)
+        return result;
+    std::optional<small_entry> first;
+    const sec_acltree_t *its_tree = nullptr;
+    for (sec_acltree_t *tree : trees()) {
+        const std::optional<small_entry> found = tree->first_duplicate();
+        if (found && (!first || found->place < first->place)) {
+            first = found;
+            its_tree = tree;
+        }
     }
-    return result;
+    return first ? sec__report_duplicate(its_tree->view(*first)) : result;
 }
 
 int sec__add_acle_to_trees(const acle_view &acle, sec_acltree_array &array) { return array.add(acle); }

@@ -12,6 +12,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <span>
+#include <string_view>
 
 // Trees in order of the first appearance of their keys.
 class sec_acltree_array {
@@ -19,54 +20,61 @@ public:
     // For entries parsed from the text, which includes a NUL, outlives the trees, and has the readable bytes after
     // it that identity_order.h requires. Other entries fail with an internal error. With an empty text the trees
     // copy what they keep.
-    explicit sec_acltree_array(std::span<char> text = {}) : text_(text) {}
+    explicit sec_acltree_array(std::span<char> text = {});
     sec_acltree_array(const sec_acltree_array &) = delete;
     sec_acltree_array &operator=(const sec_acltree_array &) = delete;
     ~sec_acltree_array();
 
     std::span<sec_acltree_t *const> trees() const { return {trees_.get(), count_}; }
 
-    // Prefetches the memory that inserting an entry of a text reads, for callers with other work to do first.
+    // Prefetches the memory that add() reads for an entry of a text, for callers with other work to do first.
     void expect(const qz::acle_view &acle) const;
 
     // Implements sec__add_acle_to_trees.
     int add(const qz::acle_view &acle);
 
-    // The same for a text whose first failure ends the reading. Entries wait in a queue while the memory for their
-    // insertion is prefetched, so the result may be that of an earlier entry.
-    int add_soon(const qz::acle_view &acle);
-    // Inserts the waiting entries. Returns the first failure, or else `result`, which came after them.
+    // The same for a text whose first failure ends the reading. Most duplicates are only found by settle(), which sorts
+    // the entries: that takes less time than looking for each. A failure is that of the first bad entry so far.
+    int append(const qz::acle_view &acle);
+    // Looks for duplicates among the appended entries. Returns the failure of the first one, or else `result`, which
+    // came after them.
     int settle(int result);
 
 private:
+    struct tree_key {
+        std::uint64_t mechanism[2]; // folded, with NULs after it; zero for types without one
+        std::uint8_t type;
+
+        bool operator==(const tree_key &) const = default;
+    };
     struct slot {
         std::uint32_t hash;
         std::uint32_t number; // number of the tree plus one; 0 in a free slot
     };
 
-    bool is_of_key(const sec_acltree_t &tree, const qz::acle_view &acle) const;
+    tree_key key_of(std::uint8_t type, std::string_view mechanism) const;
+    std::uint32_t hash_of(const tree_key &key) const;
     bool may_borrow(const qz::acle_view &acle) const;
 
-    static constexpr std::uint32_t waiting_max = 16;
-
-    sec_acltree_t *find_tree(const qz::acle_view &acle, std::uint32_t hash);
-    int append_tree(const qz::acle_view &acle, std::uint32_t hash);
+    sec_acltree_t *find_tree(const tree_key &key, std::uint32_t hash) const;
+    int append_tree(const qz::acle_view &acle, const tree_key &key, std::uint32_t hash);
+    int add(const qz::acle_view &acle, sec_acltree_t::duplicates handled);
     qz::shortage make_room_for_tree();
     void enter_in_index(slot entry);
 
     std::span<char> text_;
+    sec_acltree_t::duplicates handled_; // when duplicates among appended entries are found
+    bool may_hold_duplicates_ = false;
     qz::owned<sec_acltree_t *[]> trees_;
     std::uint32_t count_ = 0;
     std::uint32_t capacity_ = 0;
     sec_acltree_t *last_found_ = nullptr;
+    tree_key last_key_ = {};
     // A hash table of trees by key: there may be as many mechanisms as entries.
     qz::owned<slot[]> index_;
     std::uint32_t index_size_ = 0;
     qz::identity_hash_key hash_key_ = qz::make_identity_hash_key();
     qz::arena memory_; // of the trees themselves
-    qz::acle_view waiting_[waiting_max];
-    std::uint32_t first_waiting_ = 0;
-    std::uint32_t waiting_count_ = 0;
 };
 
 // Inserts the entry into the tree of its key, which is appended if missing. Returns SEC_S_OK, SEC_S_BAD_ACLE for a
