@@ -3,6 +3,7 @@
 #include "qzacl_trace.h"
 #include "support.h"
 
+#include <atomic>
 #include <semaphore>
 #include <thread>
 
@@ -60,8 +61,11 @@ bool looks_up_a_handler() {
     std::uint32_t mask = 0;
     return sec__single_acle_perm(&acl.acl, by_handler, "unix", nullptr, "al", &mask) == SEC_S_OK && mask == 1;
 }
+// Each time from another catalog, which is opened under the lock.
 bool fetches_a_text() {
-    cu_set_error_1(4, 0, "none.cat", 1, 1, "text");
+    static std::atomic<int> number = 0;
+    const std::string catalog = "none-" + std::to_string(++number) + ".cat";
+    cu_set_error_1(4, 0, catalog.c_str(), 1, 1, "text");
     return recorded_error().text == "text";
 }
 bool registers_for_tracing() {

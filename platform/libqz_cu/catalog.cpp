@@ -4,8 +4,11 @@
 
 #include "base/uncancelled.h"
 
+#include <algorithm>
+#include <atomic>
 #include <cstddef>
 #include <cstring>
+#include <iterator>
 #include <nl_types.h>
 #include <pthread.h>
 
@@ -17,8 +20,9 @@ struct opened_catalog {
     nl_catd descriptor; // from catopen; a failure is kept, too, so that it does not search again
 };
 
+// Entries are only ever added, and the count is raised last. So the counted ones are read without the lock.
 constinit opened_catalog catalogs[8] = {};
-constinit std::size_t catalog_count = 0;
+constinit std::atomic<std::size_t> catalog_count = 0;
 pthread_mutex_t catalogs_mutex = PTHREAD_MUTEX_INITIALIZER;
 
 void lock() { pthread_mutex_lock(&catalogs_mutex); }
@@ -30,27 +34,46 @@ void unlock() { pthread_mutex_unlock(&catalogs_mutex); }
 
 const nl_catd no_catalog = reinterpret_cast<nl_catd>(-1);
 
-nl_catd find_or_open(const char *name) {
-    for (std::size_t i = 0; i < catalog_count; ++i)
-        if (std::strcmp(catalogs[i].name, name) == 0)
-            return catalogs[i].descriptor;
+const opened_catalog *find(const char *name) {
+    const std::size_t count = catalog_count.load(std::memory_order_acquire);
+    const opened_catalog *const found =
+        std::find_if(catalogs, catalogs + count,
+                     [name](const opened_catalog &each) { return std::strcmp(each.name, name) == 0; });
+    return found == catalogs + count ? nullptr : found;
+}
+
+// The caller holds the lock. Null if there is no room for another catalog.
+const opened_catalog *find_or_open(const char *name) {
+    if (const opened_catalog *const found = find(name))
+        return found;
+    const std::size_t count = catalog_count.load(std::memory_order_relaxed);
     const std::size_t length = std::strlen(name);
-    if (catalog_count == sizeof catalogs / sizeof *catalogs || length >= sizeof catalogs->name)
-        return no_catalog;
-    opened_catalog &added = catalogs[catalog_count++];
+    if (count == std::size(catalogs) || length >= sizeof catalogs->name)
+        return nullptr;
+    opened_catalog &added = catalogs[count];
     std::memcpy(added.name, name, length + 1);
     added.descriptor = catopen(name, NL_CAT_LOCALE);
-    return added.descriptor;
+    catalog_count.store(count + 1, std::memory_order_release);
+    return &added;
+}
+
+[[gnu::noinline]] const opened_catalog *find_or_open_locked(const char *name) {
+    const uncancelled until_unlocked;
+    lock();
+    const opened_catalog *const found = find_or_open(name);
+    unlock();
+    return found;
 }
 
 } // namespace
 
 const char *catalog_text(const char *catalog, int set, int message_id) {
-    const uncancelled until_unlocked;
-    lock();
-    const nl_catd descriptor = find_or_open(catalog);
-    unlock();
-    return descriptor == no_catalog ? nullptr : catgets(descriptor, set, message_id, nullptr);
+    const opened_catalog *opened = find(catalog);
+    if (opened == nullptr)
+        opened = find_or_open_locked(catalog);
+    if (opened == nullptr || opened->descriptor == no_catalog)
+        return nullptr;
+    return catgets(opened->descriptor, set, message_id, nullptr);
 }
 
 } // namespace qz::cu
