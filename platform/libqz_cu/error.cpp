@@ -1,5 +1,6 @@
 // The error facility: each thread's current error, recorded unformatted. Its text is made when it is fetched.
 #include "base/kept_errno.h"
+#include "base/owned.h"
 #include "libqz_cu/catalog.h"
 #include "libqz_cu/message_text.h"
 #include "qz/cu.h"
@@ -141,7 +142,9 @@ const char *text_of(const recorded_error &error) {
 } // namespace qz::cu
 
 using namespace qz::cu;
+using qz::allocate;
 using qz::kept_errno;
+using qz::owned;
 
 int cu_set_error_1(int code, int, const char *catalog, int set, int message_id, const char *default_text,
                    ...) {
@@ -204,17 +207,19 @@ int cu_get_errmsg_1(const cu_error_t *error, char **text) {
     const kept_errno kept;
     const recorded_error &from = record_of(error);
     const char *shown = from.present ? text_of(from) : "";
-    // Most texts fit here and are formatted only once.
-    char room[512];
-    const std::size_t size = format_text(shown, from.given, room, sizeof room);
-    char *made = static_cast<char *>(std::malloc(size));
+    // Most texts fit into this and are formatted only once.
+    constexpr std::size_t room = 512;
+    owned<char[]> made = allocate<char>(room);
     if (made == nullptr)
         return CU_NO_MEMORY;
-    if (size <= sizeof room)
-        std::memcpy(made, room, size);
-    else
-        format_text(shown, from.given, made, size);
-    *text = made;
+    const std::size_t size = format_text(shown, from.given, made.get(), room);
+    if (size > room) {
+        made = allocate<char>(size);
+        if (made == nullptr)
+            return CU_NO_MEMORY;
+        format_text(shown, from.given, made.get(), size);
+    }
+    *text = made.release();
     return CU_OK;
 }
 

@@ -180,11 +180,11 @@ std::size_t format_text(const char *text, const arguments &given, char *out, std
     sink to(out, room);
     conversion next;
     for (;;) {
-        const char *percent = std::strchr(text, '%');
-        if (percent == nullptr)
-            break;
+        const char *percent = strchrnul(text, '%');
         to.put(text, static_cast<std::size_t>(percent - text));
         text = percent;
+        if (*percent == '\0')
+            break;
         if (percent[1] == '%') {
             to.put("%", 1);
             text += 2;
@@ -197,7 +197,7 @@ std::size_t format_text(const char *text, const arguments &given, char *out, std
             text += 1;
         }
     }
-    to.put(text, std::strlen(text) + 1);
+    to.put("", 1);
     return to.length();
 }
 
