@@ -24,31 +24,27 @@ constexpr std::uint64_t fold8(std::uint64_t word) {
     return word | (upper >> 2);
 }
 
-// Orders the folded words at two places: below 0, 0 or above 0.
-inline int fold_compare8(const char *a, const char *b) {
-    const std::uint64_t left = first_byte_highest(fold8(load8(a)));
-    const std::uint64_t right = first_byte_highest(fold8(load8(b)));
+// Orders two words whose first byte is the lowest without regard to case: below 0, 0 or above 0.
+inline int fold_compare8(std::uint64_t a, std::uint64_t b) {
+    const std::uint64_t left = __builtin_bswap64(fold8(a));
+    const std::uint64_t right = __builtin_bswap64(fold8(b));
     return left == right ? 0 : left < right ? -1 : 1;
 }
 
 // Orders two runs of n bytes without regard to case, NUL being a byte like any other: below 0, 0 or above 0.
 inline int fold_compare(const char *a, const char *b, std::size_t n) {
-    if (n >= word_size) {
-        // The last word may overlap the one before it, whose bytes are then known to be alike.
-        const std::size_t last = n - word_size;
-        for (std::size_t at = 0; at < last; at += word_size) {
-            if (const int order = fold_compare8(a + at, b + at); order != 0)
-                return order;
-        }
-        return fold_compare8(a + last, b + last);
+    if (n < word_size)
+        return fold_compare8(load_few(a, n), load_few(b, n));
+    const auto compare_at = [a, b](std::size_t at) {
+        return fold_compare8(first_byte_lowest(load8(a + at)), first_byte_lowest(load8(b + at)));
+    };
+    // The last word may overlap the one before it, whose bytes are then known to be alike.
+    const std::size_t last = n - word_size;
+    for (std::size_t at = 0; at < last; at += word_size) {
+        if (const int order = compare_at(at); order != 0)
+            return order;
     }
-    for (; n != 0; ++a, ++b, --n) {
-        const int left = fold(static_cast<unsigned char>(*a));
-        const int right = fold(static_cast<unsigned char>(*b));
-        if (left != right)
-            return left - right;
-    }
-    return 0;
+    return compare_at(last);
 }
 
 // Compares two NUL-terminated strings without regard to case: below 0, 0 or above 0. It reads single bytes, because a

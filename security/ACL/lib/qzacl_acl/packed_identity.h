@@ -149,12 +149,8 @@ private:
     // The words are assembled in registers: loading one right after storing fewer bytes would stall as long as
     // comparing several entries takes.
     static std::uint64_t first_word(const char *text, std::size_t length) {
-        if (length >= word_size)
-            return first_byte_highest(load8(text));
-        std::uint64_t word = 0;
-        for (std::size_t index = 0; index < length; ++index)
-            word |= std::uint64_t{static_cast<unsigned char>(text[index])} << (8 * (word_size - 1 - index));
-        return word;
+        return length >= word_size ? first_byte_highest(load8(text))
+                                   : __builtin_bswap64(load_few(text, length));
     }
 
     static std::uint64_t second_word(const char *text, std::size_t length) {
