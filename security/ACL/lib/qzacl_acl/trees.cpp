@@ -170,7 +170,7 @@ int sec_acltree_array::append(const acle_view &acle) {
     return result == SEC_S_OK ? SEC_S_OK : settle(result);
 }
 
-int sec_acltree_array::settle(int result) {
+int sec_acltree_array::settle(int result) const {
     if (!may_hold_duplicates_)
         return result;
     std::optional<small_entry> first;

@@ -38,7 +38,7 @@ public:
     int append(const qz::acle_view &acle);
     // Looks for duplicates among the appended entries. Returns the failure of the first one, or else `result`, which
     // came after them.
-    int settle(int result);
+    int settle(int result) const;
 
 private:
     struct tree_key {
