@@ -66,8 +66,8 @@ int sec__register_id_handler(std::uint32_t kind, const char *mechanism, sec_id_c
     });
 }
 
+// While the lock is held, no call is a cancellation point, so cancellation stays as it is.
 int sec__get_id_handler(std::uint32_t kind, const char *mechanism, sec_id_compare_fn *handler) {
-    const uncancelled until_unlocked;
     pthread_once(&acl__init_once_block, acl__state_init);
     *handler = nullptr;
     if (const int error = pthread_mutex_lock(&acl__state.lock); error != 0)
