@@ -11,32 +11,15 @@
 namespace qz {
 namespace {
 
-struct sorts_before {
-    const identity_store &identities;
-
-    bool operator()(const small_entry &a, const small_entry &b) const {
-        if (a.key != b.key)
-            return a.key < b.key;
-        const int order = compare_identities(identities.identity(a.place), identities.identity(b.place));
-        return order != 0 ? order < 0 : a.place < b.place;
-    }
-};
-
-// The length of the folded prefix common to all identities.
-std::size_t common_prefix(std::span<const small_entry> entries, const identity_store &identities) {
-    const small_entry &first = entries.front();
-    std::uint64_t difference = 0;
-    for (const small_entry &entry : entries)
-        difference |= entry.key ^ first.key;
-    if (difference != 0)
-        return static_cast<std::size_t>(std::countl_zero(difference)) / 8;
-    if (ends_within(first.key))
-        return 0; // all are equal
-    const char *const text = identities.identity(first.place);
+// The length of the folded prefix common to all identities, at least `known` bytes unless they are equal.
+std::size_t common_prefix(std::span<const small_entry> entries, const identity_store &identities,
+                          std::size_t known) {
+    const char *const text = identities.identity(entries.front().place);
     std::size_t prefix = identity_length(text);
     for (const small_entry &entry : entries.subspan(1)) {
         const char *const other = identities.identity(entry.place);
-        std::size_t same = identity_word_size;
+        std::uint64_t difference = 0;
+        std::size_t same = known;
         while (same < prefix && (difference = ordered_word(text + same) ^ ordered_word(other + same)) == 0)
             same += identity_word_size;
         if (same < prefix)
@@ -71,39 +54,100 @@ void order_by_digit(std::span<small_entry> entries, const digit_of_key &digit, c
     }
 }
 
-// Sorts by one digit after the other. The recursion is at most as deep as a key has bytes.
-void radix_sort(std::span<small_entry> entries, digit_of_key digit, const sorts_before &before) {
-    // Up to this many entries, a comparison sort is faster.
-    constexpr std::size_t few = 48;
-    if (entries.size() <= few || digit.number == sizeof(small_entry::key)) {
-        std::sort(entries.begin(), entries.end(), before);
-        return;
+// Sorts by one digit of the keys after the other and, where all of them are equal, by the keys of the bytes after them.
+class radix_sort {
+public:
+    explicit radix_sort(const identity_store &identities) : identities_(identities) {}
+
+    // Makes the bytes after the first `shared` ones the keys.
+    void load_keys(std::span<small_entry> entries, std::size_t shared) {
+        for (small_entry &entry : entries)
+            entry.key = ordered_word(identities_.identity(entry.place) + shared);
+        has_whole_keys_ = false;
     }
-    digit_counts sizes{};
-    for (const small_entry &entry : entries)
-        ++sizes[digit(entry)];
-    if (sizes[digit(entries.front())] != entries.size())
+
+    // The identities have the first `shared` bytes in common, and so have the keys the digits before `digit`.
+    void sort(std::span<small_entry> entries, std::size_t shared, digit_of_key digit) {
+        // Up to this many entries, a comparison sort is faster.
+        constexpr std::size_t few = 48;
+        while (entries.size() > few) {
+            if (digit.number == identity_word_size) {
+                if (ends_within(entries.front().key))
+                    break; // all are equal
+                shared = common_prefix(entries, identities_, shared + identity_word_size);
+                load_keys(entries, shared);
+                digit = {0};
+            }
+            entries = sort_all_but_largest(entries, shared, digit);
+            ++digit.number;
+        }
+        std::sort(entries.begin(), entries.end(), [this, shared](const small_entry &a, const small_entry &b) {
+            return sorts_before(a, b, shared);
+        });
+    }
+
+    bool has_whole_keys() const { return has_whole_keys_; }
+
+private:
+    // Orders entries by a digit and sorts the ranges with equal ones, except for the largest, which it returns. So the
+    // depth of the recursion is logarithmic.
+    std::span<small_entry> sort_all_but_largest(std::span<small_entry> entries, std::size_t shared,
+                                                digit_of_key digit) {
+        digit_counts sizes{};
+        for (const small_entry &entry : entries)
+            ++sizes[digit(entry)];
+        if (sizes[digit(entries.front())] == entries.size())
+            return entries;
         order_by_digit(entries, digit, sizes);
-    std::size_t start = 0;
-    for (const std::uint32_t size : sizes) {
-        if (size > 1)
-            radix_sort(entries.subspan(start, size), {digit.number + 1}, before);
-        start += size;
+        std::span<small_entry> largest;
+        std::size_t start = 0;
+        for (const std::uint32_t size : sizes) {
+            std::span<small_entry> range = entries.subspan(start, size);
+            start += size;
+            if (size > largest.size())
+                std::swap(range, largest);
+            if (range.size() > 1)
+                sort(range, shared, {digit.number + 1});
+        }
+        return largest;
     }
-}
+
+    bool sorts_before(const small_entry &a, const small_entry &b, std::size_t shared) const {
+        if (a.key != b.key)
+            return a.key < b.key;
+        if (!ends_within(a.key)) {
+            const std::size_t equal = shared + identity_word_size;
+            const int order = compare_identities(identities_.identity(a.place) + equal,
+                                                 identities_.identity(b.place) + equal);
+            if (order != 0)
+                return order < 0;
+        }
+        return a.place < b.place;
+    }
+
+    const identity_store &identities_;
+    bool has_whole_keys_ = true;
+};
 
 } // namespace
 
-std::size_t sort_by_identity(std::span<small_entry> entries, const identity_store &identities) {
+bool sort_by_identity(std::span<small_entry> entries, const identity_store &identities) {
     if (entries.size() < 2)
-        return 0;
-    const std::size_t prefix = common_prefix(entries, identities);
-    if (prefix != 0) {
-        for (small_entry &entry : entries)
-            entry.key = ordered_word(identities.identity(entry.place) + prefix);
-    }
-    radix_sort(entries, {.number = 0}, {identities});
-    return prefix;
+        return true;
+    const std::uint64_t first = entries.front().key;
+    std::uint64_t difference = 0;
+    for (const small_entry &entry : entries)
+        difference |= entry.key ^ first;
+    std::size_t shared = 0;
+    if (difference != 0)
+        shared = static_cast<std::size_t>(std::countl_zero(difference)) / 8;
+    else if (!ends_within(first))
+        shared = common_prefix(entries, identities, identity_word_size);
+    radix_sort sorting(identities);
+    if (shared != 0)
+        sorting.load_keys(entries, shared);
+    sorting.sort(entries, shared, {0});
+    return sorting.has_whole_keys();
 }
 
 std::optional<small_entry> first_duplicate(std::span<const small_entry> sorted,

@@ -19,10 +19,10 @@ struct small_entry {
 };
 static_assert(sizeof(small_entry) == 16);
 
-// Sorts entries by identity, and those with equal ones by place. Takes O(n log n) comparisons for any order of input
-// and a bounded stack depth, and no memory. Returns the length of the prefix common to all identities; the keys then hold
-// the bytes after it.
-std::size_t sort_by_identity(std::span<small_entry> entries, const identity_store &identities);
+// Sorts entries by identity, and those with equal ones by place. Takes O(n log n) comparisons for any order of input, a
+// logarithmic stack depth, and no memory. Returns whether the keys still hold the start of the identities. If not, they
+// hold later bytes, from places that differ.
+bool sort_by_identity(std::span<small_entry> entries, const identity_store &identities);
 
 // Of sorted entries, the one with the lowest place that repeats the identity of an earlier one.
 std::optional<small_entry> first_duplicate(std::span<const small_entry> sorted,

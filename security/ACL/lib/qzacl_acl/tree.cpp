@@ -88,7 +88,7 @@ sec_acltree::insertion sec_acltree::insert(const acle_view &acle, duplicates han
     if (is_ascending_ && count != 0)
         is_ascending_ = sorts_last(wanted);
     if (handled == duplicates::are_found_later) {
-        table_.release(); // it lacks this entry
+        table_.release(); // it would lack this entry
     } else if (!is_ascending_) {
         if (count >= few && table_.room() <= count) {
             if (const shortage lacking = fill_table(place))
@@ -118,15 +118,16 @@ std::optional<small_entry> sec_acltree::first_duplicate() {
         return qz::first_duplicate(entries_.all(), identities_);
     }
     // Expanded entries keep the order of insertion.
+    restore_keys();
     const std::span<small_entry> entries = entries_.all();
     const owned<small_entry[]> copy = allocate<small_entry>(entries.size());
     const std::span<small_entry> sorted = copy == nullptr ? entries : std::span(copy.get(), entries.size());
     if (copy != nullptr)
         std::copy(entries.begin(), entries.end(), sorted.begin());
-    const bool drops_prefix = sort_by_identity(sorted, identities_) != 0;
+    const bool has_whole_keys = sort_by_identity(sorted, identities_);
     const std::optional<small_entry> found = qz::first_duplicate(sorted, identities_);
     if (copy == nullptr) {
-        has_whole_keys_ = !drops_prefix;
+        has_whole_keys_ = has_whole_keys;
         std::sort(entries.begin(), entries.end(),
                   [](const small_entry &a, const small_entry &b) { return a.place < b.place; });
     }
@@ -165,7 +166,7 @@ void sec_acltree::put_in_order() const {
     table_.release(); // its numbers become invalid, and sorting can use the memory
     if (type_ == SEC_ACLE_EXPANDED)
         return;
-    has_whole_keys_ = sort_by_identity(entries_.all(), identities_) == 0;
+    has_whole_keys_ = sort_by_identity(entries_.all(), identities_);
     is_ascending_ = true;
 }
 

@@ -98,7 +98,7 @@ private:
     std::uint64_t packed_size_ = 0;
     std::uint32_t held_count_ = 0;
     std::uint32_t overlong_count_ = 0;
-    mutable bool has_whole_keys_ = true; // false once sorting has dropped a common prefix from the keys
+    mutable bool has_whole_keys_ = true; // false once sorting has replaced keys by later bytes
     // True while every entry sorts after its predecessor. As long as it is, no two are equal, and the table is unused.
     mutable bool is_ascending_ = true;
     std::uint8_t type_;
