@@ -57,7 +57,7 @@ const opened_catalog *find_or_open(const char *name) {
     return &added;
 }
 
-[[gnu::noinline]] const opened_catalog *find_or_open_locked(const char *name) {
+const opened_catalog *lock_and_open(const char *name) {
     const uncancelled until_unlocked;
     lock();
     const opened_catalog *const found = find_or_open(name);
@@ -70,9 +70,11 @@ const opened_catalog *find_or_open(const char *name) {
 const char *catalog_text(const char *catalog, int set, int message_id) {
     const opened_catalog *opened = find(catalog);
     if (opened == nullptr)
-        opened = find_or_open_locked(catalog);
+        opened = lock_and_open(catalog);
     if (opened == nullptr || opened->descriptor == no_catalog)
         return nullptr;
+    // POSIX lets it be a cancellation point, and callers hold memory.
+    const uncancelled until_found;
     return catgets(opened->descriptor, set, message_id, nullptr);
 }
 

@@ -207,7 +207,7 @@ int cu_get_errmsg_1(const cu_error_t *error, char **text) {
     const kept_errno kept;
     const recorded_error &from = record_of(error);
     const char *shown = from.present ? text_of(from) : "";
-    // Most texts fit into this and are formatted only once.
+    // Most texts fit into this and are formatted only once. What remains of the block is freed with the text.
     constexpr std::size_t room = 512;
     owned<char[]> made = allocate<char>(room);
     if (made == nullptr)
