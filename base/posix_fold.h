@@ -24,7 +24,7 @@ constexpr std::uint64_t fold8(std::uint64_t word) {
     return word | (upper >> 2);
 }
 
-// Orders two words whose first byte is the lowest without regard to case: below 0, 0 or above 0.
+// Orders two words, whose first byte is the lowest, without regard to case: below 0, 0 or above 0.
 inline int fold_compare8(std::uint64_t a, std::uint64_t b) {
     const std::uint64_t left = __builtin_bswap64(fold8(a));
     const std::uint64_t right = __builtin_bswap64(fold8(b));

@@ -33,22 +33,26 @@ constexpr std::uint64_t first_byte_highest(std::uint64_t loaded) {
     return std::endian::native == std::endian::little ? __builtin_bswap64(loaded) : loaded;
 }
 
-// Less than eight bytes as a number whose lowest byte is the first one, followed by zeros. The parts that are loaded
+// The bytes of a smaller type as a number whose lowest byte is the first in memory.
+template <class Part>
+std::uint64_t load_part(const unsigned char *at) {
+    Part loaded;
+    std::memcpy(&loaded, at, sizeof loaded);
+    const std::uint64_t number = loaded;
+    return std::endian::native == std::endian::little ? number
+                                                      : __builtin_bswap64(number) >> (64 - 8 * sizeof loaded);
+}
+
+// Fewer than eight bytes as a number whose lowest byte is the first in memory, the rest zero. The parts that are loaded
 // overlap, because a loop over bytes would take longer than a comparison.
 inline std::uint64_t load_few(const void *at, std::size_t count) {
     const auto *const bytes = static_cast<const unsigned char *>(at);
-    const auto part = [bytes]<class Part>(Part, std::size_t place) {
-        Part loaded;
-        std::memcpy(&loaded, bytes + place, sizeof loaded);
-        const std::uint64_t number = loaded;
-        return std::endian::native == std::endian::little
-                   ? number
-                   : __builtin_bswap64(number) >> (64 - 8 * sizeof loaded);
-    };
     if (count >= 4)
-        return part(std::uint32_t{}, 0) | part(std::uint32_t{}, count - 4) << (8 * (count - 4));
+        return load_part<std::uint32_t>(bytes) | load_part<std::uint32_t>(bytes + count - 4)
+                                                     << (8 * (count - 4));
     if (count >= 2)
-        return part(std::uint16_t{}, 0) | part(std::uint16_t{}, count - 2) << (8 * (count - 2));
+        return load_part<std::uint16_t>(bytes) | load_part<std::uint16_t>(bytes + count - 2)
+                                                     << (8 * (count - 2));
     return count == 0 ? 0 : *bytes;
 }
 

@@ -154,12 +154,18 @@ TEST_F(allocations, of_files_fail) {
     fail_each({"check", check_and_tell, tolerated});
 }
 
-// Insertions wait for later lines; the first mistake is reported all the same.
+// Duplicates are reported late; the first mistake is reported all the same.
 TEST_F(files, tell_their_first_mistake) {
     const int duplicate = msg::duplicate_group.id;
     const int bad_type = msg::bad_type_token.id;
     const std::string twice = "g a\ng A\n";
     const std::string bad = "x y\n";
+    const auto repeated = [](int times, const std::string &lines) {
+        std::string all;
+        while (times-- != 0)
+            all += lines;
+        return all;
+    };
     const auto good = [](int count) {
         std::string lines;
         while (count-- != 0)
@@ -171,10 +177,11 @@ TEST_F(files, tell_their_first_mistake) {
         {twice + bad, duplicate},
         {bad + twice, bad_type},
         {"g a\n" + bad + "g A\n", bad_type},
-        {twice + good(14) + bad, duplicate},
+        {twice + std::string(1200, 'x'), duplicate},
         {twice + good(100) + bad, duplicate},
         {good(100) + twice + good(3), duplicate},
         {good(40) + "g MEMBER39\n", duplicate},
+        {good(3) + repeated(100, twice) + bad, duplicate},
     };
     for (const auto &[text, id] : rows) {
         write_file(path, text);
@@ -196,6 +203,18 @@ TEST_F(files, are_read_with_few_allocations) {
     }
     EXPECT_LT(counts[1], 100u);
     EXPECT_LE(counts[1], counts[0] + 10);
+}
+
+// They may be as long as the text.
+TEST_F(files, are_read_without_copying_the_tokens_of_a_line_that_is_too_long) {
+    std::vector<std::size_t> counts;
+    for (const char filling : {' ', 'x'}) {
+        write_file(path, std::string(2000, filling));
+        faults::allocations.count = 0;
+        EXPECT_EQ(read_acl(path, text_only).id, msg::line_too_long.id);
+        counts.push_back(faults::allocations.count);
+    }
+    EXPECT_EQ(counts[0], counts[1]);
 }
 
 } // namespace

@@ -26,39 +26,36 @@ namespace {
 
 constexpr bool is_line_end(char c) { return c == '\n' || c == '\f' || c == '\r'; }
 
-// Steps through the bytes of a text that are no plain signs: blanks, control characters, and bytes above ASCII.
-class sign_scan {
+// Steps through the bytes that may end a token: blanks, control characters, and bytes above ASCII.
+class token_end_scan {
 public:
     // The bytes from `begin` up to `limit` end in a NUL.
-    sign_scan(char *begin, const char *limit) : block_(begin), limit_(limit) { load(); }
+    token_end_scan(char *begin, const char *limit) : block_(begin), limit_(limit) { load(); }
 
     // The next such byte. The caller stops at the last NUL.
-    char *next_other() {
-        while (others_ == 0) {
+    char *next() {
+        while (candidates_ == 0) {
             block_ += word_size;
             load();
         }
-        char *const found = block_ + std::countr_zero(others_) / 8;
-        others_ &= others_ - 1;
+        char *const found = block_ + std::countr_zero(candidates_) / 8;
+        candidates_ &= candidates_ - 1;
         return found;
     }
 
 private:
     void load() {
-        std::uint64_t word = 0;
-        if (limit_ - block_ >= static_cast<std::ptrdiff_t>(word_size)) [[likely]]
-            word = first_byte_lowest(load8(block_));
-        else
-            for (const char *at = limit_; at != block_;)
-                word = word << 8 | static_cast<unsigned char>(*--at);
-        // The high bit of each byte that is not above the blank, or above 127. No sum carries into the next byte.
+        const auto left = static_cast<std::size_t>(limit_ - block_);
+        const std::uint64_t word =
+            left >= word_size ? first_byte_lowest(load8(block_)) : load_few(block_, left);
+        // The high bit of each byte, unless the byte is above the blank and below 128. No sum carries into the next byte.
         const std::uint64_t above_blank = (word & in_each_byte(0x7f)) + in_each_byte(0x7f - ' ');
-        others_ = (~above_blank | word) & in_each_byte(0x80);
+        candidates_ = (~above_blank | word) & in_each_byte(0x80);
     }
 
-    char *block_;
+    char *block_; // of eight bytes
     const char *limit_;
-    std::uint64_t others_ = 0;
+    std::uint64_t candidates_ = 0; // the high bits of those bytes of the block that are left
 };
 
 std::uint8_t type_of_letter(char letter) {
@@ -87,48 +84,40 @@ std::uint8_t type_of_letter(char letter) {
 class line_tokens {
 public:
     // The bytes from `begin` up to `limit` end in a NUL.
-    line_tokens(char *begin, const char *limit) : at_(begin), others_(begin, limit) {}
+    line_tokens(char *begin, const char *limit) : begin_(begin), at_(begin), candidates_(begin, limit) {}
 
     // False when only blanks or a comment are left.
     bool next(line_word &out) {
         while (end_ == nullptr) {
             char *const stop = next_separator();
-            if (ends_line(*stop))
-                end_at(stop);
-            if (stop != at_) {
-                if (*at_ == '#')
-                    return false;
-                out = {at_, static_cast<std::size_t>(stop - at_)};
-                *stop = '\0';
-                at_ = stop + 1;
-                return true;
+            // White space of the locale that is no blank ends a token even if that is empty.
+            if (stop == at_ && (end_ != nullptr || is_blank(*stop))) {
+                ++at_;
+                continue;
             }
-            if (end_ == nullptr && !is_blank(*stop)) {
-                out = {at_, 0};
-                at_ = stop + 1;
-                *stop = '\0';
-                return true;
-            }
-            ++at_;
+            if (*at_ == '#')
+                return false;
+            out = {at_, static_cast<std::size_t>(stop - at_)};
+            *stop = '\0';
+            at_ = stop + 1;
+            return true;
         }
         return false;
     }
 
-    // The end of the line, and whether it is a NUL.
+    // The line end or NUL.
     char *end() {
-        while (end_ == nullptr) {
-            char *const other = others_.next_other();
-            if (ends_line(*other))
-                end_at(other);
-        }
+        while (end_ == nullptr)
+            note_end(candidates_.next());
         return end_;
     }
+    std::size_t length() { return static_cast<std::size_t>(end() - begin_) + 1; }
     bool ends_at_nul() const { return ends_at_nul_; }
 
 private:
-    static constexpr bool ends_line(char c) { return c == '\0' || is_line_end(c); }
-
-    void end_at(char *stop) {
+    void note_end(char *stop) {
+        if (*stop != '\0' && !is_line_end(*stop))
+            return;
         end_ = stop;
         ends_at_nul_ = *stop == '\0';
     }
@@ -136,16 +125,18 @@ private:
     // White space, a line end, or a NUL.
     char *next_separator() {
         for (;;) {
-            char *const other = others_.next_other();
-            if (*other == ' ' || ends_line(*other) || is_space_(*other))
-                return other;
+            char *const candidate = candidates_.next();
+            note_end(candidate);
+            if (end_ != nullptr || *candidate == ' ' || is_space_(*candidate))
+                return candidate;
         }
     }
 
+    char *begin_;
     char *at_;
     char *end_ = nullptr;
-    bool ends_at_nul_ = false;
-    sign_scan others_;
+    bool ends_at_nul_ = false; // noted, because the NUL of the last token overwrites the line end
+    token_end_scan candidates_;
     space_class is_space_;
 };
 
@@ -156,26 +147,30 @@ void fold_in_place(const line_word &word) {
 
 // Fills the entry from the tokens of a line. Without any, its type stays 0.
 int parse_line(line_tokens &tokens, const sec_perm_set_t &set, int line, parsed_acle &entry) {
+    // Of a line that is too long, nothing else is reported: its tokens may be as long as the text.
+    const auto refuse = [&tokens](int code, const auto &message, auto... values) {
+        return tokens.length() > line_length_max ? code : report(code, message, values...);
+    };
     line_word type;
     if (!tokens.next(type))
         return SEC_S_OK;
     entry.type = type.length == 1 ? type_of_letter(type.text[0]) : std::uint8_t{0};
     if (entry.type == 0)
-        return report(SEC_S_BAD_ACL, msg::bad_type_token, line, type.text);
+        return refuse(SEC_S_BAD_ACL, msg::bad_type_token, line, type.text);
 
     if (has_mechanism(entry.type)) {
         line_word mechanism;
         if (!tokens.next(mechanism))
-            return report(SEC_S_BAD_ACL, msg::tokens_missing, line);
+            return refuse(SEC_S_BAD_ACL, msg::tokens_missing, line);
         if (mechanism.length > mechanism_max)
-            return report(SEC_S_BAD_ACL, msg::mechanism_too_long, mechanism.text, line);
+            return refuse(SEC_S_BAD_ACL, msg::mechanism_too_long, mechanism.text, line);
         fold_in_place(mechanism);
         entry.mechanism = {mechanism.text, mechanism.length};
     }
     if (has_identity(entry.type)) {
         line_word identity;
         if (!tokens.next(identity))
-            return report(SEC_S_BAD_ACL, msg::tokens_missing, line);
+            return refuse(SEC_S_BAD_ACL, msg::tokens_missing, line);
         entry.identity = {identity.text, identity.length};
     }
 
@@ -186,12 +181,11 @@ int parse_line(line_tokens &tokens, const sec_perm_set_t &set, int line, parsed_
         result != SEC_S_OK) {
         // This message replaces the one about the letter, because it names the line.
         cu_set_no_error_1();
-        report(result, msg::bad_permission_token, line, permissions.text);
-        return result;
+        return refuse(result, msg::bad_permission_token, line, permissions.text);
     }
     line_word excess;
     if (tokens.next(excess))
-        return report(SEC_S_BAD_ACL, msg::tokens_in_excess, line);
+        return refuse(SEC_S_BAD_ACL, msg::tokens_in_excess, line);
     return SEC_S_OK;
 }
 
@@ -217,8 +211,7 @@ int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size
     const auto shown_line = static_cast<int>(*line);
     line_tokens tokens(begin, begin + *remaining);
     int result = parse_line(tokens, set == nullptr ? acl__default_perm_set : *set, shown_line, *entry);
-    char *const end = tokens.end();
-    const std::size_t length = static_cast<std::size_t>(end - begin) + 1;
+    const std::size_t length = tokens.length();
     if (length > line_length_max) {
         *entry = {};
         trace(point::line_too_long, *line, length);
@@ -229,7 +222,7 @@ int sec__read_acle_from_text(const sec_perm_set_t *set, char **cursor, std::size
         ++*line;
         return report(SEC_S_BAD_ACL, msg::line_corrupted, shown_line);
     }
-    *cursor = tokens.ends_at_nul() ? nullptr : end + 1;
+    *cursor = tokens.ends_at_nul() ? nullptr : tokens.end() + 1;
     *remaining -= length;
     ++*line;
     return result == SEC_S_OK ? line_consumed : result;

@@ -39,7 +39,7 @@ sec_acle_t record_of(const parsed_acle &entry);
 } // namespace qz
 
 // Reads the line at `*cursor` into `*entry`, which then points into the text. The text is writable and ends in a NUL;
-// `*remaining` counts the bytes from the cursor to that NUL, inclusive. A null `set` means the default templates.
+// `*remaining` counts the bytes from the cursor to that NUL, inclusive; no others are read. A null `set` means the default templates.
 //
 // Returns SEC_S_OK when nothing is left, and line_consumed when it consumed a line; the entry's type is 0 for a line
 // without one. Any other result is a recorded failure: SEC_S_BAD_PERMISSION, SEC_S_FILE_ERROR or SEC_S_BAD_ACL. That

@@ -23,13 +23,6 @@ private:
 #endif
 };
 
-// Moves to the next word. False when only blanks or a comment are left.
-inline bool find_word(char *&at, const char *end) {
-    while (at != end && is_blank(*at))
-        ++at;
-    return at != end && *at != '#';
-}
-
 // A word in the line.
 struct line_word {
     char *text = nullptr;
@@ -44,7 +37,9 @@ public:
 
     // False when only blanks or a comment are left.
     bool next(line_word &out) {
-        if (!find_word(at_, end_))
+        while (at_ != end_ && is_blank(*at_))
+            ++at_;
+        if (at_ == end_ || *at_ == '#')
             return false;
         out.text = at_;
         while (at_ != end_ && !is_space_(*at_))
