@@ -147,13 +147,13 @@ private:
     qz::parsed_acle parsed_;
 };
 
-// Reads the text up to its first failure, finding duplicates late. Compiles it if there is none.
+// Reads the text up to its first failure, which reports duplicates late. Compiles it if there is none.
 failure read_at_once(const std::string &text, buffer &out) {
     const buffer copy(text_field(text) + std::string(readable_behind, 'x'));
     char *cursor = static_cast<char *>(copy.acl.data);
     std::size_t left = text.size() + 1;
     std::uint32_t line = 1;
-    sec_acltree_array trees(std::span(cursor, left));
+    sec_acltree_array trees(std::span(cursor, left), qz::on_duplicate::report_late);
     qz::parsed_acle parsed;
     qz::acle_view last;
     int result = qz::line_consumed;
@@ -162,8 +162,8 @@ failure read_at_once(const std::string &text, buffer &out) {
         if (result != qz::line_consumed || parsed.type == 0)
             continue;
         last = qz::view_of(parsed);
-        if (const int appended = trees.append(last); appended != SEC_S_OK)
-            return outcome_of(appended);
+        if (const int added = trees.add(last); added != SEC_S_OK)
+            return outcome_of(added);
     }
     // Without memory for a copy, expanded entries are sorted another way.
     const auto settles = [&] { return trees.settle(result); };
@@ -171,8 +171,9 @@ failure read_at_once(const std::string &text, buffer &out) {
     if (const failure first = outcome_of(is_patient ? faults::patiently(settles) : settles());
         first != no_error)
         return first;
-    EXPECT_TRUE(trees.trees().empty() || outcome_of(trees.add(last)) != no_error);
-    return outcome_of(sec__acltrees_to_acl(trees.trees(), &out.acl));
+    const failure compiled = outcome_of(sec__acltrees_to_acl(trees.trees(), &out.acl));
+    EXPECT_TRUE(trees.trees().empty() || outcome_of(trees.settle(trees.add(last))) != no_error);
+    return compiled;
 }
 
 } // namespace

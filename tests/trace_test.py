@@ -95,12 +95,17 @@ class Trace(CommandCase):
         released = [record["items"][4]["text"] for record in records if record["id"] == RELEASES_TOLD_ENTRY]
         self.assertEqual("".join(released), "cifpwtm" + "dcba" + "abcd" + "cbda" + "tfm")
 
-    def test_trees_of_a_text_with_a_duplicate(self):
-        """They hold the entries before it."""
+    def test_a_text_with_a_duplicate(self):
+        """Nothing shows the lines after it: neither the trees, nor a line that is too long."""
         errors = message("duplicate_group", "g", "B") + message("cache_skipped_after_errors")
         self.check("-s", "g c\ng b\ng B\ng a\n", Code.BAD_ACLE, errors)
         released = [record["items"][4]["text"] for record in self.records() if record["id"] == RELEASES_TOLD_ENTRY]
         self.assertEqual(released, ["b", "c"])
+
+        self.write("a", "g b\ng B\n" + "x" * 1200)
+        pathlib.Path(self.dir + ".trace").unlink()
+        self.expect(["-sf", "a"], Code.BAD_ACLE, errors, environment=self.traced("Errors=1"))
+        self.assertEqual(self.records(), [])
 
     def test_replaced_entries(self):
         """A mechanism that fills its array is recorded without the bytes after it."""

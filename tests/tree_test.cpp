@@ -18,8 +18,8 @@ TEST(tree, holds_what_a_text_says) {
         const auto below = [&](std::size_t limit) { return random() % limit; };
         std::string text;
         for (auto count = 1 + below(round % 20 == 7 ? 500 : 60); count != 0; --count) {
-            // Of few letters, of all bytes, and after a long shared prefix.
-            std::string name(round % 5 == 2 ? round % 60 : 0, 'z');
+            // Of few letters, of all bytes, and after one of two long prefixes.
+            std::string name(round % 5 == 2 ? round % 60 : 0, "yz"[below(2)]);
             for (auto left = 1 + below(round % 5 == 1 ? 150 : 6); left != 0; --left)
                 name +=
                     round % 5 == 1 ? static_cast<char>(33 + below(223)) : "aAbBzZ@[`{\x7f\x80\xff"[below(13)];

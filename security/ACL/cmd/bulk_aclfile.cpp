@@ -108,7 +108,6 @@ private:
 int read_entries(acl_text &text, unsigned flags, sec_acltree_array &trees, bool &is_clean) {
     const bool goes_on = (flags & ACLFCK_OPT_CONTINUE) != 0;
     const bool is_verbose = (flags & ACLFCK_OPT_VERBOSE) != 0;
-    const bool may_wait = !goes_on && !is_verbose;
     line_failures failures(goes_on);
     parsed_acle entry;
     while (!line_failures::must_end()) {
@@ -124,7 +123,7 @@ int read_entries(acl_text &text, unsigned flags, sec_acltree_array &trees, bool 
                 const sec_acle_t shown = record_of(entry);
                 sec__dump_acle(&shown, nullptr, "");
             }
-            result = may_wait ? trees.append(acle) : trees.add(acle);
+            result = trees.add(acle);
             may_go_on = goes_on && result == SEC_S_BAD_ACLE;
         } else {
             result = trees.settle(line == acl_line::bad ? text.failure() : SEC_S_OK);
@@ -182,7 +181,9 @@ int aclfck__bulk_aclfile(const char *aclfname, const char *username, unsigned fl
         return SEC_S_OK;
     }
 
-    sec_acltree_array trees(text.all());
+    // With either option, the output shows the lines before a failure, or those after it.
+    const bool shows_lines = (flags & (ACLFCK_OPT_CONTINUE | ACLFCK_OPT_VERBOSE)) != 0;
+    sec_acltree_array trees(text.all(), shows_lines ? on_duplicate::report : on_duplicate::report_late);
     bool is_clean = true;
     if (const int result = read_entries(text, flags, trees, is_clean); result != SEC_S_OK) {
         warn_of_skipped_cache(flags);

@@ -6,8 +6,9 @@
 
 namespace qz {
 
-// What adding an entry does when its key already has an entry with its identity.
-enum class on_duplicate : std::uint8_t { replace_mask, report };
+// What adding an entry does when its key already has an entry with its identity. A duplicate that is reported late is
+// added, and found when all entries are sorted.
+enum class on_duplicate : std::uint8_t { replace_mask, report, report_late };
 
 } // namespace qz
 

@@ -87,7 +87,6 @@ bool acl_file_reader::read_cache(sec_acl_buffer_t &out) {
 
 int acl_file_reader::parse_lines(sec_acltree_array &trees) {
     const bool traces_lines = traces(point::line_read);
-    const bool may_wait = !traces_lines && !traces(point::parsing); // traces show the line of a failure
     parsed_acle entry;
     for (;;) {
         const acl_line line = text_.next(entry);
@@ -100,7 +99,7 @@ int acl_file_reader::parse_lines(sec_acltree_array &trees) {
             point::line_read.record(text_.line(), entry.type, acle.mechanism, acle.identity, entry.perm_mask);
         if (line == acl_line::none)
             continue;
-        if (const int added = may_wait ? trees.append(acle) : trees.add(acle); added != SEC_S_OK)
+        if (const int added = trees.add(acle); added != SEC_S_OK)
             return added;
     }
 }
@@ -108,7 +107,7 @@ int acl_file_reader::parse_lines(sec_acltree_array &trees) {
 int acl_file_reader::parse(sec_acl_buffer_t &out) {
     const trace_timer<point::parsing> parsing;
     flags_ &= ~std::uint32_t{SEC_READ_ACL_CONVERT};
-    sec_acltree_array trees(text_.all());
+    sec_acltree_array trees(text_.all(), on_duplicate::report_late);
     int result = parse_lines(trees);
     if (result == SEC_S_OK && !trees.trees().empty())
         result = sec__acltrees_to_acl(trees.trees(), &out);

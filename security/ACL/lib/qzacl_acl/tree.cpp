@@ -69,7 +69,7 @@ small_entry *sec_acltree::find_equal(const candidate &wanted, std::uint64_t hash
     return number == identity_table::none ? nullptr : &entries[number];
 }
 
-sec_acltree::insertion sec_acltree::insert(const acle_view &acle, duplicates handled) {
+sec_acltree::insertion sec_acltree::insert(const acle_view &acle, on_duplicate handling) {
     const std::uint32_t count = entries_.count();
     if (is_single_type(type_) && count != 0)
         return {outcome::duplicate, &entries_.all().front(), {}};
@@ -87,9 +87,7 @@ sec_acltree::insertion sec_acltree::insert(const acle_view &acle, duplicates han
     const candidate wanted = {identity, ordered_word(identity)};
     if (is_ascending_ && count != 0)
         is_ascending_ = sorts_last(wanted);
-    if (handled == duplicates::are_found_later) {
-        table_.release(); // it would lack this entry
-    } else if (!is_ascending_) {
+    if (!is_ascending_ && handling != on_duplicate::report_late) {
         if (count >= few && table_.room() <= count) {
             if (const shortage lacking = fill_table(place))
                 return {outcome::no_memory, nullptr, lacking};
@@ -216,14 +214,13 @@ void sec_acltree::trace_release() {
 
 namespace qz {
 
-int add_to_tree(on_duplicate handling, const acle_view &acle, sec_acltree &tree,
-                sec_acltree::duplicates duplicates) {
-    const sec_acltree::insertion done = tree.insert(acle, duplicates);
+int add_to_tree(on_duplicate handling, const acle_view &acle, sec_acltree &tree) {
+    const sec_acltree::insertion done = tree.insert(acle, handling);
     switch (done.result) {
     case sec_acltree::outcome::inserted:
         break;
     case sec_acltree::outcome::duplicate:
-        if (handling == on_duplicate::report)
+        if (handling != on_duplicate::replace_mask)
             return sec__report_duplicate(acle);
         done.entry->perm_mask = acle.perm_mask;
         sec__trace_replacement(acle);

@@ -2,8 +2,8 @@
 // mechanism, that of all others the type alone.
 //
 // Entries are stored in order of insertion. User and group entries are sorted by identity when their order is first
-// needed. Finding a duplicate takes one hash look-up for any order of input, and nothing recurses on the size of a
-// tree. tree_shape.h has the few things that depend on the shape of a linked tree.
+// needed. Each duplicate is found by one hash look-up, or all are found at once by sorting. Nothing recurses on the size
+// of a tree. tree_shape.h has the few things that depend on the shape of a linked tree.
 #ifndef QZACL_TREE_H
 #define QZACL_TREE_H
 
@@ -40,11 +40,8 @@ public:
     // The mechanism of the key, as the first entry inserted spells it.
     std::string_view mechanism() const { return identities_.first_mechanism(); }
 
-    // An entry whose identity is already there is either refused, or inserted and found by first_duplicate().
-    enum class duplicates : std::uint8_t { are_refused, are_found_later };
-
-    // A refused duplicate changes nothing. To find duplicates later, the identities must be in the text.
-    insertion insert(const qz::acle_view &acle, duplicates handled = duplicates::are_refused);
+    // A duplicate changes nothing, unless it is to be reported late. Then all are, and the identities are in the text.
+    insertion insert(const qz::acle_view &acle, qz::on_duplicate handling);
     // The first entry inserted that repeats the identity of an earlier one.
     std::optional<qz::small_entry> first_duplicate();
     // The memory that inserting an entry of the text reads first, or null if unknown.
@@ -118,8 +115,7 @@ void sec__free_acltree(sec_acltree_t *root);
 namespace qz {
 
 // The same for an existing tree.
-int add_to_tree(on_duplicate handling, const acle_view &acle, sec_acltree &tree,
-                sec_acltree::duplicates duplicates = sec_acltree::duplicates::are_refused);
+int add_to_tree(on_duplicate handling, const acle_view &acle, sec_acltree &tree);
 
 struct free_acltree {
     void operator()(sec_acltree_t *root) const { sec__free_acltree(root); }

@@ -2,8 +2,8 @@
 #include "qzacl_acl/trees.h"
 
 #include "base/posix_fold.h"
-#include "qzacl_trace.h"
 #include "report.h"
+#include "trace_points.h"
 
 #include <algorithm>
 #include <cstring>
@@ -14,32 +14,38 @@ using namespace qz;
 
 namespace {
 
-// The mechanism of an entry in the text as two words with NULs after it. The parser has folded it, and two words are
-// readable there, so that this takes no call.
-void load_words(std::string_view mechanism, std::uint64_t (&words)[2]) {
-    words[0] = first_byte_highest(load8(mechanism.data())) & ~bits_after(mechanism.size());
-    if (mechanism.size() > word_size)
-        words[1] = first_byte_highest(load8(mechanism.data() + word_size)) &
-                   ~bits_after(mechanism.size() - word_size);
+// A mechanism in two words, folded, the rest zero.
+using mechanism_words = std::array<std::uint64_t, 2>;
+
+// Of an entry in the text. The parser has folded it, and two words are readable there, so that this takes no call.
+mechanism_words words_in_text(std::string_view mechanism) {
+    const std::uint64_t first = first_byte_highest(load8(mechanism.data())) & ~bits_after(mechanism.size());
+    if (mechanism.size() <= word_size)
+        return {first, 0};
+    return {first, first_byte_highest(load8(mechanism.data() + word_size)) &
+                       ~bits_after(mechanism.size() - word_size)};
 }
 
-// The same for any other mechanism.
-void fold_words(std::string_view mechanism, std::uint64_t (&words)[2]) {
+// Of any other entry.
+mechanism_words folded_words(std::string_view mechanism) {
     char padded[mechanism_max] = {};
     std::memcpy(padded, mechanism.data(), mechanism.size());
-    words[0] = fold8(load8(padded));
-    words[1] = fold8(load8(padded + word_size));
+    return {fold8(load8(padded)), fold8(load8(padded + word_size))};
+}
+
+// Reporting duplicates late needs places that ascend in order of insertion over all trees. A trace of lines or releases
+// must show none after the first bad entry.
+on_duplicate possible_handling(std::span<char> text, on_duplicate wanted) {
+    const bool is_traced = traces(trace_category::api) || traces(point::line_too_long) ||
+                           traces(point::line_read) || traces(point::parsing);
+    return text.empty() || text.size() > identity_store::last_place || is_traced ? on_duplicate::report
+                                                                                 : wanted;
 }
 
 } // namespace
 
-// Finding duplicates by sorting needs places that ascend in order of insertion over all trees. When releases are traced,
-// the trees must not hold entries after the first bad one.
-sec_acltree_array::sec_acltree_array(std::span<char> text)
-    : text_(text),
-      handled_(text.empty() || text.size() > identity_store::last_place || traces(trace_category::api)
-                   ? sec_acltree_t::duplicates::are_refused
-                   : sec_acltree_t::duplicates::are_found_later) {}
+sec_acltree_array::sec_acltree_array(std::span<char> text, on_duplicate handling)
+    : text_(text), handling_(possible_handling(text, handling)) {}
 
 sec_acltree_array::~sec_acltree_array() {
     const bool is_traced = traces(trace_category::api);
@@ -52,10 +58,9 @@ sec_acltree_array::~sec_acltree_array() {
 }
 
 sec_acltree_array::tree_key sec_acltree_array::key_of(std::uint8_t type, std::string_view mechanism) const {
-    tree_key key = {.mechanism = {}, .type = type};
-    if (has_mechanism(type))
-        text_.empty() ? fold_words(mechanism, key.mechanism) : load_words(mechanism, key.mechanism);
-    return key;
+    if (!has_mechanism(type))
+        return {{}, type};
+    return {text_.empty() ? folded_words(mechanism) : words_in_text(mechanism), type};
 }
 
 std::uint32_t sec_acltree_array::hash_of(const tree_key &key) const {
@@ -116,7 +121,7 @@ int sec_acltree_array::append_tree(const acle_view &acle, const tree_key &key, s
     if (const shortage lacking = memory_.make_room(sizeof(sec_acltree_t)))
         return report_no_memory("sec__add_acle_to_tree", lacking);
     auto *tree = new (memory_.room()) sec_acltree_t(acle.type, text_);
-    if (const int result = add_to_tree(on_duplicate::report, acle, *tree); result != SEC_S_OK) {
+    if (const int result = add_to_tree(handling_, acle, *tree); result != SEC_S_OK) {
         tree->~sec_acltree();
         return result;
     }
@@ -139,10 +144,11 @@ bool sec_acltree_array::may_borrow(const acle_view &acle) const {
 }
 
 int sec_acltree_array::add(const acle_view &acle) {
-    return add(acle, sec_acltree_t::duplicates::are_refused);
+    const int result = insert(acle);
+    return result == SEC_S_OK ? SEC_S_OK : settle(result);
 }
 
-int sec_acltree_array::add(const acle_view &acle, sec_acltree_t::duplicates handled) {
+int sec_acltree_array::insert(const acle_view &acle) {
     if (!may_borrow(acle))
         return report(SEC_S_INTERNAL, msg::internal_failure, acl_source, __LINE__, SEC_S_INTERNAL);
     const tree_key key = key_of(acle.type, acle.mechanism);
@@ -154,7 +160,7 @@ int sec_acltree_array::add(const acle_view &acle, sec_acltree_t::duplicates hand
         last_found_ = found;
         last_key_ = key;
     }
-    return add_to_tree(on_duplicate::report, acle, *last_found_, handled);
+    return add_to_tree(handling_, acle, *last_found_);
 }
 
 void sec_acltree_array::expect(const acle_view &acle) const {
@@ -164,14 +170,8 @@ void sec_acltree_array::expect(const acle_view &acle) const {
         __builtin_prefetch(last_found_->first_look(acle), for_writing);
 }
 
-int sec_acltree_array::append(const acle_view &acle) {
-    may_hold_duplicates_ = handled_ == sec_acltree_t::duplicates::are_found_later;
-    const int result = add(acle, handled_);
-    return result == SEC_S_OK ? SEC_S_OK : settle(result);
-}
-
 int sec_acltree_array::settle(int result) const {
-    if (!may_hold_duplicates_)
+    if (handling_ != on_duplicate::report_late)
         return result;
     std::optional<small_entry> first;
     const sec_acltree_t *its_tree = nullptr;

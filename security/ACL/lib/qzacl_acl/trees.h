@@ -9,6 +9,7 @@
 #include "qzacl_acl/identity_order.h"
 #include "qzacl_acl/tree.h"
 
+#include <array>
 #include <cstddef>
 #include <cstdint>
 #include <span>
@@ -20,29 +21,30 @@ public:
     // For entries parsed from the text, which includes a NUL, outlives the trees, and has the readable bytes after
     // it that identity_order.h requires. Other entries fail with an internal error. With an empty text the trees
     // copy what they keep.
-    explicit sec_acltree_array(std::span<char> text = {});
+    //
+    // A reader that ends at the first failure may have duplicates reported late: sorting takes less time than looking
+    // for each. Where the text or tracing does not allow it, they are reported at once.
+    explicit sec_acltree_array(std::span<char> text = {},
+                               qz::on_duplicate handling = qz::on_duplicate::report);
     sec_acltree_array(const sec_acltree_array &) = delete;
     sec_acltree_array &operator=(const sec_acltree_array &) = delete;
     ~sec_acltree_array();
 
     std::span<sec_acltree_t *const> trees() const { return {trees_.get(), count_}; }
 
-    // Prefetches the memory that add() reads for an entry of a text, for callers with other work to do first.
+    // Prefetches the memory that add() reads to report a duplicate at once, for callers with other work to do first.
     void expect(const qz::acle_view &acle) const;
 
-    // Implements sec__add_acle_to_trees.
+    // Implements sec__add_acle_to_trees. When duplicates are reported late, a failure is that of the first bad entry so far.
     int add(const qz::acle_view &acle);
 
-    // The same for a text whose first failure ends the reading. Most duplicates are only found by settle(), which sorts
-    // the entries: that takes less time than looking for each. A failure is that of the first bad entry so far.
-    int append(const qz::acle_view &acle);
-    // Looks for duplicates among the appended entries. Returns the failure of the first one, or else `result`, which
-    // came after them.
+    // Reports the first duplicate, if that is done late and there is one. Otherwise returns `result`, which came after all
+    // entries.
     int settle(int result) const;
 
 private:
     struct tree_key {
-        std::uint64_t mechanism[2]; // folded, with NULs after it; zero for types without one
+        std::array<std::uint64_t, 2> mechanism; // folded, the rest zero; all zero for types without one
         std::uint8_t type;
 
         bool operator==(const tree_key &) const = default;
@@ -58,13 +60,12 @@ private:
 
     sec_acltree_t *find_tree(const tree_key &key, std::uint32_t hash) const;
     int append_tree(const qz::acle_view &acle, const tree_key &key, std::uint32_t hash);
-    int add(const qz::acle_view &acle, sec_acltree_t::duplicates handled);
+    int insert(const qz::acle_view &acle);
     qz::shortage make_room_for_tree();
     void enter_in_index(slot entry);
 
     std::span<char> text_;
-    sec_acltree_t::duplicates handled_; // when duplicates among appended entries are found
-    bool may_hold_duplicates_ = false;
+    const qz::on_duplicate handling_;
     qz::owned<sec_acltree_t *[]> trees_;
     std::uint32_t count_ = 0;
     std::uint32_t capacity_ = 0;
